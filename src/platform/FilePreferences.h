@@ -1,0 +1,31 @@
+#pragma once
+
+#include "platform/Preferences.h"
+#include "platform/PropertyListFiles.h"
+
+namespace kvr {
+
+/// Preferences kept as one property list a domain below "Library/Preferences" of the home directory.
+class FilePreferences : public Preferences {
+ public:
+  FilePreferences(PropertyListFiles& lists, Log& log, std::string standardDomain);
+
+  void registerDefaults(const Value::Dictionary& defaults) override;
+  Value objectForKey(std::string_view key) const override;
+  Value objectForKey(std::string_view key, std::string_view domain) const override;
+  void setObject(const Value& value, std::string_view key) override;
+  void removeObject(std::string_view key) override;
+  std::vector<std::string> allKeys() const override;
+  void update(std::string_view key, const std::function<Value(const Value&)>& change) override;
+
+ private:
+  std::string pathOf(std::string_view domain) const;
+
+  PropertyListFiles& lists_;
+  Log& log_;
+  const std::string standardPath_;
+  mutable std::mutex defaultsMutex_;
+  Value::Dictionary defaults_;
+};
+
+}  // namespace kvr

@@ -1,0 +1,27 @@
+#pragma once
+
+#include "platform/Error.h"
+#include "platform/Value.h"
+
+#include <string>
+#include <string_view>
+
+namespace kvr {
+
+enum class PropertyListEncoding { XML, Binary };
+
+/// How deep containers may be nested in any tree that is read (the top level is 1).
+inline constexpr std::size_t kMaximumDepth = 512;
+
+/// Reads a property list in any encoding: XML, binary, or the old ASCII form.
+///
+/// Takes any bytes: what is no property list, is nested deeper than `kMaximumDepth`, or unfolds to more than
+/// a bounded number of values is an error in domain "plist". Thread-safe, no state.
+Result<Value> readPropertyList(std::string_view bytes);
+
+/// Writes a tree. XML holds no null, no character that XML forbids and no date outside the calendar, and
+/// drops a date's fraction of a second; the binary encoding holds every tree. A tree that does not fit, or is
+/// nested deeper than `kMaximumDepth`, is an error in domain "plist".
+Result<std::string> writePropertyList(const Value& tree, PropertyListEncoding encoding);
+
+}  // namespace kvr

@@ -1,0 +1,27 @@
+#pragma once
+
+#include <map>
+#include <memory>
+#include <mutex>
+#include <typeindex>
+
+namespace kvr {
+
+/// The objects of which one platform has one each, made at their first use. Thread-safe.
+class SharedObjects {
+ public:
+  /// The one `T`, made by `make` (which must not ask for another shared object) if there is none yet.
+  template <class T, class Make>
+  T& get(const Make& make) {
+    const std::lock_guard lock(mutex_);
+    auto& slot = objects_[std::type_index(typeid(T))];
+    if (!slot) slot = std::static_pointer_cast<void>(std::shared_ptr<T>(make()));
+    return *static_cast<T*>(slot.get());
+  }
+
+ private:
+  std::mutex mutex_;
+  std::map<std::type_index, std::shared_ptr<void>> objects_;
+};
+
+}  // namespace kvr

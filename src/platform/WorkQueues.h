@@ -1,0 +1,84 @@
+#pragma once
+
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <utility>
+#include <vector>
+
+namespace kvr {
+
+using Work = std::function<void()>;
+
+/// Runs what it is handed, later. What it was handed is released right after it ran, on the thread it ran on.
+/// An exception that leaves a work item is logged and ends that item only.
+class WorkQueue {
+ public:
+  virtual ~WorkQueue() = default;
+  /// Hands over one item, from any thread. It never runs before `async` has returned on a queue that is the
+  /// caller's own.
+  virtual void async(Work work) = 0;
+};
+
+using WorkQueueRef = std::shared_ptr<WorkQueue>;
+
+enum class Priority { Default, Background };
+
+/// A repeating timer; destroying it, or `invalidate`, ends it. A firing already handed to its queue may still
+/// run.
+class Timer {
+ public:
+  virtual ~Timer() = default;
+  virtual void invalidate() = 0;
+};
+
+/// One event that happens once and stays. Any thread may signal; any number may wait.
+class Signal {
+ public:
+  virtual ~Signal() = default;
+  virtual void signal() = 0;
+  /// Blocks until signalled (true), or until `limit` seconds have passed or the process is ending (false).
+  /// Nothing as the limit waits without one. Never called on the main queue.
+  virtual bool wait(std::optional<double> limit) = 0;
+};
+
+/// The queues, timers and waits of one process.
+///
+/// Serial queues (the main queue is one) run one item at a time in the order handed over. Concurrent queues
+/// run items side by side. However many items block, others go on: blocked threads are made up for.
+/// Delays are in seconds and count while the device sleeps; a negative or undefined delay counts as 0.
+class WorkQueues {
+ public:
+  virtual ~WorkQueues() = default;
+  virtual WorkQueueRef mainQueue() = 0;
+  /// A fresh serial queue; it lives until the last reference is gone and its items have run.
+  virtual WorkQueueRef newSerialQueue(std::string label) = 0;
+  virtual WorkQueueRef concurrentQueue(Priority priority) = 0;
+  /// Hands `work` to `queue` once `delay` seconds have passed.
+  virtual void after(double delay, WorkQueueRef queue, Work work) = 0;
+  /// Hands `work` to `queue` every `interval` seconds, first after one interval.
+  virtual std::shared_ptr<Timer> newRepeatingTimer(double interval, WorkQueueRef queue, Work work) = 0;
+  virtual std::shared_ptr<Signal> newSignal() = 0;
+};
+
+/// A count of outstanding work with notice when it is empty. Usable again after each emptying. Thread-safe.
+class WorkGroup {
+ public:
+  void enter() {
+    const std::lock_guard lock(mutex_);
+    ++outstanding_;
+  }
+  /// Ends one `enter`. The last one hands every waiting notice to its queue.
+  void leave();
+  /// Hands `work` to `queue` when nothing is outstanding; at once if nothing is.
+  void notify(WorkQueueRef queue, Work work);
+
+ private:
+  std::mutex mutex_;
+  std::size_t outstanding_ = 0;
+  std::vector<std::pair<WorkQueueRef, Work>> notices_;
+};
+
+}  // namespace kvr
