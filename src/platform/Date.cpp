@@ -2,12 +2,13 @@
 
 #include <cmath>
 #include <cstdio>
+#include <cstdlib>
 
 namespace kvr {
 namespace {
 
 constexpr long long kSecondsPerDay = 86400;
-constexpr double kCalendarLimit = 1e15;  // about 31 million years either way
+constexpr double kCalendarLimit = 1e15;
 
 /// Days since 1970-01-01 of a proleptic Gregorian date; eras of 400 years keep the arithmetic exact.
 long long daysFromCivil(long long year, int month, int day) {
@@ -20,6 +21,10 @@ long long daysFromCivil(long long year, int month, int day) {
 }
 
 }  // namespace
+
+bool isInCalendar(Date date) {
+  return std::isfinite(date.secondsSince1970) && std::abs(date.secondsSince1970) <= kCalendarLimit;
+}
 
 CalendarTime calendarTime(long long seconds) {
   long long days = seconds / kSecondsPerDay;
@@ -37,7 +42,11 @@ CalendarTime calendarTime(long long seconds) {
   const int day = static_cast<int>(dayOfYear - (153 * shiftedMonth + 2) / 5 + 1);
   const int month = static_cast<int>(shiftedMonth < 10 ? shiftedMonth + 3 : shiftedMonth - 9);
   const long long year = yearOfEra + era * 400 + (month <= 2 ? 1 : 0);
-  return {year, month, day, static_cast<int>(rest / 3600), static_cast<int>(rest / 60 % 60),
+  return {year,
+          month,
+          day,
+          static_cast<int>(rest / 3600),
+          static_cast<int>(rest / 60 % 60),
           static_cast<int>(rest % 60)};
 }
 
@@ -48,13 +57,13 @@ long long secondsSince1970(const CalendarTime& time) {
 
 std::string describe(Date date) {
   char text[64];
-  if (!std::isfinite(date.secondsSince1970) || std::abs(date.secondsSince1970) > kCalendarLimit) {
+  if (!isInCalendar(date)) {
     std::snprintf(text, sizeof text, "%g s since 1970", date.secondsSince1970);
     return text;
   }
   const auto time = calendarTime(static_cast<long long>(std::floor(date.secondsSince1970)));
-  std::snprintf(text, sizeof text, "%04lld-%02d-%02d %02d:%02d:%02d +0000", time.year, time.month, time.day,
-                time.hour, time.minute, time.second);
+  std::snprintf(text, sizeof text, "%s%04lld-%02d-%02d %02d:%02d:%02d +0000", time.year < 0 ? "-" : "",
+                std::abs(time.year), time.month, time.day, time.hour, time.minute, time.second);
   return text;
 }
 

@@ -25,14 +25,19 @@ struct CalendarTime {
   int hour;
   int minute;
   int second;
+
+  friend bool operator==(const CalendarTime&, const CalendarTime&) = default;
 };
+
+/// Whether a calendar reaches the date: it is finite and within 1e15 s (some 31 million years) of 1970.
+bool isInCalendar(Date date);
 
 /// The calendar reading of whole seconds since 1970; fractions are the caller's to drop.
 CalendarTime calendarTime(long long secondsSince1970);
 /// Seconds since 1970 of a calendar reading. The fields must be in their ranges.
 long long secondsSince1970(const CalendarTime& time);
 
-/// "2026-11-24 15:41:46 +0000"; a date no calendar reaches (not finite, or beyond +/-1e15 s) prints its seconds.
+/// "2026-11-24 15:41:46 +0000"; a date that is not in the calendar prints its seconds.
 std::string describe(Date date);
 
 }  // namespace kvr

@@ -46,6 +46,14 @@ struct AttestationOptions {
 class DeviceAttestation {
  public:
   static constexpr std::string_view kErrorDomain = "com.tarsil.attestation";
+
+  // The groups of device identifiers that a certificate may attest.
+  static constexpr std::string_view kWELDDeviceIdentifiers = "WELDDeviceIdentifiers";
+  static constexpr std::string_view kDeviceIdentifiers = "DeviceIdentifiers";
+  static constexpr std::string_view kHardwareProperties = "HardwareProperties";
+  static constexpr std::string_view kAccessControls = "AccessControls";
+  static constexpr std::string_view kDeviceOSInformation = "DeviceOSInformation";
+
   using Reply = std::function<void(AttestedKeyRef key, std::optional<CertificateChain> chain, std::optional<Error> error)>;
 
   virtual ~DeviceAttestation() = default;

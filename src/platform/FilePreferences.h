@@ -6,6 +6,10 @@
 namespace kvr {
 
 /// Preferences kept as one property list a domain below "Library/Preferences" of the home directory.
+///
+/// A domain that cannot be read is left as it is: its keys read as their registered values, and a change of
+/// one is refused. Changes are made under the directory's lock, on what the file holds at that moment, so no
+/// two threads or processes lose each other's keys.
 class FilePreferences : public Preferences {
  public:
   FilePreferences(PropertyListFiles& lists, Log& log, std::string standardDomain);
@@ -23,6 +27,7 @@ class FilePreferences : public Preferences {
 
   PropertyListFiles& lists_;
   Log& log_;
+  const std::string directory_;
   const std::string standardPath_;
   mutable std::mutex defaultsMutex_;
   Value::Dictionary defaults_;

@@ -57,8 +57,11 @@ class Files {
   virtual std::optional<Error> remove(const std::string& path) = 0;
   /// Durably, within one directory; replaces what bears the new name.
   virtual std::optional<Error> rename(const std::string& from, const std::string& to) = 0;
-  /// The lock on changes of the files in `directory`. It waits for other holders, for some seconds at most: a
-  /// holder that hangs must not hang the agent.
+  /// As `rename`, but replaces nothing: when anything bears the new name, an error with code EEXIST.
+  virtual std::optional<Error> renameToUnused(const std::string& from, const std::string& to) = 0;
+  /// The lock on changes of the files in `directory`, which is created if it is missing. It waits for other
+  /// holders, for some seconds at most: a holder that hangs must not hang the agent. The thread that holds it
+  /// may take it again; it is given back on that thread.
   virtual std::unique_ptr<FileLock> lock(const std::string& directory) = 0;
 };
 

@@ -6,7 +6,8 @@
 namespace kvr {
 
 std::string describe(const Error& error) {
-  return "Error Domain=" + error.domain + " Code=" + std::to_string(error.code) + " \"" + error.message + "\"";
+  return "Error Domain=" + error.domain + " Code=" + std::to_string(error.code) + " \"" + error.message +
+         "\"";
 }
 
 namespace format_detail {
@@ -23,7 +24,8 @@ void appendUnsigned(std::string& out, unsigned long long number) {
 
 void appendReal(std::string& out, double number, std::string_view precision) {
   int digits = 6;
-  if (precision.size() > 1) std::from_chars(precision.data() + 1, precision.data() + precision.size(), digits);
+  if (precision.size() > 1)
+    std::from_chars(precision.data() + 1, precision.data() + precision.size(), digits);
   char text[512];  // the largest double has 309 digits before the point
   const int length = std::snprintf(text, sizeof text, "%.*f", digits, number);
   out.append(text, std::min(static_cast<std::size_t>(length), sizeof text - 1));

@@ -77,22 +77,32 @@ void appendReal(std::string& out, double number, std::string_view precision);
 
 template <class T>
 constexpr Kind kindOf() {
-  if constexpr (std::integral<T>) return Kind::Integer;
-  else if constexpr (std::floating_point<T>) return Kind::Real;
-  else if constexpr (std::convertible_to<T, std::string_view>) return Kind::Text;
-  else return Kind::Object;
+  if constexpr (std::integral<T>)
+    return Kind::Integer;
+  else if constexpr (std::floating_point<T>)
+    return Kind::Real;
+  else if constexpr (std::convertible_to<T, std::string_view>)
+    return Kind::Text;
+  else
+    return Kind::Object;
 }
 
 template <class T>
 Argument argument(const T& value) {
-  return {kindOf<T>(), &value, [](std::string& out, const void* object, std::string_view precision) {
-            const auto& typed = *static_cast<const T*>(object);
-            if constexpr (std::floating_point<T>) appendReal(out, typed, precision);
-            else if constexpr (std::unsigned_integral<T>) appendUnsigned(out, typed);
-            else if constexpr (std::integral<T>) appendInteger(out, typed);
-            else if constexpr (std::convertible_to<T, std::string_view>) out += std::string_view(typed);
-            else out += describe(typed);
-          }};
+  return {
+      kindOf<T>(), &value, [](std::string& out, const void* object, std::string_view precision) {
+        const auto& typed = *static_cast<const T*>(object);
+        if constexpr (std::floating_point<T>)
+          appendReal(out, typed, precision);
+        else if constexpr (std::unsigned_integral<T>)
+          appendUnsigned(out, typed);
+        else if constexpr (std::integral<T>)
+          appendInteger(out, typed);
+        else if constexpr (std::convertible_to<T, std::string_view> && !std::convertible_to<T, const char*>)
+          out += std::string_view(typed);
+        else
+          out += describe(typed);
+      }};
 }
 
 template <std::size_t N>
@@ -102,7 +112,7 @@ Argument argument(const char (&text)[N]) {
           }};
 }
 
-/// Finds the next placeholder at or after `from`; `end` is one past it. An unknown one has kind `unknown`.
+/// Finds the next placeholder at or after `from`; `end` is one past it. An unknown one is not `known`.
 struct Placeholder {
   std::size_t begin;
   std::size_t end;
@@ -130,12 +140,22 @@ constexpr std::optional<Placeholder> nextPlaceholder(std::string_view text, std:
   if (used < rest.size() && rest[used] == 'l') ++used;
   const char conversion = used < rest.size() ? rest[used] : '\0';
   switch (conversion) {
-    case '@': found.kind = Kind::Object; break;
-    case 's': found.kind = Kind::Text; break;
+    case '@':
+      found.kind = Kind::Object;
+      break;
+    case 's':
+      found.kind = Kind::Text;
+      break;
     case 'd':
-    case 'u': found.kind = Kind::Integer; break;
-    case 'f': found.kind = Kind::Real; break;
-    default: found.known = false; break;
+    case 'u':
+      found.kind = Kind::Integer;
+      break;
+    case 'f':
+      found.kind = Kind::Real;
+      break;
+    default:
+      found.known = false;
+      break;
   }
   found.end = begin + 1 + (found.isPrivate ? 9U : 0U) + used + 1;
   return found;
@@ -152,8 +172,8 @@ template <class... A>
 class FormatString {
  public:
   consteval FormatString(const char* text) : text_(text) {  // NOLINT(google-explicit-constructor)
-    constexpr format_detail::Kind kKinds[] = {format_detail::kindOf<std::remove_cvref_t<std::decay_t<A>>>()...,
-                                              format_detail::Kind::Object};
+    constexpr format_detail::Kind kKinds[] = {
+        format_detail::kindOf<std::remove_cvref_t<std::decay_t<A>>>()..., format_detail::Kind::Object};
     std::size_t count = 0;
     std::size_t at = 0;
     while (const auto placeholder = format_detail::nextPlaceholder(text_, at)) {

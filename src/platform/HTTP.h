@@ -18,7 +18,7 @@ class HTTPHeaders {
  public:
   using Field = std::pair<std::string, std::string>;
 
-  /// Sets a field, replacing one of the same name (which keeps its place); nothing removes it.
+  /// Sets a field, in the place of one of the same name if there is one; no value takes such a field away.
   void set(std::string_view name, std::optional<std::string> value);
   std::optional<std::string> value(std::string_view name) const;
   const std::vector<Field>& fields() const { return fields_; }

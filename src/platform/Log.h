@@ -40,11 +40,12 @@ class Log {
   /// From here on the process is ending: answers that will not come any more are no fault.
   void beginEnding() { ending_ = true; }
   /// Reports an answer that was never given, or given twice; nothing while the process is ending.
-  void reportMisusedCompletion(std::string_view what, std::string_view name) {
+  virtual void reportMisusedCompletion(std::string_view what, std::string_view name) {
     if (!ending_) error("%s: %s", name, what);
   }
 
  protected:
+  bool isEnding() const { return ending_; }
   /// One message, its private values already redacted. May hold line breaks. Called from any thread.
   virtual void write(LogLevel level, const std::string& message) = 0;
 

@@ -14,8 +14,9 @@ namespace kvr {
 /// Property lists on disk, each read afresh when asked and replaced as a whole.
 ///
 /// Every reading is of the file as it is now; a file whose stamp shows that nothing changed is not parsed a
-/// second time. Thread-safe; a reader sees the old or the new content. The text of a file must be a dictionary
-/// or an array; `Expected` says which.
+/// second time. Thread-safe; a reader sees the old or the new content. The text of a file must be a
+/// dictionary or an array; `Expected` says which. Files of more than `kLimit` bytes are neither read nor
+/// written.
 class PropertyListFiles {
  public:
   enum class Expected { Dictionary, Array };
@@ -24,6 +25,8 @@ class PropertyListFiles {
     SetAside,  ///< renamed beside itself to its name with ".damaged-" and a time
     Leave,
   };
+
+  static constexpr std::size_t kLimit = 16UL * 1024 * 1024;
 
   PropertyListFiles(Files& files, const Clock& clock, Log& log);
 
@@ -37,27 +40,38 @@ class PropertyListFiles {
   Files& files() { return files_; }
 
  private:
+  /// What was made of a file: its tree, or why it is no property list.
   struct Parsed {
     FileStamp stamp;
-    Expected expected;
-    Value tree;
+    Result<Value> outcome;
+  };
+  struct Remembered {
+    Parsed parsed;
     std::list<std::string>::iterator age;
   };
+  struct Report {
+    std::string complaint;
+    FileStamp stamp;
+  };
 
-  std::optional<Value> remembered(const std::string& path, const FileStamp& stamp, Expected expected);
-  void remember(const std::string& path, const FileStamp& stamp, Expected expected, const Value& tree);
+  Result<std::optional<Parsed>> parse(const std::string& path);
+  std::optional<Parsed> remembered(const std::string& path, const FileStamp& stamp);
+  void remember(const std::string& path, const Parsed& parsed);
   void forget(const std::string& path);
-  void handleDamage(const std::string& path, const Error& error, const FileStamp& stamp, WhenDamaged whenDamaged);
-  void reportOnce(const std::string& path, const std::string& complaint, const FileStamp& stamp);
+  void forgetWhileLocked(const std::string& path);
+  std::optional<Result<Value>> setAside(const std::string& path, const Error& reason, const FileStamp& stamp);
+  Error reportUnreadable(const std::string& path, const Error& error);
+  bool isNews(const std::string& path, const std::string& complaint, const FileStamp& stamp);
+  void noteSound(const std::string& path);
 
   Files& files_;
   const Clock& clock_;
   Log& log_;
-  std::mutex mutex_;  ///< guards what follows
-  std::map<std::string, Parsed> parsed_;
-  std::list<std::string> byAge_;  ///< paths of `parsed_`, the longest unused first
-  std::uint64_t parsedBytes_ = 0;
-  std::map<std::string, FileStamp> reported_;
+  std::mutex mutex_;  ///< guards what follows; never held while a file is touched
+  std::map<std::string, Remembered> remembered_;
+  std::list<std::string> byAge_;  ///< paths of `remembered_`, the longest unused first
+  std::uint64_t rememberedBytes_ = 0;
+  std::map<std::string, Report> reported_;  ///< the last complaint about each file that is not sound
 };
 
 }  // namespace kvr

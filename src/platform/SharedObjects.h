@@ -12,11 +12,11 @@ class SharedObjects {
  public:
   /// The one `T`, made by `make` (which must not ask for another shared object) if there is none yet.
   template <class T, class Make>
-  T& get(const Make& make) {
+  std::shared_ptr<T> get(const Make& make) {
     const std::lock_guard lock(mutex_);
     auto& slot = objects_[std::type_index(typeid(T))];
-    if (!slot) slot = std::static_pointer_cast<void>(std::shared_ptr<T>(make()));
-    return *static_cast<T*>(slot.get());
+    if (!slot) slot = std::shared_ptr<T>(make());
+    return std::static_pointer_cast<T>(slot);
   }
 
  private:

@@ -1,5 +1,8 @@
 #include "platform/Value.h"
 
+#include "platform/Numbers.h"
+
+#include <algorithm>
 #include <charconv>
 #include <cmath>
 #include <limits>
@@ -9,6 +12,10 @@ namespace {
 
 constexpr double kTwoTo63 = 9223372036854775808.0;
 constexpr double kTwoTo64 = 18446744073709551616.0;
+
+bool equalReals(double left, double right) {
+  return left == right || (std::isnan(left) && std::isnan(right));
+}
 
 bool equalsReal(const Value& integer, double real) {
   if (std::isnan(real) || real != std::trunc(real)) return false;
@@ -21,9 +28,7 @@ bool equalsReal(const Value& integer, double real) {
 bool equalNumbers(const Value& left, const Value& right) {
   const bool leftReal = left.kind() == Value::Kind::Real;
   const bool rightReal = right.kind() == Value::Kind::Real;
-  if (leftReal && rightReal) {
-    return left.real() == right.real() || (std::isnan(left.real()) && std::isnan(right.real()));
-  }
+  if (leftReal && rightReal) return equalReals(left.real(), right.real());
   if (leftReal) return equalsReal(right, left.real());
   if (rightReal) return equalsReal(left, right.real());
   if (left.kind() != right.kind()) return false;
@@ -54,17 +59,12 @@ double stringAsDouble(std::string_view text) {
   const bool negative = text.starts_with('-');
   // Only decimal numbers count: from_chars would read "inf" and "nan" too.
   const auto first = negative ? 1U : 0U;
-  if (text.size() <= first || std::string_view("0123456789.").find(text[first]) == std::string_view::npos) return 0;
+  if (text.size() <= first || std::string_view("0123456789.").find(text[first]) == std::string_view::npos)
+    return 0;
   double number = 0;
-  const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
-  if (error == std::errc::result_out_of_range) {
-    // Too large, or too small to tell from zero; the sign of the exponent decides.
-    const bool tiny = std::string_view(text.data(), end).find("e-") != std::string_view::npos ||
-                      std::string_view(text.data(), end).find("E-") != std::string_view::npos;
-    if (tiny) return 0;
-    return negative ? -std::numeric_limits<double>::max() : std::numeric_limits<double>::max();
-  }
-  return error == std::errc() ? number : 0;
+  readReal(text, number);
+  constexpr double kLargest = std::numeric_limits<double>::max();
+  return std::clamp(number, -kLargest, kLargest);
 }
 
 std::int64_t stringAsInteger(std::string_view text) {
@@ -88,8 +88,8 @@ std::int64_t realAsInteger(double real) {
 bool isPlainWord(std::string_view text) {
   if (text.empty()) return false;
   for (const char c : text) {
-    const bool plain = (c >= '0' && c <= '9') || (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || c == '_' ||
-                       c == '.' || c == '/' || c == ':' || c == '-';
+    const bool plain = (c >= '0' && c <= '9') || (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') ||
+                       c == '_' || c == '.' || c == '/' || c == ':' || c == '-';
     if (!plain) return false;
   }
   return true;
@@ -118,21 +118,24 @@ void appendData(std::string& out, const Value::Bytes& bytes) {
   out += '>';
 }
 
-template <class Number>
-void appendNumber(std::string& out, Number number) {
-  char text[32];
-  const auto result = std::to_chars(text, text + sizeof text, number);
-  out.append(text, result.ptr);
-}
-
 // Depth is bounded: every reader of trees refuses what is nested deeper than it allows.
 void append(std::string& out, const Value& value, bool nested) {
   switch (value.kind()) {
-    case Value::Kind::Null: out += nested ? "<null>" : "(null)"; break;
-    case Value::Kind::Bool: out += value.boolean() ? '1' : '0'; break;
-    case Value::Kind::Int: appendNumber(out, value.integer()); break;
-    case Value::Kind::UInt: appendNumber(out, value.unsignedInteger()); break;
-    case Value::Kind::Real: appendNumber(out, value.real()); break;
+    case Value::Kind::Null:
+      out += nested ? "<null>" : "(null)";
+      break;
+    case Value::Kind::Bool:
+      out += value.boolean() ? '1' : '0';
+      break;
+    case Value::Kind::Int:
+      appendNumber(out, value.integer());
+      break;
+    case Value::Kind::UInt:
+      appendNumber(out, value.unsignedInteger());
+      break;
+    case Value::Kind::Real:
+      appendNumber(out, value.real());
+      break;
     case Value::Kind::String:
       if (nested) {
         appendQuoted(out, value.string());
@@ -149,7 +152,9 @@ void append(std::string& out, const Value& value, bool nested) {
       }
       break;
     }
-    case Value::Kind::Data: appendData(out, value.data()); break;
+    case Value::Kind::Data:
+      appendData(out, value.data());
+      break;
     case Value::Kind::Array: {
       const char* separator = "";
       out += '(';
@@ -212,34 +217,52 @@ bool Value::contains(std::string_view key) const {
 
 bool Value::asBool() const {
   switch (kind()) {
-    case Kind::Bool: return boolean();
-    case Kind::Int: return integer() != 0;
-    case Kind::UInt: return true;
-    case Kind::Real: return real() != 0;
-    case Kind::String: return stringAsBool(string());
-    default: return false;
+    case Kind::Bool:
+      return boolean();
+    case Kind::Int:
+      return integer() != 0;
+    case Kind::UInt:
+      return true;
+    case Kind::Real:
+      return real() != 0;
+    case Kind::String:
+      return stringAsBool(string());
+    default:
+      return false;
   }
 }
 
 double Value::asDouble() const {
   switch (kind()) {
-    case Kind::Bool: return boolean() ? 1 : 0;
-    case Kind::Int: return static_cast<double>(integer());
-    case Kind::UInt: return static_cast<double>(unsignedInteger());
-    case Kind::Real: return real();
-    case Kind::String: return stringAsDouble(string());
-    default: return 0;
+    case Kind::Bool:
+      return boolean() ? 1 : 0;
+    case Kind::Int:
+      return static_cast<double>(integer());
+    case Kind::UInt:
+      return static_cast<double>(unsignedInteger());
+    case Kind::Real:
+      return real();
+    case Kind::String:
+      return stringAsDouble(string());
+    default:
+      return 0;
   }
 }
 
 std::int64_t Value::asInteger() const {
   switch (kind()) {
-    case Kind::Bool: return boolean() ? 1 : 0;
-    case Kind::Int: return integer();
-    case Kind::UInt: return std::numeric_limits<std::int64_t>::max();
-    case Kind::Real: return realAsInteger(real());
-    case Kind::String: return stringAsInteger(string());
-    default: return 0;
+    case Kind::Bool:
+      return boolean() ? 1 : 0;
+    case Kind::Int:
+      return integer();
+    case Kind::UInt:
+      return std::numeric_limits<std::int64_t>::max();
+    case Kind::Real:
+      return realAsInteger(real());
+    case Kind::String:
+      return stringAsInteger(string());
+    default:
+      return 0;
   }
 }
 
@@ -247,14 +270,20 @@ bool operator==(const Value& left, const Value& right) {
   if (left.isNumber() && right.isNumber()) return equalNumbers(left, right);
   if (left.kind() != right.kind()) return false;
   switch (left.kind()) {
-    case Value::Kind::Bool: return left.boolean() == right.boolean();
-    case Value::Kind::String: return left.string() == right.string();
-    case Value::Kind::Date: return left.date() == right.date();
-    case Value::Kind::Data: return left.data() == right.data();
-    case Value::Kind::Array: return &left.array() == &right.array() || left.array() == right.array();
+    case Value::Kind::Bool:
+      return left.boolean() == right.boolean();
+    case Value::Kind::String:
+      return left.string() == right.string();
+    case Value::Kind::Date:
+      return equalReals(left.date().secondsSince1970, right.date().secondsSince1970);
+    case Value::Kind::Data:
+      return left.data() == right.data();
+    case Value::Kind::Array:
+      return &left.array() == &right.array() || left.array() == right.array();
     case Value::Kind::Dictionary:
       return &left.dictionary() == &right.dictionary() || left.dictionary() == right.dictionary();
-    default: return true;
+    default:
+      return true;
   }
 }
 

@@ -27,24 +27,26 @@ class Value {
   using Dictionary = std::map<std::string, Value, std::less<>>;
 
   Value() = default;
-  Value(bool value) : state_(value) {}                              // NOLINT(google-explicit-constructor)
-  Value(int value) : state_(static_cast<std::int64_t>(value)) {}    // NOLINT(google-explicit-constructor)
-  Value(unsigned value) : state_(static_cast<std::int64_t>(value)) {}  // NOLINT(google-explicit-constructor)
-  Value(long value) : state_(static_cast<std::int64_t>(value)) {}   // NOLINT(google-explicit-constructor)
-  Value(long long value) : state_(static_cast<std::int64_t>(value)) {}  // NOLINT(google-explicit-constructor)
-  Value(unsigned long value) : Value(static_cast<unsigned long long>(value)) {}  // NOLINT(google-explicit-constructor)
-  Value(unsigned long long value);                                  // NOLINT(google-explicit-constructor)
-  Value(double value) : state_(value) {}                            // NOLINT(google-explicit-constructor)
-  Value(kvr::Date value) : state_(value) {}                         // NOLINT(google-explicit-constructor)
-  Value(std::string value);                                         // NOLINT(google-explicit-constructor)
-  Value(std::string_view value) : Value(std::string(value)) {}      // NOLINT(google-explicit-constructor)
-  Value(const char* value) : Value(std::string(value)) {}           // NOLINT(google-explicit-constructor)
-  Value(Bytes value);                                               // NOLINT(google-explicit-constructor)
-  Value(Array value);                                               // NOLINT(google-explicit-constructor)
-  Value(Dictionary value);                                          // NOLINT(google-explicit-constructor)
+  // NOLINTBEGIN(google-explicit-constructor): whatever a tree holds is one
+  Value(bool value) : state_(value) {}
+  Value(int value) : state_(static_cast<std::int64_t>(value)) {}
+  Value(unsigned value) : state_(static_cast<std::int64_t>(value)) {}
+  Value(long value) : state_(static_cast<std::int64_t>(value)) {}
+  Value(long long value) : state_(static_cast<std::int64_t>(value)) {}
+  Value(unsigned long value) : Value(static_cast<unsigned long long>(value)) {}
+  Value(unsigned long long value);
+  Value(double value) : state_(value) {}
+  Value(kvr::Date value) : state_(value) {}
+  Value(std::string value);
+  Value(std::string_view value) : Value(std::string(value)) {}
+  Value(const char* value) : Value(std::string(value)) {}
+  Value(Bytes value);
+  Value(Array value);
+  Value(Dictionary value);
   /// A present value, or null.
   template <class T>
-  Value(const std::optional<T>& value) : Value(value ? Value(*value) : Value()) {}  // NOLINT(google-explicit-constructor)
+  Value(const std::optional<T>& value) : Value(value ? Value(*value) : Value()) {}
+  // NOLINTEND(google-explicit-constructor)
   /// No pointer becomes a bool by accident.
   template <class T>
   Value(T*) = delete;
@@ -82,7 +84,8 @@ class Value {
   bool contains(std::string_view key) const;
 
   // Readings of any kind as another, the way stored settings are read.
-  /// A number or bool: non-zero. A string: after blanks, signs and zeros, a first character Y, y, T, t or 1 to 9.
+  /// A number or bool: non-zero. A string: after blanks, signs and zeros, a first character Y, y, T, t or 1
+  /// to 9.
   bool asBool() const;
   /// A number or bool as it is, a string by its leading decimal number; anything else 0.
   double asDouble() const;

@@ -27,7 +27,7 @@ using WorkQueueRef = std::shared_ptr<WorkQueue>;
 enum class Priority { Default, Background };
 
 /// A repeating timer; destroying it, or `invalidate`, ends it. A firing already handed to its queue may still
-/// run.
+/// run; while it waits there, no further one is handed over.
 class Timer {
  public:
   virtual ~Timer() = default;

@@ -1,0 +1,188 @@
+#include "agent/KVRAgent.h"
+
+#include "agent/AgentKeys.h"
+#include "agent/KVRUtilities.h"
+#include "agent/SerialNumber.h"
+#include "devices/DeviceKeys.h"
+#include "devices/KVRDevicesManager.h"
+#include "warranty/KVRAgentDefaultWarrantyProvider.h"
+#include "warranty/KVRServerVersionUtilities.h"
+
+#include <mutex>
+
+namespace kvr {
+
+std::shared_ptr<KVRAgent> KVRAgent::initWithCallingProcessBundleID(Platform& platform,
+                                                                   std::optional<std::string> bundleID) {
+  if (!bundleID) {
+    platform.log.standard("%s: callingProcessBundleID is nil. Falling back to Preferences Bundle ID",
+                          "-[KVRAgent initWithCallingProcessBundleID:]");
+    bundleID = kPreferencesBundleID;
+  }
+  return std::make_shared<KVRAgent>(platform,
+                                    std::make_shared<KVRAgentDefaultWarrantyProvider>(platform, *bundleID),
+                                    KVRDevicesManager::sharedManager(platform));
+}
+
+KVRAgent::KVRAgent(Platform& platform, std::shared_ptr<KVRAgentWarrantyProvider> theWarrantyProvider,
+                   std::shared_ptr<KVRAgentDeviceProvider> theDeviceProvider)
+    : warrantyProvider(std::move(theWarrantyProvider)),
+      deviceProvider(std::move(theDeviceProvider)),
+      platform_(platform),
+      policyLookupQueue_(platform.queues.newSerialQueue("com.tarsil.kavrel.kvragent.policyqueue")) {}
+
+void KVRAgent::scheduleOutreach(BoolReply withReply) { scheduleOutreachAfter(0, std::move(withReply)); }
+
+void KVRAgent::scheduleOutreachAfter(double, BoolReply withReply) {
+  // The outreach activity is scheduled here, once activities are connected; the answer is true in any case.
+  withReply(true);
+}
+
+void KVRAgent::tarsilAccountAdded(BoolReply withReply) {
+  constexpr const char* kOperation = "-[KVRAgent tarsilAccountAddedWithReply:]";
+  auto& preferences = platform_.preferences;
+  if (!preferences.boolForKey(preference::kPostUpgradeActivityCompleted)) {
+    platform_.log.standard("%s: Skipped scheduling/downloading new warranty", kOperation);
+    withReply(false);
+    return;
+  }
+  const double delay = preferences.doubleForKey(preference::kPostUpgradeOutreachDelay);
+  if (preferences.boolForKey(preference::kInitialOutreachActivityScheduled)) {
+    platform_.log.standard("%s: New warranty to be downloaded after: %f", kOperation, delay);
+    const auto background = platform_.queues.concurrentQueue(Priority::Background);
+    platform_.queues.after(delay, background, [self = shared_from_this(), withReply] {
+      self->getAllDeviceInfosUsingPolicy(
+          LookupPolicy::kRefresh, false,
+          DeviceInfosReply(self->platform_.log, "tarsilAccountAdded",
+                           [withReply](const KVRDeviceInfoList&) { withReply(true); }));
+    });
+    return;
+  }
+  platform_.log.standard("%s: Outreach to be scheduled after: %f", kOperation, delay);
+  scheduleOutreachAfter(delay, std::move(withReply));
+  preferences.setObject(true, preference::kInitialOutreachActivityScheduled);
+}
+
+void KVRAgent::checkIsAvailableInStore(const std::string& bundleIdentifier, DictionaryReply withReply) {
+  platform_.log.standard("Checking for %@ in the Quillmart", bundleIdentifier);
+  // A new KVRTarsilSupportManager answers here, once it is connected; until then nothing is known.
+  withReply({});
+}
+
+void KVRAgent::appSupportAvailability(const std::string& bundleIdentifier, DictionaryReply withReply) {
+  platform_.log.standard("Availability for %@", bundleIdentifier);
+  // A new KVRTarsilSupportManager answers here, once it is connected; until then nothing is known.
+  withReply({});
+}
+
+void KVRAgent::readWebURLOverride(std::optional<StringReply> reply) {
+  Value url;
+  if (KVRUtilities::isInternal(platform_)) {
+    url = KVRServerVersionUtilities::readWebURLOverride(platform_);
+    platform_.log.standard("readWebURLOverride = %@", url);
+  }
+  if (reply) (*reply)(url.isString() ? url : Value());
+}
+
+void KVRAgent::defaultDevice(DeviceReply reply) { reply(deviceProvider()->defaultDevice()); }
+
+void KVRAgent::pairedDevices(DevicesReply reply) {
+  std::vector<KVRDeviceRef> devices;
+  for (const auto& [serialNumber, device] : deviceProvider()->pairedDevices()) devices.push_back(device);
+  reply(std::move(devices));
+}
+
+void KVRAgent::getDefaultDeviceInfoUsingPolicy(std::uint64_t policy, DeviceInfoReply withReply) {
+  const auto device = deviceProvider()->defaultDevice();
+  getWarrantyUsingPolicy(
+      policy, device->serialNumber(),
+      WarrantyReply(platform_.log, "getDefaultDeviceInfoUsingPolicy",
+                    [self = shared_from_this(), device, withReply](const KVRWarrantyRef& warranty) {
+                      const KVRDeviceInfoRef info = KVRDeviceInfo::deviceInfoWithDevice(device, warranty);
+                      self->platform_.log.standard("getDefaultDeviceInfoUsingPolicy for device: '%@'", info);
+                      withReply(info);
+                      self->warrantyProvider()->refreshFollowupWithDeviceInfo(info);
+                    }));
+}
+
+std::string KVRAgent::mappedSerialNumber(const std::string& serialNumber) {
+  const auto watches = platform_.preferences.objectForKey(preference::kPairedWatchesSerialNumbers);
+  const auto accessories =
+      platform_.preferences.objectForKey(preference::kPairedBluetoothDevicesSerialNumbers);
+  if (!watches.isDictionary() && !accessories.isDictionary()) return serialNumber;
+  auto mapped = watches[serialNumber];
+  if (mapped.isNull()) mapped = accessories[serialNumber];
+  platform_.log.debug("serialNumberOverride for Serial Number: %@ with serial: %@", serialNumber, mapped);
+  if (!mapped.isString()) return serialNumber;
+  platform_.log.debug("Override Serial Number: %@ found for SN: %@", mapped, serialNumber);
+  return mapped.string();
+}
+
+KVRDeviceRef KVRAgent::deviceFor(const std::string& serialNumber) {
+  const auto devices = deviceProvider()->allDevices();
+  const auto found = devices.find(serialNumber);
+  if (found != devices.end()) return found->second;
+  return KVRDevice::deviceWithName("<unknown>", serialNumber, std::nullopt, KVRDevice::kOther);
+}
+
+void KVRAgent::getDeviceInfoForSerialNumber(const std::string& serialNumber, std::uint64_t usingPolicy,
+                                            DeviceInfoReply withReply) {
+  const auto mapped = mappedSerialNumber(serialNumber);
+  if (const auto* fault = faultOfSerialNumber(mapped)) {
+    platform_.log.error("%s: serial number refused, it %s",
+                        "-[KVRAgent getDeviceInfoForSerialNumber:usingPolicy:withReply:]", fault);
+    withReply(KVRDeviceInfo::deviceInfoWithDevice(
+        KVRDevice::deviceWithName("<unknown>", mapped, std::nullopt, KVRDevice::kOther), nullptr));
+    return;
+  }
+  getWarrantyUsingPolicy(
+      usingPolicy, mapped,
+      WarrantyReply(platform_.log, "getDeviceInfoForSerialNumber",
+                    [self = shared_from_this(), mapped, withReply](const KVRWarrantyRef& warranty) {
+                      const KVRDeviceInfoRef info =
+                          KVRDeviceInfo::deviceInfoWithDevice(self->deviceFor(mapped), warranty);
+                      self->platform_.log.standard("getDeviceInfoForSerialNumber for device: '%@'", info);
+                      withReply(info);
+                      self->warrantyProvider()->refreshFollowupWithDeviceInfo(info);
+                    }));
+}
+
+void KVRAgent::getAllDeviceInfosUsingPolicy(std::uint64_t policy, bool updateFollowUps,
+                                            DeviceInfosReply withReply) {
+  struct Results {
+    std::mutex mutex;
+    KVRDeviceInfoList list;
+  };
+  const auto results = std::make_shared<Results>();
+  const auto self = shared_from_this();
+  for (const auto& [serialNumber, device] : deviceProvider()->allDevices()) {
+    group_.enter();
+    getWarrantyUsingPolicy(
+        policy, serialNumber,
+        WarrantyReply(platform_.log, "getAllDeviceInfosUsingPolicy",
+                      [self, results, device](const KVRWarrantyRef& warranty) {
+                        {
+                          const std::lock_guard lock(results->mutex);
+                          results->list.push_back(KVRDeviceInfo::deviceInfoWithDevice(device, warranty));
+                        }
+                        self->group_.leave();
+                      }));
+  }
+  group_.notify(policyLookupQueue_, [self, results, updateFollowUps, withReply] {
+    KVRDeviceInfoList list;
+    {
+      const std::lock_guard lock(results->mutex);
+      list = results->list;
+    }
+    self->platform_.log.standard("getAllDeviceInfosUsingPolicy: '%@'", list);
+    if (updateFollowUps) self->warrantyProvider()->refreshFollowupWithDeviceInfos(list);
+    withReply(std::move(list));
+  });
+}
+
+void KVRAgent::dismissFollowUpForSerialNumber(const std::string& serialNumber, BoolReply completion) {
+  warrantyProvider()->dismissFollowUpForSerialNumber(serialNumber);
+  completion(true);
+}
+
+}  // namespace kvr

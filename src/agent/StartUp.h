@@ -1,0 +1,24 @@
+#pragma once
+
+#include "agent/KVRAgent.h"
+#include "agent/ServiceDelegate.h"
+#include "platform/Platform.h"
+
+#include <memory>
+
+namespace kvr {
+
+/// Brings the agent up in its fixed order, on the main thread, and holds what lives until the process ends:
+/// defaults, activities, the settings application's agent, migration, monitors, and last the named service,
+/// so that no client is served before all else stands. The caller then runs the main loop.
+class StartUp {
+ public:
+  explicit StartUp(Platform& platform);
+
+ private:
+  std::shared_ptr<KVRAgent> agent_;
+  ServiceDelegate delegate_;
+  std::unique_ptr<ServiceListener> listener_;
+};
+
+}  // namespace kvr

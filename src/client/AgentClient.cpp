@@ -1,0 +1,115 @@
+#include "client/AgentClient.h"
+
+#include "platform/local/bus/BusCodec.h"
+
+#include <cerrno>
+#include <utility>
+
+namespace kvr::client {
+namespace {
+
+constexpr const char* kName = "com.tarsil.kvragent";
+constexpr const char* kPath = "/com/tarsil/kvragent";
+constexpr const char* kInterface = "com.tarsil.kvragent.KVRAgentProtocol";
+
+/// Downloads with all their retries take hours at worst; an agent that ends is noticed at once.
+constexpr std::uint64_t kLongestCall = 24ULL * 3600 * 1'000'000;  // microseconds
+
+constexpr const char* kUnreachable[] = {
+    SD_BUS_ERROR_SERVICE_UNKNOWN, SD_BUS_ERROR_NAME_HAS_NO_OWNER, SD_BUS_ERROR_NO_REPLY,
+    SD_BUS_ERROR_DISCONNECTED,    SD_BUS_ERROR_TIMEOUT,           SD_BUS_ERROR_NO_SERVER,
+    SD_BUS_ERROR_UNKNOWN_OBJECT,
+};
+
+Error failure(Failure code, std::string message) {
+  return {std::string(kErrorDomain), code, std::move(message)};
+}
+
+Error failureOf(int result, const BusError& error) {
+  const std::string_view name = error.name();
+  const std::string message = *error.message() ? error.message() : std::generic_category().message(-result);
+  if (name == SD_BUS_ERROR_ACCESS_DENIED) return failure(Refused, message);
+  for (const char* one : kUnreachable) {
+    if (name == one) return failure(AgentUnreachable, message);
+  }
+  const bool couldNotStart = name.starts_with("org.freedesktop.DBus.Error.Spawn.");
+  if (couldNotStart || result == -ECONNRESET || result == -ENOTCONN)
+    return failure(AgentUnreachable, message);
+  return failure(OtherFailure, message);
+}
+
+Value argumentOf(Policy policy) { return static_cast<std::uint64_t>(policy); }
+
+template <class Record>
+Result<Record> recordIn(const Result<Value>& reply) {
+  if (!reply) return reply.error();
+  return Record::from(*reply);
+}
+
+template <class Record>
+Result<std::vector<Record>> recordsIn(const Result<Value>& reply) {
+  if (!reply) return reply.error();
+  std::vector<Record> records;
+  for (const Value& record : reply->array()) records.push_back(Record::from(record));
+  return records;
+}
+
+}  // namespace
+
+Result<AgentClient> AgentClient::connect() {
+  sd_bus* bus = nullptr;
+  const int r = sd_bus_open_user_with_description(&bus, "kvragent client");
+  if (r < 0)
+    return failure(NoBus, "the session bus cannot be reached: " + std::generic_category().message(-r));
+  return AgentClient(BusRef(bus));
+}
+
+Result<Value> AgentClient::call(const char* member, const std::vector<Argument>& arguments,
+                                const char* replyType) const {
+  sd_bus_message* made = nullptr;
+  int r = sd_bus_message_new_method_call(bus_.get(), &made, kName, kPath, kInterface, member);
+  const BusMessageRef message(made);
+  if (r < 0) return failure(OtherFailure, busError(r, "the call cannot be made").message);
+  for (const Argument& argument : arguments) {
+    const auto error = appendBusValue(made, argument.type, argument.value);
+    if (error) return failure(OtherFailure, error->message);
+  }
+  BusError error;
+  sd_bus_message* answer = nullptr;
+  r = sd_bus_call(bus_.get(), made, kLongestCall, error.get(), &answer);
+  const BusMessageRef reply(answer);
+  if (r < 0) return failureOf(r, error);
+  Result<Value> value = readBusValue(answer, replyType);
+  if (!value) return failure(OtherFailure, "the agent's answer cannot be read: " + value.error().message);
+  return value;
+}
+
+Result<Device> AgentClient::defaultDevice() const {
+  return recordIn<Device>(call("DefaultDevice", {}, "a{sv}"));
+}
+
+Result<std::vector<Device>> AgentClient::pairedDevices() const {
+  return recordsIn<Device>(call("PairedDevices", {}, "aa{sv}"));
+}
+
+Result<DeviceInfo> AgentClient::defaultDeviceInfo(Policy policy) const {
+  return recordIn<DeviceInfo>(call("GetDefaultDeviceInfoUsingPolicy", {{"t", argumentOf(policy)}}, "a{sv}"));
+}
+
+Result<DeviceInfo> AgentClient::deviceInfo(const std::string& serialNumber, Policy policy) const {
+  return recordIn<DeviceInfo>(
+      call("GetDeviceInfoForSerialNumber", {{"s", serialNumber}, {"t", argumentOf(policy)}}, "a{sv}"));
+}
+
+Result<std::vector<DeviceInfo>> AgentClient::allDeviceInfos(Policy policy, bool updateFollowUps) const {
+  return recordsIn<DeviceInfo>(
+      call("GetAllDeviceInfosUsingPolicy", {{"t", argumentOf(policy)}, {"b", updateFollowUps}}, "aa{sv}"));
+}
+
+Result<bool> AgentClient::dismissFollowUp(const std::string& serialNumber) const {
+  const Result<Value> reply = call("DismissFollowUpForSerialNumber", {{"s", serialNumber}}, "b");
+  if (!reply) return reply.error();
+  return reply->boolean();
+}
+
+}  // namespace kvr::client

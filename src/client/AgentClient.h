@@ -1,0 +1,62 @@
+#pragma once
+
+#include "client/Records.h"
+#include "platform/Error.h"
+#include "platform/local/bus/BusHandles.h"
+
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace kvr::client {
+
+/// How a warranty is looked up.
+enum class Policy : std::uint64_t {
+  Default = 0,    ///< the cache where it is good enough, else a download
+  CacheOnly = 1,  ///< never a download
+  Refresh = 2,    ///< always a download
+};
+
+/// Who speaks in a client's errors, and what their codes mean.
+inline constexpr std::string_view kErrorDomain = "kvragent.client";
+enum Failure : std::int64_t {
+  NoBus = 1,             ///< there is no session bus to speak through
+  AgentUnreachable = 2,  ///< no agent is there, or it went away before it had answered
+  Refused = 3,           ///< the agent does not serve this program; the message says what it is missing
+  OtherFailure = 4,      ///< anything else, in the message's words
+};
+
+/// A connection to the agent. One call after the other, on one thread:
+///
+///     Result<AgentClient> agent = AgentClient::connect();
+///     if (agent) { auto info = agent->defaultDeviceInfo(Policy::Default); … }
+///
+/// A call waits for its answer, which may take as long as a download does. Errors are in domain
+/// `kErrorDomain`.
+class AgentClient {
+ public:
+  struct Argument {
+    const char* type;  ///< "s", "d", "t", "b", "a{sv}" or "aa{sv}"
+    Value value;
+  };
+
+  static Result<AgentClient> connect();
+
+  Result<Device> defaultDevice() const;
+  Result<std::vector<Device>> pairedDevices() const;
+  Result<DeviceInfo> defaultDeviceInfo(Policy policy) const;
+  /// The text must be UTF-8 without NUL.
+  Result<DeviceInfo> deviceInfo(const std::string& serialNumber, Policy policy) const;
+  Result<std::vector<DeviceInfo>> allDeviceInfos(Policy policy, bool updateFollowUps) const;
+  Result<bool> dismissFollowUp(const std::string& serialNumber) const;
+
+  /// Any operation, by its member's name and the type of what it replies.
+  Result<Value> call(const char* member, const std::vector<Argument>& arguments, const char* replyType) const;
+
+ private:
+  explicit AgentClient(BusRef bus) : bus_(std::move(bus)) {}
+
+  BusRef bus_;
+};
+
+}  // namespace kvr::client

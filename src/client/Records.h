@@ -1,0 +1,34 @@
+#pragma once
+
+#include "platform/Date.h"
+#include "platform/Value.h"
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace kvr::client {
+
+// The agent's records as a client sees them. A property that is missing, or of another kind than it should
+// be, is absent; no record fails as a whole for that.
+
+struct Device {
+  enum Type : std::uint64_t { Default = 0, Watch = 1, Other = 2 };
+
+  std::optional<std::string> name;
+  std::optional<std::string> serialNumber;
+  std::optional<Date> activationDate;
+  std::uint64_t deviceType = Default;  ///< any number is possible
+
+  static Device from(const Value& record);
+};
+
+struct DeviceInfo {
+  Device device;
+  Value warranty;  ///< the warranty's dictionary, null when none is known
+
+  static DeviceInfo from(const Value& record);
+};
+
+}  // namespace kvr::client

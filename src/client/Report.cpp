@@ -1,0 +1,208 @@
+#include "client/Report.h"
+
+#include "platform/Base64.h"
+#include "platform/JSON.h"
+#include "platform/UTF8.h"
+
+#include <algorithm>
+#include <cmath>
+#include <cstdio>
+#include <utility>
+
+namespace kvr::client {
+namespace {
+
+constexpr std::string_view kVersion = "1";
+constexpr std::size_t kShownSerialCharacters = 4;
+constexpr double kFirstMillisecondEpoch = 1e10;
+constexpr double kLastCalendarSecond = 1e15;
+
+/// Control characters, line separators, and what reorders text.
+bool isUnprintable(char32_t point) {
+  return point < 0x20 || (point >= 0x7F && point <= 0x9F) || (point >= 0x2028 && point <= 0x202E) ||
+         (point >= 0x2066 && point <= 0x2069) || point == 0x200E || point == 0x200F || point == 0x061C;
+}
+
+std::optional<std::string> isoDate(Date date) {
+  const double seconds = std::floor(date.secondsSince1970);
+  if (!(std::abs(seconds) <= kLastCalendarSecond)) return std::nullopt;
+  const CalendarTime time = calendarTime(static_cast<long long>(seconds));
+  char text[64];
+  std::snprintf(text, sizeof text, "%04lld-%02d-%02dT%02d:%02d:%02dZ", time.year, time.month, time.day,
+                time.hour, time.minute, time.second);
+  return text;
+}
+
+/// The tree as JSON can hold it.
+Value plain(const Value& tree) {
+  switch (tree.kind()) {
+    case Value::Kind::Date:
+      return Value(isoDate(tree.date()));
+    case Value::Kind::Data:
+      return Value(base64Encode(tree.data()));
+    case Value::Kind::Real:
+      return std::isfinite(tree.real()) ? tree : Value();
+    case Value::Kind::Array: {
+      Value::Array result;
+      for (const Value& element : tree.array()) result.push_back(plain(element));
+      return result;
+    }
+    case Value::Kind::Dictionary: {
+      Value::Dictionary result;
+      for (const auto& [key, value] : tree.dictionary()) result.emplace_hint(result.end(), key, plain(value));
+      return result;
+    }
+    default:
+      return tree;
+  }
+}
+
+const char* nameOfType(std::uint64_t type) {
+  return type == Device::Watch ? "Watch" : type == Device::Other ? "Other" : "Default";
+}
+
+std::optional<Date> epochDate(const Value& epoch) {
+  if (!epoch.isNumber()) return std::nullopt;
+  const double number = epoch.asDouble();
+  return Date{number > kFirstMillisecondEpoch ? number / 1000 : number};
+}
+
+std::string shown(const std::optional<Date>& date) {
+  return date ? isoDate(*date).value_or("unknown") : "unknown";
+}
+
+void appendWarranty(std::vector<std::pair<std::string, std::string>>& lines, const Value& warranty) {
+  if (warranty.isNull()) {
+    lines.emplace_back("Warranty", "none known");
+    return;
+  }
+  const auto appendText = [&](const char* name, const char* key) {
+    if (warranty[key].isString()) lines.emplace_back(name, warranty[key].string());
+  };
+  const auto appendDate = [&](const char* name, const char* key) {
+    if (const auto date = epochDate(warranty[key])) lines.emplace_back(name, shown(date));
+  };
+  lines.emplace_back("Covered", warranty["covered"].asBool() ? "yes" : "no");
+  appendText("Coverage", "coverageLocalizedLabel");
+  appendText("Description", "coverageLocalizedDesc");
+  appendDate("Coverage ends", "coverageEndDate");
+  if (!warranty["zubOfferEligible"].asBool()) return;
+  appendText("Offer", "zubLocalizedOfferLabel");
+  appendDate("Offer ends", "zubOfferEligibleUntil");
+}
+
+std::string aligned(const std::vector<std::pair<std::string, std::string>>& lines) {
+  std::size_t width = 0;
+  for (const auto& line : lines) width = std::max(width, line.first.size());
+  std::string text;
+  for (const auto& [name, value] : lines) {
+    text += name + ":" + std::string(width - name.size() + 1, ' ') + printable(value) + "\n";
+  }
+  return text;
+}
+
+/// A document of one property beside the version. The parts are put together as text, because each of them
+/// may be nested as deep as a document can.
+std::string document(std::string_view name, const std::string& content) {
+  return printable("{\"" + std::string(name) + "\":" + content + ",\"version\":" + std::string(kVersion) +
+                   "}") +
+         "\n";
+}
+
+Result<std::string> list(const std::vector<Result<std::string>>& elements) {
+  std::string text = "[";
+  for (const auto& element : elements) {
+    if (!element) return element.error();
+    text += (text.size() > 1 ? "," : "") + *element;
+  }
+  return text + "]";
+}
+
+}  // namespace
+
+std::string printable(std::string_view text) {
+  std::string result;
+  for (std::size_t at = 0; at < text.size();) {
+    const std::size_t begin = at;
+    char32_t point = nextCodePoint(text, at);
+    if (point == kNoCodePoint) {
+      point = 0xFFFD;
+      ++at;
+    } else if (!isUnprintable(point)) {
+      result += text.substr(begin, at - begin);
+      continue;
+    }
+    char escape[8];
+    std::snprintf(escape, sizeof escape, "\\u%04x", static_cast<unsigned>(point));
+    result += escape;
+  }
+  return result;
+}
+
+std::string Report::serial(const std::string& whole) const {
+  if (serials_ == Serials::Whole || whole.size() <= kShownSerialCharacters) return whole;
+  std::size_t begin = whole.size() - kShownSerialCharacters;
+  while (begin < whole.size() && (static_cast<unsigned char>(whole[begin]) & 0xC0U) == 0x80) ++begin;
+  return "…" + whole.substr(begin);
+}
+
+Report::Lines Report::linesOf(const Device& device) const {
+  Lines lines{{"Device", device.name.value_or("unnamed")},
+              {"Serial number", device.serialNumber ? serial(*device.serialNumber) : "unknown"},
+              {"Type", nameOfType(device.deviceType)}};
+  if (device.activationDate) lines.emplace_back("Activated", shown(device.activationDate));
+  return lines;
+}
+
+std::string Report::text(const std::vector<Device>& devices) const {
+  std::string text;
+  for (const Device& device : devices) text += (text.empty() ? "" : "\n") + aligned(linesOf(device));
+  return text;
+}
+
+std::string Report::text(const std::vector<DeviceInfo>& infos) const {
+  std::string text;
+  for (const DeviceInfo& info : infos) {
+    Lines lines = linesOf(info.device);
+    appendWarranty(lines, info.warranty);
+    text += (text.empty() ? "" : "\n") + aligned(lines);
+  }
+  return text;
+}
+
+Value Report::treeOf(const Device& device) const {
+  Value::Dictionary tree{{"deviceType", device.deviceType}, {"type", nameOfType(device.deviceType)}};
+  if (device.name) tree.emplace("name", *device.name);
+  if (device.serialNumber) tree.emplace("serialNumber", serial(*device.serialNumber));
+  if (device.activationDate) tree.emplace("activationDate", *device.activationDate);
+  return plain(tree);
+}
+
+Result<std::string> Report::json(const Device& device) const {
+  const Result<std::string> content = writeJSON(treeOf(device));
+  if (!content) return content.error();
+  return document("device", *content);
+}
+
+Result<std::string> Report::json(const std::vector<Device>& devices) const {
+  std::vector<Result<std::string>> elements;
+  for (const Device& device : devices) elements.push_back(writeJSON(treeOf(device)));
+  const Result<std::string> content = list(elements);
+  if (!content) return content.error();
+  return document("devices", *content);
+}
+
+Result<std::string> Report::json(const std::vector<DeviceInfo>& infos) const {
+  std::vector<Result<std::string>> elements;
+  for (const DeviceInfo& info : infos) {
+    const Result<std::string> device = writeJSON(treeOf(info.device));
+    const Result<std::string> warranty = writeJSON(plain(info.warranty));
+    if (!device || !warranty) return device ? warranty.error() : device.error();
+    elements.emplace_back("{\"device\":" + *device + ",\"warranty\":" + *warranty + "}");
+  }
+  const Result<std::string> content = list(elements);
+  if (!content) return content.error();
+  return document("deviceInfos", *content);
+}
+
+}  // namespace kvr::client

@@ -1,0 +1,46 @@
+#pragma once
+
+#include "client/Records.h"
+#include "platform/Error.h"
+
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace kvr::client {
+
+/// What a person, or a program, is shown of the agent's answers.
+///
+/// The text comes from servers and paired devices, so whatever could command a terminal is written as an
+/// escape,
+/// `\u001b`, in both forms. Serial numbers are shortened to their end unless asked for whole.
+class Report {
+ public:
+  enum class Serials { Shortened, Whole };
+
+  explicit Report(Serials serials) : serials_(serials) {}
+
+  // For people: lines of a name and a value, records set apart by an empty line.
+  std::string text(const std::vector<Device>& devices) const;
+  std::string text(const std::vector<DeviceInfo>& infos) const;
+
+  // For programs: one JSON document on one line, with its format's version under "version". Dates are ISO
+  // 8601 in UTC, data is base64; a number that is not finite and a date outside the calendar are null.
+  Result<std::string> json(const Device& device) const;
+  Result<std::string> json(const std::vector<Device>& devices) const;
+  Result<std::string> json(const std::vector<DeviceInfo>& infos) const;
+
+ private:
+  using Lines = std::vector<std::pair<std::string, std::string>>;
+
+  std::string serial(const std::string& whole) const;
+  Lines linesOf(const Device& device) const;
+  Value treeOf(const Device& device) const;
+
+  const Serials serials_;
+};
+
+/// The text with control characters, and others that change how their surroundings look, as escapes.
+std::string printable(std::string_view text);
+
+}  // namespace kvr::client

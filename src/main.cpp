@@ -1,0 +1,61 @@
+// The agent's program: builds the platform of this machine, starts the agent on it, and runs the main loop.
+
+#include "agent/StartUp.h"
+#include "platform/local/EventLoop.h"
+#include "platform/local/LocalPlatform.h"
+
+#include <systemd/sd-daemon.h>
+#include <systemd/sd-event.h>
+
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <exception>
+
+namespace {
+
+constexpr double kEndingLimit = 10;  // seconds
+
+/// Termination signals end the main loop; blocked here, before any thread starts, so that the loop gets them.
+void handleSignals(kvr::EventLoop& loop) {
+  std::signal(SIGPIPE, SIG_IGN);
+  sigset_t signals;
+  sigemptyset(&signals);
+  sigaddset(&signals, SIGTERM);
+  sigaddset(&signals, SIGINT);
+  pthread_sigmask(SIG_BLOCK, &signals, nullptr);
+  const auto end = [](sd_event_source*, const signalfd_siginfo*, void* context) {
+    static_cast<kvr::EventLoop*>(context)->exit(EXIT_SUCCESS);
+    return 0;
+  };
+  for (const int signal : {SIGTERM, SIGINT}) sd_event_add_signal(loop.event(), nullptr, signal, end, &loop);
+}
+
+int run() {
+  kvr::EventLoop loop;
+  handleSignals(loop);
+  kvr::LocalPlatform local(loop, [&loop] { loop.exit(EXIT_FAILURE); });
+  int status = EXIT_SUCCESS;
+  {
+    const kvr::StartUp startUp(local.platform);
+    sd_notify(0, "READY=1");
+    status = loop.run();
+    sd_notify(0, "STOPPING=1");
+    if (!local.end(kEndingLimit)) {
+      local.log->error("Work did not finish within %d seconds of the end", static_cast<int>(kEndingLimit));
+      std::_Exit(EXIT_FAILURE);
+    }
+  }
+  return status;
+}
+
+}  // namespace
+
+int main() {
+  try {
+    return run();
+  } catch (const std::exception& error) {
+    std::fprintf(stderr, "kvragent: %s\n", error.what());
+    return EXIT_FAILURE;
+  }
+}

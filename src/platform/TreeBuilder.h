@@ -1,0 +1,61 @@
+#pragma once
+
+#include "platform/Value.h"
+
+#include <cstddef>
+#include <optional>
+#include <string>
+#include <utility>
+#include <vector>
+
+namespace kvr {
+
+/// Puts a tree together from the events of a reader, without recursion.
+///
+/// A container is opened, filled with `add` or further containers, and closed; in a dictionary each value
+/// follows its key, and the last of equal keys wins. Every operation returns whether it was taken; one that
+/// was not leaves its reason in `problem()`, and the reader should give up.
+class TreeBuilder {
+ public:
+  /// The tree may hold so many values, containers included.
+  explicit TreeBuilder(std::size_t maximumValues) : maximumValues_(maximumValues) { open_.reserve(16); }
+
+  bool openArray() { return open(false); }
+  bool openDictionary() { return open(true); }
+  bool setKey(std::string key);
+  bool add(Value value);
+  bool close();
+
+  /// How many containers are open.
+  std::size_t depth() const { return open_.size(); }
+  /// Whether the innermost open container is a dictionary.
+  bool isInDictionary() const { return !open_.empty() && open_.back().isDictionary; }
+  /// Whether the one value at the top level is there, with nothing left open.
+  bool isComplete() const { return complete_; }
+  /// The complete tree.
+  Value take() { return std::move(tree_); }
+  /// Why the last operation was not taken.
+  const char* problem() const { return problem_; }
+
+ private:
+  struct Container {
+    bool isDictionary;
+    Value::Array array;
+    Value::Dictionary dictionary;
+    std::optional<std::string> key;
+  };
+
+  bool open(bool isDictionary);
+  bool mayTakeValue();
+  void place(Value value);
+  bool refuse(const char* problem);
+
+  const std::size_t maximumValues_;
+  std::size_t values_ = 0;
+  std::vector<Container> open_;
+  Value tree_;
+  bool complete_ = false;
+  const char* problem_ = "";
+};
+
+}  // namespace kvr

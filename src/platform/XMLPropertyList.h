@@ -1,0 +1,20 @@
+#pragma once
+
+#include "platform/Error.h"
+#include "platform/Value.h"
+
+#include <string>
+#include <string_view>
+
+namespace kvr {
+
+/// The XML encoding of property lists; `PropertyList.h` is what others use.
+///
+/// Reads a document in any encoding that Expat knows, from its XML declaration, document type or root on. A
+/// document type may stand there but may declare nothing.
+Result<Value> readXMLPropertyList(std::string_view bytes);
+
+/// Writes UTF-8 without document type, an element a line.
+Result<std::string> writeXMLPropertyList(const Value& tree);
+
+}  // namespace kvr

@@ -1,0 +1,152 @@
+#include "platform/local/LocalHTTP.h"
+
+#include "platform/local/LoadedLibrary.h"
+#include "platform/local/http/HTTPTransfers.h"
+
+#include <algorithm>
+#include <mutex>
+#include <utility>
+
+namespace kvr {
+namespace {
+
+// libcurl's numbers for what is refused before libcurl is there.
+constexpr int kUnsupportedProtocol = 1;
+constexpr int kFailedInitialisation = 2;
+constexpr int kMalformedURL = 3;
+constexpr int kAborted = 42;
+constexpr int kBadArgument = 43;
+
+Error failure(int code, std::string message) { return {"http", code, std::move(message)}; }
+
+/// Whether the text is a token, which methods and header names are.
+bool isToken(std::string_view text) {
+  return !text.empty() && std::ranges::all_of(text, [](char c) {
+    return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') ||
+           std::string_view("!#$%&'*+-.^_`|~").find(c) != std::string_view::npos;
+  });
+}
+
+bool breaksLine(std::string_view text) {
+  return text.find_first_of(std::string_view("\r\n\0", 3)) != std::string_view::npos;
+}
+
+/// Why a request must not be sent, if so.
+std::optional<Error> faultOf(const HTTPRequest& request) {
+  const auto url = URL::parse(request.url);
+  if (!url) return failure(kMalformedURL, "malformed URL");
+  if (!url->isWeb()) return failure(kUnsupportedProtocol, "not a web address");
+  if (url->scheme() == "http" && !url->isLoopback()) {
+    return failure(kUnsupportedProtocol, "TLS is required except towards a loopback address");
+  }
+  if (!isToken(request.method)) return failure(kBadArgument, "invalid method");
+  for (const auto& [name, value] : request.headers.fields()) {
+    if (!isToken(name)) return failure(kBadArgument, "invalid header name");
+    if (breaksLine(value)) return failure(kBadArgument, "line break or NUL in the header " + name);
+  }
+  // The length of the message is the transport's to say: a second opinion would split it in two.
+  for (const auto* framing : {"Content-Length", "Transfer-Encoding"}) {
+    if (request.headers.value(framing)) return failure(kBadArgument, std::string(framing) + " cannot be set");
+  }
+  return std::nullopt;
+}
+
+}  // namespace
+
+/// What every session sends through; it lives as long as any of them.
+class LocalHTTP::Transport {
+ public:
+  using Transfers = std::shared_ptr<HTTPTransfers>;
+
+  Transport(WorkQueues& queues, Log& log) : queues_(queues), log_(log) {}
+
+  void send(HTTPRequest request, HTTPSession::Reply reply) {
+    HTTPTransfers::Done done = [queue = queues_.concurrentQueue(Priority::Default),
+                                reply = std::move(reply)](HTTPResponse response) mutable {
+      queue->async([reply = std::move(reply), response = std::move(response)]() mutable {
+        reply(std::move(response));
+      });
+    };
+    if (auto fault = faultOf(request)) return done({0, std::nullopt, std::move(fault)});
+    const auto transfers = this->transfers();
+    if (!transfers) return done({0, std::nullopt, transfers.error()});
+    (*transfers)->start(std::move(request), std::move(done));
+  }
+
+  void beginEnding() {
+    Transfers transfers;
+    {
+      const std::lock_guard lock(mutex_);
+      ending_ = true;
+      transfers = transfers_;
+    }
+    if (transfers) transfers->beginEnding();
+  }
+
+  /// As `beginEnding`, and waits until nothing is under way.
+  void end() {
+    beginEnding();
+    Transfers last;
+    const std::lock_guard lock(mutex_);
+    last.swap(transfers_);
+  }
+
+ private:
+  Result<Transfers> transfers() {
+    const std::lock_guard lock(mutex_);
+    if (ending_) return failure(kAborted, "the process is ending");
+    if (transfers_) return transfers_;
+    if (!fault_) {
+      if (const auto symbol = loadSymbol(kHTTPModuleFile, kNewHTTPTransfersSymbol)) {
+        transfers_.reset(reinterpret_cast<NewHTTPTransfers>(*symbol)());
+        if (transfers_) return transfers_;
+        fault_ = failure(kFailedInitialisation, "no transfers can be started");
+      } else {
+        fault_ = failure(kFailedInitialisation, symbol.error().message);
+      }
+      log_.error("HTTP is not available: %@", *fault_);
+    }
+    return *fault_;
+  }
+
+  WorkQueues& queues_;
+  Log& log_;
+  std::mutex mutex_;  ///< guards what follows
+  Transfers transfers_;
+  std::optional<Error> fault_;  ///< why there are no transfers, once that is known
+  bool ending_ = false;
+};
+
+class LocalHTTP::Session : public HTTPSession {
+ public:
+  Session(std::shared_ptr<Transport> transport, bool isUncached)
+      : transport_(std::move(transport)), isUncached_(isUncached) {}
+
+  void send(HTTPRequest request, Reply reply) override {
+    if (isUncached_) {
+      request.headers.set("Cache-Control", "no-cache");
+      request.headers.set("Pragma", "no-cache");
+    }
+    transport_->send(std::move(request), std::move(reply));
+  }
+
+ private:
+  const std::shared_ptr<Transport> transport_;
+  const bool isUncached_;
+};
+
+LocalHTTP::LocalHTTP(WorkQueues& queues, Log& log)
+    : transport_(std::make_shared<Transport>(queues, log)),
+      sharedSession_(std::make_unique<Session>(transport_, false)) {}
+
+LocalHTTP::~LocalHTTP() { transport_->end(); }
+
+HTTPSession& LocalHTTP::sharedSession() { return *sharedSession_; }
+
+std::shared_ptr<HTTPSession> LocalHTTP::newUncachedSession() {
+  return std::make_shared<Session>(transport_, true);
+}
+
+void LocalHTTP::beginEnding() { transport_->beginEnding(); }
+
+}  // namespace kvr

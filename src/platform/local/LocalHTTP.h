@@ -1,0 +1,37 @@
+#pragma once
+
+#include "platform/HTTP.h"
+#include "platform/Log.h"
+#include "platform/WorkQueues.h"
+
+#include <memory>
+
+namespace kvr {
+
+/// HTTP/1.1 over the network, by a library that is loaded at the first request.
+///
+/// Connections are kept alive, at most 6 to a host; requests beyond them wait. Plain http is for loopback
+/// addresses only. The proxies that the environment names are used, except towards a loopback address.
+/// Replies arrive on the concurrent queue of default priority. Errors bear libcurl's codes.
+class LocalHTTP : public HTTP {
+ public:
+  LocalHTTP(WorkQueues& queues, Log& log);
+  /// Ends as `beginEnding` does, and waits until nothing is under way.
+  ~LocalHTTP() override;
+  LocalHTTP(const LocalHTTP&) = delete;
+  LocalHTTP& operator=(const LocalHTTP&) = delete;
+
+  HTTPSession& sharedSession() override;
+  std::shared_ptr<HTTPSession> newUncachedSession() override;
+
+  /// Every request under way, and every later one, fails at once. Any thread.
+  void beginEnding();
+
+ private:
+  class Transport;
+  class Session;
+  std::shared_ptr<Transport> transport_;
+  std::unique_ptr<Session> sharedSession_;
+};
+
+}  // namespace kvr

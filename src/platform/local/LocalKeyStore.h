@@ -1,0 +1,74 @@
+#pragma once
+
+#include "platform/Clock.h"
+#include "platform/DeviceAttestation.h"
+#include "platform/Files.h"
+#include "platform/Log.h"
+#include "platform/local/LocalCertificates.h"
+
+#include <cstdint>
+#include <map>
+#include <mutex>
+#include <optional>
+#include <string>
+
+namespace kvr {
+
+/// A private key of the user and what attests it.
+struct AttestedCredentials {
+  AttestedKeyRef key;
+  std::string leaf;    ///< DER
+  std::string issuer;  ///< DER
+};
+
+/// Keys with certificates of a local authority, kept below "Library/Keys/LABEL" of the home directory:
+/// the authority as "authority.key" and "authority.pem", and for each kind of certificate KIND.key and
+/// KIND.pem (the leaf, then the authority).
+///
+/// What is asked for is issued once and answered from there until it is out of date or the device is no
+/// longer what it attests. A file that is missing is made anew; so is one that is damaged or does not match
+/// the others, after it was reported once at error level. Any thread, and any number of processes.
+class LocalKeyStore {
+ public:
+  struct Request {
+    std::string label;          ///< becomes a directory's name
+    std::string kind;           ///< becomes files' names
+    DistinguishedName subject;  ///< what the certificate says of the device
+    std::int64_t validity = 0;  ///< minutes, above 0
+  };
+
+  LocalKeyStore(Files& files, const Clock& clock, Log& log);
+
+  /// What is kept or newly issued. An error when the files can be neither read nor written.
+  Result<AttestedCredentials> credentialsFor(const Request& request);
+
+ private:
+  /// A key and the certificates of its file: its own, then that of who issued it.
+  struct KeyPair {
+    openssl::Key key;
+    std::vector<openssl::Certificate> certificates;
+  };
+  struct Authority {
+    CertifiedKey pair;
+    bool isNew;
+  };
+
+  Result<Authority> authorityIn(const std::string& directory);
+  Result<std::optional<CertifiedKey>> keptLeaf(const std::string& base, const Request& request,
+                                               const openssl::Certificate& authority);
+  Result<CertifiedKey> issueLeaf(const std::string& base, const Request& request,
+                                 const CertifiedKey& authority);
+  Result<std::optional<KeyPair>> readPair(const std::string& base, std::size_t certificates);
+  std::optional<Error> writePair(const std::string& base, const openssl::Key& key,
+                                 const std::vector<openssl::Certificate>& certificates);
+  Result<std::optional<std::string>> contentOf(const std::string& path);
+  void reportDamage(const std::string& path, const char* what);
+
+  Files& files_;
+  const Clock& clock_;
+  Log& log_;
+  std::mutex mutex_;  ///< guards what follows
+  std::map<std::string, FileStamp> reported_;
+};
+
+}  // namespace kvr

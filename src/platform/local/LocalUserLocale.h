@@ -1,0 +1,28 @@
+#pragma once
+
+#include "platform/UserLocale.h"
+#include "platform/local/DeviceRoot.h"
+
+#include <mutex>
+
+namespace kvr {
+
+/// The locale of "Locale.plist", else that of the environment (LC_ALL, LC_MESSAGES, LANG); the time zone of
+/// the environment (TZ) or the system.
+class LocalUserLocale : public UserLocale {
+ public:
+  LocalUserLocale(const DeviceRoot& root, Log& log) : root_(root), log_(log) {}
+
+  std::string preferredIdentifier() const override;
+  long secondsFromGMT(Date date) const override;
+  /// Plain digits when the library that knows the locales cannot be had, which is one error line.
+  std::string decimalString(std::uint64_t number) const override;
+
+ private:
+  const DeviceRoot& root_;
+  Log& log_;
+  mutable std::once_flag loaded_;
+  mutable void* decimalString_ = nullptr;
+};
+
+}  // namespace kvr

@@ -1,0 +1,12 @@
+#pragma once
+
+#include <string>
+#include <string_view>
+
+namespace kvr {
+
+/// The SHA-256 of a text's UTF-8 bytes, up to the first NUL, as 64 lower-case hexadecimal digits. Serial
+/// numbers become file names and preference keys in this form only. Any thread.
+std::string sha256Hash(std::string_view text);
+
+}  // namespace kvr

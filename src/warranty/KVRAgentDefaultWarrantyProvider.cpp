@@ -1,0 +1,83 @@
+#include "warranty/KVRAgentDefaultWarrantyProvider.h"
+
+#include "warranty/CacheMetadata.h"
+#include "warranty/KVRWarrantyDownloader.h"
+#include "warranty/WarrantyKeys.h"
+
+#include <algorithm>
+#include <limits>
+
+namespace kvr {
+
+KVRAgentDefaultWarrantyProvider::KVRAgentDefaultWarrantyProvider(Platform& platform,
+                                                                 std::string callingProcessBundleID)
+    : platform_(platform), callingProcessBundleID_(std::move(callingProcessBundleID)) {
+  platform_.log.debug("%s: callingProcess=%@",
+                      "-[KVRAgentDefaultWarrantyProvider initWithCallingProcessBundleID:]",
+                      callingProcessBundleID_);
+}
+
+// The four follow-up operations go to a new KVRFollowUp each, once follow-ups are connected.
+
+KVRDeviceInfoList KVRAgentDefaultWarrantyProvider::refreshFollowupWithDeviceInfos(const KVRDeviceInfoList&) {
+  return {};
+}
+
+KVRDeviceInfoList KVRAgentDefaultWarrantyProvider::refreshFollowupWithDeviceInfo(const KVRDeviceInfoRef&) {
+  return {};
+}
+
+void KVRAgentDefaultWarrantyProvider::dismissFollowUpForSerialNumber(const std::string&) {}
+
+void KVRAgentDefaultWarrantyProvider::migrateLegacyFollowUpIfNeededWithDeviceInfo(const KVRDeviceInfoRef&) {}
+
+void KVRAgentDefaultWarrantyProvider::downloadWarrantyForSerialNumber(const std::string& serialNumber,
+                                                                      DownloadCompletion completionHandler) {
+  const auto downloader = std::make_shared<KVRWarrantyDownloader>(platform_, callingProcessBundleID_);
+  downloader->downloadWarrantyForSerialNumber(serialNumber, std::move(completionHandler));
+}
+
+KVRWarrantyRef KVRAgentDefaultWarrantyProvider::cachedWarrantyForSerialNumber(
+    const std::string& serialNumber) {
+  return KVRWarranty::cachedWarrantyForSerialNumber(platform_, serialNumber);
+}
+
+std::optional<Date> KVRAgentDefaultWarrantyProvider::lastUpdatedDateForSerialNumber(
+    const std::string& serialNumber) {
+  return platform_.preferences.dateForKey(CacheMetadata(serialNumber).lastUpdatedDateKey);
+}
+
+std::optional<std::string> KVRAgentDefaultWarrantyProvider::cachedWarrantyVersionForSerialNumber(
+    const std::string& serialNumber) {
+  return platform_.preferences.stringForKey(CacheMetadata(serialNumber).versionKey);
+}
+
+std::optional<std::string> KVRAgentDefaultWarrantyProvider::cachedWarrantyLocaleForSerialNumber(
+    const std::string& serialNumber) {
+  return platform_.preferences.stringForKey(CacheMetadata(serialNumber).localeKey);
+}
+
+KVRWarrantyRef KVRAgentDefaultWarrantyProvider::migrateLegacyCachedWarrantyIfNeededForSerialNumber(
+    const std::string& serialNumber) {
+  return KVRWarranty::migrateLegacyCachedWarrantyIfNeededForSerialNumber(platform_, serialNumber);
+}
+
+double KVRAgentDefaultWarrantyProvider::cachedWarrantyValidityDuration() {
+  return platform_.preferences.doubleForKey(preference::kCachedWarrantyValidityDuration);
+}
+
+bool KVRAgentDefaultWarrantyProvider::isSignedInToNimbra() {
+  return platform_.accounts.primaryAccount().has_value();
+}
+
+std::int32_t KVRAgentDefaultWarrantyProvider::migrationVersion() {
+  using Limits = std::numeric_limits<std::int32_t>;
+  return static_cast<std::int32_t>(std::clamp<std::int64_t>(
+      platform_.preferences.integerForKey(preference::kMigrationVersion), Limits::min(), Limits::max()));
+}
+
+void KVRAgentDefaultWarrantyProvider::setMigrationVersion(std::int32_t version) {
+  platform_.preferences.setObject(version, preference::kMigrationVersion);
+}
+
+}  // namespace kvr

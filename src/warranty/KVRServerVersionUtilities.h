@@ -1,0 +1,71 @@
+#pragma once
+
+#include "platform/Completion.h"
+#include "platform/Platform.h"
+
+#include <cstdint>
+#include <optional>
+#include <vector>
+
+namespace kvr {
+
+/// A set of service versions; numbers in it are equal by value.
+class VersionSet {
+ public:
+  void insert(const Value& version);
+  bool contains(const Value& version) const;
+  bool isEmpty() const { return versions_.empty(); }
+  VersionSet intersectedWith(const VersionSet& other) const;
+  std::string description() const;
+
+ private:
+  std::vector<Value> versions_;
+};
+
+/// Negotiates which versions of the coverage service client and service share.
+///
+/// A version pair is a dictionary with "LowServerVersion" and "HighServerVersion", the two versions that one
+/// side speaks. The service publishes its pair as a property-list asset; what was learned is kept in the
+/// "ServerVersionCache" preference. A lookup policy says where the service's pair comes from:
+///
+/// | policy      | source, in order of preference       | network               | stores the pair       |
+/// |-------------|--------------------------------------|-----------------------|-----------------------|
+/// | kDefault    | cache, asset, the client's own       | without a cache       | a fetched one         |
+/// | kCacheOnly  | cache, the client's own              | never                 | never                 |
+/// | kRefresh    | asset, cache, the client's own       | always                | always                |
+///
+/// The "ServerVersionOverride" preference comes before all of these. Completions run before the operation
+/// returns when nothing is fetched, else on a work queue of the HTTP session. Any thread; no state.
+class KVRServerVersionUtilities {
+ public:
+  static constexpr std::uint64_t kDefault = 0;
+  static constexpr std::uint64_t kCacheOnly = 1;
+  static constexpr std::uint64_t kRefresh = 2;
+
+  using BoolCompletion = Completion<bool>;
+  /// Nothing when the service's pair was malformed.
+  using VersionsCompletion = Completion<std::optional<VersionSet>>;
+  /// Null when there is no dictionary.
+  using DictionaryCompletion = Completion<Value>;
+
+  /// Whether client and service share a version, by the asset of this moment.
+  static void serverVersionSupported(Platform& platform, BoolCompletion completion);
+  /// Whether the shared versions hold the client's highest, whose feature set is the paired watches.
+  static void isHighServerVersionFeaturesetEnabled(Platform& platform, std::uint64_t policy,
+                                                   BoolCompletion withCompletion);
+  static void isHighServerVersionFeaturesetEnabled(Platform& platform, BoolCompletion completion);
+  /// The same by what is known already; never sends a request.
+  static bool isHighServerVersionFeaturesetEnabled(Platform& platform);
+  /// The "WebFlowURL" preference, of whatever kind it is.
+  static Value readWebURLOverride(Platform& platform);
+
+  static void _supportedVersionsForClientAndServer(Platform& platform, std::uint64_t policy,
+                                                   VersionsCompletion withCompletion);
+  /// The cached pair, or null; a cache entry that is no dictionary is removed.
+  static Value _getValidServerVersionCache(Platform& platform);
+  /// Fetches a dictionary; one that is not a dictionary is asked for once more, past every cache.
+  static void _dictionaryFromURL(Platform& platform, const Value& url, bool shouldRetry,
+                                 DictionaryCompletion withCompletion);
+};
+
+}  // namespace kvr

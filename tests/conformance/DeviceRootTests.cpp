@@ -1,0 +1,444 @@
+#include "conformance/FileWorld.h"
+#include "platform/local/DelayedAnswers.h"
+#include "platform/local/DeviceRoot.h"
+#include "platform/local/LocalAccountSession.h"
+#include "platform/local/LocalAccountStore.h"
+#include "platform/local/LocalDeviceProperties.h"
+#include "platform/local/LocalEntitlements.h"
+#include "platform/local/LocalFeatureFlags.h"
+#include "platform/local/LocalPairedDeviceRegistry.h"
+#include "platform/local/LocalProcesses.h"
+#include "platform/local/LocalUserLocale.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <array>
+#include <future>
+#include <limits>
+
+namespace kvr {
+namespace {
+
+namespace fs = std::filesystem;
+using ::testing::ElementsAre;
+using ::testing::HasSubstr;
+using ::testing::IsEmpty;
+using ::testing::Pair;
+using ::testing::SizeIs;
+using Dictionary = Value::Dictionary;
+
+/// One variable of the environment, for as long as this lives.
+class Variable {
+ public:
+  Variable(const char* name, const char* value) : name_(name) {
+    if (const char* before = std::getenv(name)) before_ = before;
+    set(value);
+  }
+  Variable(const Variable&) = delete;
+  Variable& operator=(const Variable&) = delete;
+  ~Variable() { set(before_ ? before_->c_str() : nullptr); }
+  void set(const char* value) const { value != nullptr ? ::setenv(name_, value, 1) : ::unsetenv(name_); }
+
+ private:
+  const char* name_;
+  std::optional<std::string> before_;
+};
+
+class ADevice : public ::testing::Test {
+ protected:
+  ADevice() { fs::permissions(directory.path(), fs::perms::owner_all); }
+
+  std::string pathOf(const std::string& file) const { return directory.path() + "/" + file; }
+  void put(const std::string& file, const Value& tree) const {
+    writeFile(pathOf(file), *writePropertyList(tree, PropertyListEncoding::Binary));
+    fs::permissions(pathOf(file), fs::perms::owner_read | fs::perms::owner_write);
+  }
+  std::vector<std::string> errors() const { return log.texts(LogLevel::Error); }
+
+  TemporaryDirectory directory;
+  SimulatedClock clock;
+  SimulatedLog log;
+  LocalFiles files{log, directory.path()};
+  PropertyListFiles lists{files, clock, log};
+  DeviceRoot root{lists, log, directory.path()};
+};
+
+TEST_F(ADevice, IsDescribedByWhatTheFilesHoldNow) {
+  EXPECT_TRUE(root.dictionary("F.plist").isNull());
+  put("F.plist", Dictionary{{"a", 1}});
+  EXPECT_EQ(root.dictionary("F.plist")["a"], Value(1));
+  EXPECT_TRUE(root.array("F.plist").isNull());
+  writeFile(pathOf("F.plist"), "garbage {");
+  EXPECT_TRUE(root.dictionary("F.plist").isNull());
+  EXPECT_TRUE(root.dictionary("F.plist").isNull());
+  EXPECT_THAT(errors(), ElementsAre(HasSubstr("not an array"), HasSubstr(pathOf("F.plist"))));
+  EXPECT_EQ(contentOfFile(pathOf("F.plist")), "garbage {");
+}
+
+TEST_F(ADevice, IsTrustedOnlyWhereNobodyElseCanWrite) {
+  put("F.plist", Dictionary{{"a", 1}});
+  fs::create_directory(pathOf("open"));
+  fs::create_symlink("open/F.plist", pathOf("linked.plist"));
+  put("open/F.plist", Dictionary{{"a", 1}});
+  const struct {
+    const char* changed;
+    mode_t mode;
+    const char* asked;
+    const char* reason;  ///< null: trusted
+  } cases[] = {
+      {"F.plist", 0600, "F.plist", nullptr},
+      {"F.plist", 0644, "F.plist", nullptr},
+      {"F.plist", 0620, "F.plist", "by group"},
+      {"F.plist", 0602, "F.plist", "by everyone"},
+      {"F.plist", 0600, "F.plist", nullptr},
+      {"", 01777, "F.plist", "by everyone"},
+      {"", 0770, "F.plist", "by group"},
+      {"", 0755, "F.plist", nullptr},
+      {"open", 0777, "linked.plist", "by everyone"},
+      {"open", 0700, "linked.plist", nullptr},
+      {"open/F.plist", 0666, "linked.plist", "by everyone"},
+  };
+  for (const auto& [changed, mode, asked, reason] : cases) {
+    SCOPED_TRACE(std::string(changed) + " " + std::to_string(mode));
+    log.clear();
+    ASSERT_EQ(::chmod(pathOf(changed).c_str(), mode), 0);
+    for (int round = 0; round < 2; ++round)
+      EXPECT_EQ(root.trustedDictionary(asked).isNull(), reason != nullptr);
+    if (reason != nullptr) {
+      EXPECT_THAT(errors(), ElementsAre(HasSubstr(reason)));
+    } else {
+      EXPECT_THAT(errors(), IsEmpty());
+    }
+  }
+  EXPECT_TRUE(root.trustedDictionary("missing.plist").isNull());
+}
+
+TEST_F(ADevice, IsNotTrustedInAnotherUsersHands) {
+  put("F.plist", Dictionary{{"a", 1}});
+  if (::chown(pathOf("F.plist").c_str(), 4711, static_cast<gid_t>(-1)) != 0) GTEST_SKIP() << "needs root";
+  EXPECT_TRUE(root.trustedDictionary("F.plist").isNull());
+  EXPECT_THAT(errors(), ElementsAre(HasSubstr("belongs to user 4711")));
+}
+
+TEST_F(ADevice, HasThePropertiesStatedElseThoseOfItsHost) {
+  const std::string host = directory.path() + "/host";
+  const LocalDeviceProperties properties(root, host);
+  const auto answers = [&] {
+    std::vector<std::string> found;
+    for (const auto question : {DeviceProperties::kSerialNumber, DeviceProperties::kProductType,
+                                DeviceProperties::kProductVersion}) {
+      found.push_back(describe(properties.answer(question)));
+    }
+    return found;
+  };
+  EXPECT_THAT(answers(), ElementsAre("(null)", "(null)", "(null)"));
+  writeFile(host + "/sys/class/dmi/id/product_serial", "To Be Filled By O.E.M.\n");
+  writeFile(host + "/proc/device-tree/serial-number", std::string("10000000abc\0", 12));
+  writeFile(host + "/sys/class/dmi/id/product_name", " Phone 14 \n");
+  writeFile(host + "/usr/lib/os-release", "VERSION_ID=1\n");
+  EXPECT_THAT(answers(), ElementsAre("10000000abc", "Phone 14", "1"));
+  writeFile(host + "/etc/os-release", "NAME='x'\nMY_VERSION_ID=3\nVERSION_ID=\"12.1\"\nVERSION_IDS=4");
+  EXPECT_THAT(answers(), ElementsAre("10000000abc", "Phone 14", "12.1"));
+  put("DeviceProperties.plist",
+      Dictionary{{"SerialNumber", "S1"}, {"ProductType", 7}, {"InternalInstall", 1}});
+  EXPECT_THAT(answers(), ElementsAre("S1", "Phone 14", "12.1"));
+  EXPECT_FALSE(properties.isInternalInstall());
+  put("DeviceProperties.plist", Dictionary{{"UserAssignedDeviceName", "Ann's"}, {"InternalInstall", true}});
+  EXPECT_TRUE(properties.isInternalInstall());
+  EXPECT_EQ(properties.answer("UserAssignedDeviceName"), "Ann's");
+  EXPECT_EQ(properties.answer("InternalInstall"), std::nullopt);
+  EXPECT_THAT(errors(), IsEmpty());
+}
+
+TEST_F(ADevice, HasTheFeaturesThatAreSwitchedOnByABool) {
+  const LocalFeatureFlags flags(root);
+  EXPECT_FALSE(flags.isEnabled("D", "on"));
+  put("FeatureFlags.plist",
+      Dictionary{{"D", Dictionary{{"on", true}, {"off", false}, {"one", 1}}}, {"E", true}});
+  EXPECT_TRUE(flags.isEnabled("D", "on"));
+  for (const auto* feature : {"off", "one", "missing"}) EXPECT_FALSE(flags.isEnabled("D", feature));
+  EXPECT_FALSE(flags.isEnabled("E", "on"));
+}
+
+TEST_F(ADevice, IsPairedWithTheListedWatches) {
+  const LocalPairedDeviceRegistry registry(root);
+  const auto all = [](const PairedDeviceEntry&) { return true; };
+  EXPECT_THAT(registry.allDevicesPassing(all), IsEmpty());
+  put("PairedDevices.plist",
+      Value::Array{Dictionary{{"name", "A"},
+                              {"localizedModel", "M"},
+                              {"serialNumber", "S"},
+                              {"pairedDate", Date{5}},
+                              {"isPaired", true},
+                              {"isArchived", false}},
+                   "no watch", Dictionary{{"name", 1}, {"pairedDate", "today"}, {"isPaired", 1}}});
+  EXPECT_EQ(describe(registry.allDevicesPassing(all)),
+            "({isArchived = 0; isPaired = 1; localizedModel = M; name = A; pairedDate = \"1970-01-01 "
+            "00:00:05 +0000\"; "
+            "serialNumber = S; }, {})");
+  EXPECT_THAT(registry.allDevicesPassing([](const auto& entry) { return entry.name == "A"; }), SizeIs(1));
+}
+
+TEST_F(ADevice, EntitlesTheFilesThatThePathsLeadTo) {
+  const LocalEntitlements entitlements(root);
+  writeFile(pathOf("program"), "1");
+  writeFile(pathOf("copy"), "1");
+  fs::create_hard_link(pathOf("program"), pathOf("sameProgram"));
+  const auto valueOf = [&](const std::string& program, std::string_view entitlement = "e") {
+    return entitlements.valueFor(*FileIdentity::of(pathOf(program)), entitlement);
+  };
+  EXPECT_TRUE(valueOf("program").isNull());
+  put("Entitlements.plist", Dictionary{{pathOf("missing"), Dictionary{{"e", false}}},
+                                       {pathOf("program"), Dictionary{{"e", true}, {"one", 1}}},
+                                       {"program", Dictionary{{"relative", true}}},
+                                       {pathOf("copy"), "not a dictionary"}});
+  EXPECT_EQ(valueOf("program"), Value(true));
+  EXPECT_EQ(valueOf("sameProgram"), Value(true));
+  EXPECT_EQ(valueOf("program", "one").kind(), Value::Kind::Int);
+  EXPECT_TRUE(valueOf("program", "relative").isNull());
+  EXPECT_TRUE(valueOf("copy").isNull());
+  fs::rename(pathOf("copy"), pathOf("program"));  // another file under the entitled path
+  EXPECT_EQ(valueOf("program"), Value(true));
+  EXPECT_TRUE(valueOf("sameProgram").isNull());
+  fs::permissions(pathOf("Entitlements.plist"), fs::perms::others_write, fs::perm_options::add);
+  EXPECT_TRUE(valueOf("program").isNull());
+}
+
+TEST_F(ADevice, KnowsProgramsAndTheBundlesAroundThem) {
+  const LocalProcesses processes(lists);
+  std::array<char, 4096> buffer{};
+  const auto length = processes.executablePath(::getpid(), buffer);
+  ASSERT_GT(length, 0);
+  EXPECT_EQ(std::string(buffer.data(), static_cast<std::size_t>(length)), fs::read_symlink("/proc/self/exe"));
+  EXPECT_LE(processes.executablePath(::getpid(), std::span(buffer).first(static_cast<std::size_t>(length))),
+            0);
+  EXPECT_LE(processes.executablePath(-1, buffer), 0);
+
+  put("Apps/Outer/Info.plist", Dictionary{{"BundleIdentifier", "outer"}});
+  put("Apps/Outer/Parts/Info.plist", Dictionary{{"BundleIdentifier", 1}});
+  EXPECT_EQ(processes.bundleLocationForExecutable(pathOf("Apps/Outer/Parts/bin/program")),
+            pathOf("Apps/Outer"));
+  EXPECT_EQ(processes.bundleLocationForExecutable(pathOf("Apps/program")), std::nullopt);
+  EXPECT_EQ(processes.bundleLocationForExecutable("program"), std::nullopt);
+  EXPECT_EQ(processes.bundleAt(pathOf("Apps/Outer"))->identifier, "outer");
+  EXPECT_EQ(processes.bundleAt(pathOf("Apps/Outer/Parts"))->identifier, std::nullopt);
+  EXPECT_FALSE(processes.bundleAt(pathOf("Apps")));
+}
+
+TEST_F(ADevice, GivesNoPathForAProgramThatIsNoLongerThere) {
+  const LocalProcesses processes(lists);
+  // A program that says when it runs, and ends with its input.
+  fs::copy_file("/bin/cat", pathOf("program (deleted)"));
+  int input[2];
+  int output[2];
+  ASSERT_EQ(::pipe2(input, O_CLOEXEC), 0);
+  ASSERT_EQ(::pipe2(output, O_CLOEXEC), 0);
+  const std::string program = pathOf("program (deleted)");
+  const pid_t child = ::fork();
+  if (child == 0) {
+    ::dup2(input[0], STDIN_FILENO);
+    ::dup2(output[1], STDOUT_FILENO);
+    ::execl(program.c_str(), "program", nullptr);
+    ::_exit(1);
+  }
+  char echo = 0;
+  ASSERT_EQ(::write(input[1], "x", 1), 1);
+  ASSERT_EQ(::read(output[0], &echo, 1), 1);
+  std::array<char, 4096> buffer{};
+  EXPECT_EQ(processes.executablePath(child, buffer), static_cast<std::int64_t>(program.size()));
+  fs::remove(program);
+  EXPECT_LE(processes.executablePath(child, buffer), 0);
+  writeFile(program + " (deleted)", "another file");
+  EXPECT_LE(processes.executablePath(child, buffer), 0);
+  for (const int end : {input[0], input[1], output[0], output[1]}) ::close(end);
+  ::waitpid(child, nullptr, 0);
+}
+
+TEST_F(ADevice, SpeaksTheLanguageStatedElseThatOfTheEnvironment) {
+  const LocalUserLocale locale(root, log);
+  const Variable all("LC_ALL", nullptr);
+  const Variable messages("LC_MESSAGES", nullptr);
+  const Variable language("LANG", nullptr);
+  const struct {
+    const char* all;
+    const char* messages;
+    const char* language;
+    const char* identifier;
+  } cases[] = {{"", "", "", "en_US"},
+               {"", "", "de_DE.UTF-8", "de_DE"},
+               {"", "fr_FR@euro", "de_DE", "fr_FR"},
+               {"ja_JP.eucJP@x", "fr_FR", "de_DE", "ja_JP"},
+               {"C", "fr_FR", "de_DE", "en_US"},
+               {"", "", "C.UTF-8", "en_US"},
+               {"POSIX", "", "", "en_US"},
+               {"../../etc", "", "", "en_US"}};
+  for (const auto& [allValue, messagesValue, languageValue, identifier] : cases) {
+    all.set(allValue);
+    messages.set(messagesValue);
+    language.set(languageValue);
+    EXPECT_EQ(locale.preferredIdentifier(), identifier);
+  }
+  all.set("it_IT");
+  for (const auto& unusable : {Value(1), Value(""), Value("a/b"), Value("en_US\r\nX: y")}) {
+    put("Locale.plist", Dictionary{{"identifier", unusable}});
+    EXPECT_EQ(locale.preferredIdentifier(), "it_IT");
+  }
+  const std::pair<const char*, const char*> numbers[] = {{"en_US", "18,446,744,073,709,551,615"},
+                                                         {"de_DE", "18.446.744.073.709.551.615"},
+                                                         {"en_IN", "1,84,46,74,40,73,70,95,51,615"}};
+  for (const auto& [identifier, text] : numbers) {
+    put("Locale.plist", Dictionary{{"identifier", identifier}});
+    EXPECT_EQ(locale.decimalString(std::numeric_limits<std::uint64_t>::max()), text);
+  }
+  EXPECT_THAT(errors(), IsEmpty());
+}
+
+TEST_F(ADevice, KnowsTheOffsetOfItsTimeZoneAtADate) {
+  const LocalUserLocale locale(root, log);
+  const Variable zone("TZ", "CET-1CEST,M3.5.0,M10.5.0/3");
+  EXPECT_EQ(locale.secondsFromGMT(Date{1768000000}), 3600);  // January
+  EXPECT_EQ(locale.secondsFromGMT(Date{1784000000}), 7200);  // July
+  zone.set("IST-5:30");
+  for (const double seconds : {1768000000.9, std::nan(""), -1e300, 1e300}) {
+    EXPECT_EQ(locale.secondsFromGMT(Date{seconds}), 19800);
+  }
+}
+
+class AnAccount : public ADevice {
+ protected:
+  using Outcome = std::pair<std::int64_t, std::string>;
+
+  static Value tree(const Value& renewal, const std::string& altDSID = "alt") {
+    return Dictionary{
+        {"primaryAccount",
+         Dictionary{{"altDSID", altDSID},
+                    {"storeAccountIdentifier", 42},
+                    {"storefront", "143441"},
+                    {"authenticationAccount", Dictionary{{"alternateDSID", "auth"},
+                                                         {"tokens", Dictionary{{"s", "held"}, {"number", 1}}},
+                                                         {"renewal", renewal}}}}},
+        {"sessionHeaders", Dictionary{{"clientInfo", Dictionary{{"X-Client", "c"}, {"X-Number", 1}}},
+                                      {"deviceIdentifier", Dictionary{{"X-Device", "d"}}},
+                                      {"authentication", Dictionary{{"X-A", "1"}, {"X-B", "2"}}}}}};
+  }
+  std::future<Outcome> renew(AccountStore& store) const {
+    auto promise = std::make_shared<std::promise<Outcome>>();
+    store.renewCredentialsFor(account, {}, [promise](std::int64_t code, const std::optional<Error>& error) {
+      promise->set_value({code, error ? error->message : ""});
+    });
+    return promise->get_future();
+  }
+
+  const AuthenticationAccount account{"auth"};
+};
+
+TEST_F(AnAccount, IsTheOneThatTheFileHolds) {
+  const LocalAccountStore store(root, log);
+  EXPECT_FALSE(store.primaryAccount());
+  put("Accounts.plist", tree({}));
+  const auto cloud = store.primaryAccount();
+  ASSERT_TRUE(cloud);
+  EXPECT_EQ(cloud->altDSID, "alt");
+  EXPECT_EQ(store.authenticationAccountFor(*cloud)->alternateDSID, "auth");
+  EXPECT_EQ(store.storeAccountFor(*cloud)->identifier, 42);
+  EXPECT_EQ(store.storeAccountFor(*cloud)->storefront, "143441");
+  EXPECT_EQ(store.tokenFor(account, "s"), "held");
+  EXPECT_EQ(store.tokenFor(account, "number"), std::nullopt);
+  EXPECT_EQ(store.tokenFor({"another"}, "s"), std::nullopt);
+
+  put("Accounts.plist", tree({}, "another"));
+  EXPECT_FALSE(store.authenticationAccountFor(*cloud));
+  EXPECT_FALSE(store.storeAccountFor(*cloud));
+  put("Accounts.plist", Dictionary{{"primaryAccount", Dictionary{{"altDSID", 1}, {"storefront", 2}}}});
+  ASSERT_TRUE(store.primaryAccount());
+  EXPECT_EQ(store.primaryAccount()->altDSID, std::nullopt);
+  EXPECT_FALSE(store.authenticationAccountFor({}));
+  EXPECT_FALSE(store.storeAccountFor({}));
+  EXPECT_THAT(errors(), IsEmpty());
+  fs::permissions(pathOf("Accounts.plist"), fs::perms::group_write, fs::perm_options::add);
+  EXPECT_FALSE(store.primaryAccount());
+  EXPECT_THAT(errors(), SizeIs(1));
+}
+
+TEST_F(AnAccount, BringsItsSessionsHeaders) {
+  const LocalAccountSession session(root);
+  HTTPRequest request;
+  session.addClientInfoHeader(request);
+  EXPECT_THAT(request.headers.fields(), IsEmpty());
+  put("Accounts.plist", tree({}));
+  session.addClientInfoHeader(request);
+  session.addDeviceIdentifierHeader(request);
+  EXPECT_THAT(request.headers.fields(), ElementsAre(Pair("X-Client", "c"), Pair("X-Device", "d")));
+  EXPECT_THAT(session.authenticationHeadersFor(request), ElementsAre(Pair("X-A", "1"), Pair("X-B", "2")));
+}
+
+TEST_F(AnAccount, IsRenewedAsScripted) {
+  const Value tokens = Dictionary{{"s", "new"}, {"t", 1}};
+  const double kNaN = std::nan("");
+  const struct {
+    Value renewal;
+    Outcome outcome;
+    std::string token;
+  } cases[] = {
+      {{}, {1, "there is no renewal service for the account"}, "held"},
+      {Dictionary{{"resultCode", 0}, {"tokens", tokens}, {"delay", -1}}, {0, ""}, "new"},
+      {Dictionary{{"tokens", tokens}, {"delay", kNaN}, {"error", "still"}}, {0, "still"}, "new"},
+      {Dictionary{{"resultCode", 0}}, {0, ""}, "held"},
+      {Dictionary{{"resultCode", -7}, {"tokens", tokens}, {"error", "no"}, {"delay", "x"}},
+       {-7, "no"},
+       "held"},
+  };
+  LocalAccountStore store(root, log);
+  for (const auto& [renewal, outcome, token] : cases) {
+    put("Accounts.plist", tree(renewal));
+    EXPECT_EQ(renew(store).get(), outcome);
+    EXPECT_EQ(store.tokenFor(account, "s"), token);
+  }
+}
+
+TEST_F(AnAccount, HoldsRenewedTokensUntilTheFileChangesOrTheStoreGoes) {
+  put("Accounts.plist", tree(Dictionary{{"tokens", Dictionary{{"s", "new"}}}}));
+  {
+    LocalAccountStore store(root, log);
+    EXPECT_EQ(renew(store).get().first, 0);
+    EXPECT_EQ(store.tokenFor(account, "s"), "new");
+    EXPECT_EQ(LocalAccountStore(root, log).tokenFor(account, "s"), "held");
+    put("Accounts.plist", tree({}));
+    EXPECT_EQ(store.tokenFor(account, "s"), "held");
+  }
+  put("Accounts.plist", tree(Dictionary{{"delay", 1e300}, {"tokens", Dictionary{{"s", "new"}}}}));
+  std::future<Outcome> late;
+  {
+    LocalAccountStore store(root, log);
+    late = renew(store);
+  }
+  EXPECT_EQ(late.get(), Outcome(LocalAccountStore::kEnding, "the agent is ending"));
+}
+
+TEST(DelayedAnswersTo, SeveralQuestionsAreGivenInOrderOnAnotherThreadAndNoneIsOwedAtTheEnd) {
+  SimulatedLog log;
+  std::vector<std::string> given;  // by one thread, which is joined
+  std::promise<std::thread::id> thread;
+  {
+    DelayedAnswers answers(log);
+    const auto add = [&](double delay, const std::string& name) {
+      answers.after(delay,
+                    [&given, name](bool ending) { given.push_back(name + (ending ? " at the end" : "")); });
+    };
+    add(std::numeric_limits<double>::infinity(), "never");
+    add(3600, "in an hour");
+    answers.after(0, [](bool) { throw std::runtime_error("fault"); });
+    add(-1, "first");
+    add(std::nan(""), "second");
+    answers.after(0.001, [&](bool) { thread.set_value(std::this_thread::get_id()); });
+    EXPECT_NE(thread.get_future().get(), std::this_thread::get_id());
+  }
+  EXPECT_THAT(given, ElementsAre("first", "second", "in an hour at the end", "never at the end"));
+  EXPECT_THAT(log.texts(LogLevel::Error), ElementsAre("a delayed answer failed: fault"));
+}
+
+}  // namespace
+}  // namespace kvr

@@ -1,0 +1,379 @@
+#include "conformance/FileWorld.h"
+#include "platform/PropertyListFiles.h"
+#include "platform/local/Descriptor.h"
+#include "platform/local/LocalLog.h"
+
+#include <fcntl.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+
+#include <cerrno>
+#include <limits>
+#include <regex>
+#include <thread>
+
+namespace kvr {
+namespace {
+
+namespace fs = std::filesystem;
+using ::testing::ElementsAre;
+using ::testing::HasSubstr;
+using ::testing::IsEmpty;
+using ::testing::MatchesRegex;
+using ::testing::SizeIs;
+using Expected = PropertyListFiles::Expected;
+using WhenDamaged = PropertyListFiles::WhenDamaged;
+
+std::int64_t codeOf(const std::optional<Error>& error) { return error ? error->code : 0; }
+
+template <class T>
+std::int64_t codeOf(const Result<T>& result) {
+  return result ? 0 : result.error().code;
+}
+
+std::string bytesOf(const Value& tree) { return *writePropertyList(tree, PropertyListEncoding::Binary); }
+
+class AFile : public InBothWorlds {};
+INSTANTIATE_TEST_SUITE_P(, AFile, ::testing::Bool(), AFile::nameOf);
+
+TEST_P(AFile, IsReplacedAsAWholeAndReadWithinALimit) {
+  const auto path = world.path("file");
+  const auto missing = world.files().read(path, 10);
+  ASSERT_TRUE(missing);
+  EXPECT_FALSE(*missing);
+  EXPECT_FALSE(world.files().stamp(path));
+  std::optional<FileStamp> last;
+  for (const auto& bytes : {std::string(), std::string("a\0b", 3), std::string(10, 'x')}) {
+    ASSERT_EQ(codeOf(world.files().replace(path, bytes)), 0);
+    const auto contents = world.files().read(path, 10);
+    ASSERT_TRUE(contents && *contents);
+    EXPECT_EQ((*contents)->bytes, bytes);
+    EXPECT_EQ((*contents)->stamp.size, bytes.size());
+    EXPECT_NE((*contents)->stamp, last);
+    last = (*contents)->stamp;
+  }
+  EXPECT_EQ(codeOf(world.files().read(path, 9)), EFBIG);
+  EXPECT_THAT(world.names(world.files().homeDirectory()), ElementsAre("file"));
+}
+
+TEST_P(AFile, IsNotMadeOfWhatIsNoPlainFile) {
+  ASSERT_EQ(codeOf(world.files().createDirectory(world.path("a/b"))), 0);
+  EXPECT_EQ(codeOf(world.files().createDirectory(world.path("a/b"))), 0);
+  world.put(world.path("file"), "x");
+  EXPECT_EQ(codeOf(world.files().read(world.path("a"), 10)), EISDIR);
+  EXPECT_EQ(codeOf(world.files().replace(world.path("a"), "x")), EISDIR);
+  EXPECT_EQ(codeOf(world.files().replace(world.path("missing/file"), "x")), ENOENT);
+  EXPECT_EQ(codeOf(world.files().createDirectory(world.path("file/below"))), ENOTDIR);
+  EXPECT_EQ(codeOf(world.files().createDirectory(world.path("file"))), ENOTDIR);
+  EXPECT_EQ(world.get(world.path("file")), "x");
+}
+
+TEST_P(AFile, IsRenamedOverAnotherOnlyWhereThatIsAsked) {
+  world.put(world.path("a"), "1");
+  world.put(world.path("b"), "2");
+  EXPECT_EQ(codeOf(world.files().renameToUnused(world.path("a"), world.path("b"))), EEXIST);
+  EXPECT_EQ(world.get(world.path("b")), "2");
+  EXPECT_EQ(codeOf(world.files().renameToUnused(world.path("a"), world.path("c"))), 0);
+  EXPECT_EQ(codeOf(world.files().rename(world.path("c"), world.path("b"))), 0);
+  EXPECT_EQ(world.get(world.path("b")), "1");
+  EXPECT_EQ(codeOf(world.files().rename(world.path("c"), world.path("b"))), ENOENT);
+  EXPECT_EQ(codeOf(world.files().remove(world.path("b"))), 0);
+  EXPECT_EQ(codeOf(world.files().remove(world.path("b"))), ENOENT);
+  EXPECT_THAT(world.names(world.files().homeDirectory()), IsEmpty());
+}
+
+class APropertyListFile : public InBothWorlds {
+ protected:
+  Value read(WhenDamaged whenDamaged = WhenDamaged::SetAside, Expected expected = Expected::Dictionary) {
+    const auto tree = lists.read(path, expected, whenDamaged);
+    EXPECT_TRUE(tree) << describe(tree.error());
+    return tree ? *tree : Value();
+  }
+
+  const std::string path = world.path("list.plist");
+  PropertyListFiles lists{world.files(), world.clock, world.log};
+};
+INSTANTIATE_TEST_SUITE_P(, APropertyListFile, ::testing::Bool(), APropertyListFile::nameOf);
+
+TEST_P(APropertyListFile, IsReadAsItIsNow) {
+  EXPECT_TRUE(read().isNull());
+  // Contents of equal size, one right after the other: no stamp may hide one.
+  for (int round = 0; round < 50; ++round) {
+    world.put(path, bytesOf(Value::Dictionary{{"round", round}}));
+    EXPECT_EQ(read()["round"], Value(round));
+  }
+  world.erase(path);
+  EXPECT_TRUE(read().isNull());
+  EXPECT_THAT(world.log.lines(), IsEmpty());
+}
+
+TEST_P(APropertyListFile, IsSetAsideUnderANameOfItsOwnWhenItIsDamaged) {
+  ASSERT_EQ(codeOf(lists.write(path, Value::Dictionary{}, PropertyListEncoding::XML)), 0);
+  const std::string damaged[] = {"", "garbage {", bytesOf(Value::Array{1}), bytesOf(Value("text"))};
+  for (const auto& bytes : damaged) {
+    world.put(path, bytes);
+    EXPECT_TRUE(read().isNull());
+    EXPECT_TRUE(read().isNull());
+  }
+  const std::string name = "list.plist.damaged-20261124T160443Z";
+  EXPECT_THAT(world.names(world.files().homeDirectory()),
+              ElementsAre(name, name + "-2", name + "-3", name + "-4"));
+  EXPECT_EQ(world.get(world.path(name + "-2")), damaged[1]);
+  const auto errors = world.log.texts(LogLevel::Error);
+  ASSERT_THAT(errors, SizeIs(4));
+  EXPECT_THAT(errors[2], HasSubstr(path + " is damaged (the top level is not a dictionary): set aside as "));
+}
+
+TEST_P(APropertyListFile, IsLeftAndReportedOnceAStateWhereItIsNotOurs) {
+  world.put(path, "garbage {");
+  EXPECT_TRUE(read(WhenDamaged::Leave).isNull());
+  EXPECT_TRUE(read(WhenDamaged::Leave).isNull());
+  EXPECT_THAT(world.log.texts(LogLevel::Error), SizeIs(1));
+  world.put(path, bytesOf(Value::Array{1}));
+  EXPECT_TRUE(read(WhenDamaged::Leave).isNull());
+  EXPECT_THAT(world.log.texts(LogLevel::Error), SizeIs(2));
+  EXPECT_EQ(read(WhenDamaged::Leave, Expected::Array), Value(Value::Array{1}));
+  world.put(path, "garbage {");
+  EXPECT_TRUE(read(WhenDamaged::Leave).isNull());
+  EXPECT_THAT(world.log.texts(LogLevel::Error), SizeIs(3));
+  EXPECT_THAT(world.names(world.files().homeDirectory()), ElementsAre("list.plist"));
+}
+
+TEST_P(APropertyListFile, IsAnErrorReportedOnceWhileItCannotBeRead) {
+  world.put(path, std::string(PropertyListFiles::kLimit + 1, ' '));
+  for (int round = 0; round < 2; ++round) {
+    EXPECT_EQ(codeOf(lists.read(path, Expected::Dictionary, WhenDamaged::SetAside)), EFBIG);
+  }
+  EXPECT_THAT(world.log.texts(LogLevel::Error), SizeIs(1));
+  world.put(path, bytesOf(Value::Dictionary{{"a", 1}}));
+  EXPECT_EQ(read()["a"], Value(1));
+  world.put(path, std::string(PropertyListFiles::kLimit + 1, ' '));
+  EXPECT_EQ(codeOf(lists.read(path, Expected::Dictionary, WhenDamaged::SetAside)), EFBIG);
+  EXPECT_THAT(world.log.texts(LogLevel::Error), SizeIs(2));
+  EXPECT_THAT(world.names(world.files().homeDirectory()), ElementsAre("list.plist"));
+}
+
+TEST_P(APropertyListFile, KeepsItsContentWhenANewOneCannotBeWritten) {
+  ASSERT_EQ(codeOf(lists.write(path, Value::Dictionary{{"a", 1}}, PropertyListEncoding::XML)), 0);
+  EXPECT_TRUE(lists.write(path, Value::Dictionary{{"a", Value()}}, PropertyListEncoding::XML));
+  const std::string large(PropertyListFiles::kLimit, 'x');
+  EXPECT_EQ(codeOf(lists.write(path, Value::Dictionary{{"a", large}}, PropertyListEncoding::Binary)), EFBIG);
+  EXPECT_TRUE(lists.write(path + "/below", Value::Dictionary{}, PropertyListEncoding::XML));
+  EXPECT_EQ(read()["a"], Value(1));
+}
+
+TEST(AnUnchangedPropertyList, IsParsedOnceWhileTheMemoryForItLasts) {
+  const SimulatedClock clock;
+  SimulatedLog log;
+  SimulatedFiles files(clock);
+  PropertyListFiles lists(files, clock, log);
+  const auto readsFor = [&](const std::string& name) {
+    const auto before = files.readCount();
+    EXPECT_TRUE(lists.read("/home/user/" + name, Expected::Dictionary, WhenDamaged::Leave));
+    return files.readCount() - before;
+  };
+  const std::string large(1500 * 1024, 'x');
+  for (const auto* name : {"a", "b", "c"}) {
+    files.put(std::string("/home/user/") + name, bytesOf(Value::Dictionary{{"text", large}}));
+  }
+  files.put("/home/user/damaged", "garbage {");
+  EXPECT_EQ(readsFor("a"), 1U);
+  EXPECT_EQ(readsFor("damaged"), 1U);
+  EXPECT_EQ(readsFor("damaged"), 0U);
+  EXPECT_EQ(readsFor("b"), 1U);
+  EXPECT_EQ(readsFor("a"), 0U);
+  EXPECT_EQ(readsFor("c"), 1U);  // takes the place of what was longest unused
+  EXPECT_EQ(readsFor("a"), 0U);
+  EXPECT_EQ(readsFor("b"), 1U);
+}
+
+TEST(ADamagedFile, IsNotOverwrittenWhenItCannotBeSetAside) {
+  const SimulatedClock clock;
+  SimulatedLog log;
+  SimulatedFiles files(clock);
+  PropertyListFiles lists(files, clock, log);
+  files.put("/home/user/a", "garbage {");
+  files.setWriteFault("/home/user/a", Error{"files", EROFS, "read-only"});
+  for (int round = 0; round < 2; ++round) {
+    EXPECT_EQ(codeOf(lists.read("/home/user/a", Expected::Dictionary, WhenDamaged::SetAside)), EROFS);
+  }
+  EXPECT_THAT(log.texts(LogLevel::Error), ElementsAre(HasSubstr("not set aside: read-only")));
+  EXPECT_EQ(files.get("/home/user/a"), "garbage {");
+}
+
+class LocalFilesOf : public ::testing::Test {
+ protected:
+  std::vector<std::string> names() const {
+    std::vector<std::string> names;
+    for (const auto& entry : fs::directory_iterator(home)) names.push_back(entry.path().filename().string());
+    return names;
+  }
+  mode_t modeOf(const std::string& path) const {
+    struct stat status {};
+    return ::stat(path.c_str(), &status) == 0 ? status.st_mode & 07777U : 0;
+  }
+
+  TemporaryDirectory directory;
+  const std::string home = directory.path();
+  SimulatedLog log;
+  LocalFiles files{log, home + "/", 0.01};
+};
+
+TEST_F(LocalFilesOf, AUserAreForThatUserAlone) {
+  ASSERT_EQ(codeOf(files.createDirectory(home + "/a/b")), 0);
+  ASSERT_EQ(codeOf(files.replace(home + "/a/b/file", "x")), 0);
+  EXPECT_EQ(modeOf(home + "/a"), 0700U);
+  EXPECT_EQ(modeOf(home + "/a/b"), 0700U);
+  EXPECT_EQ(modeOf(home + "/a/b/file"), 0600U);
+  EXPECT_EQ(files.homeDirectory(), home);
+}
+
+TEST_F(LocalFilesOf, OtherKindsThanPlainOnesAreRefusedWithoutWaiting) {
+  ASSERT_EQ(::mkfifo((home + "/fifo").c_str(), 0600), 0);
+  EXPECT_EQ(codeOf(files.read(home + "/fifo", 10)), EINVAL);
+  EXPECT_EQ(codeOf(files.replace(home + "/fifo", "x")), EINVAL);
+  EXPECT_FALSE(files.stamp(home + "/fifo"));
+  EXPECT_EQ(codeOf(files.read("/dev/zero", 10)), EINVAL);
+  EXPECT_EQ(codeOf(files.read("relative", 10)), EINVAL);
+  EXPECT_EQ(codeOf(files.replace(home + std::string("/a\0b", 4), "x")), EINVAL);
+  // Files of the kernel have no size before they are read.
+  EXPECT_TRUE(*files.read("/proc/self/status", 65536));
+  EXPECT_THAT(names(), ElementsAre("fifo"));
+}
+
+TEST_F(LocalFilesOf, AStampSettlesOnlyWhenItsTimeHasPassed) {
+  ASSERT_EQ(codeOf(files.replace(home + "/file", "x")), 0);
+  EXPECT_FALSE(files.stamp(home + "/file")->settled);
+  EXPECT_FALSE((*files.read(home + "/file", 10))->stamp.settled);
+  EXPECT_TRUE(files.stamp("/etc/passwd")->settled);
+  const timespec future[2] = {{4102444800, 0}, {4102444800, 0}};
+  ASSERT_EQ(::utimensat(AT_FDCWD, (home + "/file").c_str(), future, 0), 0);
+  EXPECT_FALSE(files.stamp(home + "/file")->settled);
+}
+
+TEST_F(LocalFilesOf, AKilledProcessLeaveNothingButALivingOneKeepsItsOwn) {
+  writeFile(home + "/.list.plist.kvr-abcdef", "half");
+  writeFile(home + "/.list.plist.abcdef", "another program's");
+  writeFile(home + "/.list.plist.kvr-ghijkl", "being written");
+  const Descriptor writer(::open((home + "/.list.plist.kvr-ghijkl").c_str(), O_RDWR | O_CLOEXEC));
+  ASSERT_EQ(::flock(writer.get(), LOCK_EX), 0);
+  ASSERT_EQ(codeOf(files.replace(home + "/list.plist", "x")), 0);
+  EXPECT_THAT(names(),
+              ::testing::UnorderedElementsAre("list.plist", ".list.plist.abcdef", ".list.plist.kvr-ghijkl"));
+}
+
+TEST_F(LocalFilesOf, ADirectoryAreLockedAgainstOtherProcessesWhileThatIsPossible) {
+  const auto folder = home + "/new";
+  const auto isLocked = [&] {
+    const Descriptor other(::open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    return ::flock(other.get(), LOCK_EX | LOCK_NB) != 0;
+  };
+  {
+    const auto lock = files.lock(folder);
+    { const auto again = files.lock(folder); }
+    EXPECT_TRUE(isLocked());
+  }
+  EXPECT_FALSE(isLocked());
+  {
+    const Descriptor hung(::open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    ASSERT_EQ(::flock(hung.get(), LOCK_EX), 0);
+    EXPECT_TRUE(files.lock(folder));
+    EXPECT_TRUE(files.lock(folder));
+    EXPECT_THAT(log.texts(LogLevel::Error), ElementsAre(HasSubstr(folder)));
+  }
+  const auto lock = files.lock(folder);
+  EXPECT_TRUE(isLocked());
+}
+
+TEST_F(LocalFilesOf, ADirectoryAreChangedByOneThreadAtATime) {
+  constexpr int kThreads = 4;
+  constexpr int kRounds = 200;
+  int count = 0;  // guarded by the lock alone
+  std::vector<std::thread> threads;
+  for (int i = 0; i < kThreads; ++i) {
+    threads.emplace_back([&] {
+      for (int round = 0; round < kRounds; ++round) {
+        const auto lock = files.lock(home);
+        ++count;
+      }
+    });
+  }
+  for (auto& thread : threads) thread.join();
+  EXPECT_EQ(count, kThreads * kRounds);
+}
+
+class ALogLine : public ::testing::Test {
+ protected:
+  std::string written() const { return contentOfFile(path).value_or(""); }
+
+  TemporaryDirectory directory;
+  const std::string path = directory.path() + "/log";
+  const Descriptor descriptor{::open(path.c_str(), O_CREAT | O_WRONLY | O_APPEND | O_CLOEXEC, 0600)};
+};
+
+TEST_F(ALogLine, NamesTimeLevelAndChannelAndStaysOneLine) {
+  LocalLog log(LogLevel::Debug, false, LocalLog::Sink::Lines, descriptor.get());
+  const struct {
+    std::string message;
+    std::string text;
+  } cases[] = {
+      {"", ""},
+      {"caf\u00e9\twith a tab and a \\n", "caf\u00e9\twith a tab and a \\n"},
+      {"two\nlines\r\nand\rmore", "two\\nlines\\r\\nand\\rmore"},
+      {"\x1b[2J\x7f\v" + std::string(1, '\0'), "\\x1b[2J\\x7f\\x0b\\x00"},
+      {"\u0085\u2028\u2029\u2027", "\\xc2\\x85\\xe2\\x80\\xa8\\xe2\\x80\\xa9\u2027"},
+      {"\xe2\x80", "\xe2\x80"},
+      {std::string(100000, 'x'), std::string(100000, 'x')},
+  };
+  for (const auto& [message, text] : cases) {
+    ASSERT_EQ(::ftruncate(descriptor.get(), 0), 0);
+    log.standard("%s", message);
+    const std::string line = written();
+    const auto space = line.find(' ');
+    EXPECT_TRUE(std::regex_match(line.substr(0, space),
+                                 std::regex("\\d{4}-\\d\\d-\\d\\dT\\d\\d:\\d\\d:\\d\\d\\.\\d{6}Z")));
+    EXPECT_EQ(line.substr(space), " default com.tarsil.Kavrel:core " + text + "\n");
+  }
+}
+
+TEST_F(ALogLine, IsWrittenAtTheLevelsAndInTheClearnessThatTheEnvironmentNames) {
+  const Descriptor standardError(::dup(STDERR_FILENO));
+  const auto linesWith = [&](const char* level, const char* isPrivate, const char* journal) {
+    ::setenv("KVR_LOG_LEVEL", level, 1);
+    ::setenv("KVR_LOG_PRIVATE", isPrivate, 1);
+    ::setenv("JOURNAL_STREAM", journal, 1);
+    ::dup2(descriptor.get(), STDERR_FILENO);
+    EXPECT_EQ(::ftruncate(descriptor.get(), 0), 0);
+    {
+      const auto log = LocalLog::fromEnvironment();
+      log->debug("d %{private}@", "secret");
+      log->standard("s");
+      log->error("e");
+    }
+    ::dup2(standardError.get(), STDERR_FILENO);
+    for (const auto* name : {"KVR_LOG_LEVEL", "KVR_LOG_PRIVATE", "JOURNAL_STREAM"}) ::unsetenv(name);
+    return std::regex_replace(written(), std::regex("\\S+ (\\w+) \\S+ ([^\n]*)\n"), "$1:$2;");
+  };
+  EXPECT_EQ(linesWith("debug", "1", "1:1"), "debug:d secret;default:s;error:e;");
+  EXPECT_EQ(linesWith("debug", "yes", ""), "debug:d <private>;default:s;error:e;");
+  EXPECT_EQ(linesWith("", "", "nonsense"), "default:s;error:e;");
+  EXPECT_EQ(linesWith("error", "", ""), "error:e;");
+}
+
+TEST_F(ALogLine, IsLostWithoutHarmWhenNobodyTakesIt) {
+  int ends[2];
+  ASSERT_EQ(::pipe2(ends, O_CLOEXEC | O_NONBLOCK), 0);
+  const Descriptor reader(ends[0]);
+  {
+    const Descriptor writer(ends[1]);
+    LocalLog log(LogLevel::Debug, false, LocalLog::Sink::Lines, writer.get());
+    for (int i = 0; i < 3; ++i) log.standard("%s", std::string(100000, 'x'));
+    std::string taken(1, '\0');
+    EXPECT_EQ(::read(reader.get(), taken.data(), 1), 1);
+  }
+  LocalLog log(LogLevel::Debug, false, LocalLog::Sink::Lines, 9999);
+  log.standard("no such descriptor");
+}
+
+}  // namespace
+}  // namespace kvr

@@ -1,0 +1,189 @@
+#include "conformance/FileWorld.h"
+#include "platform/FilePreferences.h"
+
+#include <cerrno>
+#include <cmath>
+#include <limits>
+#include <thread>
+
+namespace kvr {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::HasSubstr;
+using ::testing::IsEmpty;
+using ::testing::SizeIs;
+
+const std::string kDomain = "com.tarsil.kvragent";
+
+/// The preferences as one process has them.
+struct Process {
+  Process(Files& files, FileWorld& world)
+      : lists(files, world.clock, world.log), preferences(lists, world.log, kDomain) {}
+
+  PropertyListFiles lists;
+  FilePreferences preferences;
+};
+
+class APreference : public InBothWorlds {
+ protected:
+  std::string pathOf(const std::string& domain) { return folder + "/" + domain + ".plist"; }
+  Value stored() {
+    const auto bytes = world.get(pathOf(kDomain));
+    return bytes ? *readPropertyList(*bytes) : Value();
+  }
+  /// A new one at every writing.
+  std::uint64_t inodeOfDomain() { return world.files().stamp(pathOf(kDomain)).value_or(FileStamp{}).inode; }
+  void put(const std::string& domain, const Value& tree) {
+    world.put(pathOf(domain), *writePropertyList(tree, PropertyListEncoding::XML));
+  }
+
+  const std::string folder = world.path("Library/Preferences");
+  Process process{world.files(), world};
+  FilePreferences& preferences = process.preferences;
+};
+INSTANTIATE_TEST_SUITE_P(, APreference, ::testing::Bool(), APreference::nameOf);
+
+TEST_P(APreference, IsTheStoredValueElseTheRegisteredOne) {
+  preferences.registerDefaults({{"a", 1}, {"b", 2}});
+  preferences.registerDefaults({{"b", 3}, {"none", Value()}});
+  EXPECT_EQ(preferences.integerForKey("a"), 1);
+  EXPECT_EQ(preferences.integerForKey("b"), 3);
+  EXPECT_FALSE(world.get(pathOf(kDomain)));
+  preferences.setObject("text", "a");
+  preferences.setObject(false, "c");
+  EXPECT_EQ(preferences.objectForKey("a"), Value("text"));
+  EXPECT_THAT(preferences.allKeys(), ElementsAre("a", "b", "c"));
+  EXPECT_EQ(stored(), Value(Value::Dictionary{{"a", "text"}, {"c", false}}));
+  preferences.removeObject("a");
+  EXPECT_EQ(preferences.integerForKey("a"), 1);
+  preferences.setObject({}, "c");
+  EXPECT_TRUE(preferences.objectForKey("c").isNull());
+  EXPECT_THAT(preferences.allKeys(), ElementsAre("a", "b"));
+}
+
+TEST_P(APreference, KeepsEveryKindOfValueAndSeesChangesFromOutside) {
+  const Value values[] = {true,
+                          1,
+                          -1,
+                          std::numeric_limits<std::uint64_t>::max(),
+                          0.5,
+                          "t\u00e9xt",
+                          Date{1795536283.25},
+                          Value::Bytes{0, 255},
+                          Value::Array{1, Value::Dictionary{{"k", "v"}}},
+                          Value::Dictionary{}};
+  for (const auto& value : values) {
+    preferences.setObject(value, "key");
+    EXPECT_EQ(preferences.objectForKey("key"), value);
+    EXPECT_EQ(preferences.objectForKey("key").kind(), value.kind());
+  }
+  put(kDomain, Value::Dictionary{{"key", "from outside"}, {"other", 1}});
+  EXPECT_EQ(preferences.objectForKey("key"), Value("from outside"));
+  preferences.setObject(2, "key");
+  EXPECT_EQ(stored(), Value(Value::Dictionary{{"key", 2}, {"other", 1}}));
+}
+
+TEST_P(APreference, IsWrittenOnlyWhenItChanges) {
+  const struct {
+    Value before;
+    Value after;
+    bool writes;
+  } cases[] = {{1, 1, false},
+               {1.0, 1, false},
+               {1, true, true},
+               {true, true, false},
+               {{}, {}, false},
+               {1, {}, true},
+               {"1", 1, true},
+               {{}, 1, true},
+               {Value::Array{1, 2}, Value::Array{1, 2}, false},
+               {std::nan(""), std::nan(""), false}};
+  for (const auto& [before, after, writes] : cases) {
+    SCOPED_TRACE(describe(before) + " to " + describe(after));
+    preferences.setObject(before, "key");
+    const auto inode = inodeOfDomain();
+    preferences.setObject(after, "key");
+    EXPECT_EQ(inodeOfDomain() != inode, writes);
+    EXPECT_EQ(preferences.objectForKey("key"), after);
+  }
+}
+
+TEST_P(APreference, OfAnotherDomainIsReadWhereTheNameLeadsNowhereElse) {
+  put("com.tarsil.Widgetry", Value::Dictionary{{"size", "L"}});
+  world.put(world.path("Library/outside.plist"),
+            *writePropertyList(Value::Dictionary{{"size", "X"}}, PropertyListEncoding::XML));
+  EXPECT_EQ(preferences.objectForKey("size", "com.tarsil.Widgetry"), Value("L"));
+  preferences.registerDefaults({{"size", "default"}});
+  const std::string domains[] = {
+      "", "..", "../outside", "com.tarsil.Widgetry/", "missing", std::string("com.tarsil.Widgetry\0", 20)};
+  for (const auto& domain : domains) {
+    EXPECT_TRUE(preferences.objectForKey("size", domain).isNull()) << domain;
+  }
+  EXPECT_THAT(world.log.lines(), IsEmpty());
+}
+
+TEST_P(APreference, OfADamagedDomainIsAbsentAndTheDomainStartsAfresh) {
+  preferences.registerDefaults({{"a", 1}});
+  world.put(pathOf(kDomain), "garbage {");
+  EXPECT_EQ(preferences.integerForKey("a"), 1);
+  preferences.setObject(2, "b");
+  EXPECT_EQ(stored(), Value(Value::Dictionary{{"b", 2}}));
+  EXPECT_THAT(world.names(folder),
+              ElementsAre(kDomain + ".plist", kDomain + ".plist.damaged-20261124T160443Z"));
+  EXPECT_THAT(world.log.texts(LogLevel::Error), SizeIs(1));
+}
+
+TEST_P(APreference, OfADomainThatCannotBeReadIsNeverOverwritten) {
+  preferences.registerDefaults({{"a", 1}});
+  const std::string large(PropertyListFiles::kLimit + 1, ' ');
+  world.put(pathOf(kDomain), large);
+  EXPECT_EQ(preferences.integerForKey("a"), 1);
+  EXPECT_THAT(preferences.allKeys(), ElementsAre("a"));
+  preferences.setObject(2, "a");
+  preferences.update("a", [](const Value&) -> Value { return ADD_FAILURE(), 3; });
+  EXPECT_EQ(world.get(pathOf(kDomain)), large);
+  EXPECT_THAT(world.log.texts(LogLevel::Error),
+              ElementsAre(HasSubstr("cannot be read"), HasSubstr("preference a is not changed"),
+                          HasSubstr("preference a is not changed")));
+}
+
+TEST_P(APreference, ThatCannotBeStoredLeavesTheOthersAsTheyWere) {
+  preferences.setObject(1, "a");
+  preferences.setObject(std::string(PropertyListFiles::kLimit, 'x'), "b");
+  EXPECT_THAT(world.log.texts(LogLevel::Error), ElementsAre(HasSubstr("preference b cannot be stored")));
+  EXPECT_EQ(stored(), Value(Value::Dictionary{{"a", 1}}));
+}
+
+TEST_P(APreference, LosesNoEntryHoweverManyThreadsAndProcessesAddThem) {
+  constexpr int kThreads = 4;
+  constexpr int kEach = 25;
+  const auto otherFiles = world.filesOfAnotherProcess();
+  Process other(otherFiles ? *otherFiles : world.files(), world);
+  std::vector<std::thread> threads;
+  for (int number = 0; number < kThreads; ++number) {
+    threads.emplace_back([&, number] {
+      auto& mine = number % 2 == 0 ? preferences : other.preferences;
+      for (int i = 0; i < kEach; ++i) {
+        mine.update("list", [&](const Value& list) {
+          Value::Array entries = list.isArray() ? list.array() : Value::Array();
+          entries.emplace_back(number * kEach + i);
+          return Value(std::move(entries));
+        });
+        mine.setObject(i, "thread " + std::to_string(number));
+      }
+    });
+  }
+  for (auto& thread : threads) thread.join();
+  const auto list = preferences.objectForKey("list");
+  ASSERT_TRUE(list.isArray());
+  std::set<std::int64_t> entries;
+  for (const auto& entry : list.array()) entries.insert(entry.asInteger());
+  EXPECT_THAT(entries, SizeIs(kThreads * kEach));
+  EXPECT_THAT(preferences.allKeys(), SizeIs(1 + kThreads));
+  EXPECT_THAT(world.log.lines(), IsEmpty());
+  EXPECT_THAT(world.names(folder), ElementsAre(kDomain + ".plist"));
+}
+
+}  // namespace
+}  // namespace kvr

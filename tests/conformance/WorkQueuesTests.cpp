@@ -1,0 +1,456 @@
+#include "conformance/QueuesWorld.h"
+#include "platform/local/LocalRandom.h"
+#include "platform/simulated/SimulatedRandom.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <cmath>
+#include <mutex>
+#include <set>
+#include <stdexcept>
+
+namespace kvr {
+namespace {
+
+using ::testing::Contains;
+using ::testing::Each;
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+using ::testing::MatchesRegex;
+
+constexpr int kMany = 200;
+
+/// What happened, in order, on whatever threads.
+class Record {
+ public:
+  void add(std::string entry) {
+    const std::lock_guard lock(mutex_);
+    entries_.push_back(std::move(entry));
+  }
+  std::vector<std::string> entries() const {
+    const std::lock_guard lock(mutex_);
+    return entries_;
+  }
+
+ private:
+  mutable std::mutex mutex_;
+  std::vector<std::string> entries_;
+};
+
+class WorkQueuesTest : public ::testing::TestWithParam<bool> {
+ protected:
+  WorkQueuesTest() {
+    if (GetParam())
+      world = std::make_unique<LocalQueuesWorld>();
+    else
+      world = std::make_unique<SimulatedQueuesWorld>();
+  }
+
+  WorkQueues& queues() { return world->queues(); }
+  std::shared_ptr<Signal> newSignal() { return queues().newSignal(); }
+  WorkQueueRef serial() { return queues().newSerialQueue("test"); }
+  WorkQueueRef concurrent() { return queues().concurrentQueue(Priority::Default); }
+  static void await(const std::shared_ptr<Signal>& signal) { ASSERT_TRUE(signal->wait(std::nullopt)); }
+  /// Lets everything handed to `queue` so far run.
+  void flush(const WorkQueueRef& queue) {
+    const auto done = newSignal();
+    queue->async([done] { done->signal(); });
+    await(done);
+  }
+
+  Record record;
+  std::unique_ptr<QueuesWorld> world;
+};
+
+INSTANTIATE_TEST_SUITE_P(Both, WorkQueuesTest, ::testing::Values(true, false),
+                         [](const auto& tested) { return tested.param ? "Local" : "Simulated"; });
+
+TEST_P(WorkQueuesTest, MainAndSerialQueuesRunOneItemAtATimeInTheOrderHandedOver) {
+  for (const auto& queue : {queues().mainQueue(), serial()}) {
+    std::vector<int> order;
+    std::vector<int> expected;
+    std::atomic<int> running{0};
+    std::atomic<int> most{0};
+    for (int i = 0; i < kMany; ++i) {
+      expected.push_back(i);
+      queue->async([&, i] {
+        most = std::max<int>(most, ++running);
+        order.push_back(i);
+        --running;
+      });
+    }
+    flush(queue);
+    EXPECT_EQ(order, expected);
+    EXPECT_EQ(most, 1);
+  }
+}
+
+TEST_P(WorkQueuesTest, AnItemHandedOverFromInsideAnItemRunsAfterIt) {
+  for (const auto& queue : {queues().mainQueue(), serial()}) {
+    Record seen;
+    const auto done = newSignal();
+    queue->async([&] {
+      queue->async([&] {
+        seen.add("inner");
+        done->signal();
+      });
+      seen.add("outer");
+    });
+    await(done);
+    EXPECT_THAT(seen.entries(), ElementsAre("outer", "inner"));
+  }
+}
+
+TEST_P(WorkQueuesTest, OthersGoOnHoweverManyItemsWait) {
+  const auto gate = newSignal();
+  const auto allThrough = newSignal();
+  std::atomic<int> arrived{0};
+  std::atomic<int> through{0};
+  std::vector<WorkQueueRef> serialQueues;
+  const auto waitAtGate = [&] {
+    // The last to arrive opens the gate: all must have been let in side by side.
+    if (++arrived == 3 * kMany) gate->signal();
+    if (gate->wait(std::nullopt) && ++through == 3 * kMany) allThrough->signal();
+  };
+  for (int i = 0; i < kMany; ++i) {
+    concurrent()->async(waitAtGate);
+    queues().concurrentQueue(Priority::Background)->async(waitAtGate);
+    serialQueues.push_back(serial());
+    serialQueues.back()->async(waitAtGate);
+  }
+  await(allThrough);
+  EXPECT_THAT(world->failures(), IsEmpty());
+}
+
+TEST_P(WorkQueuesTest, ASerialQueueStaysBusyWhileItsItemWaits) {
+  const auto gate = newSignal();
+  const auto queue = serial();
+  queue->async([&] {
+    record.add("begins");
+    gate->wait(std::nullopt);
+    record.add("ends");
+  });
+  queue->async([&] { record.add("next"); });
+  flush(serial());
+  queues().after(0.01, concurrent(), [&] { gate->signal(); });
+  flush(queue);
+  EXPECT_THAT(record.entries(), ElementsAre("begins", "ends", "next"));
+}
+
+TEST_P(WorkQueuesTest, DelayedWorkIsHandedOverInTheOrderOfItsDates) {
+  const auto queue = serial();
+  const auto done = newSignal();
+  queues().after(0.03, queue, [&] { done->signal(); });
+  queues().after(0.02, queue, [&] { record.add("later"); });
+  queues().after(0.01, queue, [&] { record.add("sooner"); });
+  queues().after(std::nan(""), queue, [&] { record.add("undefined"); });
+  queues().after(-1, queue, [&] { record.add("negative"); });
+  queues().after(INFINITY, queue, [&] { record.add("never"); });
+  queues().after(1e300, queue, [&] { record.add("never"); });
+  await(done);
+  EXPECT_THAT(record.entries(), ElementsAre("undefined", "negative", "sooner", "later"));
+}
+
+TEST_P(WorkQueuesTest, AGroupGivesNoticeWhenItIsEmptyAndCanBeUsedAgain) {
+  const auto queue = serial();
+  WorkGroup group;
+  group.notify(queue, [&] { record.add("was empty"); });
+  flush(queue);
+  for (const std::string round : {"first", "second"}) {
+    const auto noticed = newSignal();
+    for (int i = 0; i < kMany; ++i) group.enter();
+    group.notify(queue, [&, noticed] {
+      record.add(round);
+      noticed->signal();
+    });
+    for (int i = 0; i < kMany; ++i) {
+      concurrent()->async([&] {
+        record.add("work");
+        group.leave();
+      });
+    }
+    await(noticed);
+  }
+  const auto entries = record.entries();
+  ASSERT_EQ(entries.size(), 2 * kMany + 3U);
+  EXPECT_EQ(entries.front(), "was empty");
+  EXPECT_EQ(entries[kMany + 1], "first");
+  EXPECT_EQ(entries.back(), "second");
+}
+
+TEST_P(WorkQueuesTest, ASignalStaysAndAWaitEndsAtItsLimit) {
+  const auto never = newSignal();
+  const auto signalled = newSignal();
+  signalled->signal();
+  signalled->signal();
+  const auto done = newSignal();
+  concurrent()->async([&] {
+    for (const double limit : {0.01, 0.0, -1.0, std::nan("")}) {
+      record.add(never->wait(limit) ? "signalled" : "over");
+    }
+    record.add(signalled->wait(0) ? "signalled" : "over");
+    record.add(signalled->wait(std::nullopt) ? "signalled" : "over");
+    record.add(signalled->wait(INFINITY) ? "signalled" : "over");
+    done->signal();
+  });
+  await(done);
+  EXPECT_THAT(record.entries(),
+              ElementsAre("over", "over", "over", "over", "signalled", "signalled", "signalled"));
+  EXPECT_FALSE(never->wait(0.01)) << "outside of all queues";
+}
+
+TEST_P(WorkQueuesTest, ATimerRepeatsUntilItIsInvalidated) {
+  const auto queue = serial();
+  const auto marker = std::make_shared<int>(0);
+  const std::weak_ptr<int> released = marker;
+  std::atomic<int> firings{0};
+  const auto thrice = newSignal();
+  std::shared_ptr<Timer> timer;
+  queue->async([&, held = marker] {
+    timer = queues().newRepeatingTimer(0.001, queue, [&, held] {
+      if (++firings < 3) return;
+      timer->invalidate();
+      thrice->signal();
+    });
+  });
+  await(thrice);
+  const auto later = newSignal();
+  queues().after(0.01, queue, [&] { later->signal(); });
+  await(later);
+  EXPECT_EQ(firings, 3);
+  EXPECT_EQ(released.use_count(), 1) << "an invalidated timer still holds its work";
+}
+
+TEST_P(WorkQueuesTest, ATimerDoesNotFloodAQueueThatIsBehind) {
+  const auto queue = serial();
+  std::atomic<int> firings{0};
+  const auto gate = newSignal();
+  queue->async([&] { gate->wait(std::nullopt); });
+  const auto timer = queues().newRepeatingTimer(0.001, queue, [&] { ++firings; });
+  queues().after(0.02, concurrent(), [&] {
+    timer->invalidate();
+    gate->signal();
+  });
+  await(gate);
+  flush(queue);
+  EXPECT_EQ(firings, 1);
+}
+
+TEST_P(WorkQueuesTest, WorkIsReleasedRightAfterItRan) {
+  for (const auto& queue : {queues().mainQueue(), serial()}) {
+    auto marker = std::make_shared<int>(0);
+    const std::weak_ptr<int> watched = marker;
+    std::atomic<bool> wasReleased{false};
+    queue->async([held = std::move(marker)] { ASSERT_EQ(held.use_count(), 1); });
+    queue->async([&] { wasReleased = watched.expired(); });
+    flush(queue);
+    EXPECT_TRUE(wasReleased);
+  }
+}
+
+TEST_P(WorkQueuesTest, AnExceptionEndsItsItemOnlyAndIsReported) {
+  for (const auto& queue : {queues().mainQueue(), serial()}) {
+    const auto before = world->failures().size();
+    queue->async([] { throw std::runtime_error("boom"); });
+    queue->async([] { throw 1; });
+    flush(queue);
+    EXPECT_EQ(world->failures().size(), before + 2);
+  }
+  EXPECT_THAT(world->failures(), Contains("work item failed: boom").Times(2));
+}
+
+TEST_P(WorkQueuesTest, WorkThatNeverRanIsReleasedAtTheEnd) {
+  auto marker = std::make_shared<int>(0);
+  const auto queue = serial();
+  queues().after(1e6, queue, [held = marker] {});
+  queues().after(INFINITY, queues().mainQueue(), [held = marker] {});
+  const auto timer = queues().newRepeatingTimer(1e6, queue, [held = marker] {});
+  concurrent()->async([never = newSignal(), queue, held = marker] {
+    never->wait(std::nullopt);  // ends with the world: what follows comes too late
+    for (int i = 0; i < kMany; ++i) queue->async([held] {});
+  });
+  flush(serial());
+  timer->invalidate();
+  world->beginEnding();
+  world.reset();
+  EXPECT_EQ(marker.use_count(), 1);
+}
+
+TEST_P(WorkQueuesTest, EndingEndsEveryWait) {
+  const auto never = newSignal();
+  std::atomic<int> begun{0};
+  std::atomic<int> ended{0};
+  const auto allBegun = newSignal();
+  for (int i = 0; i < kMany; ++i) {
+    concurrent()->async([&, limit = i % 2 == 0 ? std::optional(1e6) : std::nullopt] {
+      if (++begun == kMany) allBegun->signal();
+      if (!never->wait(limit)) ++ended;
+    });
+  }
+  await(allBegun);
+  world->beginEnding();
+  EXPECT_FALSE(never->wait(std::nullopt));
+  world.reset();
+  EXPECT_EQ(ended, kMany);
+}
+
+TEST(ANewUUID, IsRandomAndWellFormedOnBothPlatforms) {
+  LocalRandom local;
+  SimulatedRandom simulated(1);
+  for (Random* const random : std::initializer_list<Random*>{&local, &simulated}) {
+    std::set<std::string> seen;
+    for (int i = 0; i < kMany; ++i) seen.insert(random->uuid());
+    EXPECT_EQ(seen.size(), kMany);
+    EXPECT_THAT(seen,
+                Each(MatchesRegex("[0-9A-F]{8}-[0-9A-F]{4}-4[0-9A-F]{3}-[89AB][0-9A-F]{3}-[0-9A-F]{12}")));
+  }
+}
+
+// What only real threads do.
+
+TEST(LocalQueues, DrainOnceNothingIsQueuedOrRunningAndTakeNothingMore) {
+  LocalQueuesWorld world;
+  auto& queues = world.queues();
+  const auto gate = queues.newSignal();
+  const auto queue = queues.newSerialQueue("test");
+  std::atomic<bool> last{false};
+  queue->async([&] { gate->wait(std::nullopt); });
+  queue->async([&] { last = true; });
+  queues.after(1e6, queue, [] {});
+  EXPECT_EQ(queues.outstanding(), 2U);
+  EXPECT_FALSE(queues.drain(0));
+  gate->signal();
+  EXPECT_TRUE(queues.drain(INFINITY));
+  EXPECT_TRUE(last);
+  EXPECT_EQ(queues.outstanding(), 0U);
+
+  const auto marker = std::make_shared<int>(0);
+  queue->async([held = marker] { FAIL() << "ran after the end"; });
+  EXPECT_EQ(marker.use_count(), 1);
+}
+
+TEST(LocalQueues, RunDefaultItemsFirstWithoutStarvingTheBackground) {
+  LocalQueuesWorld world;
+  auto& queues = world.queues();
+  const auto background = queues.newSignal();
+  // Default items that beget one another for as long as the background has not had its turn.
+  Work again;
+  again = [&] {
+    if (!background->wait(0)) queues.concurrentQueue(Priority::Default)->async(again);
+  };
+  for (int i = 0; i < kMany; ++i) queues.concurrentQueue(Priority::Default)->async(again);
+  queues.concurrentQueue(Priority::Background)->async([&] { background->signal(); });
+  EXPECT_TRUE(background->wait(std::nullopt));
+  EXPECT_TRUE(queues.drain(INFINITY));
+}
+
+TEST(AnEventLoop, RunsWhatWasPostedBeforeTheExitAndReleasesTheRest) {
+  EventLoop loop;
+  std::vector<std::string> ran;
+  const auto marker = std::make_shared<int>(0);
+  const auto cancelled = loop.after(1e6, [held = marker] {});
+  EXPECT_EQ(marker.use_count(), 2);
+  loop.cancel(cancelled);
+  EXPECT_EQ(marker.use_count(), 1);
+  loop.setFailureHandler([&](const std::string& what) { ran.push_back(what); });
+  loop.after(0, [&] {
+    ran.emplace_back("timer");
+    loop.post([&] {
+      ran.emplace_back("posted");
+      throw std::runtime_error("boom");
+    });
+    loop.exit(7);
+    loop.post([&, held = marker] { ran.emplace_back("posted after the exit"); });
+    loop.after(1e6, [held = marker] {});
+    loop.after(INFINITY, [held = marker] {});
+  });
+  EXPECT_EQ(loop.run(), 7);
+  EXPECT_THAT(ran, ElementsAre("timer", "posted", "boom"));
+  loop.post([held = marker] {});
+  EXPECT_EQ(marker.use_count(), 1);
+}
+
+// What only the simulation does.
+
+class SimulatedQueues : public ::testing::Test {
+ protected:
+  static std::vector<std::string> orderFor(std::uint64_t seed) {
+    SimulatedClock clock;
+    SimulatedWorkQueues queues(clock, seed);
+    Record record;
+    for (const std::string name : {"a", "b", "c"}) {
+      const auto queue = queues.newSerialQueue(name);
+      for (const std::string item : {"1", "2", "3"})
+        queue->async([&, entry = name + item] { record.add(entry); });
+      queues.concurrentQueue(Priority::Default)->async([&, name] { record.add(name); });
+    }
+    queues.run();
+    return record.entries();
+  }
+
+  SimulatedClock clock{Date{1000}};
+  SimulatedWorkQueues queues{clock, 1};
+  WorkQueueRef concurrent = queues.concurrentQueue(Priority::Default);
+  Record record;
+};
+
+TEST_F(SimulatedQueues, RunInAnOrderThatTheSeedDecides) {
+  std::set<std::vector<std::string>> orders;
+  for (std::uint64_t seed = 0; seed < 20; ++seed) {
+    EXPECT_EQ(orderFor(seed), orderFor(seed));
+    orders.insert(orderFor(seed));
+  }
+  EXPECT_EQ(orders.size(), 20U);
+}
+
+TEST_F(SimulatedQueues, LetTimePassOnlyWhenAskedTo) {
+  constexpr double kYear = 366 * 86400.0;
+  queues.after(kYear, concurrent, [&] { record.add("a year later"); });
+  concurrent->async([&] { record.add(queues.newSignal()->wait(60) ? "signalled" : "over"); });
+  queues.run();
+  EXPECT_EQ(clock.elapsed(), 0);
+  EXPECT_EQ(queues.waiting(), 1U);
+  queues.advance(59);
+  EXPECT_THAT(record.entries(), IsEmpty());
+  clock.set(Date{5});
+  queues.advance(1);
+  EXPECT_THAT(record.entries(), ElementsAre("over"));
+  EXPECT_EQ(clock.now(), Date{6});
+  EXPECT_TRUE(queues.runUntil([&] { return record.entries().size() == 2; }));
+  EXPECT_EQ(clock.elapsed(), kYear);
+  EXPECT_FALSE(queues.hasFuture());
+}
+
+TEST_F(SimulatedQueues, AWaitIsNotHeldUpByTheWaitsOfOthers) {
+  for (const double limit : {30.0, 10.0, 20.0}) {
+    concurrent->async([&, limit] {
+      queues.newSignal()->wait(limit);
+      record.add(std::to_string(static_cast<int>(clock.elapsed())));
+    });
+  }
+  queues.advance(60);
+  EXPECT_THAT(record.entries(), ElementsAre("10", "20", "30"));
+}
+
+TEST_F(SimulatedQueues, TellOfWaitsThatNothingCanEnd) {
+  const auto never = queues.newSignal();
+  EXPECT_THROW(never->wait(std::nullopt), std::logic_error);
+  concurrent->async([&] { never->wait(std::nullopt); });
+  EXPECT_FALSE(queues.runUntil([] { return false; }));
+  queues.mainQueue()->async([&] { never->wait(1); });
+  queues.run();
+  EXPECT_THAT(queues.takeFaults(), ElementsAre("work item failed: deadlock: nothing can end this wait",
+                                               "work item failed: an item waits on the main queue"));
+}
+
+TEST_F(SimulatedQueues, TellOfWorkWithoutEnd) {
+  Work again;
+  again = [&] { concurrent->async(again); };
+  concurrent->async(again);
+  EXPECT_THROW(queues.run(), std::logic_error);
+}
+
+}  // namespace
+}  // namespace kvr

@@ -1,0 +1,498 @@
+#include "platform/local/EventLoop.h"
+#include "platform/local/LocalHTTP.h"
+#include "platform/local/LocalWorkQueues.h"
+
+#include <arpa/inet.h>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <netinet/in.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <cstdlib>
+#include <functional>
+#include <future>
+#include <latch>
+#include <list>
+#include <mutex>
+#include <thread>
+
+namespace kvr {
+namespace {
+
+using testing::HasSubstr;
+
+constexpr std::size_t kMebibyte = std::size_t{1} << 20;
+constexpr int kCouldNotConnect = 7;
+constexpr int kTimedOut = 28;
+constexpr int kAborted = 42;
+constexpr int kTooLarge = 63;
+
+class QuietLog : public Log {
+ public:
+  QuietLog() : Log(LogLevel::Debug, true) {}
+
+ protected:
+  void write(LogLevel, const std::string&) override {}
+};
+
+/// The server's end of one connection.
+class Peer {
+ public:
+  explicit Peer(int descriptor) : descriptor_(descriptor) {}
+
+  /// The next request, head and body; empty when the client has gone.
+  std::string request() {
+    std::size_t length = std::string::npos;
+    while (unread_.size() < length) {
+      if (const auto head = unread_.find("\r\n\r\n");
+          head != std::string::npos && length == std::string::npos) {
+        const auto field = unread_.find("Content-Length: ");
+        length = head + 4 + (field < head ? std::stoul(unread_.substr(field + 16)) : 0);
+        continue;
+      }
+      char buffer[4096];
+      const auto count = recv(descriptor_, buffer, sizeof buffer, 0);
+      if (count <= 0) return {};
+      unread_.append(buffer, static_cast<std::size_t>(count));
+    }
+    std::string request = unread_.substr(0, length);
+    unread_.erase(0, length);
+    return request;
+  }
+  /// False when the client has gone.
+  bool write(std::string_view bytes) const {
+    while (!bytes.empty()) {
+      const auto count = send(descriptor_, bytes.data(), bytes.size(), MSG_NOSIGNAL);
+      if (count <= 0) return false;
+      bytes.remove_prefix(static_cast<std::size_t>(count));
+    }
+    return true;
+  }
+  void reset() const {
+    const linger abrupt{1, 0};
+    setsockopt(descriptor_, SOL_SOCKET, SO_LINGER, &abrupt, sizeof abrupt);
+  }
+
+ private:
+  const int descriptor_;
+  std::string unread_;
+};
+
+/// A server on a loopback port that treats every connection as its script says; a connection is closed when
+/// the script returns.
+class ScriptedServer {
+ public:
+  using Script = std::function<void(Peer&)>;
+
+  explicit ScriptedServer(Script script)
+      : script_(std::move(script)), listener_(socket(AF_INET, SOCK_STREAM, 0)) {
+    sockaddr_in address{};
+    address.sin_family = AF_INET;
+    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    socklen_t size = sizeof address;
+    EXPECT_EQ(bind(listener_, reinterpret_cast<sockaddr*>(&address), size), 0);
+    EXPECT_EQ(listen(listener_, 64), 0);
+    getsockname(listener_, reinterpret_cast<sockaddr*>(&address), &size);
+    host_ = "127.0.0.1:" + std::to_string(ntohs(address.sin_port));
+    acceptor_ = std::thread([this] { accept(); });
+  }
+  ~ScriptedServer() {
+    shutdown(listener_, SHUT_RDWR);
+    acceptor_.join();
+    {
+      const std::lock_guard lock(mutex_);
+      for (const int descriptor : open_) shutdown(descriptor, SHUT_RDWR);
+    }
+    for (auto& thread : threads_) thread.join();
+    close(listener_);
+  }
+  ScriptedServer(const ScriptedServer&) = delete;
+  ScriptedServer& operator=(const ScriptedServer&) = delete;
+
+  const std::string& host() const { return host_; }
+  std::string url(const std::string& path = "/") const { return "http://" + host_ + path; }
+  std::size_t connections() const {
+    const std::lock_guard lock(mutex_);
+    return threads_.size();
+  }
+  std::size_t mostConnectionsAtOnce() const {
+    const std::lock_guard lock(mutex_);
+    return mostOpen_;
+  }
+
+ private:
+  void accept() {
+    while (true) {
+      const int descriptor = ::accept(listener_, nullptr, nullptr);
+      if (descriptor < 0) return;
+      const std::lock_guard lock(mutex_);
+      open_.push_back(descriptor);
+      mostOpen_ = std::max(mostOpen_, open_.size());
+      threads_.emplace_back([this, descriptor] { serve(descriptor); });
+    }
+  }
+  void serve(int descriptor) {
+    Peer peer(descriptor);
+    script_(peer);
+    const std::lock_guard lock(mutex_);
+    open_.remove(descriptor);
+    close(descriptor);
+  }
+
+  const Script script_;
+  const int listener_;
+  std::string host_;
+  mutable std::mutex mutex_;
+  std::list<int> open_;
+  std::size_t mostOpen_ = 0;
+  std::list<std::thread> threads_;
+  std::thread acceptor_;
+};
+
+std::string response(std::string_view status, std::string_view body) {
+  return "HTTP/1.1 " + std::string(status) + "\r\nContent-Length: " + std::to_string(body.size()) +
+         "\r\n\r\n" + std::string(body);
+}
+
+/// Answers every request of a connection with what was asked.
+void echo(Peer& peer) {
+  for (auto request = peer.request(); !request.empty(); request = peer.request()) {
+    if (!peer.write(response("200 OK", request))) return;
+  }
+}
+
+/// Reads requests and never answers.
+void keepSilent(Peer& peer) {
+  while (!peer.request().empty()) {
+  }
+}
+
+class OverHTTP : public testing::Test {
+ protected:
+  std::future<HTTPResponse> start(HTTPRequest request) {
+    return start(http().sharedSession(), std::move(request));
+  }
+  std::future<HTTPResponse> start(HTTPSession& session, HTTPRequest request) {
+    auto promise = std::make_shared<std::promise<HTTPResponse>>();
+    auto future = promise->get_future();
+    // A second reply would throw.
+    session.send(std::move(request), [promise](HTTPResponse reply) { promise->set_value(std::move(reply)); });
+    return future;
+  }
+  HTTPResponse exchange(HTTPRequest request) { return start(std::move(request)).get(); }
+  LocalHTTP& http() { return *http_; }
+  void endHTTP() { http_.reset(); }
+
+ private:
+  QuietLog log_;
+  EventLoop loop_;
+  LocalWorkQueues queues_{loop_, log_};
+  std::unique_ptr<LocalHTTP> http_ = std::make_unique<LocalHTTP>(queues_, log_);
+};
+
+HTTPRequest get(std::string url) {
+  HTTPRequest request;
+  request.url = std::move(url);
+  return request;
+}
+
+HTTPRequest post(std::string url, std::string body) {
+  HTTPRequest request = get(std::move(url));
+  request.method = "POST";
+  request.body = std::move(body);
+  request.followsRedirects = false;
+  return request;
+}
+
+TEST_F(OverHTTP, ARequestIsSentExactlyAsItWasGiven) {
+  const ScriptedServer server(echo);
+  const std::string host = "Host: " + server.host() + "\r\n";
+
+  HTTPRequest full = post(server.url("/a/../b?c=%20"), "{\"a\":1}");
+  full.headers.set("X-Second", "2");
+  full.headers.set("X-First", " padded\t");
+  full.headers.set("X-Empty", "");
+  full.headers.set("User-Agent", "<a/b/c>");
+  full.headers.set("Content-Type", "application/json");
+  HTTPRequest remove = get(server.url());
+  remove.method = "DELETE";
+  HTTPRequest getWithBody = get(server.url());
+  getWithBody.body = "b";
+
+  EXPECT_EQ(exchange(get(server.url("/x#y"))).body, "GET /x HTTP/1.1\r\n" + host + "\r\n");
+  EXPECT_EQ(exchange(full).body,
+            "POST /a/../b?c=%20 HTTP/1.1\r\n" + host +
+                "X-Second: 2\r\nX-First:  padded\t\r\nX-Empty:\r\nUser-Agent: <a/b/c>\r\n"
+                "Content-Type: application/json\r\nContent-Length: 7\r\n\r\n{\"a\":1}");
+  EXPECT_EQ(exchange(post(server.url(), "")).body,
+            "POST / HTTP/1.1\r\n" + host + "Content-Length: 0\r\n\r\n");
+  EXPECT_EQ(exchange(remove).body, "DELETE / HTTP/1.1\r\n" + host + "\r\n");
+  EXPECT_EQ(exchange(getWithBody).body, "GET / HTTP/1.1\r\n" + host + "Content-Length: 1\r\n\r\nb");
+  EXPECT_EQ(start(*http().newUncachedSession(), get(server.url())).get().body,
+            "GET / HTTP/1.1\r\n" + host + "Cache-Control: no-cache\r\nPragma: no-cache\r\n\r\n");
+  EXPECT_EQ(server.connections(), 1U);
+}
+
+TEST_F(OverHTTP, ALargeBodyIsSentWithoutAskingFirst) {
+  std::promise<std::string> got;
+  const ScriptedServer server([&got](Peer& peer) {
+    got.set_value(peer.request());
+    peer.write(response("200 OK", ""));
+  });
+  EXPECT_EQ(exchange(post(server.url(), std::string(3 * kMebibyte, 'a'))).status, 200);
+  const std::string request = got.get_future().get();
+  EXPECT_EQ(request.find("Expect"), std::string::npos);
+  EXPECT_TRUE(request.ends_with("\r\n\r\n" + std::string(3 * kMebibyte, 'a')));
+}
+
+TEST_F(OverHTTP, AResponseIsTakenOnlyWhole) {
+  struct Case {
+    const char* name;
+    HTTPRequest request;
+    ScriptedServer::Script script;
+    int status;
+    std::optional<std::string> body;
+    int code;  ///< any when negative
+  };
+  const auto send = [](std::string bytes) {
+    return [bytes = std::move(bytes)](Peer& peer) { peer.write(bytes); };
+  };
+  const std::string mebibyte(kMebibyte, 'a');
+  HTTPRequest brief = get("");
+  brief.timeout = 0.05;
+  HTTPRequest unfollowed = get("");
+  unfollowed.followsRedirects = false;
+  const std::string chunked = "HTTP/1.1 200 OK\r\nTransfer-Encoding: chunked\r\n\r\n";
+  const std::string redirect =
+      "HTTP/1.1 302 Found\r\nLocation: http://127.0.0.1:1/\r\nContent-Length: 1\r\n\r\nr";
+  const std::vector<Case> cases = {
+      {"plain", get(""), send(response("404 Not Found", "no")), 404, "no", 0},
+      {"until closed", get(""), send("HTTP/1.1 200 OK\r\n\r\nall"), 200, "all", 0},
+      {"exactly 1 MiB", get(""), send(response("200 OK", mebibyte)), 200, mebibyte, 0},
+      {"a byte more", get(""), send(response("401 Unauthorized", mebibyte + "a")), 401, {}, kTooLarge},
+      {"1 MiB in chunks", get(""), send(chunked + "100000\r\n" + mebibyte + "\r\n0\r\n\r\n"), 200, mebibyte,
+       0},
+      {"a chunk more",
+       get(""),
+       send(chunked + "100000\r\n" + mebibyte + "\r\n1\r\na\r\n0\r\n\r\n"),
+       200,
+       {},
+       kTooLarge},
+      {"a byte more, until closed",
+       get(""),
+       send("HTTP/1.1 200 OK\r\n\r\n" + mebibyte + "a"),
+       200,
+       {},
+       kTooLarge},
+      {"compressed unasked", get(""), send("HTTP/1.1 200 OK\r\nContent-Encoding: gzip\r\n\r\nz"), 200, "z",
+       0},
+      {"shorter than it says", get(""), send("HTTP/1.1 200 OK\r\nContent-Length: 5\r\n\r\nfour"), 0, {}, 18},
+      {"broken chunk", get(""), send(chunked + "zz\r\n"), 0, {}, 56},
+      {"not HTTP", get(""), send("hello\r\n\r\n"), 0, {}, 1},
+      {"nothing", get(""), send(""), 0, {}, 52},
+      {"reset in the middle",
+       get(""),
+       [](Peer& peer) {
+         peer.write("HTTP/1.1 200 OK\r\nContent-Length: 5\r\n\r\nf");
+         peer.reset();
+       },
+       0,
+       {},
+       -1},
+      {"endless headers",
+       get(""),
+       [](Peer& peer) {
+         peer.write("HTTP/1.1 200 OK\r\n");
+         while (peer.write("X-More: " + std::string(1000, 'a') + "\r\n")) {
+         }
+       },
+       0,
+       {},
+       kTooLarge},
+      {"one endless header",
+       get(""),
+       [](Peer& peer) {
+         peer.write("HTTP/1.1 200 OK\r\nX-More: ");
+         while (peer.write(std::string(1000, 'a'))) {
+         }
+       },
+       0,
+       {},
+       -1},
+      {"endless informational responses",
+       get(""),
+       [](Peer& peer) {
+         while (peer.write("HTTP/1.1 103 Early Hints\r\nX-More: " + std::string(1000, 'a') + "\r\n\r\n")) {
+         }
+       },
+       0,
+       {},
+       kTooLarge},
+      {"never", brief, keepSilent, 0, {}, kTimedOut},
+      {"never the end",
+       brief,
+       [](Peer& peer) {
+         peer.write("HTTP/1.1 200 OK\r\nContent-Length: 5\r\n\r\nf");
+         keepSilent(peer);
+       },
+       0,
+       {},
+       kTimedOut},
+      {"redirected POST", post("", "{}"), send(redirect), 302, "r", 0},
+      {"redirect not to be followed", unfollowed, send(redirect), 302, "r", 0},
+      {"redirect to plain http", get(""), send(redirect), 302, {}, 1},
+      {"redirect to a file",
+       get(""),
+       send("HTTP/1.1 301 Moved\r\nLocation: file:///etc/hosts\r\n\r\n"),
+       301,
+       {},
+       1},
+      {"redirect to https",
+       get(""),
+       send("HTTP/1.1 301 Moved\r\nLocation: https://127.0.0.1:1/\r\n\r\n"),
+       0,
+       {},
+       kCouldNotConnect},
+      {"another answer with a location", get(""),
+       send("HTTP/1.1 201 Created\r\nLocation: https://127.0.0.1:1/\r\nContent-Length: 1\r\n\r\nc"), 201, "c",
+       0},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    const ScriptedServer server([&c](Peer& peer) {
+      peer.request();
+      c.script(peer);
+    });
+    HTTPRequest request = c.request;
+    request.url = server.url();
+    const HTTPResponse got = exchange(request);
+    EXPECT_EQ(got.status, c.status);
+    EXPECT_TRUE(got.body == c.body) << got.body.value_or("none").substr(0, 100);
+    EXPECT_EQ(got.error.has_value(), !c.body.has_value());
+    if (!got.error) continue;
+    EXPECT_EQ(got.error->domain, "http");
+    EXPECT_FALSE(got.error->message.empty());
+    EXPECT_TRUE(c.code < 0 || got.error->code == c.code) << describe(*got.error);
+  }
+}
+
+TEST_F(OverHTTP, WhatMustNotBeSentFailsWithoutAConnection) {
+  const ScriptedServer server(echo);
+  using namespace std::string_literals;
+  std::vector<HTTPRequest> refused;
+  for (const auto& [name, value] :
+       std::vector<std::pair<std::string, std::string>>{{"X-A", "a\r\nX-B: b"},
+                                                        {"X-A", "a\nb"},
+                                                        {"X-A", "a\rb"},
+                                                        {"X-A", "a\0b"s},
+                                                        {"", "a"},
+                                                        {"X A", "a"},
+                                                        {"X-A:", "a"},
+                                                        {"X-A\r\nX-B", "a"},
+                                                        {"X-A\0"s, "a"},
+                                                        {"X-\xC3\xA4", "a"},
+                                                        {"Content-Length", "0"},
+                                                        {"transfer-encoding", "chunked"}}) {
+    refused.push_back(get(server.url()));
+    refused.back().headers.set(name, value);
+  }
+  for (const auto* method : {"", "GET /x HTTP/1.1\r\nX:", "G T"}) {
+    refused.push_back(get(server.url()));
+    refused.back().method = method;
+  }
+  for (const auto& url : {"file:///etc/hosts"s, "ftp://127.0.0.1/"s, "http://a.example/"s, "none"s, ""s,
+                          "http://localhost@a.example/"s, server.url("/ HTTP/1.1\r\nX: y")}) {
+    refused.push_back(get(url));
+  }
+  for (const HTTPRequest& request : refused) {
+    const HTTPResponse got = exchange(request);
+    EXPECT_EQ(got.status, 0) << request.url;
+    EXPECT_EQ(got.body, std::nullopt) << request.url;
+    EXPECT_TRUE(got.error && got.error->domain == "http" && got.error->code != 0) << request.url;
+  }
+  EXPECT_EQ(server.connections(), 0U);
+}
+
+TEST_F(OverHTTP, FiftyRequestsAtOnceShareSixConnections) {
+  std::latch sixAtOnce(6);
+  std::atomic<int> waiting{0};
+  const ScriptedServer server([&](Peer& peer) {
+    if (waiting++ < 6) sixAtOnce.arrive_and_wait();
+    echo(peer);
+  });
+  std::vector<std::future<HTTPResponse>> replies;
+  for (int i = 0; i < 50; ++i) replies.push_back(start(get(server.url("/" + std::to_string(i)))));
+  for (int i = 0; i < 50; ++i) {
+    const HTTPResponse got = replies[static_cast<std::size_t>(i)].get();
+    EXPECT_EQ(got.status, 200) << i;
+    EXPECT_THAT(got.body.value_or(""), HasSubstr("GET /" + std::to_string(i) + " "));
+  }
+  EXPECT_EQ(server.mostConnectionsAtOnce(), 6U);
+}
+
+TEST_F(OverHTTP, TheTimeSpentWaitingForAConnectionCounts) {
+  const ScriptedServer server(keepSilent);
+  std::vector<std::future<HTTPResponse>> pending;
+  for (int i = 0; i < 6; ++i) pending.push_back(start(get(server.url())));
+  HTTPRequest brief = get(server.url());
+  brief.timeout = 0.05;
+  EXPECT_EQ(exchange(brief).error.value_or(Error{}).code, kTimedOut);
+  endHTTP();
+  for (auto& reply : pending) EXPECT_EQ(reply.get().error.value_or(Error{}).code, kAborted);
+}
+
+TEST_F(OverHTTP, AReplyThatBlocksHoldsUpNobody) {
+  const ScriptedServer server(echo);
+  std::promise<void> release;
+  std::promise<std::thread::id> first;
+  http().sharedSession().send(get(server.url()), [&](const HTTPResponse&) {
+    release.get_future().wait();
+    first.set_value(std::this_thread::get_id());
+  });
+  EXPECT_EQ(exchange(get(server.url())).status, 200);
+  release.set_value();
+  EXPECT_NE(first.get_future().get(), std::this_thread::get_id());
+}
+
+TEST_F(OverHTTP, EndingFailsWhatIsPendingAndWhatComesLater) {
+  std::latch silent(1);
+  const ScriptedServer server([&silent](Peer& peer) {
+    peer.request();
+    silent.count_down();
+    keepSilent(peer);
+  });
+  auto pending = start(get(server.url()));
+  silent.wait();
+  http().beginEnding();
+  EXPECT_EQ(pending.get().error.value_or(Error{}).code, kAborted);
+  EXPECT_EQ(exchange(get(server.url())).error.value_or(Error{}).code, kAborted);
+  const auto session = http().newUncachedSession();
+  endHTTP();
+  EXPECT_EQ(start(*session, get(server.url())).get().error.value_or(Error{}).code, kAborted);
+  EXPECT_EQ(server.connections(), 1U);
+}
+
+TEST_F(OverHTTP, AProxyIsNotAskedForALoopbackAddress) {
+  const ScriptedServer proxy(echo);
+  const ScriptedServer server(echo);
+  for (const auto* name : {"http_proxy", "https_proxy", "all_proxy"}) setenv(name, proxy.url().c_str(), 1);
+  const int status = exchange(get(server.url())).status;
+  EXPECT_NE(exchange(get("https://a.invalid/")).error, std::nullopt);
+  for (const auto* name : {"http_proxy", "https_proxy", "all_proxy"}) unsetenv(name);
+  EXPECT_EQ(status, 200);
+  EXPECT_EQ(proxy.connections(), 1U);
+}
+
+TEST_F(OverHTTP, AConnectionThatWentStaleIsReplaced) {
+  const ScriptedServer server([](Peer& peer) {
+    peer.request();
+    peer.write(response("200 OK", "once"));
+  });
+  EXPECT_EQ(exchange(get(server.url())).body, "once");
+  EXPECT_EQ(exchange(post(server.url(), "{}")).body, "once");
+  EXPECT_EQ(server.connections(), 2U);
+}
+
+}  // namespace
+}  // namespace kvr

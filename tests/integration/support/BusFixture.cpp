@@ -1,0 +1,101 @@
+#include "support/BusFixture.h"
+
+#include <stdlib.h>
+
+#include <filesystem>
+
+namespace kvr::testing {
+namespace {
+
+const ServiceInterface& testInterface() {
+  static const ServiceInterface kInterface{
+      RawBusClient::kInterface,
+      {{"EchoRecord", {{"record", "a{sv}"}}, {"record", "a{sv}"}},
+       {"EchoRecords", {{"records", "aa{sv}"}}, {"records", "aa{sv}"}},
+       {"EchoText", {{"text", "s"}}, {"text", "s"}},
+       {"EchoNumber", {{"number", "t"}}, {"number", "t"}},
+       {"EchoReal", {{"real", "d"}}, {"real", "d"}},
+       {"EchoFlag", {{"flag", "b"}}, {"flag", "b"}},
+       {"Record", {{"text", "s"}, {"number", "t"}}, {"record", "a{sv}"}}}};
+  return kInterface;
+}
+
+}  // namespace
+
+class BusFixture::Object : public ServiceObject {
+ public:
+  Object(Behaviour behaviour, std::function<void()> gone)
+      : behaviour_(std::move(behaviour)), gone_(std::move(gone)) {}
+  ~Object() override { gone_(); }
+  Object(const Object&) = delete;
+  Object& operator=(const Object&) = delete;
+
+  void invoke(std::size_t method, const Value::Array& arguments, ServiceReply reply) override {
+    behaviour_(testInterface().methods[method].member, arguments, std::move(reply));
+  }
+
+ private:
+  const Behaviour behaviour_;
+  const std::function<void()> gone_;
+};
+
+BusFixture::BusFixture()
+    : newBehaviour([] {
+        return [](const std::string&, const Value::Array& arguments, const ServiceReply& reply) {
+          reply(arguments.at(0));
+        };
+      }) {
+  ::setenv("DBUS_SESSION_BUS_ADDRESS", bus.address().c_str(), 1);
+  entitle(true);
+  listeners =
+      std::make_unique<LocalServiceListeners>(queues_, log, entitlements_, [this] { lost_.set_value(); });
+  listener = listeners->newListener(RawBusClient::kName);
+  listener->setDelegate(*this);
+}
+
+BusFixture::~BusFixture() {
+  log.beginEnding();
+  listener.reset();
+  listeners.reset();
+  queues_.beginEnding();
+  queues_.drain(static_cast<double>(kLimit.count()));
+}
+
+void BusFixture::entitle(const Value& value) {
+  const auto program = std::filesystem::read_symlink("/proc/self/exe").string();
+  const Value::Dictionary granted{{std::string(kEntitlement), value}};
+  const auto problem = lists_.write(root_ / "Entitlements.plist", Value::Dictionary{{program, granted}},
+                                    PropertyListEncoding::XML);
+  if (problem) throw std::runtime_error(describe(*problem));
+}
+
+void BusFixture::serve() {
+  const RawBusClient watcher = newClient();
+  std::promise<void> owned;
+  const auto handler = [](sd_bus_message*, void* userdata, sd_bus_error*) {
+    *static_cast<bool*>(userdata) = true;
+    return 0;
+  };
+  bool isOwned = false;
+  sd_bus_match_signal(watcher.bus(), nullptr, "org.freedesktop.DBus", nullptr, "org.freedesktop.DBus",
+                      "NameOwnerChanged", handler, &isOwned);
+  listener->resume(testInterface());
+  while (!isOwned) {
+    const int r = sd_bus_process(watcher.bus(), nullptr);
+    if (r < 0) throw std::runtime_error("the bus is gone");
+    if (r == 0 && sd_bus_wait(watcher.bus(), std::chrono::microseconds(kLimit).count()) == 0) {
+      throw std::runtime_error("the name never came");
+    }
+  }
+}
+
+bool BusFixture::shouldAcceptNewConnection(ServiceConnection& connection) {
+  decisions.push_back(connection.valueForEntitlement(kEntitlement));
+  if (!(decisions.back() == Value(true))) return false;
+  connection.setExportedInterface(testInterface());
+  connection.setExportedObject(std::make_shared<Object>(newBehaviour(), onObjectGone));
+  connection.resume();
+  return true;
+}
+
+}  // namespace kvr::testing

@@ -1,0 +1,70 @@
+#pragma once
+
+#include "platform/local/EventLoop.h"
+#include "platform/local/LocalClock.h"
+#include "platform/local/LocalFiles.h"
+#include "platform/local/LocalServiceListeners.h"
+#include "platform/local/LocalWorkQueues.h"
+#include "support/PrivateBus.h"
+#include "support/RawBusClient.h"
+#include "support/RecordingLog.h"
+#include "support/TemporaryDirectory.h"
+
+#include <gtest/gtest.h>
+
+#include <functional>
+#include <future>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <vector>
+
+namespace kvr::testing {
+
+/// A service on a bus of its own, in this process, that does what a test tells it; its clients, too, are this
+/// program.
+class BusFixture : public ::testing::Test, public ServiceListenerDelegate {
+ protected:
+  static constexpr std::string_view kEntitlement = "com.example.entitlement";
+  /// Long enough for the slowest machine under a sanitizer; only ever spent on a failure.
+  static constexpr std::chrono::seconds kLimit{60};
+
+  using Behaviour =
+      std::function<void(const std::string& member, const Value::Array& arguments, ServiceReply reply)>;
+
+  BusFixture();
+  ~BusFixture() override;
+
+  void entitle(const Value& value);
+  /// Serves the name on the bus; returns once it is there.
+  void serve();
+  RawBusClient newClient() const { return RawBusClient(bus.address()); }
+  bool waitUntilLost() { return lost_.get_future().wait_for(kLimit) == std::future_status::ready; }
+
+  bool shouldAcceptNewConnection(ServiceConnection& connection) override;
+
+  PrivateBus bus;
+  RecordingLog log;
+  /// What objects made from now on do. By default they reply what they were given.
+  std::function<Behaviour()> newBehaviour;
+  std::function<void()> onObjectGone = [] {};
+  std::vector<Value> decisions;  ///< the entitlement's value, at every decision
+
+  std::unique_ptr<LocalServiceListeners> listeners;
+  std::unique_ptr<ServiceListener> listener;
+
+ private:
+  class Object;
+
+  TemporaryDirectory root_;
+  LocalClock clock_;
+  LocalFiles files_{log, root_.path()};
+  PropertyListFiles lists_{files_, clock_, log};
+  DeviceRoot deviceRoot_{lists_, log, root_.path()};
+  LocalEntitlements entitlements_{deviceRoot_};
+  EventLoop loop_;
+  LocalWorkQueues queues_{loop_, log};
+  std::promise<void> lost_;
+};
+
+}  // namespace kvr::testing

@@ -1,0 +1,202 @@
+#include "support/ChildProcess.h"
+
+#include <fcntl.h>
+#include <poll.h>
+#include <signal.h>
+#include <sys/eventfd.h>
+#include <sys/prctl.h>
+#include <sys/syscall.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <array>
+#include <cerrno>
+#include <chrono>
+#include <cstring>
+#include <stdexcept>
+#include <system_error>
+
+namespace kvr::testing {
+namespace {
+
+/// Long enough for the slowest machine under a sanitizer; only ever spent on a failure.
+constexpr std::chrono::seconds kLimit{60};
+
+[[noreturn]] void fail(const char* what) { throw std::system_error(errno, std::generic_category(), what); }
+
+struct Pipe {
+  int read = -1;
+  int write = -1;
+};
+
+Pipe newPipe() {
+  std::array<int, 2> ends{};
+  if (::pipe2(ends.data(), O_CLOEXEC) < 0) fail("pipe2");
+  return {ends[0], ends[1]};
+}
+
+std::vector<std::string> environmentWith(const ChildProcess::Environment& changes) {
+  std::vector<std::string> result;
+  for (char** entry = environ; *entry; ++entry) {
+    const std::string_view text = *entry;
+    if (!changes.contains(std::string(text.substr(0, text.find('='))))) result.emplace_back(text);
+  }
+  for (const auto& [name, value] : changes) {
+    if (!value.empty()) result.push_back(name + "=" + value);
+  }
+  return result;
+}
+
+std::vector<char*> pointersTo(std::vector<std::string>& texts) {
+  std::vector<char*> result;
+  result.reserve(texts.size() + 1);
+  for (std::string& text : texts) result.push_back(text.data());
+  result.push_back(nullptr);
+  return result;
+}
+
+}  // namespace
+
+ChildProcess::ChildProcess(std::vector<std::string> arguments, const Environment& changes)
+    : name_(arguments.at(0)) {
+  std::vector<std::string> environment = environmentWith(changes);
+  const std::vector<char*> argumentPointers = pointersTo(arguments);
+  const std::vector<char*> environmentPointers = pointersTo(environment);
+  const Pipe output = newPipe();
+  const Pipe errors = newPipe();
+  const pid_t parent = ::getpid();
+  pid_ = ::fork();
+  if (pid_ < 0) fail("fork");
+  if (pid_ == 0) {
+    // A test that crashes leaves nothing running behind.
+    ::prctl(PR_SET_PDEATHSIG, SIGKILL);
+    if (::getppid() != parent) ::_exit(127);
+    ::dup2(output.write, STDOUT_FILENO);
+    ::dup2(errors.write, STDERR_FILENO);
+    ::execvpe(argumentPointers[0], argumentPointers.data(), environmentPointers.data());
+    ::_exit(127);
+  }
+  ::close(output.write);
+  ::close(errors.write);
+  outputDescriptor_ = output.read;
+  errorDescriptor_ = errors.read;
+  processDescriptor_ = static_cast<int>(::syscall(SYS_pidfd_open, pid_, 0));
+  stopDescriptor_ = ::eventfd(0, EFD_CLOEXEC);
+  if (processDescriptor_ < 0 || stopDescriptor_ < 0) fail("pidfd_open");
+  reader_ = std::thread([this] { readOutput(); });
+}
+
+ChildProcess::~ChildProcess() {
+  if (!reaped_) {
+    ::kill(pid_, SIGKILL);
+    ::waitpid(pid_, nullptr, 0);
+  }
+  // Something the child started may hold the pipes open still.
+  const std::uint64_t one = 1;
+  if (::write(stopDescriptor_, &one, sizeof one) != sizeof one) std::terminate();
+  reader_.join();
+  for (const int descriptor : {processDescriptor_, outputDescriptor_, errorDescriptor_, stopDescriptor_}) {
+    ::close(descriptor);
+  }
+}
+
+void ChildProcess::readOutput() {
+  std::array<pollfd, 3> sources{pollfd{outputDescriptor_, POLLIN, 0}, pollfd{errorDescriptor_, POLLIN, 0},
+                                pollfd{stopDescriptor_, POLLIN, 0}};
+  std::array<char, 65536> buffer{};
+  while ((sources[0].fd >= 0 || sources[1].fd >= 0) && !sources[2].revents) {
+    if (::poll(sources.data(), sources.size(), -1) < 0 && errno != EINTR) break;
+    for (std::size_t i = 0; i < 2; ++i) {
+      if (!sources[i].revents) continue;
+      const ssize_t count = ::read(sources[i].fd, buffer.data(), buffer.size());
+      if (count <= 0) sources[i].fd = -1;
+      const std::lock_guard lock(mutex_);
+      if (count > 0) (i == 0 ? output_ : errorOutput_).append(buffer.data(), static_cast<std::size_t>(count));
+      changed_.notify_all();
+    }
+  }
+  const std::lock_guard lock(mutex_);
+  closed_ = true;
+  changed_.notify_all();
+}
+
+std::string ChildProcess::output() const {
+  const std::lock_guard lock(mutex_);
+  return output_;
+}
+
+std::string ChildProcess::errorOutput() const {
+  const std::lock_guard lock(mutex_);
+  return errorOutput_;
+}
+
+std::string ChildProcess::waitForOutput(std::string_view text, std::size_t from) {
+  return waitFor(output_, text, from);
+}
+
+std::string ChildProcess::waitForErrorOutput(std::string_view text, std::size_t from) {
+  return waitFor(errorOutput_, text, from);
+}
+
+std::string ChildProcess::waitFor(const std::string& stream, std::string_view text, std::size_t from) {
+  std::unique_lock lock(mutex_);
+  std::string line;
+  const auto found = [&] {
+    const auto at = stream.find(text, from);
+    if (at == std::string::npos) return false;
+    const auto end = stream.find('\n', at);
+    if (end == std::string::npos) return false;
+    const auto lineBreak = stream.rfind('\n', at);
+    const auto begin = lineBreak == std::string::npos || at == 0 ? 0 : lineBreak + 1;
+    line = stream.substr(begin, end - begin);
+    return true;
+  };
+  bool seen = false;
+  changed_.wait_for(lock, kLimit, [&] { return (seen = found()) || closed_; });
+  if (!seen) throw std::runtime_error(name_ + " never printed \"" + std::string(text) + "\"" + printed());
+  return line;
+}
+
+std::string ChildProcess::printed() const {
+  return "; standard output:\n" + output_ + "\nstandard error:\n" + errorOutput_;
+}
+
+bool ChildProcess::isRunning() const {
+  if (reaped_) return false;
+  pollfd process{processDescriptor_, POLLIN, 0};
+  return ::poll(&process, 1, 0) == 0;
+}
+
+void ChildProcess::send(int signal) const {
+  if (::syscall(SYS_pidfd_send_signal, processDescriptor_, signal, nullptr, 0) < 0) fail("pidfd_send_signal");
+}
+
+int ChildProcess::wait() {
+  if (reaped_) return status_;
+  pollfd process{processDescriptor_, POLLIN, 0};
+  const int milliseconds = static_cast<int>(std::chrono::milliseconds(kLimit).count());
+  int ready = 0;
+  do {
+    ready = ::poll(&process, 1, milliseconds);
+  } while (ready < 0 && errno == EINTR);
+  std::unique_lock lock(mutex_);
+  if (ready != 1) throw std::runtime_error(name_ + " did not end" + printed());
+  int status = 0;
+  ::waitpid(pid_, &status, 0);
+  reaped_ = true;
+  status_ = WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status);
+  changed_.wait_for(lock, kLimit, [this] { return closed_; });
+  return status_;
+}
+
+int ChildProcess::terminate() {
+  if (isRunning()) send(SIGTERM);
+  return wait();
+}
+
+int ChildProcess::kill() {
+  if (isRunning()) send(SIGKILL);
+  return wait();
+}
+
+}  // namespace kvr::testing

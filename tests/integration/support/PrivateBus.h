@@ -1,0 +1,27 @@
+#pragma once
+
+#include "support/ChildProcess.h"
+#include "support/TemporaryDirectory.h"
+
+#include <string>
+
+namespace kvr::testing {
+
+/// A message bus of the test's own: the reference daemon as a session bus that allows its user everything.
+/// Its limit on a message's size is the daemon's default, the strictest an agent is likely to meet.
+class PrivateBus {
+ public:
+  PrivateBus();
+
+  const std::string& address() const { return address_; }
+  pid_t pid() const { return daemon_.pid(); }
+  /// Ends the bus the hard way; every connection is lost.
+  void kill() { daemon_.kill(); }
+
+ private:
+  TemporaryDirectory directory_;
+  ChildProcess daemon_;
+  std::string address_;
+};
+
+}  // namespace kvr::testing

@@ -1,0 +1,44 @@
+#pragma once
+
+#include "platform/Value.h"
+#include "platform/local/bus/BusHandles.h"
+
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace kvr::testing {
+
+/// A client that speaks to a bus in plain messages. One thread.
+class RawBusClient {
+ public:
+  static constexpr const char* kName = "com.tarsil.kvragent";
+  static constexpr const char* kPath = "/com/tarsil/kvragent";
+  static constexpr const char* kInterface = "com.tarsil.kvragent.KVRAgentProtocol";
+
+  struct Reply {
+    BusMessageRef message;  ///< null when it was an error
+    std::string error;      ///< the error's name
+    std::string errorText;
+  };
+
+  explicit RawBusClient(const std::string& address);
+
+  sd_bus* bus() const { return bus_.get(); }
+  std::string uniqueName() const;
+  /// A call of the service's interface with arguments of the bus's basic types and records.
+  BusMessageRef newCall(const char* member, const char* signature = "",
+                        const Value::Array& arguments = {}) const;
+  /// Sends a call and waits for its reply.
+  Reply call(const BusMessageRef& message) const;
+  Reply call(const char* member, const char* signature = "", const Value::Array& arguments = {}) const;
+  /// The value that a call replied; throws when it was an error.
+  Value value(const char* type, const Reply& reply) const;
+  /// Makes this client leave the bus at once.
+  void leave() { bus_.reset(); }
+
+ private:
+  BusRef bus_;
+};
+
+}  // namespace kvr::testing

@@ -1,0 +1,190 @@
+#include "agent/KVRAgent.h"
+#include "platform/JSON.h"
+#include "unit/CoverageWorld.h"
+
+namespace kvr {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+using ::testing::SizeIs;
+
+class AnAgent : public ::testing::Test {
+ protected:
+  AnAgent() : agent(KVRAgent::initWithCallingProcessBundleID(world.platform, "com.example.client")) {
+    world.featureFlags.enabled.insert({"Kavrel", "Bravik_3_0"});
+  }
+  void TearDown() override {
+    world.queues.run();
+    EXPECT_THAT(world.faults(), IsEmpty());
+  }
+  void pair(int watches) {
+    for (int i = 0; i < watches; ++i) {
+      world.pairedDevices.devices.push_back(
+          {"Watch", "Model", "W" + std::to_string(i), Date{1}, true, false});
+    }
+  }
+  static std::string serialNumberIn(const HTTPRequest& request) {
+    return (*readJSON(request.body))["serialNumber"].string();
+  }
+  /// The reply that will be there once the queues have run.
+  std::shared_ptr<std::optional<KVRDeviceInfoList>> allInfos(std::uint64_t policy) {
+    auto reply = std::make_shared<std::optional<KVRDeviceInfoList>>();
+    agent->getAllDeviceInfosUsingPolicy(
+        policy, true,
+        DeviceInfosReply(world.log, "test", [reply](const KVRDeviceInfoList& list) { *reply = list; }));
+    return reply;
+  }
+  KVRDeviceInfoRef info(const std::string& serialNumber, std::uint64_t policy) {
+    KVRDeviceInfoRef reply;
+    agent->getDeviceInfoForSerialNumber(
+        serialNumber, policy,
+        DeviceInfoReply(world.log, "test", [&](const KVRDeviceInfoRef& it) { reply = it; }));
+    world.queues.run();
+    return reply;
+  }
+  std::optional<bool> accountAdded() {
+    auto reply = std::make_shared<std::optional<bool>>();
+    agent->tarsilAccountAdded(BoolReply(world.log, "test", [reply](bool yes) { *reply = yes; }));
+    world.queues.run();
+    pending = reply;
+    return *reply;
+  }
+
+  CoverageWorld world;
+  std::shared_ptr<KVRAgent> agent;
+  std::shared_ptr<std::optional<bool>> pending;
+};
+
+TEST_F(AnAgent, FallsBackToTheSettingsApplicationWithoutABundle) {
+  KVRAgent::initWithCallingProcessBundleID(world.platform, std::nullopt);
+  EXPECT_TRUE(
+      world.log.contains("-[KVRAgent initWithCallingProcessBundleID:]: callingProcessBundleID is nil. "
+                         "Falling back to Preferences Bundle ID"));
+  EXPECT_TRUE(world.log.contains("callingProcess=com.tarsil.Preferences"));
+}
+
+TEST_F(AnAgent, AnswersOneRecordADeviceWhateverFails) {
+  pair(50);
+  int asked = 0;
+  world.coverage = [&](const HTTPRequest& request) {
+    return ++asked % 2 == 0 ? HTTPResponse{500, "{}", {}}
+                            : HTTPResponse{200, "{\"quorURL\":\"" + serialNumberIn(request) + "\"}", {}};
+  };
+  const auto first = allInfos(2);
+  const auto second = allInfos(2);
+  EXPECT_FALSE(first->has_value());
+  world.queues.run();
+  ASSERT_TRUE(first->has_value() && second->has_value());
+  EXPECT_EQ(asked, 2 * 51);
+  std::size_t withWarranty = 0;
+  for (const auto& list : {**first, **second}) {
+    std::set<std::string> serialNumbers;
+    for (const auto& record : list) {
+      serialNumbers.insert(*record->device()->serialNumber());
+      if (!record->warranty()) continue;
+      ++withWarranty;
+      EXPECT_EQ(record->warranty()->quorURL(), Value(*record->device()->serialNumber())) << "each its own";
+    }
+    EXPECT_THAT(list, SizeIs(51));
+    EXPECT_THAT(serialNumbers, SizeIs(51));
+  }
+  EXPECT_EQ(withWarranty, 51U);
+}
+
+TEST_F(AnAgent, AnswersOverlappingCallsAfterTheLookupsOfBoth) {
+  bool slow = true;
+  std::vector<SimulatedHTTP::Answer> held;
+  const auto plain = world.http.handler;
+  world.http.handler = [&](const HTTPRequest& request, bool uncached, const SimulatedHTTP::Answer& answer) {
+    if (slow && request.method == "POST") {
+      held.push_back(answer);
+    } else {
+      plain(request, uncached, answer);
+    }
+  };
+  const auto first = allInfos(2);
+  world.queues.run();
+  slow = false;
+  const auto second = allInfos(2);
+  world.queues.run();
+  EXPECT_FALSE(first->has_value());
+  EXPECT_FALSE(second->has_value()) << "the group is the agent's";
+  ASSERT_THAT(held, SizeIs(1));
+  held[0]({200, "{}", {}});
+  world.queues.run();
+  EXPECT_TRUE(first->has_value());
+  EXPECT_TRUE(second->has_value());
+}
+
+TEST_F(AnAgent, AnswersARecordForDevicesNobodyKnows) {
+  const auto unknown = info("STRANGER", 1);
+  EXPECT_EQ(unknown->description(), "<unknown> (STRANGER) ((null)) - Other: No offer");
+  EXPECT_EQ(unknown->warranty(), nullptr);
+  EXPECT_THAT(world.http.requests(), IsEmpty());
+
+  const auto absurd = info("../x", 2);
+  EXPECT_EQ(absurd->warranty(), nullptr);
+  EXPECT_EQ(absurd->device()->deviceType(), KVRDevice::kOther);
+  EXPECT_THAT(
+      world.log.texts(LogLevel::Error),
+      ElementsAre(
+          "-[KVRAgent getDeviceInfoForSerialNumber:usingPolicy:withReply:]: serial number refused, it "
+          "holds a slash"));
+  EXPECT_THAT(world.files.list("/"), IsEmpty());
+}
+
+TEST_F(AnAgent, MapsSerialNumbersThroughTheTwoTables) {
+  world.preferences.setObject(Value::Dictionary{{"S", "T"}, {"X", "Z"}, {"bad", 7}},
+                              "PairedBluetoothDevicesSerialNumbers");
+  EXPECT_EQ(*info("S", 2)->device()->serialNumber(), "T");
+  EXPECT_EQ(serialNumberIn(world.http.requests().back().request), "T");
+  EXPECT_TRUE(world.log.contains("serialNumberOverride for Serial Number: S with serial: T"));
+  EXPECT_TRUE(world.log.contains("Override Serial Number: T found for SN: S"));
+  world.preferences.setObject(Value::Dictionary{{"X", "Y"}}, "PairedWatchesSerialNumbers");
+  EXPECT_EQ(*info("X", 1)->device()->serialNumber(), "Y");
+  EXPECT_EQ(*info("bad", 1)->device()->serialNumber(), "bad");
+  EXPECT_EQ(*info("none", 1)->device()->serialNumber(), "none");
+  EXPECT_TRUE(world.log.contains("serialNumberOverride for Serial Number: none with serial: (null)"));
+}
+
+TEST_F(AnAgent, RefreshesAfterAnAccountWasAddedOnceTheFirstOutreachIsScheduled) {
+  world.preferences.registerDefaults({{"PostUpgradeOutreachDelay", 3600}});
+  EXPECT_EQ(accountAdded(), false);
+  EXPECT_TRUE(world.log.contains(
+      "-[KVRAgent tarsilAccountAddedWithReply:]: Skipped scheduling/downloading new warranty"));
+  EXPECT_FALSE(world.preferences.boolForKey("InitialOutreachActivityScheduled"));
+
+  world.preferences.setObject(true, "PostUpgradeActivityCompleted");
+  EXPECT_EQ(accountAdded(), true);
+  EXPECT_TRUE(world.log.contains("Outreach to be scheduled after: 3600.000000"));
+  EXPECT_TRUE(world.preferences.boolForKey("InitialOutreachActivityScheduled"));
+  EXPECT_THAT(world.http.requests(), IsEmpty());
+
+  EXPECT_EQ(accountAdded(), std::nullopt) << "the reply waits for the downloads";
+  EXPECT_TRUE(world.log.contains("New warranty to be downloaded after: 3600.000000"));
+  agent.reset();
+  world.queues.advance(3599);
+  EXPECT_THAT(world.http.requests(), IsEmpty());
+  world.queues.advance(1);
+  EXPECT_EQ(*pending, true);
+  EXPECT_THAT(world.http.requests(), SizeIs(2));
+}
+
+TEST_F(AnAgent, HandsOutTheWebURLOverrideOnInternalInstallationsOnly) {
+  world.preferences.setObject("https://flow.example", preference::kWebFlowURL);
+  std::vector<Value> replies;
+  const auto ask = [&] {
+    agent->readWebURLOverride(
+        StringReply(world.log, "test", [&](const Value& url) { replies.push_back(url); }));
+  };
+  ask();
+  world.deviceProperties.internalInstall = true;
+  ask();
+  agent->readWebURLOverride(std::nullopt);
+  EXPECT_THAT(replies, ElementsAre(Value(), Value("https://flow.example")));
+  EXPECT_EQ(world.log.count("readWebURLOverride = https://flow.example"), 2U);
+}
+
+}  // namespace
+}  // namespace kvr

@@ -1,0 +1,242 @@
+#include "platform/BinaryPropertyList.h"
+#include "unit/platform/Trees.h"
+
+namespace kvr {
+namespace {
+
+using namespace std::string_literals;
+
+std::string bigEndian(std::uint64_t number, std::size_t size) {
+  std::string out;
+  for (auto shift = size * 8; shift > 0;) out += static_cast<char>(number >> (shift -= 8) & 0xFFU);
+  return out;
+}
+
+struct Trailer {
+  std::uint64_t offsetSize = 4;
+  std::uint64_t referenceSize = 2;
+  std::uint64_t count;
+  std::uint64_t top = 0;
+  std::uint64_t table;
+};
+
+std::string bytesOf(const Trailer& trailer) {
+  return std::string(6, '\0') + bigEndian(trailer.offsetSize, 1) + bigEndian(trailer.referenceSize, 1) +
+         bigEndian(trailer.count, 8) + bigEndian(trailer.top, 8) + bigEndian(trailer.table, 8);
+}
+
+/// A list of the objects, whose references take two bytes; the first is the root.
+std::string listOf(const std::vector<std::string>& objects) {
+  std::string out = "bplist00";
+  std::string table;
+  for (const auto& object : objects) {
+    table += bigEndian(out.size(), 4);
+    out += object;
+  }
+  return out + table + bytesOf({.count = objects.size(), .table = out.size()});
+}
+
+/// An array of references to these objects.
+std::string arrayOf(const std::vector<unsigned>& objects) {
+  std::string out = "\xAF\x12"s + bigEndian(objects.size(), 4);
+  for (const auto object : objects) out += bigEndian(object, 2);
+  return out;
+}
+
+/// Each of `levels` arrays holds the next one twice; the last holds the string object twice.
+std::vector<std::string> doublingArrays(unsigned levels, const std::string& string) {
+  std::vector<std::string> objects;
+  for (unsigned i = 1; i <= levels; ++i) objects.push_back(arrayOf({i, i}));
+  objects.push_back(string);
+  return objects;
+}
+
+const auto kOne = "\x10\x01"s;
+const auto kKey = "\x51k"s;
+
+TEST(ABinaryObject, IsReadAsItsKind) {
+  const struct {
+    std::string object;
+    Value value;
+  } kCases[] = {
+      {"\x00"s, {}},
+      {"\x08", false},
+      {"\x09", true},
+      {"\x10\xFF", 255},
+      {"\x11\xFF\xFF", 65535},
+      {"\x12\xFF\xFF\xFF\xFF", 4294967295},
+      {"\x13\xFF\xFF\xFF\xFF\xFF\xFF\xFF\xFF", -1},
+      {"\x14" + bigEndian(0, 8) + bigEndian(~0ULL, 8), std::numeric_limits<std::uint64_t>::max()},
+      {"\x14" + bigEndian(~0ULL, 8) + bigEndian(~0ULL, 8), -1},
+      {"\x22\x3F\x80\x00\x00"s, 1.0},
+      {"\x23\x3F\xF0\x00\x00\x00\x00\x00\x00"s, 1.0},
+      {"\x33" + bigEndian(0, 8), Date{978307200}},
+      {"\x42\x01\x02", Value::Bytes{1, 2}},
+      {"\x4F\x10\x01\x07"s, Value::Bytes{7}},
+      {"\x50", ""},
+      {"\x61\x20\x28", "\u2028"},
+      {"\x62\xD8\x3D\xDE\x00"s, "\U0001F600"},
+      {"\xA0", Value::Array{}},
+      {"\xD0", Value::Dictionary{}},
+  };
+  for (const auto& [object, value] : kCases) {
+    const auto read = readPropertyList(listOf({object}));
+    ASSERT_TRUE(read) << value.asInteger() << ": " << read.error().message;
+    EXPECT_EQ(*read, value);
+    EXPECT_EQ(read->kind(), value.kind());
+  }
+}
+
+TEST(ABinaryPropertyList, IsRefusedForAnyFault) {
+  const auto count = [](std::string_view marker, std::uint64_t length) {
+    return std::string(marker) + "\x13" + bigEndian(length, 8);
+  };
+  const struct {
+    std::vector<std::string> objects;
+    std::string_view message;
+  } kCases[] = {
+      {{"\x0F"}, "an object of unknown kind"},
+      {{"\x80\x01"}, "an object of unknown kind"},
+      {{"\xC0"}, "an object of unknown kind"},
+      {{"\x70"}, "an object of unknown kind"},
+      {{"\x12\x01\x02"}, "damaged integer"},
+      {{"\x15" + std::string(32, '\0')}, "damaged integer"},
+      {{"\x14" + bigEndian(1, 8) + bigEndian(0, 8)}, "integer too large"},
+      {{"\x14" + bigEndian(~0ULL, 8) + bigEndian(1, 8)}, "integer too large"},
+      {{"\x21\x01\x02"}, "damaged real"},
+      {{"\x33\x01"}, "damaged date"},
+      {{"\x32\x01\x02\x03\x04"}, "damaged date"},
+      {{"\x53\x61\x62"}, "a length beyond the objects"},
+      {{"\x51\x80"}, "a string that is not ASCII as it says"},
+      {{"\x61\xD8\x3D"}, "a string with half a character"},
+      {{"\x62\xD8\x3D\x00\x41"s}, "a string with half a character"},
+      {{"\x61\xDE\x00"s}, "a string with half a character"},
+      {{"\x5F"}, "damaged length"},
+      {{"\x5F\x23\x00"s}, "damaged length"},
+      {{"\x5F\x14" + std::string(16, '\0')}, "damaged length"},
+      {{count("\x5F", ~0ULL)}, "a length beyond the objects"},
+      {{count("\x6F", 1ULL << 63U)}, "a length beyond the objects"},
+      {{count("\xAF", ~0ULL)}, "a length beyond the objects"},
+      {{count("\xDF", 1ULL << 62U)}, "a length beyond the objects"},
+      {{arrayOf({7}), kOne}, "a reference to no object"},
+      {{arrayOf({0})}, "a container inside itself"},
+      {{arrayOf({1}), "\xD1\x00\x02\x00\x00"s, kKey}, "a container inside itself"},
+      {{"\xD1\x00\x01\x00\x01"s, kOne}, "a key that is not a string"},
+      {doublingArrays(20, kOne), "unfolds to too much"},
+      {doublingArrays(500, kOne), "unfolds to too much"},
+      {doublingArrays(12, "\x5F\x12" + bigEndian(100'000, 4) + std::string(100'000, 'x')),
+       "unfolds to too much"},
+  };
+  for (const auto& [objects, message] : kCases) {
+    const auto read = readPropertyList(listOf(objects));
+    ASSERT_FALSE(read) << message;
+    EXPECT_EQ(read.error(), (Error{"plist", 0, std::string(message)}));
+  }
+}
+
+TEST(ABinaryPropertyList, MayShareObjects) {
+  const auto shared = readPropertyList(listOf(doublingArrays(10, kKey)));
+  ASSERT_TRUE(shared) << shared.error().message;
+  Value expected = "k";
+  for (int i = 0; i < 10; ++i) expected = Value::Array{expected, expected};
+  EXPECT_EQ(*shared, expected);
+  EXPECT_EQ(*readPropertyList(listOf({"\xD2\x00\x01\x00\x01\x00\x02\x00\x01"s, kKey, kOne})),
+            (Value::Dictionary{{"k", "k"}}));
+}
+
+TEST(ABinaryPropertyList, IsRefusedForAnyFaultOfItsTrailer) {
+  constexpr std::uint64_t kHuge = ~0ULL;
+  constexpr std::uint64_t kTable = 10;
+  const auto list = [](const Trailer& trailer) {
+    return readPropertyList("bplist00" + kOne + bigEndian(8, 4) + bytesOf(trailer));
+  };
+  ASSERT_TRUE(list({.count = 1, .table = kTable}));
+  const Trailer kCases[] = {
+      {.count = 0, .table = kTable},
+      {.count = 2, .table = kTable},
+      {.count = kHuge, .table = kTable},
+      {.count = 1, .top = 1, .table = kTable},
+      {.count = 1, .top = kHuge, .table = kTable},
+      {.count = 1, .table = 0},
+      {.count = 1, .table = 8},
+      {.count = 1, .table = 14},
+      {.count = 1, .table = kHuge},
+      {.offsetSize = 0, .count = 1, .table = kTable},
+      {.offsetSize = 9, .count = 1, .table = kTable},
+      {.referenceSize = 0, .count = 1, .table = kTable},
+      {.referenceSize = 9, .count = 1, .table = kTable},
+  };
+  for (const auto& trailer : kCases) {
+    EXPECT_FALSE(list(trailer)) << trailer.count << ' ' << trailer.top << ' ' << trailer.table;
+  }
+  for (const std::uint64_t offset : {0U, 7U, 10U, 0xFFFFFFFFU}) {
+    EXPECT_FALSE(
+        readPropertyList("bplist00" + kOne + bigEndian(offset, 4) + bytesOf({.count = 1, .table = 10})));
+  }
+}
+
+TEST(ABinaryPropertyList, CannotClaimTheSameBytesWithoutEnd) {
+  // Many strings, and the keys of many dictionaries, all made of the same megabyte.
+  constexpr unsigned kMany = 1000;
+  const auto string = "\x5F\x12" + bigEndian(1 << 20, 4) + std::string(1 << 20, 'x');
+  std::vector<unsigned> all;
+  for (unsigned i = 0; i < kMany; ++i) all.push_back(i + 2);
+  const std::string start = "bplist00" + arrayOf(all);
+  const std::string dictionary = "\xD1\x00\x01\x00\x01"s;
+  for (const bool asKeys : {false, true}) {
+    std::string table = bigEndian(8, 4) + bigEndian(start.size() + dictionary.size(), 4);
+    for (unsigned i = 0; i < kMany; ++i)
+      table += bigEndian(start.size() + (asKeys ? 0 : dictionary.size()), 4);
+    const auto body = start + dictionary + string;
+    const auto read = readPropertyList(body + table + bytesOf({.count = kMany + 2, .table = body.size()}));
+    ASSERT_FALSE(read);
+    EXPECT_EQ(read.error().message, "unfolds to too much text");
+  }
+}
+
+TEST(ABinaryPropertyList, MayBeNestedToTheLimitAndNoFurther) {
+  const auto chain = [](unsigned depth) {
+    std::vector<std::string> objects;
+    for (unsigned i = 1; i <= depth; ++i) objects.push_back(arrayOf({i}));
+    objects.push_back(kOne);
+    return readPropertyList(listOf(objects));
+  };
+  EXPECT_TRUE(chain(kMaximumDepth));
+  EXPECT_FALSE(chain(kMaximumDepth + 1));
+  EXPECT_FALSE(chain(60'000));
+  // Deep below one reference, deeper still below another that is followed later.
+  std::vector<std::string> objects{arrayOf({2, 1}), arrayOf({2})};
+  for (unsigned i = 3; i <= kMaximumDepth + 1; ++i) objects.push_back(arrayOf({i}));
+  objects.push_back(kOne);
+  EXPECT_FALSE(readPropertyList(listOf(objects)));
+}
+
+TEST(ABinaryPropertyList, IsWrittenWithEqualLeavesOnceAndTheSmallestSizes) {
+  const Value tree = Value::Array{"k", "k", 1, 1, Value::Dictionary{{"k", true}}};
+  const auto objects = "\xA5\x01\x01\x02\x02\x03\x51k\x10\x01\xD1\x01\x04\x09"s;
+  EXPECT_EQ(*writePropertyList(tree, PropertyListEncoding::Binary),
+            "bplist00" + objects + "\x08\x0E\x10\x12\x15"s +
+                bytesOf({.offsetSize = 1, .referenceSize = 1, .count = 5, .table = 8 + objects.size()}));
+}
+
+TEST(ABinaryPropertyList, IsWrittenSoThatItCanBeReadHoweverMuchIsShared) {
+  const Value text = std::string(1 << 20, 'x');
+  const Value tree = Value::Array(100, text);
+  const auto written = writePropertyList(tree, PropertyListEncoding::Binary);
+  ASSERT_TRUE(written);
+  const auto read = readPropertyList(*written);
+  ASSERT_TRUE(read) << read.error().message;
+  EXPECT_TRUE(*read == tree);
+}
+
+TEST(ABinaryPropertyList, ThatIsDamagedDoesNoHarm) {
+  const Value tree = Value::Dictionary{
+      {"a", Value::Array{1, -1, 0.5, true, Value(), Date{0}, Value::Bytes{1, 2}, ~0ULL,
+                         Value::Array{"\u00e9\U0001F600"}}},
+      {"b", Value::Dictionary{{"a string with a long length", 65536}}},
+  };
+  expectDamageIsHarmless(*writePropertyList(tree, PropertyListEncoding::Binary), readBinaryPropertyList);
+}
+
+}  // namespace
+}  // namespace kvr

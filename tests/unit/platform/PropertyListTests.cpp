@@ -1,0 +1,181 @@
+#include "platform/PropertyList.h"
+#include "unit/platform/Trees.h"
+
+namespace kvr {
+namespace {
+
+constexpr auto kXML = PropertyListEncoding::XML;
+constexpr auto kBinary = PropertyListEncoding::Binary;
+
+/// Text as UTF-16 with a byte order mark, and blanks where they belong.
+std::string utf16(std::string_view text, bool bigEndian) {
+  std::string out = bigEndian ? "\xFE\xFF" : "\xFF\xFE";
+  for (const char c : text) {
+    if (bigEndian) out += '\0';
+    out += c;
+    if (!bigEndian) out += '\0';
+  }
+  return out;
+}
+
+TEST(ATree, ComesBackEqualThroughEveryEncoding) {
+  const auto tree = treeForEveryEncoding();
+  const auto json = writeJSON(tree);
+  ASSERT_TRUE(json);
+  const auto fromJSON = readJSON(*json);
+  ASSERT_TRUE(fromJSON);
+  const auto xml = writePropertyList(*fromJSON, kXML);
+  ASSERT_TRUE(xml) << xml.error().message;
+  const auto fromXML = readPropertyList(*xml);
+  ASSERT_TRUE(fromXML) << fromXML.error().message;
+  const auto binary = writePropertyList(*fromXML, kBinary);
+  ASSERT_TRUE(binary) << binary.error().message;
+  const auto fromBinary = readPropertyList(*binary);
+  ASSERT_TRUE(fromBinary) << fromBinary.error().message;
+  EXPECT_TRUE(*fromBinary == tree);
+  // The text also tells -0.0 from 0.0 and 1.0 from 1, which compare equal.
+  EXPECT_TRUE(*writeJSON(*fromBinary) == *json);
+}
+
+TEST(ATree, WithDatesDataAndSpecialRealsComesBackEqualFromPropertyLists) {
+  Value::Bytes bytes;
+  for (unsigned i = 0; i < 256; ++i) bytes.push_back(static_cast<std::uint8_t>(i));
+  constexpr auto kInfinity = std::numeric_limits<double>::infinity();
+  const Value tree = Value::Dictionary{
+      {"data",
+       Value::Array{Value::Bytes{}, Value::Bytes{1}, Value::Bytes{1, 2}, Value::Bytes{1, 2, 3}, bytes}},
+      {"dates", Value::Array{Date{0}, Date{-1}, Date{1764000106}, Date{32503680000}, Date{-62167219201},
+                             Date{1e15}, Date{-1e15}}},
+      {"reals", Value::Array{std::numeric_limits<double>::quiet_NaN(), kInfinity, -kInfinity}},
+  };
+  for (const auto encoding : {kXML, kBinary}) {
+    const auto read = readPropertyList(*writePropertyList(tree, encoding));
+    ASSERT_TRUE(read) << read.error().message;
+    EXPECT_EQ(*read, tree);
+  }
+}
+
+TEST(ATree, ThatXMLCannotHoldIsHeldByTheBinaryEncoding) {
+  const struct {
+    Value value;
+    std::string_view message;
+  } kCases[] = {
+      {Value(), "XML holds no null"},
+      {std::string("\0", 1), "XML holds no such character"},
+      {"\x01", "XML holds no such character"},
+      {"\x0b", "XML holds no such character"},
+      {"\x1f", "XML holds no such character"},
+      {"\uFFFE", "XML holds no such character"},
+      {"\uFFFF", "XML holds no such character"},
+      {Date{std::numeric_limits<double>::infinity()}, "XML holds no date outside the calendar"},
+      {Date{std::numeric_limits<double>::quiet_NaN()}, "XML holds no date outside the calendar"},
+      {Date{-1.1e15}, "XML holds no date outside the calendar"},
+  };
+  for (const auto& [value, message] : kCases) {
+    std::vector<Value> trees{Value::Array{1, value}};
+    if (value.isString()) trees.emplace_back(Value::Dictionary{{value.string(), 1}});
+    for (const auto& tree : trees) {
+      const auto xml = writePropertyList(tree, kXML);
+      ASSERT_FALSE(xml);
+      EXPECT_EQ(xml.error(), (Error{"plist", 0, std::string(message)}));
+      const auto binary = writePropertyList(tree, kBinary);
+      ASSERT_TRUE(binary);
+      EXPECT_EQ(*readPropertyList(*binary), tree);
+    }
+  }
+}
+
+TEST(ATree, WithTextThatIsNotUTF8IsNotWritten) {
+  for (const auto* text :
+       {"\x80", "a\xC3", "\xC0\x80", "\xE0\x80\x80", "\xED\xA0\x80", "\xF4\x90\x80\x80", "\xFF"}) {
+    for (const auto encoding : {kXML, kBinary}) {
+      EXPECT_FALSE(writePropertyList(text, encoding));
+      EXPECT_FALSE(writePropertyList(Value::Dictionary{{text, 1}}, encoding));
+    }
+  }
+}
+
+TEST(ATree, IsWrittenUpToTheNestingThatIsRead) {
+  for (const auto encoding : {kXML, kBinary}) {
+    const auto deepest = nestedArrays(kMaximumDepth);
+    EXPECT_EQ(*readPropertyList(*writePropertyList(deepest, encoding)), deepest);
+    EXPECT_FALSE(writePropertyList(nestedArrays(kMaximumDepth + 1), encoding));
+  }
+}
+
+TEST(ATree, ThatUnfoldsWithoutEndIsNotWritten) {
+  Value tree = 1;
+  for (int i = 0; i < 100; ++i) tree = Value::Array{tree, tree};
+  EXPECT_FALSE(writePropertyList(tree, kXML));
+  EXPECT_FALSE(writePropertyList(tree, kBinary));
+}
+
+TEST(APropertyList, IsToldByItsStart) {
+  const std::string document = "<plist version='1.0'><string>x</string></plist>";
+  const std::string withDeclaration = "<?xml version='1.0'?>" + document;
+  const std::string withType =
+      "<!DOCTYPE plist PUBLIC \"-//X//DTD PLIST 1.0//EN\" \"http://localhost/PropertyList-1.0.dtd\">" +
+      document;
+  const std::string samples[] = {
+      document,
+      withDeclaration,
+      withType,
+      "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n" + withType,
+      "<!-- comment -->" + document,
+      "\xEF\xBB\xBF" + withDeclaration,
+      " \t\r\n" + withDeclaration,
+      "\xEF\xBB\xBF\n" + withDeclaration,
+      utf16(withDeclaration, true),
+      utf16(withDeclaration, false),
+      utf16("\n " + withDeclaration, true),
+      utf16(withDeclaration, true).substr(2),
+      utf16(document, false).substr(2),
+      *writePropertyList("x", kBinary),
+      "x",
+      "'x'",
+      "\xEF\xBB\xBF\"x\"",
+      utf16("\"x\"", true),
+      utf16(" x // comment", false),
+  };
+  for (const auto& sample : samples) {
+    const auto tree = readPropertyList(sample);
+    ASSERT_TRUE(tree) << sample << ": " << tree.error().message;
+    EXPECT_EQ(*tree, Value("x")) << sample;
+  }
+}
+
+TEST(APropertyList, IsNoneWhenItIsSomethingElse) {
+  using namespace std::string_view_literals;
+  const std::string_view samples[] = {
+      ""sv,
+      " \n"sv,
+      "// nothing"sv,
+      "\0"sv,
+      "bplist"sv,
+      "bplist00"sv,
+      "<"sv,
+      "<?xml"sv,
+      "\xFF\xFE"sv,
+      "\xFE\xFF\0"sv,
+      "\xEF\xBB"sv,
+      "Not Found"sv,
+      "[]"sv,
+      R"({"a": 1})"sv,
+      "\x89PNG"sv,
+      "\xFF\xFE\0\xD8"sv,
+      "<plist"sv,
+      "{"sv,
+      "a b"sv,
+      "\x1F\x8B\b"sv,
+      "<html><body>404</body></html>"sv,
+      "<!DOCTYPE html><html/>"sv,
+  };
+  for (const auto sample : samples) {
+    const auto tree = readPropertyList(sample);
+    ASSERT_FALSE(tree) << sample;
+    EXPECT_EQ(tree.error().domain, "plist");
+  }
+}
+
+}  // namespace
+}  // namespace kvr

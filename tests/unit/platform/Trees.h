@@ -1,0 +1,70 @@
+#pragma once
+
+#include "platform/JSON.h"
+#include "platform/PropertyList.h"
+#include "platform/UTF8.h"
+
+#include <gtest/gtest.h>
+
+#include <functional>
+#include <limits>
+
+namespace kvr {
+
+/// Every kind of leaf that JSON, XML and the binary encoding all hold, where they are hardest to hold.
+inline Value treeForEveryEncoding() {
+  std::string planes;
+  for (char32_t plane = 0; plane <= 16; ++plane) appendUTF8(planes, plane * 0x10000 + 0x1234);
+  return Value::Dictionary{
+      {"integers",
+       Value::Array{0, -1, 127, 255, 256, 65535, 65536, 4294967295, 4294967296, 10'000'000'000,
+                    std::numeric_limits<std::int64_t>::min(), std::numeric_limits<std::int64_t>::max(),
+                    std::uint64_t{1} << 63U, std::numeric_limits<std::uint64_t>::max()}},
+      {"reals", Value::Array{0.1, 1e300, -0.0, 1.0, 5e-324, 1.7976931348623157e308, 1e22, 123456789012.0}},
+      {"bools", Value::Array{true, false}},
+      {"empty", Value::Array{"", Value::Array{}, Value::Dictionary{}, Value::Dictionary{{"", ""}}}},
+      {"planes", planes},
+      {"line breaks", "a\nb\rc\r\nd\u0085e\u2028f\u2029\r\n"},
+      {"blanks", "  leading, trailing and \t tab \n"},
+      {"markup", "<&>\"'/\\ ]]> &amp; %@ {} ();=//"},
+      {std::string(300, 'k'), std::string(70000, 'v')},
+      {"\u00e9<&>\r\U0001F600", "key"},
+  };
+}
+
+inline Value nestedArrays(std::size_t depth) {
+  Value tree = "innermost";
+  for (std::size_t i = 0; i < depth; ++i) tree = Value::Array{tree};
+  return tree;
+}
+
+inline std::string repeated(std::string_view text, std::size_t times) {
+  std::string out;
+  for (std::size_t i = 0; i < times; ++i) out += text;
+  return out;
+}
+
+using TreeReader = std::function<Result<Value>(std::string_view)>;
+
+/// Damages a sample in every place. What is cut short must be refused; of what is changed, whatever is still
+/// accepted must be a sound tree: one that can be written and read again.
+inline void expectDamageIsHarmless(const std::string& sample, const TreeReader& read) {
+  ASSERT_TRUE(read(sample));
+  for (std::size_t size = 0; size < sample.size(); ++size) {
+    EXPECT_FALSE(read(std::string_view(sample).substr(0, size))) << "cut at " << size;
+  }
+  for (std::size_t at = 0; at < sample.size(); ++at) {
+    for (const unsigned change : {0x01U, 0x02U, 0x04U, 0x08U, 0x10U, 0x20U, 0x40U, 0x80U, 0xFFU}) {
+      std::string damaged = sample;
+      damaged[at] = static_cast<char>(static_cast<unsigned char>(damaged[at]) ^ change);
+      const auto tree = read(damaged);
+      if (!tree) continue;
+      const auto written = writePropertyList(*tree, PropertyListEncoding::Binary);
+      ASSERT_TRUE(written) << "byte " << at << " changed by " << change << ": " << written.error().message;
+      const auto again = readPropertyList(*written);
+      EXPECT_TRUE(again && *again == *tree) << "byte " << at << " changed by " << change;
+    }
+  }
+}
+
+}  // namespace kvr

@@ -1,0 +1,177 @@
+#include "platform/JSON.h"
+#include "signing/AccountHeaders.h"
+#include "unit/CoverageWorld.h"
+
+namespace kvr {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+using ::testing::Pair;
+
+constexpr const char* kService = "com.tarsil.vornic.supportapp.auth";
+
+class ACoverageRequest : public ::testing::Test {
+ protected:
+  void TearDown() override {
+    world.queues.run();
+    EXPECT_THAT(world.faults(), IsEmpty());
+  }
+  bool sign(bool force) { return kvr_signWithAccountHeaders(world.platform, request, force, true); }
+
+  CoverageWorld world;
+  HTTPRequest request;
+};
+
+TEST_F(ACoverageRequest, SaysWhichDeviceAndWhenAndWhere) {
+  struct Case {
+    double now;
+    long offset;
+    std::int64_t milliseconds;
+    int hours;
+  };
+  const Case cases[] = {
+      {1'800'000'000.9999, 19800, 1'800'000'000'999, 5},
+      {1, 34200, 1000, 9},
+      {1, -12600, 1000, -3},
+      {1, -28800, 1000, -8},
+      {-5, 3599, 0, 0},
+      {20'000'000'000, 0, 20'000'000'000'000, 0},
+  };
+  for (const auto& test : cases) {
+    world.clock.set(Date{test.now});
+    world.locale.offset = test.offset;
+    world.locale.identifier = "pt_BR";
+    request.body = "before";
+    kvr_setCoverageRequestBodyWithSerialNumber(world.platform, request, "S/\"é");
+    EXPECT_EQ(request.body, format("{\"locale\":\"pt_BR\",\"requestTimestamp\":%ld,\"requestTimezone\":%d,"
+                                   "\"serialNumber\":\"S/\\\"é\"}",
+                                   test.milliseconds, test.hours));
+    EXPECT_EQ(request.method, "POST");
+    EXPECT_EQ(request.headers.value("content-type"), "application/json");
+    EXPECT_EQ(bodyDescription(request), request.body);
+  }
+  request.body = "\xff";
+  EXPECT_EQ(bodyDescription(request), std::nullopt);
+}
+
+TEST_F(ACoverageRequest, CarriesTheAccountsHeadersInTheirOrder) {
+  world.accountSession.clientInfo = {{"X-Client", "info"}};
+  world.accountSession.deviceIdentifier = {{"X-Device", "id"}};
+  world.accountSession.authentication = {{"X-Auth", "proof"}, {"x-client", "replaced"}};
+  EXPECT_TRUE(sign(false));
+  EXPECT_THAT(request.headers.fields(),
+              ElementsAre(Pair("X-Tarsil-Vornic-Token", "token"), Pair("x-client", "replaced"),
+                          Pair("X-Device", "id"), Pair("X-Auth", "proof"), Pair("altDSID", "alt-dsid"),
+                          Pair("User-Agent", "<com.tarsil.kvragent/17.9/Phone1,2>"),
+                          Pair("storefrontLocale", "143441")));
+  EXPECT_THAT(world.log.texts(), ElementsAre("storeLocale 143441"));
+}
+
+TEST_F(ACoverageRequest, LeavesOutWhatThePlatformDoesNotKnow) {
+  world.deviceProperties.answers.clear();
+  world.accounts.primary = CloudAccount{};
+  world.accounts.store.reset();
+  EXPECT_TRUE(sign(false));
+  EXPECT_THAT(request.headers.fields(),
+              ElementsAre(Pair("X-Tarsil-Vornic-Token", "token"),
+                          Pair("User-Agent", "<com.tarsil.kvragent/(null)/(null)>")));
+  world.preferences.setObject("override", "storefrontLocale");
+  world.accounts.store = StoreAccount{1, "account"};
+  EXPECT_TRUE(sign(false));
+  EXPECT_EQ(request.headers.value("storefrontLocale"), "override");
+}
+
+TEST_F(ACoverageRequest, RenewsTheTokenWhenThereIsNoneOrWhenForced) {
+  using Renewal = SimulatedAccountStore::Renewal;
+  const Renewal succeeds{0, {{kService, "new"}}};
+  const Renewal bringsNothing{0, {}};
+  const Renewal fails{7, {{kService, "new"}}, 0, Error{"accounts", 7, "no"}};
+  const Renewal never{0, {}, 0, {}, true};
+  const std::string failed =
+      "No way to sign request with Vornic token because renewal of Vornic credential failed: ";
+  struct Case {
+    bool held, force;
+    Renewal renewal;
+    std::size_t renewals;
+    std::optional<std::string> token;
+    std::string error;
+  };
+  const Case cases[] = {
+      {true, false, fails, 0, "held", ""},
+      {true, true, succeeds, 1, "new", ""},
+      {true, true, fails, 1, "held", failed + "7, Error Domain=accounts Code=7 \"no\""},
+      {true, true, never, 1, "held",
+       failed + "-1, Error Domain=accounts Code=-1 \"no answer within 60 seconds\""},
+      {false, false, succeeds, 1, "new", ""},
+      {false, false, bringsNothing, 1, std::nullopt, ""},
+      {false, false, fails, 1, std::nullopt, failed + "7, Error Domain=accounts Code=7 \"no\""},
+      {false, true, never, 1, std::nullopt,
+       failed + "-1, Error Domain=accounts Code=-1 \"no answer within 60 seconds\""},
+  };
+  for (const auto& test : cases) {
+    world.accounts.tokens.clear();
+    if (test.held) world.accounts.tokens[kService] = "held";
+    world.accounts.renewal = test.renewal;
+    world.accounts.renewals.clear();
+    world.log.clear();
+    request = {};
+    EXPECT_EQ(sign(test.force), test.token.has_value());
+    EXPECT_EQ(request.headers.value("X-Tarsil-Vornic-Token"), test.token);
+    ASSERT_EQ(world.accounts.renewals.size(), test.renewals);
+    if (test.renewals != 0) {
+      EXPECT_TRUE(world.accounts.renewals[0].avoidUI);
+      EXPECT_THAT(world.accounts.renewals[0].services, ElementsAre(kService));
+      EXPECT_EQ(world.log.texts().front(), "Reprovision Vornic tokens");
+    }
+    EXPECT_THAT(world.log.texts(LogLevel::Error),
+                test.error.empty() ? ::testing::Matcher<std::vector<std::string>>(IsEmpty())
+                                   : ElementsAre(test.error));
+    if (!test.token) {
+      EXPECT_THAT(world.log.texts(LogLevel::Default),
+                  ElementsAre("Reprovision Vornic tokens",
+                              "Error: still no Vornic token even after calling renewCredentialsForAccount.",
+                              "Failed to add Vornic headers, can't sign this request"));
+      EXPECT_THAT(request.headers.fields(), IsEmpty());
+    }
+  }
+}
+
+TEST_F(ACoverageRequest, IsNotSignedWithoutAnAccount) {
+  world.accounts.authentication = AuthenticationAccount{};
+  EXPECT_FALSE(sign(false));
+  world.accounts.authentication.reset();
+  EXPECT_FALSE(sign(false));
+  world.accounts.primary.reset();
+  EXPECT_FALSE(sign(false));
+  EXPECT_THAT(world.log.texts(),
+              ElementsAre("Vornic signing failed because no there's no altDSID on the account.",
+                          "Failed to add Vornic headers, can't sign this request",
+                          "Vornic signing failed because no Vornic account was provided.",
+                          "Failed to add Vornic headers, can't sign this request",
+                          "No primary Nimbra account, can't sign this request"));
+  EXPECT_EQ(world.log.texts(LogLevel::Error).size(), 1U);
+  EXPECT_THAT(request.headers.fields(), IsEmpty());
+}
+
+TEST_F(ACoverageRequest, OffersCarryTheirOwnHeaders) {
+  const auto widgetry = "/home/user/Library/Preferences/com.tarsil.Widgetry.plist";
+  world.files.putPropertyList(widgetry, Value::Dictionary{{"UIPreferredContentSizeCategoryName", "Large"}});
+  kvr_addMirelHeadersWithOfferID(world.platform, request, "offer-7", "SN");
+  const auto first = *request.headers.value("X-Tarsil-Txn-ID");
+  EXPECT_THAT(request.headers.fields(),
+              ElementsAre(Pair("X-Tarsil-SN", "SN"), Pair("X-Tarsil-Txn-ID", first),
+                          Pair("X-Tarsil-Content-Size", "Large"), Pair("X-Tarsil-DM", "No"),
+                          Pair("User-Agent", "<com.tarsil.kvragent/17.9/Phone1,2>"),
+                          Pair("Offer-ID", "offer-7"), Pair("storefrontLocale", "143441")));
+  world.files.erase(widgetry);
+  world.accounts.primary.reset();
+  kvr_addMirelHeadersWithOfferID(world.platform, request, "offer-7", "SN");
+  EXPECT_NE(request.headers.value("X-Tarsil-Txn-ID"), first);
+  EXPECT_EQ(request.headers.value("X-Tarsil-Content-Size"), std::nullopt);
+  EXPECT_EQ(request.headers.value("storefrontLocale"), std::nullopt);
+  EXPECT_THAT(world.log.texts(LogLevel::Error), ElementsAre("Primary Nimbra Account is nil!"));
+}
+
+}  // namespace
+}  // namespace kvr
