@@ -132,7 +132,7 @@ std::string printable(std::string_view text) {
       result += text.substr(begin, at - begin);
       continue;
     }
-    char escape[8];
+    char escape[16];
     std::snprintf(escape, sizeof escape, "\\u%04x", static_cast<unsigned>(point));
     result += escape;
   }

@@ -17,7 +17,7 @@ bool isUsable(std::string_view domain) {
 
 }  // namespace
 
-FilePreferences::FilePreferences(PropertyListFiles& lists, Log& log, std::string standardDomain)
+FilePreferences::FilePreferences(PropertyListFiles& lists, Log& log, const std::string& standardDomain)
     : lists_(lists),
       log_(log),
       directory_(lists.files().homeDirectory() + "/Library/Preferences"),

@@ -12,7 +12,7 @@ namespace kvr {
 /// two threads or processes lose each other's keys.
 class FilePreferences : public Preferences {
  public:
-  FilePreferences(PropertyListFiles& lists, Log& log, std::string standardDomain);
+  FilePreferences(PropertyListFiles& lists, Log& log, const std::string& standardDomain);
 
   void registerDefaults(const Value::Dictionary& defaults) override;
   Value objectForKey(std::string_view key) const override;

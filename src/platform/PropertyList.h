@@ -20,8 +20,9 @@ inline constexpr std::size_t kMaximumDepth = 512;
 Result<Value> readPropertyList(std::string_view bytes);
 
 /// Writes a tree. XML holds no null, no character that XML forbids and no date outside the calendar, and
-/// drops a date's fraction of a second; the binary encoding holds every tree. A tree that does not fit, or is
-/// nested deeper than `kMaximumDepth`, is an error in domain "plist".
+/// drops a date's fraction of a second; the binary encoding holds every tree (a date before 1985 to a tenth
+/// of a microsecond). A tree that does not fit, whose text is not UTF-8, or that `readPropertyList` would
+/// refuse for its depth or number of values is an error in domain "plist".
 Result<std::string> writePropertyList(const Value& tree, PropertyListEncoding encoding);
 
 }  // namespace kvr

@@ -30,7 +30,7 @@ bool TreeBuilder::setKey(std::string key) {
   return true;
 }
 
-bool TreeBuilder::add(Value value) {
+bool TreeBuilder::add(Value&& value) {
   if (!mayTakeValue()) return false;
   place(std::move(value));
   return true;
@@ -47,7 +47,7 @@ bool TreeBuilder::close() {
   return true;
 }
 
-void TreeBuilder::place(Value value) {
+void TreeBuilder::place(Value&& value) {
   if (open_.empty()) {
     tree_ = std::move(value);
     complete_ = true;

@@ -23,7 +23,7 @@ class TreeBuilder {
   bool openArray() { return open(false); }
   bool openDictionary() { return open(true); }
   bool setKey(std::string key);
-  bool add(Value value);
+  bool add(Value&& value);
   bool close();
 
   /// How many containers are open.
@@ -47,7 +47,7 @@ class TreeBuilder {
 
   bool open(bool isDictionary);
   bool mayTakeValue();
-  void place(Value value);
+  void place(Value&& value);
   bool refuse(const char* problem);
 
   const std::size_t maximumValues_;

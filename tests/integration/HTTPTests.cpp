@@ -1,6 +1,7 @@
 #include "platform/local/EventLoop.h"
 #include "platform/local/LocalHTTP.h"
 #include "platform/local/LocalWorkQueues.h"
+#include "support/RecordingLog.h"
 
 #include <arpa/inet.h>
 #include <gmock/gmock.h>
@@ -17,24 +18,16 @@
 #include <mutex>
 #include <thread>
 
-namespace kvr {
+namespace kvr::testing {
 namespace {
 
-using testing::HasSubstr;
+using ::testing::HasSubstr;
 
 constexpr std::size_t kMebibyte = std::size_t{1} << 20;
 constexpr int kCouldNotConnect = 7;
 constexpr int kTimedOut = 28;
 constexpr int kAborted = 42;
 constexpr int kTooLarge = 63;
-
-class QuietLog : public Log {
- public:
-  QuietLog() : Log(LogLevel::Debug, true) {}
-
- protected:
-  void write(LogLevel, const std::string&) override {}
-};
 
 /// The server's end of one connection.
 class Peer {
@@ -168,7 +161,7 @@ void keepSilent(Peer& peer) {
   }
 }
 
-class OverHTTP : public testing::Test {
+class OverHTTP : public ::testing::Test {
  protected:
   std::future<HTTPResponse> start(HTTPRequest request) {
     return start(http().sharedSession(), std::move(request));
@@ -185,7 +178,7 @@ class OverHTTP : public testing::Test {
   void endHTTP() { http_.reset(); }
 
  private:
-  QuietLog log_;
+  RecordingLog log_;
   EventLoop loop_;
   LocalWorkQueues queues_{loop_, log_};
   std::unique_ptr<LocalHTTP> http_ = std::make_unique<LocalHTTP>(queues_, log_);
@@ -495,4 +488,4 @@ TEST_F(OverHTTP, AConnectionThatWentStaleIsReplaced) {
 }
 
 }  // namespace
-}  // namespace kvr
+}  // namespace kvr::testing

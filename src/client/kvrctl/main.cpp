@@ -9,7 +9,6 @@
 #include <cstdio>
 #include <exception>
 #include <filesystem>
-#include <map>
 #include <string>
 
 namespace {
@@ -101,6 +100,7 @@ CLI::App* addCommand(CLI::App& app, const char* name, const char* description, O
 
 int run(int argumentCount, char** arguments) {
   Options options;
+  std::string policy = "default";
   CLI::App app("Asks the agent about devices and their warranties.", "kvrctl");
   app.require_subcommand(1);
   app.footer(
@@ -114,15 +114,17 @@ int run(int argumentCount, char** arguments) {
           ->check([](const std::string& text) {
             return text.empty() ? std::string("a serial number is not empty") : std::string();
           });
-  info->add_option("--policy", options.policy, "Where the warranty comes from (default, cache, refresh)")
-      ->transform(CLI::CheckedTransformer(std::map<std::string, Policy>{
-          {"default", Policy::Default}, {"cache", Policy::CacheOnly}, {"refresh", Policy::Refresh}}));
+  info->add_option("--policy", policy, "Where the warranty comes from")
+      ->check(CLI::IsMember({"default", "cache", "refresh"}))
+      ->capture_default_str();
   info->add_flag("--all", options.all, "This device and every paired one")->excludes(serial);
   try {
     app.parse(argumentCount, arguments);
   } catch (const CLI::ParseError& error) {
     return app.exit(error) == 0 ? kFine : kFailed;
   }
+  if (policy == "cache") options.policy = Policy::CacheOnly;
+  if (policy == "refresh") options.policy = Policy::Refresh;
   const Command command = device->parsed() ? showDevice : paired->parsed() ? showPaired : showInfo;
   const Result<AgentClient> agent = AgentClient::connect();
   if (!agent) return fail(agent.error());

@@ -45,7 +45,7 @@ std::string DeviceRoot::directoryFromEnvironment() {
   return directory != nullptr && directory[0] != '\0' ? directory : "/var/lib/kvragent/device";
 }
 
-DeviceRoot::DeviceRoot(PropertyListFiles& lists, Log& log, std::string directory)
+DeviceRoot::DeviceRoot(PropertyListFiles& lists, Log& log, const std::string& directory)
     : lists_(lists), log_(log), directory_(absolute(directory)) {}
 
 Value DeviceRoot::dictionary(std::string_view file) const {

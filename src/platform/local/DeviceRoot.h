@@ -18,7 +18,7 @@ class DeviceRoot {
   /// KVR_DEVICE_ROOT, or where a device is described by default.
   static std::string directoryFromEnvironment();
 
-  DeviceRoot(PropertyListFiles& lists, Log& log, std::string directory = directoryFromEnvironment());
+  DeviceRoot(PropertyListFiles& lists, Log& log, const std::string& directory = directoryFromEnvironment());
 
   Value dictionary(std::string_view file) const;
   Value array(std::string_view file) const;

@@ -62,9 +62,9 @@ void LocalAccountStore::renewCredentialsFor(const AuthenticationAccount& account
                                             const RenewalOptions& /*options*/, RenewalReply reply) {
   // The stamp is the older of the two: tokens never go with a content that was not looked at.
   const auto stamp = root_.stamp(kFile);
-  const auto tree = authenticationTree(account);
-  const Value script = tree["renewal"];
-  answers_.after(secondsIn(script["delay"]), [this, stamp, script, reply = std::move(reply)](bool ending) {
+  Value script = authenticationTree(account)["renewal"];
+  const auto delay = secondsIn(script["delay"]);
+  answers_.after(delay, [this, stamp, script = std::move(script), reply = std::move(reply)](bool ending) {
     if (ending) return reply(kEnding, failure(kEnding, "the agent is ending"));
     if (!script.isDictionary()) {
       return reply(kNotRenewable, failure(kNotRenewable, "there is no renewal service for the account"));

@@ -35,7 +35,7 @@ Error failure(const std::string& path) { return failure(errno, path); }
 /// Why a path cannot name a file, if it cannot.
 std::optional<Error> objectionTo(const std::string& path) {
   if (path.starts_with('/') && path.find('\0') == std::string::npos) return std::nullopt;
-  return Error{"files", EINVAL, "not an absolute path: " + std::string(path.c_str())};
+  return Error{"files", EINVAL, "not an absolute path: " + path.substr(0, path.find('\0'))};
 }
 
 std::string directoryOf(const std::string& path) {

@@ -50,7 +50,7 @@ std::optional<Error> SimulatedFiles::Faults::of(const std::string& path) const {
   return found == byPath.end() ? all : found->second;
 }
 
-SimulatedFiles::SimulatedFiles(const Clock& clock) : clock_(clock) { addDirectories(homeDirectory()); }
+SimulatedFiles::SimulatedFiles(const Clock& clock) : clock_(clock) { addDirectories(kHomeDirectory); }
 
 Result<std::optional<FileContents>> SimulatedFiles::read(const std::string& path, std::size_t limit) {
   const std::lock_guard lock(mutex_);

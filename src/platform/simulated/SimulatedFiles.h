@@ -17,9 +17,11 @@ namespace kvr {
 /// same files. Thread-safe.
 class SimulatedFiles : public Files {
  public:
+  static constexpr const char* kHomeDirectory = "/home/user";
+
   explicit SimulatedFiles(const Clock& clock);
 
-  std::string homeDirectory() const override { return "/home/user"; }
+  std::string homeDirectory() const override { return kHomeDirectory; }
   Result<std::optional<FileContents>> read(const std::string& path, std::size_t limit) override;
   std::optional<FileStamp> stamp(const std::string& path) override;
   std::optional<Error> replace(const std::string& path, const std::string& bytes) override;

@@ -5,9 +5,8 @@
 #include <filesystem>
 
 namespace kvr::testing {
-namespace {
 
-const ServiceInterface& testInterface() {
+const ServiceInterface& BusFixture::echoInterface() {
   static const ServiceInterface kInterface{
       RawBusClient::kInterface,
       {{"EchoRecord", {{"record", "a{sv}"}}, {"record", "a{sv}"}},
@@ -20,21 +19,20 @@ const ServiceInterface& testInterface() {
   return kInterface;
 }
 
-}  // namespace
-
 class BusFixture::Object : public ServiceObject {
  public:
-  Object(Behaviour behaviour, std::function<void()> gone)
-      : behaviour_(std::move(behaviour)), gone_(std::move(gone)) {}
+  Object(ServiceInterface interface, Behaviour behaviour, std::function<void()> gone)
+      : interface_(std::move(interface)), behaviour_(std::move(behaviour)), gone_(std::move(gone)) {}
   ~Object() override { gone_(); }
   Object(const Object&) = delete;
   Object& operator=(const Object&) = delete;
 
   void invoke(std::size_t method, const Value::Array& arguments, ServiceReply reply) override {
-    behaviour_(testInterface().methods[method].member, arguments, std::move(reply));
+    behaviour_(interface_.methods[method].member, arguments, std::move(reply));
   }
 
  private:
+  const ServiceInterface interface_;
   const Behaviour behaviour_;
   const std::function<void()> gone_;
 };
@@ -61,25 +59,28 @@ BusFixture::~BusFixture() {
   queues_.drain(static_cast<double>(kLimit.count()));
 }
 
-void BusFixture::entitle(const Value& value) {
-  const auto program = std::filesystem::read_symlink("/proc/self/exe").string();
+void BusFixture::entitle(const Value& value, const std::string& program) {
+  const auto path = std::filesystem::canonical(program).string();
   const Value::Dictionary granted{{std::string(kEntitlement), value}};
-  const auto problem = lists_.write(root_ / "Entitlements.plist", Value::Dictionary{{program, granted}},
+  const auto problem = lists_.write(root_ / "Entitlements.plist", Value::Dictionary{{path, granted}},
                                     PropertyListEncoding::XML);
   if (problem) throw std::runtime_error(describe(*problem));
 }
 
-void BusFixture::serve() {
+void BusFixture::serve(const ServiceInterface& interface) {
+  interface_ = interface;
   const RawBusClient watcher = newClient();
-  std::promise<void> owned;
   const auto handler = [](sd_bus_message*, void* userdata, sd_bus_error*) {
     *static_cast<bool*>(userdata) = true;
     return 0;
   };
   bool isOwned = false;
-  sd_bus_match_signal(watcher.bus(), nullptr, "org.freedesktop.DBus", nullptr, "org.freedesktop.DBus",
-                      "NameOwnerChanged", handler, &isOwned);
-  listener->resume(testInterface());
+  const std::string rule = "type='signal',sender='org.freedesktop.DBus',member='NameOwnerChanged',arg0='" +
+                           std::string(RawBusClient::kName) + "'";
+  if (sd_bus_add_match(watcher.bus(), nullptr, rule.c_str(), handler, &isOwned) < 0) {
+    throw std::runtime_error("the name cannot be watched");
+  }
+  listener->resume(interface);
   while (!isOwned) {
     const int r = sd_bus_process(watcher.bus(), nullptr);
     if (r < 0) throw std::runtime_error("the bus is gone");
@@ -92,8 +93,8 @@ void BusFixture::serve() {
 bool BusFixture::shouldAcceptNewConnection(ServiceConnection& connection) {
   decisions.push_back(connection.valueForEntitlement(kEntitlement));
   if (!(decisions.back() == Value(true))) return false;
-  connection.setExportedInterface(testInterface());
-  connection.setExportedObject(std::make_shared<Object>(newBehaviour(), onObjectGone));
+  connection.setExportedInterface(interface_);
+  connection.setExportedObject(std::make_shared<Object>(interface_, newBehaviour(), onObjectGone));
   connection.resume();
   return true;
 }

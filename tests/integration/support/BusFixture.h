@@ -35,12 +35,14 @@ class BusFixture : public ::testing::Test, public ServiceListenerDelegate {
   BusFixture();
   ~BusFixture() override;
 
-  void entitle(const Value& value);
-  /// Serves the name on the bus; returns once it is there.
-  void serve();
+  /// States the entitlement's value for a program, by default this one, and for no other.
+  void entitle(const Value& value, const std::string& program = "/proc/self/exe");
+  /// Serves the name on the bus; returns once it is there. By default with operations that echo every type.
+  void serve(const ServiceInterface& interface = echoInterface());
   RawBusClient newClient() const { return RawBusClient(bus.address()); }
   bool waitUntilLost() { return lost_.get_future().wait_for(kLimit) == std::future_status::ready; }
 
+  static const ServiceInterface& echoInterface();
   bool shouldAcceptNewConnection(ServiceConnection& connection) override;
 
   PrivateBus bus;
@@ -65,6 +67,7 @@ class BusFixture : public ::testing::Test, public ServiceListenerDelegate {
   EventLoop loop_;
   LocalWorkQueues queues_{loop_, log};
   std::promise<void> lost_;
+  ServiceInterface interface_{};
 };
 
 }  // namespace kvr::testing

@@ -64,13 +64,13 @@ TEST(AJSONText, IsRefusedWithThePlaceOfItsFault) {
 }
 
 TEST(AJSONText, MayBeNestedToTheLimitAndNoFurther) {
-  for (const auto& [start, end] : {std::pair{"[", "]"}, std::pair{"{\"k\":", "}"}}) {
-    const auto nested = [&](std::size_t depth) {
-      return readJSON(repeated(start, depth) + "0" + repeated(end, depth));
+  for (const auto& containers : {std::pair{"[", "]"}, std::pair{"{\"k\":", "}"}}) {
+    const auto nested = [&containers](std::size_t depth) {
+      return readJSON(repeated(containers.first, depth) + "0" + repeated(containers.second, depth));
     };
     EXPECT_TRUE(nested(kMaximumDepth));
     EXPECT_FALSE(nested(kMaximumDepth + 1));
-    EXPECT_FALSE(readJSON(repeated(start, 100'000)));
+    EXPECT_FALSE(readJSON(repeated(containers.first, 100'000)));
   }
 }
 

@@ -45,64 +45,37 @@ TEST(AnXMLElement, IsReadAsItsKind) {
   }
 }
 
-TEST(AnXMLPropertyList, IsRefusedForAnyFault) {
-  const std::string_view contents[] = {
-      "",
-      "text",
-      "<true/><true/>",
-      "<unknown/>",
-      "<plist><true/></plist>",
-      "<string><b/></string>",
-      "<true>x</true>",
-      "<array>text</array>",
-      "<array><key>k</key></array>",
-      "<key>k</key>",
-      "<integer>abc</integer>",
-      "<integer/>",
-      "<integer>1 2</integer>",
-      "<integer>1.0</integer>",
-      "<integer>--1</integer>",
-      "<integer>0x</integer>",
-      "<integer>18446744073709551616</integer>",
-      "<integer>-9223372036854775809</integer>",
-      "<real/>",
-      "<real>0,5</real>",
-      "<real>1e999</real>",
-      "<real>--1</real>",
-      "<real>nano</real>",
-      "<real>1x</real>",
-      "<date/>",
-      "<date>2023-02-29T00:00:00Z</date>",
-      "<date>2024-13-01T00:00:00Z</date>",
-      "<date>2024-00-01T00:00:00Z</date>",
-      "<date>2024-01-01T24:00:00Z</date>",
-      "<date>2024-01-01T00:00:60Z</date>",
-      "<date>2024-01-01</date>",
-      "<date>2024-01-01T00:00:00</date>",
-      "<date>24-01-01T00:00:00Z</date>",
-      "<date>+2024-01-01T00:00:00Z</date>",
-      "<date>99999999-01-01T00:00:00Z</date>",
-      "<date>9999999999999999999-01-01T00:00:00Z</date>",
-      "<data>A</data>",
-      "<data>AQI</data>",
-      "<data>AQ==AQID</data>",
-      "<data>A===</data>",
-      "<data>AQ*=</data>",
-      "<data>AR==</data>",
-      "<dict><true/></dict>",
-      "<dict><key>k</key></dict>",
-      "<dict><key>k</key><key>l</key><true/></dict>",
-      "<dict><key>k</key><true/><true/></dict>",
-      "<string>&unknown;</string>",
-      "<string>&#0;</string>",
-      "<string>\x01</string>",
-      "<string>\xFF</string>",
-      "<array></dict>",
+TEST(AnXMLElement, IsRefusedForATextOfAnotherKind) {
+  const struct {
+    std::string name;
+    std::vector<std::string_view> texts;
+  } kCases[] = {
+      {"integer", {"", "abc", "1 2", "1.0", "--1", "0x", "18446744073709551616", "-9223372036854775809"}},
+      {"real", {"", "0,5", "1e999", "--1", "nano", "1x"}},
+      {"date", {"", "2024-01-01", "2024-01-01T00:00:00", "24-01-01T00:00:00Z", "+2024-01-01T00:00:00Z"}},
+      {"date", {"2023-02-29T00:00:00Z", "2024-13-01T00:00:00Z", "2024-00-01T00:00:00Z"}},
+      {"date", {"2024-01-01T24:00:00Z", "2024-01-01T00:60:00Z", "2024-01-01T00:00:60Z"}},
+      {"date", {"99999999-01-01T00:00:00Z", "9999999999999999999-01-01T00:00:00Z"}},
+      {"data", {"A", "AQI", "AQ==AQID", "A===", "AQ*=", "AR=="}},
+      {"string", {"&unknown;", "&#0;", "\x01", "\xFF", "<b/>"}},
+      {"array", {"text", "<key>k</key>"}},
+      {"true", {"x", "<true/>"}},
+      {"dict", {"<true/>", "<key>k</key>", "<key>k</key><key>l</key><true/>", "<key>k</key><true/><true/>"}},
+      {"plist", {"", "text", "<true/><true/>", "<unknown/>", "<plist><true/></plist>", "<key>k</key>"}},
   };
-  for (const auto content : contents) EXPECT_FALSE(readPropertyList(document(content))) << content;
+  for (const auto& [name, texts] : kCases) {
+    for (const auto text : texts) {
+      const auto element = "<" + name + ">" + std::string(text) + "</" + name + ">";
+      EXPECT_FALSE(readPropertyList(name == "plist" ? element : document(element))) << element;
+    }
+  }
+}
+
+TEST(AnXMLPropertyList, IsRefusedForAFaultOfTheDocument) {
   EXPECT_FALSE(readPropertyList("<?xml version='1.0'?><string>no root</string>"));
   EXPECT_FALSE(readPropertyList("<?xml version='1.0'?>" + document("<true/>") + "rest"));
   EXPECT_FALSE(readPropertyList("<?xml version='1.0' encoding='unknown-8'?>" + document("<true/>")));
+  EXPECT_FALSE(readPropertyList(document("<array></dict>")));
   const auto fault = readPropertyList(document("<array>\n<integer>abc</integer>\n</array>"));
   EXPECT_EQ(fault.error(), (Error{"plist", 0, "line 2: an element whose text is not of its kind"}));
 }
@@ -116,8 +89,7 @@ TEST(AnXMLPropertyList, DeclaresNoEntitiesAndFetchesNone) {
       "<!DOCTYPE plist [<!ENTITY % p SYSTEM 'file:///etc/hostname'> %p;]>",
       "<!DOCTYPE plist SYSTEM 'file:///etc/hostname'>",
       "<!DOCTYPE plist PUBLIC 'p' 'http://localhost/p.dtd'>",
-      "",
-  };
+      ""};
   for (const auto& type : types)
     EXPECT_FALSE(readPropertyList("<?xml version='1.0'?>" + type + content)) << type;
 }

@@ -1,0 +1,160 @@
+#include "platform/JSON.h"
+#include "support/BusFixture.h"
+#include "support/ChildProcess.h"
+
+#include <gmock/gmock.h>
+
+namespace kvr::testing {
+namespace {
+
+using ::testing::AllOf;
+using ::testing::HasSubstr;
+using ::testing::Not;
+
+/// The command-line client on a bus where this process plays the agent.
+class Kvrctl : public BusFixture {
+ protected:
+  struct Outcome {
+    int status;
+    std::string output;
+    std::string errors;
+  };
+
+  Kvrctl() {
+    entitle(true, kProgram);
+    newBehaviour = [this] {
+      return [this](const std::string& member, const Value::Array& arguments, const ServiceReply& reply) {
+        asked = member + describe(Value(arguments));
+        reply(answers[member]);
+      };
+    };
+  }
+
+  Outcome run(std::vector<std::string> arguments) {
+    arguments.insert(arguments.begin(), kProgram);
+    ChildProcess program(std::move(arguments), {{"DBUS_SESSION_BUS_ADDRESS", bus.address()}});
+    const int status = program.wait();
+    return {status, program.output(), program.errorOutput()};
+  }
+
+  void serveAgent() {
+    serve({RawBusClient::kInterface,
+           {{"DefaultDevice", {}, {"device", "a{sv}"}},
+            {"PairedDevices", {}, {"devices", "aa{sv}"}},
+            {"GetDefaultDeviceInfoUsingPolicy", {{"policy", "t"}}, {"info", "a{sv}"}},
+            {"GetDeviceInfoForSerialNumber", {{"serialNumber", "s"}, {"policy", "t"}}, {"info", "a{sv}"}},
+            {"GetAllDeviceInfosUsingPolicy",
+             {{"policy", "t"}, {"updateFollowUps", "b"}},
+             {"infos", "aa{sv}"}}}});
+  }
+
+  static constexpr const char* kProgram = KVR_PROGRAMS "/kvrctl";
+  std::map<std::string, Value> answers;
+  std::string asked;
+};
+
+Value device(const std::string& name) {
+  return Value::Dictionary{
+      {"name", name}, {"serialNumber", "C02XY1234"}, {"activationDate", Date{86400}}, {"deviceType", 1}};
+}
+
+Value info(const Value& warranty) {
+  Value::Dictionary record{{"device", device("a watch")}};
+  if (!warranty.isNull()) record["warranty"] = Value::Dictionary{{"DictionaryRepresentation", warranty}};
+  return record;
+}
+
+TEST_F(Kvrctl, AsksWhatItIsTold) {
+  serveAgent();
+  answers["GetDeviceInfoForSerialNumber"] = info(Value::Dictionary{{"covered", true}});
+  answers["GetDefaultDeviceInfoUsingPolicy"] = info(Value());
+  answers["GetAllDeviceInfosUsingPolicy"] = Value::Array{info(Value()), info(Value::Dictionary{})};
+  answers["DefaultDevice"] = Value::Dictionary{{"name", 7}, {"deviceType", "x"}};
+  struct {
+    std::vector<std::string> arguments;
+    const char* asked;
+    int status;
+  } const cases[] = {
+      {{"device"}, "DefaultDevice()", 0},
+      {{"paired"}, "PairedDevices()", 0},
+      {{"info"}, "GetDefaultDeviceInfoUsingPolicy(0)", 2},
+      {{"info", "S1", "--policy", "refresh"}, "GetDeviceInfoForSerialNumber(S1, 2)", 0},
+      {{"info", "--all", "--policy", "cache"}, "GetAllDeviceInfosUsingPolicy(1, 0)", 0},
+  };
+  for (const auto& one : cases) {
+    const Outcome outcome = run(one.arguments);
+    EXPECT_EQ(outcome.status, one.status) << outcome.errors;
+    EXPECT_EQ(asked, one.asked);
+    EXPECT_EQ(outcome.errors, "");
+  }
+}
+
+TEST_F(Kvrctl, TellsWhyItGotNoAnswer) {
+  EXPECT_EQ(run({"device"}).status, 3);
+  serveAgent();
+  entitle(true, "/proc/self/exe");
+  const Outcome refused = run({"device"});
+  EXPECT_EQ(refused.status, 4);
+  EXPECT_EQ(refused.output, "");
+  EXPECT_THAT(refused.errors, AllOf(HasSubstr(std::string(kEntitlement)), HasSubstr("Entitlements.plist")));
+  for (const std::vector<std::string>& wrong :
+       std::vector<std::vector<std::string>>{{},
+                                             {"devices"},
+                                             {"info", "S", "--all"},
+                                             {"info", "--policy", "7"},
+                                             {"info", ""},
+                                             {"info", "\xFF"}}) {
+    EXPECT_EQ(run(wrong).status, 1);
+  }
+  bus.kill();
+  EXPECT_EQ(run({"device"}).status, 3);
+}
+
+TEST_F(Kvrctl, PrintsTextThatCannotCommandATerminal) {
+  serveAgent();
+  answers["GetDefaultDeviceInfoUsingPolicy"] = info(Value::Dictionary{
+      {"covered", true}, {"coverageLocalizedLabel", "\x1B]0;owned\x07 \u009B2J\r\nCovered: no\u202E"}});
+  const Outcome text = run({"info"});
+  EXPECT_THAT(text.output,
+              HasSubstr("Coverage:      \\u001b]0;owned\\u0007 \\u009b2J\\u000d\\u000aCovered: no\\u202e\n"));
+  EXPECT_THAT(text.output,
+              AllOf(HasSubstr("…1234"), Not(HasSubstr("C02XY1234")), HasSubstr("1970-01-02T00:00:00Z")));
+  EXPECT_THAT(run({"info", "--show-serial"}).output, HasSubstr("C02XY1234"));
+  EXPECT_THAT(run({"info", "--json"}).output, AllOf(Not(HasSubstr("\u009B")), HasSubstr("\\u009b")));
+}
+
+TEST_F(Kvrctl, WritesOneJSONDocumentOfEverythingTheAgentKnows) {
+  serveAgent();
+  const Value warranty = Value::Dictionary{{"since", Date{86400.5}},
+                                           {"data", Value::Bytes{1, 2, 3}},
+                                           {"null", Value()},
+                                           {"big", ~std::uint64_t{0}}};
+  answers["GetAllDeviceInfosUsingPolicy"] = Value::Array{info(warranty), info(Value())};
+  const Result<Value> document = readJSON(run({"info", "--all", "--json", "--show-serial"}).output);
+  ASSERT_TRUE(document) << describe(document.error());
+  const Value told = Value::Dictionary{{"name", "a watch"},
+                                       {"serialNumber", "C02XY1234"},
+                                       {"activationDate", "1970-01-02T00:00:00Z"},
+                                       {"deviceType", 1},
+                                       {"type", "Watch"}};
+  const Value known = Value::Dictionary{
+      {"since", "1970-01-02T00:00:00Z"}, {"data", "AQID"}, {"null", Value()}, {"big", ~std::uint64_t{0}}};
+  EXPECT_EQ(*document,
+            Value(Value::Dictionary{
+                {"version", 1},
+                {"deviceInfos", Value::Array{Value::Dictionary{{"device", told}, {"warranty", known}},
+                                             Value::Dictionary{{"device", told}, {"warranty", Value()}}}}}));
+}
+
+TEST_F(Kvrctl, WritesTheDeepestWarrantyThatThereIs) {
+  serveAgent();
+  Value tree = 1;
+  for (int depth = 1; depth < 512; ++depth) tree = Value::Array{tree};
+  answers["GetDefaultDeviceInfoUsingPolicy"] = info(Value::Dictionary{{"tree", tree}});
+  const Outcome outcome = run({"info", "--json"});
+  EXPECT_EQ(outcome.status, 0) << outcome.errors;
+  EXPECT_THAT(outcome.output, HasSubstr(std::string(511, '[') + "1" + std::string(511, ']')));
+}
+
+}  // namespace
+}  // namespace kvr::testing

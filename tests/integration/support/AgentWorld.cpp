@@ -1,0 +1,179 @@
+#include "integration/support/AgentWorld.h"
+
+#include "platform/JSON.h"
+#include "platform/PropertyList.h"
+#include "signing/SHA256Hash.h"
+
+#include <httplib.h>
+#include <systemd/sd-bus.h>
+
+#include <algorithm>
+#include <fstream>
+#include <iterator>
+#include <stdexcept>
+
+namespace kvr::testing {
+namespace {
+
+constexpr std::uint64_t kLimitMicroseconds = 60'000'000;  // only ever spent on a failure
+constexpr const char* kAuthority = "home/Library/Keys/com.tarsil.kvragent.kestCertificates/authority.pem";
+
+std::string contentOf(const std::filesystem::path& path) {
+  std::ifstream file(path, std::ios::binary);
+  return {std::istreambuf_iterator<char>(file), {}};
+}
+
+Value watch(const std::string& serialNumber) {
+  return Value::Dictionary{{"name", "Watch " + serialNumber},
+                           {"serialNumber", serialNumber},
+                           {"pairedDate", Date{1'750'000'000}},
+                           {"isPaired", true}};
+}
+
+}  // namespace
+
+AgentWorld::AgentWorld(Attestation attestation) {
+  const auto binary = [](const Value& tree) {
+    return *writePropertyList(tree, PropertyListEncoding::Binary);
+  };
+  directory.write("service/kvrV2.plist", "{ LowServerVersion = 2; HighServerVersion = 3; }");
+  setCoverage("default", R"({"covered":true,"coverageLocalizedLabel":"Warranty"})");
+  for (const auto* serialNumber : {kPhone, kFirstWatch, kSecondWatch}) {
+    setCoverage(std::string(serialNumber) + ".fr_FR",
+                R"({"covered":true,"coverageLocalizedLabel":"Garantie"})");
+  }
+  writeDeviceFile("DeviceProperties.plist", Value::Dictionary{{"SerialNumber", kPhone},
+                                                              {"UserAssignedDeviceName", "Phone"},
+                                                              {"ProductType", "Phone1,2"},
+                                                              {"ProductVersion", "17.9"}});
+  writeDeviceFile("FeatureFlags.plist",
+                  Value::Dictionary{{"Kavrel", Value::Dictionary{{"Bravik_3_0", true}}}});
+  pair({kFirstWatch, kSecondWatch});
+  setAccount({});
+  setLocale("en_US");
+  entitle(true);
+
+  std::vector<std::string> command{KVR_PROGRAMS "/kvr-coverage-service", "--root",
+                                   (directory / "service").string()};
+  if (attestation == Attestation::Required) {
+    command.insert(command.end(), {"--authority", (directory / kAuthority).string()});
+  }
+  service_ = std::make_unique<ChildProcess>(command);
+  constexpr std::string_view kListening = "listening on ";
+  serviceURL_ = service_->waitForOutput(kListening).substr(kListening.size());
+  directory.write(
+      "home/Library/Preferences/com.tarsil.kvragent.plist",
+      binary(Value::Dictionary{{"ServerVersionURL", serviceURL_ + "/library/TARSIL/asset/kvrV2.plist"},
+                               {"WarrantyURL", serviceURL_ + "/api/v3/coverage/summary"},
+                               {"WearablesWarrantyURL", serviceURL_ + "/api/v2/coverage/summary"}}));
+}
+
+void AgentWorld::startAgent() {
+  const RawBusClient watcher = newClient();
+  bool isOwned = false;
+  const auto handler = [](sd_bus_message*, void* userdata, sd_bus_error*) {
+    *static_cast<bool*>(userdata) = true;
+    return 0;
+  };
+  sd_bus_match_signal(watcher.bus(), nullptr, "org.freedesktop.DBus", nullptr, "org.freedesktop.DBus",
+                      "NameOwnerChanged", handler, &isOwned);
+  agent_ = std::make_unique<ChildProcess>(std::vector<std::string>{KVR_PROGRAMS "/kvragent"},
+                                          ChildProcess::Environment{
+                                              {"HOME", home().string()},
+                                              {"KVR_DEVICE_ROOT", (directory / "device").string()},
+                                              {"KVR_LOG_PRIVATE", "1"},
+                                              {"DBUS_SESSION_BUS_ADDRESS", bus.address()},
+                                              {"LC_ALL", "C"},
+                                              {"JOURNAL_STREAM", ""},
+                                          });
+  // The watcher sees its own arrival too; it is the agent's name that counts.
+  while (!isOwned || sd_bus_get_name_creds(watcher.bus(), RawBusClient::kName, 0, nullptr) < 0) {
+    const int processed = sd_bus_process(watcher.bus(), nullptr);
+    if (processed < 0) throw std::runtime_error("the bus is gone");
+    if (processed == 0 && sd_bus_wait(watcher.bus(), kLimitMicroseconds) == 0) {
+      throw std::runtime_error("the agent never took its name: " + agent_->errorOutput());
+    }
+  }
+}
+
+void AgentWorld::writeDeviceFile(const std::string& name, const Value& tree) const {
+  directory.write("device/" + name, *writePropertyList(tree, PropertyListEncoding::XML));
+}
+
+void AgentWorld::entitle(const Value& value) const {
+  Value::Dictionary granted;
+  if (!value.isNull()) granted.emplace("com.tarsil.private.kvragent", value);
+  writeDeviceFile("Entitlements.plist",
+                  Value::Dictionary{{std::filesystem::read_symlink("/proc/self/exe").string(), granted}});
+}
+
+void AgentWorld::setLocale(const std::string& identifier) const {
+  writeDeviceFile("Locale.plist", Value::Dictionary{{"identifier", identifier}});
+}
+
+void AgentWorld::pair(const std::vector<std::string>& serialNumbers) const {
+  Value::Array watches;
+  std::ranges::transform(serialNumbers, std::back_inserter(watches), watch);
+  writeDeviceFile("PairedDevices.plist", watches);
+}
+
+void AgentWorld::setAccount(const Value& renewal) const {
+  Value::Dictionary authentication{
+      {"alternateDSID", "alternate"},
+      {"tokens", Value::Dictionary{{"com.tarsil.vornic.supportapp.auth", "first-token"}}}};
+  if (!renewal.isNull()) authentication.emplace("renewal", renewal);
+  writeDeviceFile(
+      "Accounts.plist",
+      Value::Dictionary{{"primaryAccount", Value::Dictionary{{"altDSID", "alt"},
+                                                             {"storefront", "143441"},
+                                                             {"authenticationAccount", authentication}}}});
+}
+
+void AgentWorld::setCoverage(const std::string& name, const std::string& json) const {
+  directory.write("service/coverage/" + name + ".json", json);
+}
+
+void AgentWorld::misbehave(const std::string& rules) const {
+  httplib::Client client(serviceURL_);
+  const auto answer = client.Post("/control", "{\"coverage\":" + rules + "}", "application/json");
+  if (!answer || answer->status != 200) throw std::runtime_error("the service does not take " + rules);
+}
+
+std::vector<Value> AgentWorld::requests() const {
+  std::vector<std::filesystem::path> paths;
+  for (const auto& entry : std::filesystem::directory_iterator(directory / "service/requests")) {
+    if (entry.path().extension() == ".json") paths.push_back(entry.path());
+  }
+  std::ranges::sort(paths);
+  std::vector<Value> requests;
+  for (const auto& path : paths) requests.push_back(*readJSON(contentOf(path)));
+  return requests;
+}
+
+std::vector<Value> AgentWorld::coverageRequests() const {
+  auto all = requests();
+  std::erase_if(all, [](const Value& request) { return request["method"] != Value("POST"); });
+  return all;
+}
+
+Value AgentWorld::preferences() const {
+  return *readPropertyList(contentOf(home() / "Library/Preferences/com.tarsil.kvragent.plist"));
+}
+
+std::string AgentWorld::cacheFileOf(const std::string& serialNumber) const {
+  return (home() / "Library/Application Support/com.tarsil.Kavrel" /
+          (sha256Hash(serialNumber) + "_Warranty.plist"))
+      .string();
+}
+
+Value AgentWorld::info(const RawBusClient& client, const std::string& serialNumber, std::uint64_t policy) {
+  return client.value("a{sv}", client.call("GetDeviceInfoForSerialNumber", "st", {serialNumber, policy}));
+}
+
+Value::Array AgentWorld::allInfos(const RawBusClient& client, std::uint64_t policy) {
+  return client.value("aa{sv}", client.call("GetAllDeviceInfosUsingPolicy", "tb", {policy, false})).array();
+}
+
+Value AgentWorld::warrantyIn(const Value& info) { return info["warranty"]["DictionaryRepresentation"]; }
+
+}  // namespace kvr::testing

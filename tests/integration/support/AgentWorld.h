@@ -1,0 +1,70 @@
+#pragma once
+
+#include "integration/support/ChildProcess.h"
+#include "integration/support/PrivateBus.h"
+#include "integration/support/RawBusClient.h"
+#include "integration/support/TemporaryDirectory.h"
+#include "platform/Value.h"
+
+#include <memory>
+#include <string>
+#include <vector>
+
+namespace kvr::testing {
+
+/// A phone with two watches, its coverage service and its agent: the real programs on a bus of their own. The
+/// test is the client.
+///
+/// The agent is started by `startAgent`, so that a test may change the device before.
+class AgentWorld {
+ public:
+  static constexpr const char* kPhone = "SNPHONE00001";
+  static constexpr const char* kFirstWatch = "SNWATCH00001";
+  static constexpr const char* kSecondWatch = "SNWATCH00002";
+  enum Policy : std::uint64_t { Default = 0, CacheOnly = 1, Refresh = 2 };
+
+  /// Whether the service insists on attested requests about the phone.
+  enum class Attestation { Required, Optional };
+
+  explicit AgentWorld(Attestation attestation = Attestation::Required);
+
+  /// Starts the agent and returns once it has its name on the bus.
+  void startAgent();
+  ChildProcess& agent() { return *agent_; }
+  RawBusClient newClient() const { return RawBusClient(bus.address()); }
+
+  void writeDeviceFile(const std::string& name, const Value& tree) const;
+  void entitle(const Value& value) const;
+  void setLocale(const std::string& identifier) const;
+  void pair(const std::vector<std::string>& serialNumbers) const;
+  /// The account of the device, with a script for renewals (null: none).
+  void setAccount(const Value& renewal) const;
+  /// What the service answers about a device (SERIAL), or about it in one locale (SERIAL.LOCALE).
+  void setCoverage(const std::string& name, const std::string& json) const;
+  /// Tells the service how to answer coverage requests, in the rules that its control endpoint takes.
+  void misbehave(const std::string& rules) const;
+
+  /// The requests that the service got, as it recorded them.
+  std::vector<Value> requests() const;
+  /// Those for coverage.
+  std::vector<Value> coverageRequests() const;
+  Value preferences() const;
+  std::string cacheFileOf(const std::string& serialNumber) const;
+  std::filesystem::path home() const { return directory / "home"; }
+
+  // Calls by a client, and what they reply.
+  static Value info(const RawBusClient& client, const std::string& serialNumber, std::uint64_t policy);
+  static Value::Array allInfos(const RawBusClient& client, std::uint64_t policy);
+  /// The warranty's dictionary in a device info, null for none.
+  static Value warrantyIn(const Value& info);
+
+  PrivateBus bus;
+  TemporaryDirectory directory;
+
+ private:
+  std::unique_ptr<ChildProcess> service_;
+  std::string serviceURL_;
+  std::unique_ptr<ChildProcess> agent_;
+};
+
+}  // namespace kvr::testing

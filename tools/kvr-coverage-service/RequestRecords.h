@@ -1,0 +1,34 @@
+#pragma once
+
+#include "ReceivedRequest.h"
+
+#include <cstdint>
+#include <mutex>
+#include <optional>
+#include <string>
+
+namespace kvr::coverage_service {
+
+/// What the service was sent and what it answered: one JSON document a request, NNNNNN.json, in one
+/// directory.
+///
+/// `{"time": seconds since 1970, "method", "path", "headers": [[NAME, VALUE]...], "body" (or "bodyBase64"
+/// when it is not UTF-8), "status" (0 when there is to be no answer), "reason" (why it is a 400)}`.
+/// Thread-safe.
+class RequestRecords {
+ public:
+  /// Goes on after the highest number that the directory holds. Throws when the directory cannot be made.
+  explicit RequestRecords(std::string directory);
+
+  /// The document is complete before this returns. Throws when it cannot be written.
+  void add(const ReceivedRequest& request, int status, const std::optional<std::string>& reason);
+  /// The number of the last document.
+  std::int64_t count() const;
+
+ private:
+  const std::string directory_;
+  mutable std::mutex mutex_;
+  std::int64_t count_ = 0;
+};
+
+}  // namespace kvr::coverage_service

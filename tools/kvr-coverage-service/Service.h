@@ -1,0 +1,49 @@
+#pragma once
+
+#include "Behaviours.h"
+#include "ReceivedRequest.h"
+#include "RequestRecords.h"
+#include "WireServer.h"
+
+#include <optional>
+#include <string>
+
+namespace kvr::coverage_service {
+
+/// The two endpoints, answered from files that are read afresh at each request, and the control endpoint.
+class Service {
+ public:
+  struct Options {
+    std::string root;
+    std::string authority;   ///< path of a certificate file; empty for none
+    std::string accounts;    ///< path of a property list; empty for none
+    std::string storefront;  ///< empty for the account's own
+  };
+
+  /// Adds its handlers to `server`, which must not serve any longer than this lives.
+  Service(WireServer& server, Options options);
+  Service(const Service&) = delete;
+  Service& operator=(const Service&) = delete;
+
+ private:
+  struct Answer {
+    int status = 200;
+    std::string body;
+    const char* type = "text/plain";
+    std::optional<std::string> reason;  ///< why the request was refused
+  };
+
+  void handle(const httplib::Request& request, httplib::Response& response);
+  void handleControl(const httplib::Request& request, httplib::Response& response);
+  Answer coverage(const ReceivedRequest& request, Behaviour& behaviour);
+  Answer asset(const ReceivedRequest& request, Behaviour& behaviour);
+  /// Why a coverage request is refused, if it is.
+  std::optional<std::string> faultIn(const ReceivedRequest& request) const;
+  std::optional<std::string> coverageFile(const std::string& serialNumber, const std::string& locale) const;
+
+  const Options options_;
+  Behaviours behaviours_;
+  RequestRecords records_;
+};
+
+}  // namespace kvr::coverage_service

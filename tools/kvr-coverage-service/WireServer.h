@@ -1,0 +1,66 @@
+#pragma once
+
+#include "platform/HTTP.h"
+#include "platform/local/Descriptor.h"
+
+#include <httplib.h>
+
+#include <string>
+#include <vector>
+
+namespace kvr::coverage_service {
+
+/// One client's connection, for as long as it lasts.
+class Connection : public httplib::Stream {
+ public:
+  /// `stop` becomes readable when the server stops.
+  Connection(Descriptor socket, int stop) : socket_(std::move(socket)), stop_(stop) {}
+
+  /// Waits for the first byte of another request; false when the client has gone or kept silent for long, or
+  /// the server stops.
+  bool awaitRequest();
+  /// The header fields of the request at hand, in the order in which they came.
+  std::vector<HTTPHeaders::Field> headers() const;
+  /// Waits; without a limit when `seconds` is negative. False when meanwhile the client went or the server
+  /// stopped.
+  bool wait(double seconds) const;
+  /// Nothing more is written: the client sees the connection end.
+  void abandon() { isAbandoned_ = true; }
+
+  bool is_readable() const override;
+  bool is_writable() const override { return !isAbandoned_; }
+  ssize_t read(char* bytes, std::size_t size) override;
+  ssize_t write(const char* bytes, std::size_t size) override;
+  void get_remote_ip_and_port(std::string& ip, int& port) const override;
+  void get_local_ip_and_port(std::string& ip, int& port) const override;
+  socket_t socket() const override { return socket_.get(); }
+
+ private:
+  bool becomesReadable(int milliseconds) const;
+
+  const Descriptor socket_;
+  const int stop_;
+  std::string unread_;
+  std::size_t readUpTo_ = 0;
+  std::string head_;  ///< of the request at hand, as far as it has been read
+  bool isHeadComplete_ = false;
+  bool isAbandoned_ = false;
+};
+
+/// An HTTP server with a thread for each connection, so that an answer that is held back holds up nobody.
+class WireServer : public httplib::Server {
+ public:
+  WireServer();
+
+  /// The connection of the request that the calling thread is answering.
+  static Connection& connection();
+  /// Lets nobody wait any longer and ends `listen_after_bind`, if it has begun. Any thread.
+  void stopServing();
+
+ private:
+  bool process_and_close_socket(socket_t socket) override;
+
+  const Descriptor stop_;
+};
+
+}  // namespace kvr::coverage_service
