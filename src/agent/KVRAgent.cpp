@@ -5,6 +5,8 @@
 #include "agent/SerialNumber.h"
 #include "devices/DeviceKeys.h"
 #include "devices/KVRDevicesManager.h"
+#include "scheduling/KVROutreachActivity.h"
+#include "scheduling/KVRScheduler.h"
 #include "warranty/KVRAgentDefaultWarrantyProvider.h"
 #include "warranty/KVRServerVersionUtilities.h"
 
@@ -33,8 +35,14 @@ KVRAgent::KVRAgent(Platform& platform, std::shared_ptr<KVRAgentWarrantyProvider>
 
 void KVRAgent::scheduleOutreach(BoolReply withReply) { scheduleOutreachAfter(0, std::move(withReply)); }
 
-void KVRAgent::scheduleOutreachAfter(double, BoolReply withReply) {
-  // The outreach activity is scheduled here, once activities are connected; the answer is true in any case.
+void KVRAgent::scheduleOutreachAfter(double delay, BoolReply withReply) {
+  if (isInCalendar(platform_.clock.now() + delay)) {
+    KVRScheduler::newSchedulerWithActivityDelegate(platform_, std::make_shared<KVROutreachActivity>(platform_))
+        ->scheduleActivityWithDelay(delay);
+  } else {
+    platform_.log.error("%s: delay refused, no date lies %f seconds ahead",
+                        "-[KVRAgent scheduleOutreachAfter:withReply:]", delay);
+  }
   withReply(true);
 }
 

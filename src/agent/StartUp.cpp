@@ -2,20 +2,34 @@
 
 #include "agent/AgentKeys.h"
 #include "agent/Configuration.h"
+#include "followup/KVRFollowUpRefresh.h"
+#include "scheduling/KVRConversionOutreachActivity.h"
+#include "scheduling/KVROutreachActivity.h"
+#include "scheduling/KVRPostBootActivity.h"
+#include "scheduling/KVRPostUpgradeActivity.h"
 
 namespace kvr {
 
 StartUp::StartUp(Platform& platform) : delegate_(platform) {
   platform.log.standard("launched");
   kvr_registerDefaults(platform.preferences);
-  // The five long-lived activities are armed here, in this order: post-upgrade, post-boot, outreach,
-  // conversion outreach, follow-up refresh.
+  monitor(platform, std::make_shared<KVRPostUpgradeActivity>(platform));
+  monitor(platform, std::make_shared<KVRPostBootActivity>(platform));
+  monitor(platform, std::make_shared<KVROutreachActivity>(platform));
+  monitor(platform, std::make_shared<KVRConversionOutreachActivity>(platform));
+  monitor(platform, std::make_shared<KVRFollowUpRefresh>(platform));
   agent_ = KVRAgent::initWithCallingProcessBundleID(platform, kPreferencesBundleID);
   // Migration runs here, synchronously; then the locale monitor and the paired-devices monitor start with
   // this agent.
   listener_ = platform.services.newListener(kServiceName);
   listener_->setDelegate(delegate_);
   listener_->resume(agentServiceInterface());
+}
+
+void StartUp::monitor(Platform& platform, std::shared_ptr<KVRSchedulerActivityDelegate> activity) {
+  auto scheduler = KVRScheduler::newSchedulerWithActivityDelegate(platform, std::move(activity));
+  scheduler->monitorForScheduledActivity();
+  schedulers_.push_back(std::move(scheduler));
 }
 
 }  // namespace kvr

@@ -3,8 +3,10 @@
 #include "agent/KVRAgent.h"
 #include "agent/ServiceDelegate.h"
 #include "platform/Platform.h"
+#include "scheduling/KVRScheduler.h"
 
 #include <memory>
+#include <vector>
 
 namespace kvr {
 
@@ -16,6 +18,9 @@ class StartUp {
   explicit StartUp(Platform& platform);
 
  private:
+  void monitor(Platform& platform, std::shared_ptr<KVRSchedulerActivityDelegate> activity);
+
+  std::vector<std::shared_ptr<KVRScheduler>> schedulers_;
   std::shared_ptr<KVRAgent> agent_;
   ServiceDelegate delegate_;
   std::unique_ptr<ServiceListener> listener_;

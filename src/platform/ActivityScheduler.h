@@ -46,7 +46,8 @@ class Activity {
   /// The platform holds the block until the activity has finished or is registered anew.
   virtual void schedule(ActivityBlock block) = 0;
   /// Tells the platform, during a run that is about to be deferred, the date before which running again is of
-  /// no use.
+  /// no use. Set before `schedule`, for a preregistered activity: the date for which its client has it
+  /// scheduled; should the platform have lost the registration, it is registered for that date.
   virtual void setEarliestDate(Date date) = 0;
   /// Whether the platform asks the running activity to stop and defer.
   virtual bool shouldDefer() const = 0;

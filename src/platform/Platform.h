@@ -1,10 +1,13 @@
 #pragma once
 
 #include "platform/AccountStore.h"
+#include "platform/ActivityScheduler.h"
+#include "platform/CarrierInfo.h"
 #include "platform/Clock.h"
 #include "platform/DeviceAttestation.h"
 #include "platform/DeviceProperties.h"
 #include "platform/FeatureFlags.h"
+#include "platform/FollowUpCenter.h"
 #include "platform/HTTP.h"
 #include "platform/Log.h"
 #include "platform/PairedDeviceRegistry.h"
@@ -43,6 +46,9 @@ struct Platform {
   DeviceAttestation& attestation;
   ServiceListeners& services;
   Processes& processes;
+  ActivityScheduler& activities;
+  FollowUpCenter& followUps;
+  CarrierInfo& carriers;
   std::string mainBundleIdentifier;
   SharedObjects sharedObjects{};
 };

@@ -52,7 +52,8 @@ std::string compactTime(Date date) {
 PropertyListFiles::PropertyListFiles(Files& files, const Clock& clock, Log& log)
     : files_(files), clock_(clock), log_(log) {}
 
-Result<Value> PropertyListFiles::read(const std::string& path, Expected expected, WhenDamaged whenDamaged) {
+Result<Value> PropertyListFiles::read(const std::string& path, Expected expected, WhenDamaged whenDamaged,
+                                      const Complaint& complaintOfReader) {
   for (int attempt = 0; attempt < kAttempts; ++attempt) {
     const auto parsed = parse(path);
     if (!parsed) return reportUnreadable(path, parsed.error());
@@ -62,7 +63,8 @@ Result<Value> PropertyListFiles::read(const std::string& path, Expected expected
       return Value();
     }
     const auto& [stamp, outcome] = **parsed;
-    const auto complaint = complaintAbout(outcome, expected);
+    auto complaint = complaintAbout(outcome, expected);
+    if (!complaint && complaintOfReader) complaint = complaintOfReader(*outcome);
     if (!complaint) {
       noteSound(path);
       return *outcome;

@@ -5,6 +5,7 @@
 #include "platform/Log.h"
 #include "platform/PropertyList.h"
 
+#include <functional>
 #include <list>
 #include <map>
 #include <mutex>
@@ -30,9 +31,14 @@ class PropertyListFiles {
 
   PropertyListFiles(Files& files, const Clock& clock, Log& log);
 
+  /// What a reader finds wrong with a tree of the expected kind, if anything.
+  using Complaint = std::function<std::optional<Error>(const Value& tree)>;
+
   /// The file's content; null when it is missing or damaged. An error when it is there but could not be read
-  /// (reported once): nothing may then be written in its place.
-  Result<Value> read(const std::string& path, Expected expected, WhenDamaged whenDamaged);
+  /// (reported once): nothing may then be written in its place. A file of which `complaint` complains counts
+  /// as damaged.
+  Result<Value> read(const std::string& path, Expected expected, WhenDamaged whenDamaged,
+                     const Complaint& complaint = nullptr);
 
   /// Replaces the file, creating its directory as needed. On failure the old file stays.
   std::optional<Error> write(const std::string& path, const Value& tree, PropertyListEncoding encoding);

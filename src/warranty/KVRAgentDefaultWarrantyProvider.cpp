@@ -1,5 +1,6 @@
 #include "warranty/KVRAgentDefaultWarrantyProvider.h"
 
+#include "followup/KVRFollowUp.h"
 #include "warranty/CacheMetadata.h"
 #include "warranty/KVRWarrantyDownloader.h"
 #include "warranty/WarrantyKeys.h"
@@ -17,19 +18,24 @@ KVRAgentDefaultWarrantyProvider::KVRAgentDefaultWarrantyProvider(Platform& platf
                       callingProcessBundleID_);
 }
 
-// The four follow-up operations go to a new KVRFollowUp each, once follow-ups are connected.
-
-KVRDeviceInfoList KVRAgentDefaultWarrantyProvider::refreshFollowupWithDeviceInfos(const KVRDeviceInfoList&) {
-  return {};
+KVRDeviceInfoList KVRAgentDefaultWarrantyProvider::refreshFollowupWithDeviceInfos(
+    const KVRDeviceInfoList& deviceInfos) {
+  return KVRFollowUp(platform_).refreshFollowupWithDeviceInfos(deviceInfos);
 }
 
-KVRDeviceInfoList KVRAgentDefaultWarrantyProvider::refreshFollowupWithDeviceInfo(const KVRDeviceInfoRef&) {
-  return {};
+KVRDeviceInfoList KVRAgentDefaultWarrantyProvider::refreshFollowupWithDeviceInfo(
+    const KVRDeviceInfoRef& deviceInfo) {
+  return KVRFollowUp(platform_).refreshFollowupWithDeviceInfo(deviceInfo, false);
 }
 
-void KVRAgentDefaultWarrantyProvider::dismissFollowUpForSerialNumber(const std::string&) {}
+void KVRAgentDefaultWarrantyProvider::dismissFollowUpForSerialNumber(const std::string& serialNumber) {
+  KVRFollowUp(platform_).dismissFollowUpForSerialNumber(serialNumber);
+}
 
-void KVRAgentDefaultWarrantyProvider::migrateLegacyFollowUpIfNeededWithDeviceInfo(const KVRDeviceInfoRef&) {}
+void KVRAgentDefaultWarrantyProvider::migrateLegacyFollowUpIfNeededWithDeviceInfo(
+    const KVRDeviceInfoRef& deviceInfo) {
+  KVRFollowUp(platform_).migrateLegacyFollowUpIfNeededWithDeviceInfo(*deviceInfo);
+}
 
 void KVRAgentDefaultWarrantyProvider::downloadWarrantyForSerialNumber(const std::string& serialNumber,
                                                                       DownloadCompletion completionHandler) {

@@ -3,6 +3,9 @@
 #include "devices/KVRDevicesManager.h"
 #include "platform/JSON.h"
 #include "platform/PropertyList.h"
+#include "scheduling/KVRConversionOutreachActivity.h"
+#include "scheduling/KVRScheduler.h"
+#include "scheduling/SchedulingKeys.h"
 #include "signing/AccountHeaders.h"
 #include "signing/KestHeaders.h"
 #include "warranty/CacheMetadata.h"
@@ -202,7 +205,29 @@ void KVRWarrantyDownloader::_scheduleConversionOutreachIfRequiredForWarranty(
     if (!cachedDate || !date || *cachedDate == *date) return;
   }
   if (!date) return;
-  // The conversion outreach activity is scheduled for `date` here, once activities are connected.
+  const auto scheduled = platform_.preferences.dateForKey(preference::kConversionOutreachScheduledDate);
+  if (scheduled && *date >= *scheduled) return;
+  if (scheduled) {
+    platform_.log.standard("Re-scheduling conversion outreach %@", *date);
+  } else {
+    platform_.log.standard("scheduling conversion outreach %@", *date);
+  }
+  scheduleConversionOutreachFor(*date);
+}
+
+void KVRWarrantyDownloader::scheduleConversionOutreachFor(Date date) {
+  const auto scheduler = KVRScheduler::newSchedulerWithActivityDelegate(
+      platform_, std::make_shared<KVRConversionOutreachActivity>(platform_));
+  scheduler->scheduleActivityForDate(date);
+  // Another device's download may be here at the same time: the earliest date stays, and whoever finds that a
+  // later one was scheduled over it sets that right.
+  platform_.preferences.update(preference::kConversionOutreachScheduledDate, [&](const Value& stored) -> Value {
+    const auto other = stored.dateIfAny();
+    if (other && *other < date) date = *other;
+    return date;
+  });
+  const auto target = scheduler->scheduledActivityDate();
+  if (target && *target > date) scheduler->scheduleActivityForDate(date);
 }
 
 }  // namespace kvr

@@ -1,11 +1,14 @@
 #pragma once
 
+#include "platform/FileFollowUpCenter.h"
 #include "platform/FilePreferences.h"
 #include "platform/Platform.h"
 #include "platform/local/DeviceRoot.h"
 #include "platform/local/EventLoop.h"
 #include "platform/local/LocalAccountSession.h"
 #include "platform/local/LocalAccountStore.h"
+#include "platform/local/LocalActivityScheduler.h"
+#include "platform/local/LocalCarrierInfo.h"
 #include "platform/local/LocalClock.h"
 #include "platform/local/LocalDeviceAttestation.h"
 #include "platform/local/LocalDeviceProperties.h"
@@ -57,6 +60,9 @@ struct LocalPlatform {
   LocalDeviceAttestation attestation{root, deviceProperties, files, clock, *log};
   LocalHTTP http{queues, *log};
   LocalServiceListeners services;
+  LocalActivityScheduler activities;
+  FileFollowUpCenter followUps{propertyLists, clock};
+  LocalCarrierInfo carriers{root};
   Platform platform{*log,          clock,
                     queues,        files,
                     propertyLists, preferences,
@@ -65,7 +71,9 @@ struct LocalPlatform {
                     featureFlags,  pairedDevices,
                     accounts,      accountSession,
                     attestation,   services,
-                    processes,     kMainBundleIdentifier};
+                    processes,     activities,
+                    followUps,     carriers,
+                    kMainBundleIdentifier};
 
   static constexpr const char* kMainBundleIdentifier = "com.tarsil.kvragent";
 };

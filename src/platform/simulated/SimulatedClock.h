@@ -2,6 +2,9 @@
 
 #include "platform/Clock.h"
 
+#include <functional>
+#include <utility>
+
 namespace kvr {
 
 /// The two clocks of the simulation: virtual time, which only `SimulatedWorkQueues` moves, and the wall
@@ -14,8 +17,10 @@ class SimulatedClock : public Clock {
 
   Date now() const override { return base_ + elapsed_; }
   /// Moves the wall clock; delays and waits under way are not touched.
-  void set(Date now) { base_ = now - elapsed_; }
-  void moveBy(double seconds) { base_ = base_ + seconds; }
+  void set(Date now) { moveTo(now - elapsed_); }
+  void moveBy(double seconds) { moveTo(base_ + seconds); }
+  /// What is to happen when the wall clock is moved; one thing, or nothing.
+  void whenMoved(std::function<void()> moved) { moved_ = std::move(moved); }
 
   /// Virtual seconds since the simulation began.
   double elapsed() const { return elapsed_; }
@@ -23,8 +28,14 @@ class SimulatedClock : public Clock {
  private:
   friend class SimulatedWorkQueues;
 
+  void moveTo(Date base) {
+    base_ = base;
+    if (moved_) moved_();
+  }
+
   Date base_;  ///< what the wall clock showed, by its present setting, at the beginning
   double elapsed_ = 0;
+  std::function<void()> moved_;
 };
 
 }  // namespace kvr

@@ -1,8 +1,11 @@
 #pragma once
 
+#include "platform/FileFollowUpCenter.h"
 #include "platform/FilePreferences.h"
 #include "platform/Platform.h"
 #include "platform/simulated/SimulatedAccountStore.h"
+#include "platform/simulated/SimulatedActivityScheduler.h"
+#include "platform/simulated/SimulatedCarrierInfo.h"
 #include "platform/simulated/SimulatedClock.h"
 #include "platform/simulated/SimulatedDeviceAttestation.h"
 #include "platform/simulated/SimulatedDeviceProperties.h"
@@ -39,6 +42,7 @@ struct SimulatedPlatform {
   /// What waits finishes and all other work goes while everything it may use is still there.
   ~SimulatedPlatform() {
     log.beginEnding();
+    activities.beginEnding();
     queues.end();
   }
   SimulatedPlatform(const SimulatedPlatform&) = delete;
@@ -69,6 +73,11 @@ struct SimulatedPlatform {
   SimulatedDeviceAttestation attestation{queues};
   SimulatedServiceListeners services{queues, log};
   SimulatedProcesses processes;
+  SimulatedActivityScheduler activities{
+      propertyLists, clock, queues, random, deviceProperties, log, kMainBundleIdentifier,
+      {"com.tarsil.kvragent.upgrade", "com.tarsil.kvragent.boot"}};
+  FileFollowUpCenter followUps{propertyLists, clock};
+  SimulatedCarrierInfo carriers;
   Platform platform{log,           clock,
                     queues,        files,
                     propertyLists, preferences,
@@ -77,7 +86,9 @@ struct SimulatedPlatform {
                     featureFlags,  pairedDevices,
                     accounts,      accountSession,
                     attestation,   services,
-                    processes,     kMainBundleIdentifier};
+                    processes,     activities,
+                    followUps,     carriers,
+                    kMainBundleIdentifier};
 };
 
 }  // namespace kvr

@@ -1,0 +1,32 @@
+#pragma once
+
+#include "followup/FollowUpRules.h"
+
+#include <vector>
+
+namespace kvr {
+
+/// A device as the next-date computations see it.
+struct FollowUpDateFacts {
+  OfferFacts offer;
+  bool isPosted = false;           ///< its follow-up has been posted before
+  std::uint32_t daysEligible = 0;  ///< whole days left, rounded up
+};
+
+/// The earliest moment at which a device that has not been posted yet reaches its post date, or the end of
+/// such a device's eligibility when that comes earlier. An end that has passed is the answer at once. Nothing
+/// when there is no such moment.
+std::optional<Date> nextPostDate(const std::vector<FollowUpDateFacts>& devices, Date now);
+
+/// The earliest moment at which a shown follow-up's day count drops, a follow-up is due to be shown, or an
+/// eligibility ends. `day` is the length of a day in seconds. The initial form takes only what the devices
+/// give, and may be nothing; the other starts from a day after now.
+std::optional<Date> nextRefreshDate(const std::vector<FollowUpDateFacts>& devices, Date now, double day,
+                                    bool isInitialCall);
+
+/// The date for which an activity schedules itself again when `next` was computed at the end of a run: never
+/// one that would make it run back to back, whatever day length is stored.
+Date followingPostDate(Date next, Date now, double day);
+Date followingRefreshDate(Date next, Date now);
+
+}  // namespace kvr

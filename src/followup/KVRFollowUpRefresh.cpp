@@ -1,0 +1,59 @@
+#include "followup/KVRFollowUpRefresh.h"
+
+#include "agent/LookupPolicy.h"
+#include "followup/DeviceFacts.h"
+#include "followup/FollowUpKeys.h"
+#include "followup/KVRFollowUp.h"
+#include "scheduling/KVRScheduler.h"
+#include "warranty/WarrantyKeys.h"
+
+namespace kvr {
+
+std::string KVRFollowUpRefresh::identifier() const { return activity::kFollowUpRefresh; }
+
+void KVRFollowUpRefresh::performActivityForScheduler(const std::shared_ptr<KVRScheduler>& /*scheduler*/,
+                                                     ActivityHandler withCompletionHandler) {
+  deviceInfosQuery_(
+      LookupPolicy::kCacheOnly,
+      DeviceInfosAnswer(platform_.log, "KVRFollowUpRefresh",
+                        [self = shared_from_this(),
+                         withCompletionHandler](const std::optional<KVRDeviceInfoList>& list) {
+                          if (list) {
+                            self->refreshAndSchedule(*list);
+                            withCompletionHandler(ActivityResult::Finished);
+                          } else {
+                            self->platform_.log.standard(
+                                "Unable to load device info for followup refresh, defer");
+                            withCompletionHandler(ActivityResult::Deferred);
+                          }
+                        }));
+}
+
+void KVRFollowUpRefresh::refreshAndSchedule(const KVRDeviceInfoList& devicesInfo) {
+  auto& log = platform_.log;
+  const auto shown = KVRFollowUp(platform_).refreshFollowupWithDeviceInfos(devicesInfo);
+  if (shown.empty()) {
+    log.standard("No followups present, don't schedule another refresh");
+    return;
+  }
+  log.standard("Followup present, schedule refresh for %@", shown);
+  const auto now = platform_.clock.now();
+  const auto date = followingRefreshDate(_refreshDateWithDevicesInfo(platform_, shown).value_or(now), now);
+  log.standard("Schedule next refresh for %@", date);
+  KVRScheduler::newSchedulerWithActivityDelegate(platform_, shared_from_this())
+      ->scheduleActivityForDate(date);
+}
+
+std::optional<Date> KVRFollowUpRefresh::nextFollowUpRefreshDateWithDevicesInfo(
+    Platform& platform, const KVRDeviceInfoList& devicesInfo, bool isInitialCall) {
+  return nextRefreshDate(dateFactsOf(platform, devicesInfo), platform.clock.now(),
+                         platform.preferences.doubleForKey(preference::kOneDayInterval), isInitialCall);
+}
+
+std::optional<Date> KVRFollowUpRefresh::_refreshDateWithDevicesInfo(Platform& platform,
+                                                                    const KVRDeviceInfoList& devicesInfo) {
+  const auto date = nextFollowUpRefreshDateWithDevicesInfo(platform, devicesInfo, true);
+  return date ? date : nextFollowUpRefreshDateWithDevicesInfo(platform, devicesInfo, false);
+}
+
+}  // namespace kvr

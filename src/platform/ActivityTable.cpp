@@ -1,0 +1,271 @@
+#include "platform/ActivityTable.h"
+
+#include <algorithm>
+#include <cmath>
+#include <utility>
+
+namespace kvr {
+namespace {
+
+constexpr const char* kActivities = "activities";
+constexpr const char* kBootIdentifier = "bootIdentifier";
+constexpr const char* kOSVersion = "OSVersion";
+
+constexpr const char* kDelay = "delay";
+constexpr const char* kGracePeriod = "gracePeriod";
+constexpr const char* kRequiresNetwork = "requiresNetwork";
+constexpr const char* kPriority = "priority";
+constexpr const char* kRegisteredDate = "registeredDate";
+constexpr const char* kDueDate = "dueDate";
+
+/// The one priority at which activities run.
+constexpr const char* kUtility = "utility";
+
+bool isUsableDate(const Value& value) {
+  return value.isDate() && std::isfinite(value.date().secondsSince1970);
+}
+
+bool isRegistration(const Value& value) {
+  return value[kDelay].isNumber() && value[kGracePeriod].isNumber() && value[kRequiresNetwork].isBool() &&
+         isUsableDate(value[kRegisteredDate]) && isUsableDate(value[kDueDate]);
+}
+
+/// Whole seconds that are not negative.
+double seconds(std::int64_t count) { return static_cast<double>(std::max<std::int64_t>(count, 0)); }
+
+}  // namespace
+
+std::optional<Error> ActivityTable::complaintAbout(const Value& tree) {
+  const Value& activities = tree[kActivities];
+  if (activities.isNull()) return std::nullopt;
+  if (!activities.isDictionary()) return Error{"activities", 0, "the activities are not a dictionary"};
+  for (const auto& [identifier, registration] : activities.dictionary()) {
+    if (!isRegistration(registration)) {
+      return Error{"activities", 0, "activity " + identifier + " is no registration"};
+    }
+  }
+  return std::nullopt;
+}
+
+void ActivityTable::adopt(const Value& tree) {
+  if (!tree.isDictionary()) return;
+  Value::Dictionary records = tree.dictionary();
+  const Value activities = tree[kActivities];
+  records.erase(kActivities);
+  records_.merge(records);
+  if (!activities.isDictionary()) return;
+  for (const auto& [identifier, value] : activities.dictionary()) {
+    Entry& entry = entries_[identifier];
+    if (entry.registration) continue;
+    entry.registration = Registration{{value[kDelay].asInteger(), value[kGracePeriod].asInteger(),
+                                       value[kRequiresNetwork].asBool()},
+                                      value[kRegisteredDate].date(),
+                                      value[kDueDate].date()};
+    entry.registrationNumber = ++lastNumber_;
+  }
+}
+
+Value ActivityTable::tree() const {
+  Value::Dictionary activities;
+  for (const auto& [identifier, entry] : entries_) {
+    if (!entry.registration) continue;
+    const auto& [criteria, registered, due] = *entry.registration;
+    activities.emplace(identifier, Value::Dictionary{{kDelay, criteria.delay},
+                                                     {kGracePeriod, criteria.gracePeriod},
+                                                     {kRequiresNetwork, criteria.requiresNetwork},
+                                                     {kPriority, kUtility},
+                                                     {kRegisteredDate, registered},
+                                                     {kDueDate, due}});
+  }
+  Value::Dictionary tree = records_;
+  tree.insert_or_assign(kActivities, std::move(activities));
+  return tree;
+}
+
+ActivityBlock ActivityTable::add(const std::string& identifier, const ActivityCriteria& criteria,
+                                 ActivityBlock block, const Now& now, double draw) {
+  Entry& entry = entries_[identifier];
+  const Date opens = now.date + seconds(criteria.delay);
+  entry.registration = Registration{criteria, now.date, opens + seconds(criteria.gracePeriod) * draw};
+  entry.registrationNumber = ++lastNumber_;
+  entry.earliest.reset();
+  entry.notBefore = 0;
+  entry.backOff = 0;
+  return std::exchange(entry.block, std::move(block));
+}
+
+ActivityBlock ActivityTable::checkIn(const std::string& identifier, ActivityBlock block) {
+  return std::exchange(entries_[identifier].block, std::move(block));
+}
+
+bool ActivityTable::isRegistered(const std::string& identifier) const {
+  const auto found = entries_.find(identifier);
+  return found != entries_.end() && found->second.registration;
+}
+
+// Occasions.
+
+void ActivityTable::noticeSystemVersion(const std::string& identifier,
+                                        const std::optional<std::string>& version) {
+  const auto found = records_.find(kOSVersion);
+  const bool isRecorded = found != records_.end();
+  // A version that cannot be found out leaves an empty record, so that the occasion does not come back.
+  if (!isRecorded || (version && found->second != Value(*version))) {
+    noticeOccasion(identifier, kOSVersion, version.value_or(""));
+  }
+}
+
+bool ActivityTable::noticeBoot(const std::string& identifier, const std::string& boot, bool recordsLost) {
+  const auto found = records_.find(kBootIdentifier);
+  if (found == records_.end() && !recordsLost) {
+    records_.emplace(kBootIdentifier, boot);
+    return true;
+  }
+  if (found == records_.end() || found->second != Value(boot)) {
+    noticeOccasion(identifier, kBootIdentifier, boot);
+  }
+  return false;
+}
+
+void ActivityTable::noticeOccasion(const std::string& identifier, std::string record, std::string fact) {
+  entries_[identifier].occasion = Occasion{++lastNumber_, std::move(record), std::move(fact)};
+}
+
+/// Whether the entry's occasion is the first of those that can be served.
+bool ActivityTable::isInTurn(const Entry& entry) const {
+  return entry.occasion && std::ranges::none_of(entries_, [&entry](const auto& other) {
+           const Entry& candidate = other.second;
+           return candidate.occasion && candidate.block && candidate.occasion->order < entry.occasion->order;
+         });
+}
+
+// What is due.
+
+/// Whether nothing but its date can be in the way of a run.
+bool ActivityTable::mayRun(const Entry& entry, const Now& now) const {
+  if (!entry.block || entry.run || now.uptime < entry.notBefore) return false;
+  return isInTurn(entry) ||
+         (entry.registration && (now.networkReachable || !entry.registration->criteria.requiresNetwork));
+}
+
+/// The date of an entry that may run; nothing when it need not wait for one.
+std::optional<Date> ActivityTable::dateOf(const Entry& entry) const {
+  if (isInTurn(entry)) return entry.earliest;
+  return std::max(entry.registration->due, entry.earliest.value_or(entry.registration->due));
+}
+
+bool ActivityTable::isDue(const Entry& entry, const Now& now) const {
+  if (!mayRun(entry, now)) return false;
+  const auto date = dateOf(entry);
+  return !date || now.date >= *date;
+}
+
+bool ActivityTable::isInWindow(const Entry& entry, const Now& now) {
+  if (!entry.registration || entry.earliest) return false;
+  return now.date >= entry.registration->registered + seconds(entry.registration->criteria.delay);
+}
+
+std::vector<ActivityTable::Run> ActivityTable::takeDue(const Now& now) {
+  std::vector<Run> runs;
+  const bool isAnyDue =
+      std::ranges::any_of(entries_, [&](const auto& item) { return isDue(item.second, now); });
+  if (!isAnyDue) return runs;
+  for (auto& [identifier, entry] : entries_) {
+    if (!isDue(entry, now) && !(mayRun(entry, now) && isInWindow(entry, now))) continue;
+    UnderWay run;
+    run.number = ++lastNumber_;
+    run.registrationNumber = entry.registrationNumber;
+    run.needsNetwork = entry.registration && entry.registration->criteria.requiresNetwork;
+    if (isInTurn(entry)) run.occasion = entry.occasion->order;
+    run.started = now.uptime;
+    entry.run = run;
+    runs.push_back({identifier, run.number, entry.block});
+  }
+  return runs;
+}
+
+std::optional<double> ActivityTable::secondsToNext(const Now& now) const {
+  std::optional<double> next;
+  for (const auto& item : entries_) {
+    const Entry& entry = item.second;
+    // The date and the uptime when nothing more is to be waited for.
+    if (!mayRun(entry, {now.date, std::max(now.uptime, entry.notBefore), now.networkReachable})) continue;
+    double wait = std::max(entry.notBefore - now.uptime, 0.0);
+    if (const auto date = dateOf(entry)) wait = std::max(wait, *date - now.date);
+    next = std::min(next.value_or(wait), wait);
+  }
+  return next;
+}
+
+// Runs.
+
+ActivityTable::Entry* ActivityTable::runningEntry(const std::string& identifier) {
+  const auto found = entries_.find(identifier);
+  return found == entries_.end() || !found->second.run ? nullptr : &found->second;
+}
+
+void ActivityTable::setEarliestDate(const std::string& identifier, Date date, const Now& now) {
+  Entry* const entry = runningEntry(identifier);
+  if (entry == nullptr || !std::isfinite(date.secondsSince1970) || date <= now.date) return;
+  entry->run->earliest = date;
+}
+
+void ActivityTable::noticeNetworkLoss() {
+  for (auto& [identifier, entry] : entries_) {
+    if (entry.run) entry.run->lostNetwork = true;
+  }
+}
+
+bool ActivityTable::isRunThatNeedsNetwork(const std::string& identifier) const {
+  const auto found = entries_.find(identifier);
+  return found != entries_.end() && found->second.run && found->second.run->needsNetwork;
+}
+
+std::size_t ActivityTable::runsUnderWay() const {
+  return static_cast<std::size_t>(
+      std::ranges::count_if(entries_, [](const auto& item) { return item.second.run.has_value(); }));
+}
+
+ActivityTable::Ending ActivityTable::end(const std::string& identifier, std::uint64_t number,
+                                         ActivityResult result, const Now& now) {
+  Entry* const entry = runningEntry(identifier);
+  if (entry == nullptr || entry->run->number != number) return {};
+  const UnderWay run = *std::exchange(entry->run, std::nullopt);
+  const bool isReplaced = entry->registrationNumber != run.registrationNumber;
+  Ending ending;
+  if (result != ActivityResult::Finished) {
+    if (!isReplaced) defer(*entry, run, now);
+    return ending;
+  }
+  if (run.occasion && entry->occasion && entry->occasion->order == *run.occasion) {
+    records_.insert_or_assign(entry->occasion->record, entry->occasion->fact);
+    entry->occasion.reset();
+    ending.changesTree = true;
+  }
+  if (isReplaced) return ending;
+  ending.changesTree = ending.changesTree || entry->registration;
+  ending.released = std::move(entry->block);
+  entries_.erase(identifier);
+  return ending;
+}
+
+void ActivityTable::defer(Entry& entry, const UnderWay& run, const Now& now) {
+  entry.earliest = run.earliest;
+  entry.notBefore = run.started + kShortestCycle;
+  if (run.earliest) {
+    entry.backOff = 0;
+    return;
+  }
+  // Whoever waits for the network is held back by its absence alone.
+  if (run.needsNetwork && (run.lostNetwork || !now.networkReachable)) return;
+  entry.backOff = entry.backOff == 0 ? kFirstBackOff : std::min(2 * entry.backOff, kLongestBackOff);
+  entry.notBefore = now.uptime + entry.backOff;
+}
+
+std::vector<ActivityBlock> ActivityTable::releaseBlocks() {
+  std::vector<ActivityBlock> blocks;
+  for (auto& [identifier, entry] : entries_) blocks.push_back(std::exchange(entry.block, nullptr));
+  return blocks;
+}
+
+}  // namespace kvr

@@ -1,0 +1,142 @@
+#pragma once
+
+#include "platform/ActivityScheduler.h"
+#include "platform/Error.h"
+#include "platform/Value.h"
+
+#include <map>
+#include <string>
+#include <vector>
+
+namespace kvr {
+
+/// The rules by which background activities run: what is registered, what is due, what a deferral leads to.
+///
+/// A *registration* is an activity's criteria and the dates that follow from them: its *window* opens `delay`
+/// seconds after it was registered and is `gracePeriod` seconds long; the *due date* is one point in it,
+/// drawn once. A *check-in* brings the block to run; without one a registration waits. An *occasion* is a
+/// reason of the platform's own to run an activity that has checked in: the system was upgraded, or started
+/// anew. Occasions are served one after the other, in the order noticed, so that none works on what another
+/// is about to change.
+///
+///     table.add("outreach", {.delay = 3600, .gracePeriod = 360}, block, now, 0.5);
+///     const auto wait = table.secondsToNext(now);           // arm a timer
+///     for (auto& run : table.takeDue(later)) start(run);
+///     table.end(identifier, number, ActivityResult::Finished, later);
+///
+/// Facts in, decisions out: it reads no clock and starts nothing. Not thread-safe.
+class ActivityTable {
+ public:
+  /// The moment at which a question is asked.
+  struct Now {
+    Date date;                     ///< by the wall clock
+    double uptime = 0;             ///< seconds by a clock that nobody moves and that counts while suspended
+    bool networkReachable = true;
+  };
+
+  /// A run that is to be started.
+  struct Run {
+    std::string identifier;
+    std::uint64_t number = 0;
+    ActivityBlock block;
+  };
+
+  /// What the end of a run led to.
+  struct Ending {
+    bool changesTree = false;  ///< whether what is persisted has changed
+    ActivityBlock released;    ///< a block that is not needed any more
+  };
+
+  static constexpr double kFirstBackOff = 10;      ///< seconds
+  static constexpr double kLongestBackOff = 3600;  ///< seconds
+  /// Between the starts of two runs that are one registration's, in seconds.
+  static constexpr double kShortestCycle = 0.5;
+
+  // What is persisted: registrations, and the boot and system version whose occasions were served.
+
+  /// Why a tree is not one that `tree` gave, if it is not.
+  static std::optional<Error> complaintAbout(const Value& tree);
+  /// Takes over the registrations of a sound tree, but for what is registered or recorded
+  /// already.
+  void adopt(const Value& tree);
+  Value tree() const;
+
+  /// Registers an activity anew. `draw`, from 0 to below 1, decides the due date. Returns the block that was
+  /// replaced. A run that is under way goes on and no longer concerns the registration.
+  ActivityBlock add(const std::string& identifier, const ActivityCriteria& criteria, ActivityBlock block,
+                    const Now& now, double draw);
+  /// Brings a block for whatever the identifier is or will be due for. Returns the block that was replaced.
+  ActivityBlock checkIn(const std::string& identifier, ActivityBlock block);
+  bool isRegistered(const std::string& identifier) const;
+
+  /// An occasion when none or another version is recorded. Nothing as the version (it cannot be found out) is
+  /// one only when none is recorded. The version is recorded once the run has finished.
+  void noticeSystemVersion(const std::string& identifier, const std::optional<std::string>& version);
+  /// An occasion when another boot is recorded, or when `recordsLost`: then it may have been any. The first
+  /// boot ever is only recorded. Returns whether what is persisted has changed.
+  bool noticeBoot(const std::string& identifier, const std::string& boot, bool recordsLost);
+
+  /// The runs to start now; they count as under way. Whatever is in its window goes along with what is due.
+  std::vector<Run> takeDue(const Now& now);
+  /// Seconds until something will be due, the network staying as it is; nothing when nothing will.
+  std::optional<double> secondsToNext(const Now& now) const;
+
+  /// The date that the run under way waits for; one that is not ahead tells nothing.
+  void setEarliestDate(const std::string& identifier, Date date, const Now& now);
+  /// To be called when the network has gone: runs that need it may be deferred for this reason.
+  void noticeNetworkLoss();
+  /// Whether a run is under way that needs the network.
+  bool isRunThatNeedsNetwork(const std::string& identifier) const;
+  std::size_t runsUnderWay() const;
+  Ending end(const std::string& identifier, std::uint64_t number, ActivityResult result, const Now& now);
+
+  /// Gives back every block.
+  std::vector<ActivityBlock> releaseBlocks();
+
+ private:
+  struct Registration {
+    ActivityCriteria criteria;
+    Date registered;
+    Date due;
+  };
+  struct Occasion {
+    std::uint64_t order = 0;
+    std::string record;  ///< the key under which `fact` is recorded once the occasion has been served
+    std::string fact;
+  };
+  struct UnderWay {
+    std::uint64_t number = 0;
+    std::uint64_t registrationNumber = 0;
+    bool needsNetwork = false;
+    bool lostNetwork = false;
+    std::optional<std::uint64_t> occasion;  ///< its order
+    double started = 0;                     ///< uptime
+    std::optional<Date> earliest;
+  };
+  struct Entry {
+    std::optional<Registration> registration;
+    std::uint64_t registrationNumber = 0;
+    std::optional<Occasion> occasion;
+    ActivityBlock block;
+    std::optional<UnderWay> run;
+    // What deferrals led to, since the last registration.
+    std::optional<Date> earliest;
+    double notBefore = 0;  ///< uptime
+    double backOff = 0;    ///< seconds of the last wait
+  };
+
+  Entry* runningEntry(const std::string& identifier);
+  void noticeOccasion(const std::string& identifier, std::string record, std::string fact);
+  bool isInTurn(const Entry& entry) const;
+  bool mayRun(const Entry& entry, const Now& now) const;
+  std::optional<Date> dateOf(const Entry& entry) const;
+  bool isDue(const Entry& entry, const Now& now) const;
+  static bool isInWindow(const Entry& entry, const Now& now);
+  void defer(Entry& entry, const UnderWay& run, const Now& now);
+
+  std::map<std::string, Entry, std::less<>> entries_;
+  Value::Dictionary records_;  ///< the tree's top level, but for the registrations
+  std::uint64_t lastNumber_ = 0;
+};
+
+}  // namespace kvr

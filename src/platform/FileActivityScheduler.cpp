@@ -1,0 +1,275 @@
+#include "platform/FileActivityScheduler.h"
+
+#include <algorithm>
+#include <cmath>
+#include <exception>
+#include <utility>
+
+namespace kvr {
+namespace {
+
+constexpr auto kDictionary = PropertyListFiles::Expected::Dictionary;
+constexpr auto kSetAside = PropertyListFiles::WhenDamaged::SetAside;
+
+constexpr double kLongestDelay = 1e15;  // seconds; whatever lies further ahead never comes
+
+/// Whole seconds from `now` until `date`, not negative.
+std::int64_t wholeSeconds(Date date, Date now) {
+  const double seconds = date - now;
+  return seconds > 0 ? static_cast<std::int64_t>(std::min(seconds, kLongestDelay)) : 0;
+}
+
+}  // namespace
+
+class FileActivityScheduler::Handle : public Activity {
+ public:
+  Handle(FileActivityScheduler& scheduler, std::string identifier)
+      : scheduler_(scheduler), identifier_(std::move(identifier)) {}
+
+  const std::string& identifier() const override { return identifier_; }
+  void setPreregistered(bool preregistered) override {
+    const std::lock_guard lock(mutex_);
+    preregistered_ = preregistered;
+  }
+  void setCriteria(const ActivityCriteria& criteria) override {
+    const std::lock_guard lock(mutex_);
+    criteria_ = criteria;
+  }
+  void schedule(ActivityBlock block) override {
+    bool preregistered = false;
+    {
+      const std::lock_guard lock(mutex_);
+      preregistered = preregistered_;
+      scheduled_ = true;
+    }
+    preregistered ? scheduler_.checkIn(*this, std::move(block))
+                  : scheduler_.registerAnew(*this, std::move(block));
+  }
+  void setEarliestDate(Date date) override {
+    {
+      const std::lock_guard lock(mutex_);
+      if (!scheduled_) expected_ = date;
+    }
+    scheduler_.setEarliestDate(identifier_, date);
+  }
+  bool shouldDefer() const override { return scheduler_.shouldDefer(identifier_); }
+
+  ActivityCriteria criteria() const {
+    const std::lock_guard lock(mutex_);
+    return criteria_;
+  }
+  std::optional<Date> expectedDate() const {
+    const std::lock_guard lock(mutex_);
+    return expected_;
+  }
+
+ private:
+  FileActivityScheduler& scheduler_;
+  const std::string identifier_;
+  mutable std::mutex mutex_;  ///< guards what follows
+  bool preregistered_ = false;
+  bool scheduled_ = false;
+  ActivityCriteria criteria_;
+  std::optional<Date> expected_;  ///< told before the check-in
+};
+
+/// The other end of a run's handler. A handler that goes without an answer defers its run.
+class FileActivityScheduler::RunEnd {
+ public:
+  RunEnd(FileActivityScheduler& scheduler, std::string identifier, std::uint64_t number)
+      : scheduler_(scheduler),
+        life_(scheduler.life_),
+        identifier_(std::move(identifier)),
+        number_(number) {}
+  RunEnd(const RunEnd&) = delete;
+  RunEnd& operator=(const RunEnd&) = delete;
+  ~RunEnd() {
+    try {
+      tell(ActivityResult::Deferred);
+    } catch (const std::exception&) {
+      // Without memory to go on with, the run counts as under way until the process ends.
+      told_ = true;
+    }
+  }
+
+  void tell(ActivityResult result) {
+    if (std::exchange(told_, true)) return;
+    if (const auto alive = life_.lock()) scheduler_.end(identifier_, number_, result);
+  }
+
+ private:
+  FileActivityScheduler& scheduler_;
+  const std::weak_ptr<const bool> life_;
+  const std::string identifier_;
+  const std::uint64_t number_;
+  bool told_ = false;
+};
+
+FileActivityScheduler::FileActivityScheduler(PropertyListFiles& lists, const Clock& clock, WorkQueues& queues,
+                                             Random& random, const DeviceProperties& device, Log& log,
+                                             const std::string& mainBundleIdentifier,
+                                             ActivityOccasions occasions)
+    : lists_(lists),
+      clock_(clock),
+      queues_(queues),
+      random_(random),
+      device_(device),
+      log_(log),
+      directory_(lists.files().homeDirectory() + "/Library/Activities"),
+      path_(directory_ + "/" + mainBundleIdentifier + ".plist"),
+      occasions_(std::move(occasions)) {}
+
+std::unique_ptr<Activity> FileActivityScheduler::newActivity(std::string identifier) {
+  return std::make_unique<Handle>(*this, std::move(identifier));
+}
+
+void FileActivityScheduler::checkIn(const Handle& handle, ActivityBlock block) {
+  const std::string& identifier = handle.identifier();
+  const auto expected = handle.expectedDate();
+  std::optional<std::string> version;
+  if (identifier == occasions_.afterUpgrade) version = device_.answer(DeviceProperties::kProductVersion);
+  bool changed = false;
+  ActivityBlock replaced;
+  {
+    const std::lock_guard lock(mutex_);
+    load();
+    if (expected && !table_.isRegistered(identifier)) {
+      const auto moment = now();
+      const ActivityCriteria criteria{wholeSeconds(*expected, moment.date), 0,
+                                      handle.criteria().requiresNetwork};
+      replaced = table_.add(identifier, criteria, std::move(block), moment, 0);
+      changed = true;
+    } else {
+      replaced = table_.checkIn(identifier, std::move(block));
+    }
+    if (identifier == occasions_.afterUpgrade) table_.noticeSystemVersion(identifier, version);
+    if (identifier == occasions_.afterBoot) {
+      changed |= table_.noticeBoot(identifier, bootIdentifier(), registrationsLost_);
+      registrationsLost_ = false;
+    }
+  }
+  if (changed) save();
+  startDue();
+}
+
+void FileActivityScheduler::registerAnew(const Handle& handle, ActivityBlock block) {
+  const double fraction = draw();
+  ActivityBlock replaced;
+  {
+    const std::lock_guard lock(mutex_);
+    load();
+    replaced = table_.add(handle.identifier(), handle.criteria(), std::move(block), now(), fraction);
+  }
+  save();
+  startDue();
+}
+
+void FileActivityScheduler::setEarliestDate(const std::string& identifier, Date date) {
+  const std::lock_guard lock(mutex_);
+  table_.setEarliestDate(identifier, date, now());
+}
+
+bool FileActivityScheduler::shouldDefer(const std::string& identifier) const {
+  const std::lock_guard lock(mutex_);
+  return ending_ || (!networkReachable_ && table_.isRunThatNeedsNetwork(identifier));
+}
+
+void FileActivityScheduler::setNetworkReachable(bool reachable) {
+  {
+    const std::lock_guard lock(mutex_);
+    if (networkReachable_ == reachable) return;
+    networkReachable_ = reachable;
+    if (!reachable) table_.noticeNetworkLoss();
+  }
+  startDue();
+}
+
+void FileActivityScheduler::beginEnding() {
+  const std::lock_guard lock(mutex_);
+  ending_ = true;
+  arm(std::nullopt);
+}
+
+std::size_t FileActivityScheduler::runsUnderWay() const {
+  const std::lock_guard lock(mutex_);
+  return table_.runsUnderWay();
+}
+
+ActivityTable::Now FileActivityScheduler::now() const { return {clock_.now(), uptime(), networkReachable_}; }
+
+/// From 0 to below 1; the first digits of a random UUID are all random.
+double FileActivityScheduler::draw() {
+  constexpr int kDigits = 8;
+  const std::string uuid = random_.uuid();
+  return std::ldexp(static_cast<double>(std::stoul(uuid.substr(0, kDigits), nullptr, 16)), -4 * kDigits);
+}
+
+// Runs.
+
+void FileActivityScheduler::startDue() {
+  std::vector<ActivityTable::Run> runs;
+  {
+    const std::lock_guard lock(mutex_);
+    if (ending_) return;
+    const auto moment = now();
+    runs = table_.takeDue(moment);
+    arm(table_.secondsToNext(moment));
+  }
+  for (auto& run : runs) start(std::move(run));
+}
+
+void FileActivityScheduler::start(ActivityTable::Run run) {
+  queues_.concurrentQueue(Priority::Default)->async([this, alive = life(), run = std::move(run)] {
+    if (alive.expired()) return;
+    const auto end = std::make_shared<RunEnd>(*this, run.identifier, run.number);
+    run.block(ActivityHandler(log_, "activity run", [end](ActivityResult result) { end->tell(result); }));
+  });
+}
+
+void FileActivityScheduler::end(const std::string& identifier, std::uint64_t number, ActivityResult result) {
+  ActivityTable::Ending ending;
+  {
+    const std::lock_guard lock(mutex_);
+    ending = table_.end(identifier, number, result, now());
+  }
+  if (ending.changesTree) {
+    // Whoever tells the end of a run, the main queue perhaps, is not made to wait for the disk.
+    queues_.concurrentQueue(Priority::Default)->async([this, alive = life()] {
+      if (!alive.expired()) save();
+    });
+  }
+  startDue();
+}
+
+// The file.
+
+/// With the mutex held.
+void FileActivityScheduler::load() {
+  if (std::exchange(loaded_, true)) return;
+  const bool isThere = lists_.files().stamp(path_).has_value();
+  const auto tree = lists_.read(path_, kDictionary, kSetAside, ActivityTable::complaintAbout);
+  unreadable_ = !tree;
+  registrationsLost_ = unreadable_ || (isThere && tree->isNull());
+  if (tree) table_.adopt(*tree);
+}
+
+void FileActivityScheduler::save() {
+  const std::lock_guard saving(saving_);
+  const auto fileLock = lists_.files().lock(directory_);
+  Value tree;
+  {
+    const std::lock_guard lock(mutex_);
+    if (unreadable_) {
+      const auto found = lists_.read(path_, kDictionary, kSetAside, ActivityTable::complaintAbout);
+      if (!found) return;  // which has been reported
+      table_.adopt(*found);
+      unreadable_ = false;
+    }
+    tree = table_.tree();
+  }
+  if (const auto error = lists_.write(path_, tree, PropertyListEncoding::Binary)) {
+    log_.error("the activities cannot be stored: %@", *error);
+  }
+}
+
+}  // namespace kvr

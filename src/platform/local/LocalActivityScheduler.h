@@ -1,0 +1,43 @@
+#pragma once
+
+#include "platform/FileActivityScheduler.h"
+#include "platform/local/Descriptor.h"
+#include "platform/local/LocalNetwork.h"
+
+namespace kvr {
+
+/// Background activities on this machine.
+///
+/// One timer of the wall clock, which the kernel ends early when that clock is set; it is armed for the next
+/// activity only. The wait of a deferral is boot time: it is worked out afresh whenever the timer ends. Built
+/// and destroyed on the loop's thread.
+class LocalActivityScheduler : public FileActivityScheduler {
+ public:
+  /// Where the kernel tells the identifier of this boot.
+  static constexpr const char* kBootIdentifierPath = "/proc/sys/kernel/random/boot_id";
+
+  /// Throws std::system_error when the kernel refuses a descriptor.
+  LocalActivityScheduler(EventLoop& loop, const DeviceRoot& root, const Clock& clock, WorkQueues& queues,
+                         Random& random, const DeviceProperties& device, Log& log,
+                         const std::string& mainBundleIdentifier, ActivityOccasions occasions,
+                         std::string bootIdentifierPath = kBootIdentifierPath);
+  ~LocalActivityScheduler() override;
+  LocalActivityScheduler(const LocalActivityScheduler&) = delete;
+  LocalActivityScheduler& operator=(const LocalActivityScheduler&) = delete;
+
+ protected:
+  double uptime() const override;
+  std::string bootIdentifier() const override;
+  void arm(std::optional<double> wait) override;
+
+ private:
+  void timerEnded() noexcept;
+  void networkChanged(bool reachable) noexcept;
+
+  const std::string bootIdentifierPath_;
+  const Descriptor timer_;
+  sd_event_source* source_ = nullptr;
+  LocalNetwork network_;
+};
+
+}  // namespace kvr

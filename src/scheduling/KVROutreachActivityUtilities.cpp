@@ -1,0 +1,146 @@
+#include "scheduling/KVROutreachActivityUtilities.h"
+
+#include "agent/AgentKeys.h"
+#include "devices/KVRDevicesManager.h"
+#include "followup/KVRFollowUpPost.h"
+#include "scheduling/KVRScheduler.h"
+#include "scheduling/OutreachRules.h"
+#include "warranty/KVRWarrantyDownloader.h"
+
+namespace kvr {
+namespace {
+
+constexpr double kDeferCheckInterval = 2'000'000'000;  // seconds
+
+std::string describeSubscriptions(const std::map<std::string, Carrier>& subscriptions) {
+  std::string text = "{";
+  for (const auto& [subscription, carrier] : subscriptions) {
+    text += subscription + " = " + describe(carrier) + "; ";
+  }
+  return text + "}";
+}
+
+}  // namespace
+
+void KVROutreachActivityUtilities::performOutreachActivityForConversion(
+    bool conversion, const std::shared_ptr<KVRScheduler>& withScheduler, ActivityHandler andCompletion) {
+  outreachInProgress = true;
+  startDeferCheck(conversion, withScheduler, andCompletion);
+  std::vector<KVRDeviceRef> devices;
+  for (const auto& [serialNumber, device] : KVRDevicesManager::sharedManager(platform_)->allDevices()) {
+    devices.push_back(device);
+  }
+  platform_.log.standard(
+      "%s: -- Conversion: %d -- devices: %@",
+      "-[KVROutreachActivityUtilities performOutreachActivityForConversion:withScheduler:andCompletion:]",
+      conversion, devices);
+  const auto downloader = std::make_shared<KVRWarrantyDownloader>(platform_, kPreferencesBundleID);
+  const auto self = shared_from_this();
+  for (const auto& device : devices) {
+    const auto serialNumber = device->serialNumber();
+    downloads_.enter();
+    downloader->downloadWarrantyForSerialNumber(
+        serialNumber,
+        DownloadCompletion(platform_.log, "performOutreachActivity",
+                           [self, serialNumber, conversion](bool success, const KVRWarrantyRef& warranty) {
+                             self->handleDownload(serialNumber, success, warranty, conversion);
+                             self->downloads_.leave();
+                           }));
+  }
+  downloads_.notify(
+      platform_.queues.concurrentQueue(Priority::Default),
+      [self, conversion, andCompletion] { self->finish(conversion, andCompletion); });
+}
+
+void KVROutreachActivityUtilities::startDeferCheck(bool conversion,
+                                                   const std::shared_ptr<KVRScheduler>& scheduler,
+                                                   const ActivityHandler& completion) {
+  outReachTimer = platform_.queues.newRepeatingTimer(
+      kDeferCheckInterval, platform_.queues.mainQueue(),
+      [run = weak_from_this(), conversion, scheduler, completion] {
+        const auto self = run.lock();
+        if (!self || !self->outreachInProgress || !scheduler->shouldDefer()) return;
+        self->platform_.log.standard("Warranty download activity deferred. Conversion: %d", conversion);
+        self->stopDeferCheck();
+        self->answer(completion, ActivityResult::Deferred);
+      });
+}
+
+void KVROutreachActivityUtilities::stopDeferCheck() {
+  if (const auto timer = outReachTimer()) timer->invalidate();
+  outReachTimer = nullptr;
+}
+
+void KVROutreachActivityUtilities::handleDownload(const std::optional<std::string>& serialNumber, bool success,
+                                                  const KVRWarrantyRef& warranty, bool conversion) {
+  auto& log = platform_.log;
+  log.standard("serialNumber: %@ success: %d -- Conversion: %d", serialNumber, success, conversion);
+  if (!success || !warranty) {
+    log.error("Warranty failed to download");
+    return;
+  }
+  log.standard("Warranty downloaded successfully");
+  if (!warranty->zubOfferDisplay()) {
+    log.standard("Warranty shows device is ineligible, complete activity without scheduling followup");
+    return;
+  }
+  log.standard("Coverage check shows device should display Zub offer, check on-device state");
+  if (!currentDeviceShouldReceiveOutreachForWarranty(*warranty)) {
+    log.standard(
+        "Configuration does not support current device. Complete activity without scheduling followup");
+    return;
+  }
+  const auto candidate = outreachPostDate(*warranty);
+  const auto now = platform_.clock.now();
+  const std::lock_guard lock(mutex_);
+  earliestPostDate_ = earlierPostDate(earliestPostDate_, candidate, now);
+}
+
+void KVROutreachActivityUtilities::finish(bool conversion, const ActivityHandler& completion) {
+  std::optional<Date> postDate;
+  {
+    const std::lock_guard lock(mutex_);
+    postDate = earliestPostDate_;
+  }
+  if (postDate) {
+    platform_.log.standard("Conversion: %d -- Complete activity and schedule followUp post for: %@",
+                           conversion, *postDate);
+    KVRScheduler::newSchedulerWithActivityDelegate(platform_, std::make_shared<KVRFollowUpPost>(platform_))
+        ->scheduleActivityForDate(postDate);
+  } else {
+    platform_.log.standard("Conversion: %d -- No devices eligible for followUp posts", conversion);
+  }
+  outreachInProgress = false;
+  stopDeferCheck();
+  answer(completion, ActivityResult::Finished);
+}
+
+void KVROutreachActivityUtilities::answer(const ActivityHandler& completion, ActivityResult result) {
+  if (answered_.exchange(true)) {
+    platform_.log.debug("Outreach run was answered already, result %d dropped",
+                        static_cast<std::int64_t>(result));
+    return;
+  }
+  completion(result);
+}
+
+bool KVROutreachActivityUtilities::currentDeviceShouldReceiveOutreachForWarranty(
+    const KVRWarranty& warranty) const {
+  auto& log = platform_.log;
+  const auto subscriptions = platform_.carriers.subscriptions();
+  for (const auto& [subscription, carrier] : subscriptions) {
+    if (!carrier.mobileCountryCode) {
+      log.error("No mobileCountryCode for networkInfo: %@, carrier: %@", describeSubscriptions(subscriptions),
+                describe(carrier));
+    }
+    const auto identifier = carrierID(carrier);
+    log.standard("carrierID: %@", identifier);
+    if (excludesCarrier(warranty.zubOfferToggle(), identifier)) {
+      log.standard("carrier matched");
+      return false;
+    }
+  }
+  return true;
+}
+
+}  // namespace kvr

@@ -1,0 +1,26 @@
+#pragma once
+
+#include "platform/Platform.h"
+#include "scheduling/KVRSchedulerActivityDelegate.h"
+
+namespace kvr {
+
+/// Runs after every boot: registers again what still has a target date, each for that same date, and nothing
+/// else.
+class KVRPostBootActivity : public KVRSchedulerActivityDelegate {
+ public:
+  explicit KVRPostBootActivity(Platform& platform) : platform_(platform) {}
+
+  std::string identifier() const override;
+  bool requiresNetwork() const override { return false; }
+  void performActivityForScheduler(const std::shared_ptr<KVRScheduler>& scheduler,
+                                   ActivityHandler withCompletionHandler) override;
+
+ private:
+  /// The date for which the activity was registered again, if it was.
+  std::optional<Date> registerAgain(std::shared_ptr<KVRSchedulerActivityDelegate> activity);
+
+  Platform& platform_;
+};
+
+}  // namespace kvr

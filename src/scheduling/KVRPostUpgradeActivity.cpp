@@ -1,0 +1,73 @@
+#include "scheduling/KVRPostUpgradeActivity.h"
+
+#include "agent/AgentKeys.h"
+#include "devices/DeviceKeys.h"
+#include "scheduling/KVRConversionOutreachActivity.h"
+#include "scheduling/KVROutreachActivity.h"
+#include "scheduling/KVRScheduler.h"
+#include "scheduling/SchedulingKeys.h"
+#include "scheduling/VersionOrder.h"
+
+namespace kvr {
+
+std::string KVRPostUpgradeActivity::identifier() const { return activity::kPostUpgrade; }
+
+void KVRPostUpgradeActivity::performActivityForScheduler(const std::shared_ptr<KVRScheduler>& /*scheduler*/,
+                                                         ActivityHandler withCompletionHandler) {
+  if (platform_.preferences.boolForKey(preference::kPostUpgradeActivityCompleted)) {
+    performLaterRun();
+  } else {
+    performFirstRun();
+  }
+  recordOSVersion();
+  withCompletionHandler(ActivityResult::Finished);
+}
+
+void KVRPostUpgradeActivity::performLaterRun() {
+  if (!shouldTriggerWarrantyDownload()) {
+    platform_.log.standard("post upgrade activity already performed");
+    return;
+  }
+  platform_.log.standard("Forcing conversion outreach on upgrade");
+  KVRScheduler::newSchedulerWithActivityDelegate(platform_,
+                                                 std::make_shared<KVRConversionOutreachActivity>(platform_))
+      ->scheduleActivityForDate(platform_.clock.now());
+}
+
+void KVRPostUpgradeActivity::performFirstRun() {
+  auto& preferences = platform_.preferences;
+  platform_.log.standard("post upgrade activity hasn't yet been performed, perform upgrade activity");
+  const bool hasAccount = platform_.accounts.primaryAccount().has_value();
+  KVRScheduler::clearScheduledActivities(platform_);
+  preferences.setObject(platform_.clock.now(), preference::kDefaultDeviceActivationDate);
+  if (hasAccount) {
+    KVRScheduler::newSchedulerWithActivityDelegate(platform_, std::make_shared<KVROutreachActivity>(platform_))
+        ->scheduleActivityForDate(platform_.clock.now());
+    preferences.setObject(true, preference::kInitialOutreachActivityScheduled);
+  } else {
+    platform_.log.standard(
+        "No primary account detected. Finishing post upgrade activity without scheduling outreach");
+  }
+  preferences.setObject(true, preference::kPostUpgradeActivityCompleted);
+}
+
+void KVRPostUpgradeActivity::recordOSVersion() {
+  const auto version = platform_.deviceProperties.answer(DeviceProperties::kProductVersion);
+  if (version) {
+    platform_.preferences.setObject(*version, preference::kPostUpgradeOSVersion);
+  } else {
+    platform_.log.error("Unable to get OS version");
+  }
+}
+
+bool KVRPostUpgradeActivity::shouldTriggerWarrantyDownload() const {
+  const auto current = platform_.deviceProperties.answer(DeviceProperties::kProductVersion);
+  const auto recorded = platform_.preferences.stringForKey(preference::kPostUpgradeOSVersion);
+  if (!current) return false;
+  if (recorded && compareVersions(*current, *recorded) <= 0) return false;
+  const auto outreach = KVRScheduler::newSchedulerWithActivityDelegate(
+      platform_, std::make_shared<KVROutreachActivity>(platform_));
+  return !outreach->scheduledActivityDate();
+}
+
+}  // namespace kvr

@@ -1,0 +1,107 @@
+#include "scheduling/KVRScheduler.h"
+
+#include "scheduling/SchedulingKeys.h"
+
+#include <algorithm>
+
+namespace kvr {
+namespace {
+
+constexpr double kHandBackDelay = 1;  // seconds
+constexpr double kLongestDelay = 1e15;  // seconds; the calendar's own limit
+constexpr double kGraceShare = 10;  // the grace period is this part of the delay
+
+/// From `delay`, 0 or more, in seconds.
+ActivityCriteria criteria(double delay, bool requiresNetwork) {
+  delay = std::min(delay, kLongestDelay);
+  ActivityCriteria criteria;
+  criteria.gracePeriod = static_cast<std::int64_t>(delay / kGraceShare);
+  criteria.delay = static_cast<std::int64_t>(delay);
+  criteria.requiresNetwork = requiresNetwork;
+  return criteria;
+}
+
+}  // namespace
+
+std::shared_ptr<KVRScheduler> KVRScheduler::newSchedulerWithActivityDelegate(
+    Platform& platform, std::shared_ptr<KVRSchedulerActivityDelegate> activityDelegate) {
+  return std::make_shared<KVRScheduler>(platform, std::move(activityDelegate));
+}
+
+KVRScheduler::KVRScheduler(Platform& platform, std::shared_ptr<KVRSchedulerActivityDelegate> theDelegate)
+    : activityDelegate(theDelegate),
+      platform_(platform),
+      activity_(platform.activities.newActivity(theDelegate->identifier())),
+      targetDateKey_(activity_->identifier() + preference::kTargetDateSuffix) {}
+
+void KVRScheduler::clearScheduledActivities(Platform& platform) {
+  for (const auto& key : platform.preferences.allKeys()) {
+    if (!key.ends_with(preference::kTargetDateSuffix)) continue;
+    platform.log.standard("Clearing %@", key);
+    platform.preferences.removeObject(key);
+  }
+}
+
+void KVRScheduler::monitorForScheduledActivity() {
+  platform_.log.standard("monitorForScheduledActivity for '%@'", identifier());
+  activity_->setPreregistered(true);
+  activity_->schedule([self = shared_from_this()](ActivityHandler handler) {
+    self->performScheduledOutreachWithBlock(std::move(handler));
+  });
+}
+
+void KVRScheduler::scheduleActivityWithDelay(double delay) {
+  _scheduleActivityWithDelay(delay, platform_.clock.now() + delay);
+}
+
+void KVRScheduler::scheduleActivityForDate(std::optional<Date> date) {
+  _scheduleActivityWithDelay(date ? *date - platform_.clock.now() : 0, date);
+}
+
+void KVRScheduler::_scheduleActivityWithDelay(double delay, std::optional<Date> forDate) {
+  platform_.log.standard("scheduled '%@' with delay: %.02f (%@)", identifier(), delay, forDate);
+  activity_->setPreregistered(false);
+  activity_->setCriteria(criteria(delay > 0 ? delay : 0, activityDelegate()->requiresNetwork()));
+  platform_.preferences.setObject(forDate, targetDateKey_);
+  activity_->schedule([self = shared_from_this()](ActivityHandler handler) {
+    self->platform_.log.standard("Velt activity block occured '%@' at (%@)", self->identifier(),
+                                 self->platform_.clock.now());
+    self->performScheduledOutreachWithBlock(std::move(handler));
+  });
+}
+
+std::optional<Date> KVRScheduler::scheduledActivityDate() const {
+  return platform_.preferences.dateForKey(targetDateKey_);
+}
+
+void KVRScheduler::performScheduledOutreachWithBlock(ActivityHandler block) {
+  auto& log = platform_.log;
+  const auto stored = platform_.preferences.objectForKey(targetDateKey_);
+  const auto target = stored.dateIfAny();
+  log.standard("activity for '%@' should occur on: %@", identifier(), target);
+  const double remaining = target ? *target - platform_.clock.now() : 0;
+  const ActivityHandler handler(log, "performScheduledOutreachWithBlock",
+                                [self = shared_from_this(), stored, block](ActivityResult result) {
+                                  self->relay(result, stored, block);
+                                });
+  if (remaining > 0) {
+    log.standard("target not past for '%@', defer for: %.02f", identifier(), remaining);
+    activity_->setEarliestDate(*target);
+    handler(ActivityResult::Deferred);
+    return;
+  }
+  log.standard("target reached for '%@', trigger activity", identifier());
+  activityDelegate()->performActivityForScheduler(shared_from_this(), handler);
+}
+
+void KVRScheduler::relay(ActivityResult result, const Value& startedFor, const ActivityHandler& block) {
+  if (result == ActivityResult::Finished) {
+    // A date other than the one this run started for belongs to the next run.
+    platform_.preferences.update(targetDateKey_, [&](const Value& stored) {
+      return stored == startedFor ? Value() : stored;
+    });
+  }
+  platform_.queues.after(kHandBackDelay, platform_.queues.mainQueue(), [block, result] { block(result); });
+}
+
+}  // namespace kvr

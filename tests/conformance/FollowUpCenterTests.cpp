@@ -1,0 +1,120 @@
+#include "conformance/FileWorld.h"
+#include "platform/FileFollowUpCenter.h"
+
+#include <cerrno>
+#include <thread>
+
+namespace kvr {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+using ::testing::SizeIs;
+
+const std::string kClient = "com.tarsil.Kavrel";
+
+FollowUpItem itemNamed(const std::string& identifier) {
+  FollowUpItem item;
+  item.uniqueIdentifier = identifier;
+  return item;
+}
+
+class AFollowUpCenter : public InBothWorlds {
+ protected:
+  std::vector<std::string> pending() {
+    std::vector<std::string> names;
+    for (const auto& item : *client->pendingItems()) names.push_back(*item.uniqueIdentifier);
+    return names;
+  }
+  void put(const Value& tree) { world.put(path, *writePropertyList(tree, PropertyListEncoding::XML)); }
+
+  const std::string folder = world.path("Library/FollowUps");
+  const std::string path = folder + "/" + kClient + ".plist";
+  PropertyListFiles lists{world.files(), world.clock, world.log};
+  FileFollowUpCenter center{lists, world.clock};
+  const std::unique_ptr<FollowUpCenterClient> client = center.newClient(kClient);
+};
+INSTANTIATE_TEST_SUITE_P(, AFollowUpCenter, ::testing::Bool(), AFollowUpCenter::nameOf);
+
+TEST_P(AFollowUpCenter, GivesBackAnItemWithAllItsFields) {
+  FollowUpItem item = itemNamed("a");
+  item.groupIdentifier = "group";
+  item.targetBundleIdentifier = kFollowUpSettingsBundleIdentifier;
+  item.extensionIdentifier = "extension";
+  item.displayStyle = 18;
+  item.title = "T\u00e9xt";
+  item.informativeFooterText = "footer";
+  item.expirationDate = world.clock.now() + 100.999;
+  item.userInfo = {{kFollowUpRelativeDateCeilingKey, true}, {"FollowupSerialNumber", "SN"}};
+  item.actions = {{"Buy", std::nullopt}, {Value(), "https://example.com/"}};
+  EXPECT_EQ(client->postItem(item), std::nullopt);
+  EXPECT_EQ(client->postItem(itemNamed("bare")), std::nullopt);
+  EXPECT_THAT(*client->pendingItems(), ElementsAre(item, itemNamed("bare")));
+  EXPECT_THAT(*center.newClient("com.tarsil.other")->pendingItems(), IsEmpty());
+}
+
+TEST_P(AFollowUpCenter, ReplacesClearsAndDropsItems) {
+  for (const char* name : {"a", "b", "c"}) EXPECT_FALSE(client->postItem(itemNamed(name)));
+  auto replacement = itemNamed("b");
+  replacement.title = "new";
+  replacement.expirationDate = world.clock.now() + 10;
+  EXPECT_FALSE(client->postItem(replacement));
+  EXPECT_THAT(*client->pendingItems(), ElementsAre(itemNamed("a"), replacement, itemNamed("c")));
+  EXPECT_FALSE(client->clearPendingItems({"a", "unknown"}));
+  EXPECT_THAT(pending(), ElementsAre("b", "c"));
+  world.clock.moveBy(10);
+  EXPECT_THAT(pending(), ElementsAre("c"));
+  EXPECT_FALSE(client->postItem(itemNamed("d")));
+  EXPECT_THAT((*readPropertyList(*world.get(path)))["items"].array(), SizeIs(2));
+}
+
+TEST_P(AFollowUpCenter, RefusesWhatItCannotKeep) {
+  EXPECT_EQ(client->postItem({}).value().code, EINVAL);
+  for (const char* name : {"", "../Preferences/x", "a/b"}) {
+    EXPECT_TRUE(center.newClient(name)->postItem(itemNamed("a"))) << name;
+    EXPECT_FALSE(center.newClient(name)->pendingItems()) << name;
+  }
+}
+
+TEST_P(AFollowUpCenter, SetsADamagedListAsideAndGoesOn) {
+  const Value damaged[] = {Value::Dictionary{{"items", "x"}}, Value::Dictionary{{"items", Value::Array{1}}}};
+  for (const auto& tree : damaged) {
+    put(tree);
+    EXPECT_THAT(pending(), IsEmpty());
+    EXPECT_FALSE(client->postItem(itemNamed("a")));
+    EXPECT_THAT(pending(), ElementsAre("a"));
+    world.clock.moveBy(60);
+  }
+  EXPECT_THAT(world.names(folder), ::testing::Contains(::testing::HasSubstr(".damaged-")).Times(2));
+  EXPECT_THAT(world.log.texts(LogLevel::Error), SizeIs(2));
+}
+
+TEST_P(AFollowUpCenter, LosesNothingToClientsAtTheSameTime) {
+  constexpr int kEach = 20;
+  const auto post = [this](const std::string& prefix) {
+    const auto own = center.newClient(kClient);
+    for (int i = 0; i < kEach; ++i) EXPECT_FALSE(own->postItem(itemNamed(prefix + std::to_string(i))));
+  };
+  std::thread other(post, "b");
+  post("a");
+  other.join();
+  EXPECT_THAT(pending(), SizeIs(2 * kEach));
+}
+
+TEST(ASimulatedFollowUpCenter, SaysWhyAPostOrClearFailed) {
+  FileWorld world(false);
+  SimulatedFiles files(world.clock);
+  PropertyListFiles lists(files, world.clock, world.log);
+  FileFollowUpCenter center(lists, world.clock);
+  const auto client = center.newClient(kClient);
+  EXPECT_FALSE(client->postItem(itemNamed("a")));
+  const Error full{"files", ENOSPC, "no space"};
+  files.setWriteFault(full);
+  EXPECT_EQ(client->postItem(itemNamed("b")), full);
+  EXPECT_EQ(client->clearPendingItems({"a"}), full);
+  files.setWriteFault(std::nullopt);
+  EXPECT_THAT(*client->pendingItems(), ElementsAre(itemNamed("a")));
+}
+
+}  // namespace
+}  // namespace kvr

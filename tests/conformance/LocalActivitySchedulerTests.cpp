@@ -1,0 +1,206 @@
+#include "conformance/FileWorld.h"
+#include "platform/local/EventLoop.h"
+#include "platform/local/LocalActivityScheduler.h"
+#include "platform/local/LocalCarrierInfo.h"
+#include "platform/local/LocalClock.h"
+#include "platform/local/LocalRandom.h"
+#include "platform/local/LocalWorkQueues.h"
+#include "platform/simulated/SimulatedDeviceProperties.h"
+
+#include <mutex>
+
+namespace kvr {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+using ::testing::SizeIs;
+
+constexpr const char* kUpgrade = "com.tarsil.kvragent.upgrade";
+constexpr const char* kBoot = "com.tarsil.kvragent.boot";
+
+/// One start of the process, on a device that outlives it. The test's thread is the main one.
+struct Start {
+  Start(Files& files, FileWorld& world, const std::string& device, DeviceProperties& properties,
+        const Clock& clock)
+      : lists(files, world.clock, world.log),
+        root(lists, world.log, device),
+        queues(loop, world.log),
+        scheduler(loop, root, clock, queues, random, properties, world.log, "com.tarsil.kvragent",
+                  {kUpgrade, kBoot}, device + "/boot_id") {}
+  ~Start() {
+    scheduler.beginEnding();
+    queues.beginEnding();
+    queues.drain(30);
+  }
+  Start(const Start&) = delete;
+  Start& operator=(const Start&) = delete;
+
+  ActivityBlock recorder(const std::string& name) {
+    return [this, name](const ActivityHandler& handler) {
+      {
+        const std::lock_guard lock(mutex);
+        runs.push_back(name);
+      }
+      handler(ActivityResult::Finished);
+      loop.exit(0);
+    };
+  }
+  void add(const std::string& identifier, const ActivityCriteria& criteria) {
+    const auto activity = scheduler.newActivity(identifier);
+    activity->setCriteria(criteria);
+    activity->schedule(recorder(identifier));
+  }
+  void monitor(const std::string& identifier) {
+    const auto activity = scheduler.newActivity(identifier);
+    activity->setPreregistered(true);
+    activity->schedule(recorder(identifier));
+  }
+  /// Ends this start in order; what ran in it.
+  std::vector<std::string> finish() {
+    queues.drain(30);
+    return runs;
+  }
+
+  EventLoop loop;
+  PropertyListFiles lists;
+  DeviceRoot root;
+  LocalRandom random;
+  LocalWorkQueues queues;
+  std::mutex mutex;
+  std::vector<std::string> runs;
+  LocalActivityScheduler scheduler;
+};
+
+class ALocalScheduler : public ::testing::Test {
+ protected:
+  ALocalScheduler() { writeFile(device + "/boot_id", "one\n"); }
+  std::unique_ptr<Start> start() {
+    return std::make_unique<Start>(world.files(), world, device, properties, world.clock);
+  }
+  Value stored() { return *readPropertyList(*world.get(path)); }
+  void setNetwork(bool reachable) {
+    writeFile(device + "/Network.plist", *writePropertyList(Value::Dictionary{{"reachable", reachable}},
+                                                            PropertyListEncoding::XML));
+  }
+
+  FileWorld world{true};
+  const std::string device = world.path("device");
+  const std::string path = world.path("Library/Activities/com.tarsil.kvragent.plist");
+  SimulatedDeviceProperties properties;
+};
+
+TEST_F(ALocalScheduler, TakesARegistrationUpAgainAndRunsItOnce) {
+  start()->add("a", {3600, 360});
+  const auto before = stored()["activities"]["a"];
+  EXPECT_GE(before["dueDate"].date(), world.clock.now() + 3600);
+  EXPECT_LE(before["dueDate"].date(), world.clock.now() + 3960);
+  {
+    const auto early = start();
+    early->monitor("a");
+    EXPECT_THAT(early->finish(), IsEmpty());
+  }
+  EXPECT_EQ(stored()["activities"]["a"], before) << "nothing is drawn anew";
+  world.clock.moveBy(3960);
+  {
+    const auto due = start();
+    due->monitor("a");
+    due->loop.run();
+    EXPECT_THAT(due->finish(), ElementsAre("a"));
+  }
+  EXPECT_TRUE(stored()["activities"]["a"].isNull());
+}
+
+TEST_F(ALocalScheduler, RunsWhatBecomesDueByItsTimer) {
+  const LocalClock clock;
+  Start local(world.files(), world, device, properties, clock);
+  local.add("a", {1, 0});
+  local.loop.run();
+  EXPECT_THAT(local.finish(), ElementsAre("a"));
+}
+
+TEST_F(ALocalScheduler, KeepsWhatIsRegisteredDuringARun) {
+  const auto local = start();
+  const auto activity = local->scheduler.newActivity("a");
+  activity->schedule([&](const ActivityHandler& handler) {
+    activity->setCriteria({86400, 0});
+    activity->schedule(local->recorder("again"));
+    handler(ActivityResult::Finished);
+    local->loop.exit(0);
+  });
+  local->loop.run();
+  EXPECT_THAT(local->finish(), IsEmpty());
+  EXPECT_EQ(stored()["activities"]["a"]["delay"], Value(86400));
+}
+
+TEST_F(ALocalScheduler, WaitsForTheNetworkWithoutAskingAgain) {
+  setNetwork(false);
+  const auto local = start();
+  local->add("a", {0, 0, true});
+  EXPECT_EQ(local->scheduler.runsUnderWay(), 0U);
+  setNetwork(true);
+  local->loop.run();
+  EXPECT_THAT(local->finish(), ElementsAre("a"));
+}
+
+TEST_F(ALocalScheduler, NoticesThatTheDeviceDirectoryHasGone) {
+  setNetwork(false);
+  const auto local = start();
+  local->add("a", {0, 0, true});
+  std::filesystem::remove_all(device);
+  local->loop.run();
+  EXPECT_THAT(local->finish(), ElementsAre("a"));
+}
+
+TEST_F(ALocalScheduler, RunsOccasionsAfterUpgradeBootAndDamage) {
+  const auto runsOfAStart = [this] {
+    const auto local = start();
+    local->monitor(kUpgrade);
+    local->monitor(kBoot);
+    return local->finish();
+  };
+  properties.answers["ProductVersion"] = "17.1";
+  EXPECT_THAT(runsOfAStart(), ElementsAre(kUpgrade));
+  EXPECT_THAT(runsOfAStart(), IsEmpty());
+  writeFile(device + "/boot_id", "two\n");
+  EXPECT_THAT(runsOfAStart(), ElementsAre(kBoot));
+  properties.answers["ProductVersion"] = "17.2";
+  EXPECT_THAT(runsOfAStart(), ElementsAre(kUpgrade));
+  EXPECT_THAT(world.log.texts(LogLevel::Error), IsEmpty());
+  world.put(path, "damaged");
+  EXPECT_THAT(runsOfAStart(), ElementsAre(kUpgrade, kBoot));
+  EXPECT_THAT(world.log.texts(LogLevel::Error), SizeIs(1));
+  EXPECT_EQ(stored()["bootIdentifier"], Value("two"));
+}
+
+TEST_F(ALocalScheduler, RegistersAnewWhatItsClientSaysIsScheduled) {
+  {
+    const auto local = start();
+    const auto activity = local->scheduler.newActivity("a");
+    activity->setPreregistered(true);
+    activity->setCriteria({0, 0, true});
+    activity->setEarliestDate(world.clock.now() + 500);
+    activity->schedule(local->recorder("a"));
+    EXPECT_THAT(local->finish(), IsEmpty());
+  }
+  EXPECT_EQ(stored()["activities"]["a"]["dueDate"].date(), world.clock.now() + 500);
+  EXPECT_TRUE(stored()["activities"]["a"]["requiresNetwork"].asBool());
+}
+
+TEST(LocalCarriers, AreNamedByTheirIndex) {
+  FileWorld world(true);
+  PropertyListFiles lists(world.files(), world.clock, world.log);
+  const DeviceRoot root(lists, world.log, world.path("device"));
+  const LocalCarrierInfo carriers(root);
+  EXPECT_THAT(carriers.subscriptions(), IsEmpty());
+  const Value list = Value::Array{Value::Dictionary{{"mobileCountryCode", "001"}, {"mobileNetworkCode", "01"}},
+                                  7, Value::Dictionary{{"mobileNetworkCode", 5}}};
+  world.put(root.pathOf("Carriers.plist"), *writePropertyList(list, PropertyListEncoding::XML));
+  const auto subscriptions = carriers.subscriptions();
+  ASSERT_THAT(subscriptions, SizeIs(2));
+  EXPECT_EQ(describe(subscriptions.at("0")), "001/01");
+  EXPECT_EQ(describe(subscriptions.at("2")), "(null)/(null)");
+}
+
+}  // namespace
+}  // namespace kvr

@@ -1,0 +1,233 @@
+#include "platform/ActivityTable.h"
+
+#include <gmock/gmock.h>
+
+#include <limits>
+
+namespace kvr {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+using ::testing::Optional;
+
+constexpr auto kFinished = ActivityResult::Finished;
+constexpr auto kDeferred = ActivityResult::Deferred;
+const ActivityBlock kBlock = [](const ActivityHandler&) {};
+
+class AnActivityTable : public ::testing::Test {
+ protected:
+  /// What starts now, by name.
+  std::vector<std::string> started() {
+    std::vector<std::string> names;
+    for (auto& run : table.takeDue(now)) {
+      names.push_back(run.identifier);
+      numbers[run.identifier] = run.number;
+    }
+    return names;
+  }
+  ActivityTable::Ending end(const std::string& name, ActivityResult result) {
+    return table.end(name, numbers[name], result, now);
+  }
+  void pass(double seconds) {
+    now.date = now.date + seconds;
+    now.uptime += seconds;
+  }
+  /// Lets time pass until something is due.
+  std::vector<std::string> next() {
+    pass(table.secondsToNext(now).value());
+    return started();
+  }
+
+  ActivityTable table;
+  ActivityTable::Now now{Date{1'790'000'000}, 100, true};
+  std::map<std::string, std::uint64_t> numbers;
+};
+
+TEST_F(AnActivityTable, RunsAnActivityOnceAtThePointDrawnInItsWindow) {
+  const struct {
+    ActivityCriteria criteria;
+    double draw;
+    double due;
+  } cases[] = {
+      {{0, 0}, 0.5, 0}, {{3600, 360}, 0, 3600}, {{3600, 360}, 0.5, 3780}, {{-5, -5}, 0.5, 0}, {{15, 1}, 0.25, 15.25}};
+  for (const auto& [criteria, draw, due] : cases) {
+    table.add("a", criteria, kBlock, now, draw);
+    EXPECT_THAT(table.secondsToNext(now), Optional(due));
+    if (due > 0) EXPECT_THAT(started(), IsEmpty());
+    EXPECT_THAT(next(), ElementsAre("a"));
+    EXPECT_TRUE(end("a", kFinished).changesTree);
+    EXPECT_EQ(table.secondsToNext(now), std::nullopt);
+    EXPECT_FALSE(table.isRegistered("a"));
+  }
+}
+
+TEST_F(AnActivityTable, SharesAWakeUpBetweenOverlappingWindows) {
+  table.add("early", {100, 50}, kBlock, now, 0.8);
+  table.add("late", {120, 500}, kBlock, now, 0.9);
+  table.add("apart", {200, 0}, kBlock, now, 0);
+  EXPECT_THAT(next(), ElementsAre("early", "late"));
+  EXPECT_THAT(table.secondsToNext(now), Optional(60.0));
+}
+
+TEST_F(AnActivityTable, WaitsForTheNetworkThatAnActivityNeeds) {
+  table.add("remote", {10, 0, true}, kBlock, now, 0);
+  now.networkReachable = false;
+  EXPECT_EQ(table.secondsToNext(now), std::nullopt);
+  pass(1000);
+  EXPECT_THAT(started(), IsEmpty());
+  now.networkReachable = true;
+  EXPECT_THAT(started(), ElementsAre("remote"));
+  // Deferred because it went away: at once when it is back, however often.
+  for (int i = 0; i < 3; ++i) {
+    now.networkReachable = false;
+    table.noticeNetworkLoss();
+    pass(1);
+    end("remote", kDeferred);
+    EXPECT_EQ(table.secondsToNext(now), std::nullopt);
+    now.networkReachable = true;
+    EXPECT_THAT(started(), ElementsAre("remote"));
+  }
+}
+
+TEST_F(AnActivityTable, BacksOffFromTenSecondsToAnHour) {
+  table.add("a", {}, kBlock, now, 0);
+  EXPECT_THAT(started(), ElementsAre("a"));
+  for (const double wait : {10, 20, 40, 80, 160, 320, 640, 1280, 2560, 3600, 3600}) {
+    EXPECT_FALSE(end("a", kDeferred).changesTree);
+    EXPECT_THAT(table.secondsToNext(now), Optional(wait));
+    now.date = now.date + 315'360'000;  // a moved clock shortens no wait
+    EXPECT_THAT(table.secondsToNext(now), Optional(wait));
+    EXPECT_THAT(next(), ElementsAre("a"));
+  }
+  // A new registration counts afresh.
+  table.add("a", {}, kBlock, now, 0);
+  end("a", kDeferred);
+  EXPECT_THAT(started(), ElementsAre("a"));
+}
+
+TEST_F(AnActivityTable, RunsAgainAtTheDateADeferredRunWaitsFor) {
+  table.add("a", {}, kBlock, now, 0);
+  EXPECT_THAT(started(), ElementsAre("a"));
+  table.setEarliestDate("a", now.date + 500, now);
+  pass(1);
+  end("a", kDeferred);
+  EXPECT_THAT(table.secondsToNext(now), Optional(499.0));
+  now.date = now.date - 86400;  // the date keeps its meaning
+  EXPECT_THAT(table.secondsToNext(now), Optional(499.0 + 86400));
+  now.date = now.date + 315'360'000;
+  EXPECT_THAT(started(), ElementsAre("a"));
+  // A date that is not ahead, or is none, says nothing.
+  table.setEarliestDate("a", now.date, now);
+  table.setEarliestDate("a", Date{std::numeric_limits<double>::quiet_NaN()}, now);
+  end("a", kDeferred);
+  EXPECT_THAT(table.secondsToNext(now), Optional(10.0));
+}
+
+TEST_F(AnActivityTable, NeverSpinsOnADateThatIsAlwaysAlmostReached) {
+  table.add("a", {}, kBlock, now, 0);
+  EXPECT_THAT(started(), ElementsAre("a"));
+  table.setEarliestDate("a", now.date + 0.001, now);
+  end("a", kDeferred);
+  EXPECT_THAT(table.secondsToNext(now), Optional(::testing::DoubleNear(ActivityTable::kShortestCycle, 1e-6)));
+}
+
+TEST_F(AnActivityTable, KeepsARegistrationThatWasMadeDuringTheRun) {
+  for (const auto result : {kFinished, kDeferred}) {
+    table.add("a", {}, kBlock, now, 0);
+    EXPECT_THAT(started(), ElementsAre("a"));
+    table.add("a", {5, 0}, kBlock, now, 0);
+    pass(20);
+    EXPECT_THAT(started(), IsEmpty()) << "never twice at once";
+    end("a", result);
+    EXPECT_TRUE(table.isRegistered("a"));
+    EXPECT_THAT(started(), ElementsAre("a"));
+    const auto old = numbers["a"];
+    end("a", kFinished);
+    EXPECT_FALSE(table.end("a", old, kFinished, now).changesTree) << "an end is told once";
+    EXPECT_EQ(table.runsUnderWay(), 0U);
+  }
+}
+
+TEST_F(AnActivityTable, TakesUpItsTreeAgainAndKeepsWhatNobodyChecksInFor) {
+  table.add("a", {3600, 360, true}, kBlock, now, 0.5);
+  table.add("b", {60, 0}, kBlock, now, 0);
+  ActivityTable next;
+  next.adopt(table.tree());
+  EXPECT_EQ(next.tree(), table.tree());
+  EXPECT_EQ(next.tree()["activities"]["a"],
+            Value(Value::Dictionary{{"delay", 3600}, {"gracePeriod", 360}, {"requiresNetwork", true},
+                                    {"priority", "utility"}, {"registeredDate", now.date},
+                                    {"dueDate", now.date + 3780}}));
+  EXPECT_EQ(next.secondsToNext(now), std::nullopt);
+  next.checkIn("a", kBlock);
+  EXPECT_THAT(next.secondsToNext(now), Optional(3780.0));
+  EXPECT_TRUE(next.isRegistered("b"));
+}
+
+TEST_F(AnActivityTable, ComplainsOfATreeThatIsNotItsOwn) {
+  table.add("a", {1, 2}, kBlock, now, 0);
+  auto entry = table.tree()["activities"]["a"].dictionary();
+  const auto with = [&entry](const char* key, const Value& value) {
+    auto changed = entry;
+    changed.insert_or_assign(key, value);
+    return Value(Value::Dictionary{{"activities", Value::Dictionary{{"a", changed}}}});
+  };
+  EXPECT_EQ(ActivityTable::complaintAbout(table.tree()), std::nullopt);
+  EXPECT_EQ(ActivityTable::complaintAbout(Value::Dictionary{}), std::nullopt);
+  for (const auto& tree :
+       {Value(Value::Dictionary{{"activities", 1}}), with("delay", "x"), with("dueDate", Value()),
+        with("registeredDate", Date{std::numeric_limits<double>::infinity()}), with("requiresNetwork", 7)}) {
+    EXPECT_TRUE(ActivityTable::complaintAbout(tree)) << describe(tree);
+  }
+}
+
+TEST_F(AnActivityTable, HasAnOccasionWhenTheSystemVersionIsNotTheRecordedOne) {
+  const std::optional<std::string> none;
+  const struct {
+    std::optional<std::string> version;
+    bool runs;
+  } starts[] = {{"17.1", true}, {"17.1", false}, {"17.2", true}, {none, false}, {"17.1", true}};
+  for (const auto& [version, runs] : starts) {
+    table.checkIn("upgrade", kBlock);
+    table.noticeSystemVersion("upgrade", version);
+    EXPECT_EQ(started().size(), runs ? 1U : 0U);
+    if (runs) EXPECT_TRUE(end("upgrade", kFinished).changesTree);
+  }
+  ActivityTable unknown;
+  unknown.noticeSystemVersion("upgrade", none);
+  unknown.checkIn("upgrade", kBlock);
+  const auto runs = unknown.takeDue(now);
+  ASSERT_EQ(runs.size(), 1U);
+  unknown.end("upgrade", runs[0].number, kFinished, now);
+  unknown.noticeSystemVersion("upgrade", none);
+  unknown.checkIn("upgrade", kBlock);
+  EXPECT_THAT(unknown.takeDue(now), IsEmpty());
+}
+
+TEST_F(AnActivityTable, ServesOneOccasionAfterTheOtherAndRecordsItAtTheEnd) {
+  EXPECT_TRUE(table.noticeBoot("boot", "one", false)) << "the first boot is only recorded";
+  EXPECT_THAT(started(), IsEmpty());
+  table.checkIn("upgrade", kBlock);
+  table.noticeSystemVersion("upgrade", "17.1");
+  table.checkIn("boot", kBlock);
+  EXPECT_FALSE(table.noticeBoot("boot", "two", false));
+  EXPECT_THAT(started(), ElementsAre("upgrade"));
+  end("upgrade", kDeferred);
+  EXPECT_THAT(started(), IsEmpty());
+  EXPECT_THAT(next(), ElementsAre("upgrade"));
+  EXPECT_TRUE(table.tree()["OSVersion"].isNull());
+  end("upgrade", kFinished);
+  EXPECT_EQ(table.tree()["OSVersion"], Value("17.1"));
+  EXPECT_THAT(started(), ElementsAre("boot"));
+  EXPECT_EQ(table.tree()["bootIdentifier"], Value("one"));
+  end("boot", kFinished);
+  EXPECT_EQ(table.tree()["bootIdentifier"], Value("two"));
+  ActivityTable lost;
+  lost.checkIn("boot", kBlock);
+  EXPECT_FALSE(lost.noticeBoot("boot", "two", true));
+  EXPECT_EQ(lost.takeDue(now).size(), 1U);
+}
+
+}  // namespace
+}  // namespace kvr
