@@ -37,7 +37,8 @@ void KVRAgent::scheduleOutreach(BoolReply withReply) { scheduleOutreachAfter(0, 
 
 void KVRAgent::scheduleOutreachAfter(double delay, BoolReply withReply) {
   if (isInCalendar(platform_.clock.now() + delay)) {
-    KVRScheduler::newSchedulerWithActivityDelegate(platform_, std::make_shared<KVROutreachActivity>(platform_))
+    KVRScheduler::newSchedulerWithActivityDelegate(platform_,
+                                                   std::make_shared<KVROutreachActivity>(platform_))
         ->scheduleActivityWithDelay(delay);
   } else {
     platform_.log.error("%s: delay refused, no date lies %f seconds ahead",
@@ -168,7 +169,7 @@ void KVRAgent::getAllDeviceInfosUsingPolicy(std::uint64_t policy, bool updateFol
     getWarrantyUsingPolicy(
         policy, serialNumber,
         WarrantyReply(platform_.log, "getAllDeviceInfosUsingPolicy",
-                      [self, results, device](const KVRWarrantyRef& warranty) {
+                      [self, results, device = device](const KVRWarrantyRef& warranty) {
                         {
                           const std::lock_guard lock(results->mutex);
                           results->list.push_back(KVRDeviceInfo::deviceInfoWithDevice(device, warranty));

@@ -36,8 +36,8 @@ std::vector<FollowUpDateFacts> dateFactsOf(Platform& platform, const KVRDeviceIn
   for (const auto& info : deviceInfos) {
     const auto hash = serialHashOf(*info);
     const auto warranty = info->warranty();
-    devices.push_back({offerFactsOf(*info), hash && posted.contains(*hash),
-                       warranty ? warranty->daysEligible() : 0});
+    devices.push_back(
+        {offerFactsOf(*info), hash && posted.contains(*hash), warranty ? warranty->daysEligible() : 0});
   }
   return devices;
 }

@@ -4,8 +4,8 @@
 
 namespace kvr {
 
-/// The agent's name at the follow-up centre; also the unique identifier of the single item of earlier versions
-/// and the start of every device's.
+/// The agent's name at the follow-up centre; also the unique identifier of the single item of earlier
+/// versions and the start of every device's.
 inline constexpr const char* kFollowUpClientIdentifier = "com.tarsil.Kavrel";
 inline constexpr const char* kFollowUpGroupIdentifier = "com.tarsil.followup.group.kvr";
 inline constexpr const char* kFollowUpExtensionIdentifier = "com.tarsil.Kavrel.Extension";

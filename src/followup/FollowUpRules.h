@@ -9,10 +9,10 @@ namespace kvr {
 /// What the rules know of one device and its warranty.
 struct OfferFacts {
   bool hasWarranty = false;
-  bool isOffered = false;             ///< the warranty says that the offer may be displayed
+  bool isOffered = false;  ///< the warranty says that the offer may be displayed
   std::optional<Date> eligibleUntil;
-  std::optional<Date> displayDate;    ///< from when the follow-up is to be displayed
-  double durationBeforeEnd = 0;       ///< seconds before the end from which it is, without a display date
+  std::optional<Date> displayDate;  ///< from when the follow-up is to be displayed
+  double durationBeforeEnd = 0;     ///< seconds before the end from which it is, without a display date
   std::optional<Date> activationDate;
 };
 
@@ -32,8 +32,8 @@ enum class PostingOutcome { NoWarranty, NotOffered, Ended, Dismissed, Eligible }
 /// `convertsAgain` tells whether the offer has begun anew since the dismissal. It is asked only where the
 /// answer decides, because asking it changes what is recorded.
 template <class ConvertsAgain>
-constexpr PostingOutcome postingOutcome(const OfferFacts& facts, Date now, bool isDismissed, bool repostAllowed,
-                                        const ConvertsAgain& convertsAgain) {
+constexpr PostingOutcome postingOutcome(const OfferFacts& facts, Date now, bool isDismissed,
+                                        bool repostAllowed, const ConvertsAgain& convertsAgain) {
   switch (offerState(facts, now)) {
     case OfferState::NoWarranty:
       return PostingOutcome::NoWarranty;
@@ -66,7 +66,8 @@ constexpr PostDate postDate(const OfferFacts& facts) {
 /// What a refresh does with one device's follow-up.
 enum class RefreshOutcome { NoWarranty, NotOffered, Ended, Update, Repost, LeaveAlone };
 
-constexpr RefreshOutcome refreshOutcome(const OfferFacts& facts, Date now, bool isPending, bool allowForcePost) {
+constexpr RefreshOutcome refreshOutcome(const OfferFacts& facts, Date now, bool isPending,
+                                        bool allowForcePost) {
   switch (offerState(facts, now)) {
     case OfferState::NoWarranty:
       return RefreshOutcome::NoWarranty;
@@ -85,7 +86,8 @@ constexpr RefreshOutcome refreshOutcome(const OfferFacts& facts, Date now, bool 
 /// Whether a follow-up that was dismissed is offered anew.
 enum class ConversionOutcome { NeverDismissed, NoDisplayDate, DismissedSince, DismissedBefore };
 
-constexpr ConversionOutcome conversionOutcome(std::optional<Date> dismissed, std::optional<Date> displayDate) {
+constexpr ConversionOutcome conversionOutcome(std::optional<Date> dismissed,
+                                              std::optional<Date> displayDate) {
   if (!dismissed) return ConversionOutcome::NeverDismissed;
   if (!displayDate) return ConversionOutcome::NoDisplayDate;
   if (*dismissed >= *displayDate) return ConversionOutcome::DismissedSince;
@@ -95,7 +97,7 @@ constexpr ConversionOutcome conversionOutcome(std::optional<Date> dismissed, std
 /// Whether a row carries a badge: the warranty wants one, the end is near enough, and has not come.
 constexpr bool showsRowBadge(bool isWanted, std::optional<Date> eligibleUntil, double durationBeforeEnd,
                              Date now) {
-  return isWanted && eligibleUntil && *eligibleUntil - durationBeforeEnd < now && *eligibleUntil > now;
+  return isWanted && eligibleUntil && *eligibleUntil - durationBeforeEnd<now&& * eligibleUntil> now;
 }
 
 }  // namespace kvr

@@ -20,16 +20,17 @@ Value withAppended(const Value& stored, const std::string& hash) {
 
 }  // namespace
 
-bool HashList::contains(const std::string& hash) const { return holds(preferences_.objectForKey(key_), hash); }
+bool HashList::contains(const std::string& hash) const {
+  return holds(preferences_.objectForKey(key_), hash);
+}
 
 void HashList::append(const std::string& hash) {
   preferences_.update(key_, [&](const Value& stored) { return withAppended(stored, hash); });
 }
 
 void HashList::insert(const std::string& hash) {
-  preferences_.update(key_, [&](const Value& stored) {
-    return holds(stored, hash) ? stored : withAppended(stored, hash);
-  });
+  preferences_.update(
+      key_, [&](const Value& stored) { return holds(stored, hash) ? stored : withAppended(stored, hash); });
 }
 
 void HashList::remove(const std::string& hash) {

@@ -112,7 +112,8 @@ bool KVRFollowUp::_checkConversionEligibilityForDevice(const KVRDeviceInfo& devi
       return false;
     case ConversionOutcome::DismissedSince:
       platform_.log.debug(
-          "Device not eligible for conversion. %{private}@, followup dismissed date: %@, fup display date: %@",
+          "Device not eligible for conversion. %{private}@, followup dismissed date: %@, fup display date: "
+          "%@",
           deviceInfo.device(), dismissed, displayDate);
       return false;
     case ConversionOutcome::DismissedBefore:

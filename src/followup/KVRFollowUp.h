@@ -16,9 +16,9 @@ namespace kvr {
 /// Decides, device by device, whether an offer's follow-up is posted, kept up to date, removed or left alone.
 ///
 /// A follow-up is *pending* while the follow-up centre shows it, *posted* once it has been posted, and
-/// *dismissed* once the owner dismissed it; the last two are remembered in the preferences by serial hash. New
-/// follow-ups come from posting only; a refresh updates and clears. A dismissed one is posted again only when
-/// its display date has moved past the dismissal.
+/// *dismissed* once the owner dismissed it; the last two are remembered in the preferences by serial hash.
+/// New follow-ups come from posting only; a refresh updates and clears. A dismissed one is posted again only
+/// when its display date has moved past the dismissal.
 ///
 ///     KVRFollowUp(platform).refreshFollowupWithDeviceInfos(infos);
 ///
@@ -40,7 +40,8 @@ class KVRFollowUp {
   /// Whether the offer has begun anew since its follow-up was dismissed; then it no longer counts as posted.
   bool _checkConversionEligibilityForDevice(const KVRDeviceInfo& deviceInfo);
 
-  /// Clears the follow-up and remembers the dismissal. What is no serial number is refused with an error line.
+  /// Clears the follow-up and remembers the dismissal. What is no serial number is refused with an error
+  /// line.
   void dismissFollowUpForSerialNumber(const std::string& serialNumber);
   void _clearFollowUpWithDevices(const std::vector<KVRDeviceRef>& devices);
 

@@ -54,8 +54,8 @@ void KVRFollowUp::_setupFollowUpItem(FollowUpItem& item, const KVRDeviceInfo& wi
   item.informativeFooterText = textOrNull(warranty->zubLocalizedOfferDesc());
   item.expirationDate = end ? std::optional(*end - kExpirationMargin) : std::nullopt;
   const bool shouldShowRowBadge =
-      showsRowBadge(warranty->zubOfferSettingsRowBadge(), end,
-                    warranty->zubOfferBadgeDurationBeforeEndDate(), platform_.clock.now());
+      showsRowBadge(warranty->zubOfferSettingsRowBadge(), end, warranty->zubOfferBadgeDurationBeforeEndDate(),
+                    platform_.clock.now());
   platform_.log.standard("%s: shouldShowRowBadge: %d", kSetup, shouldShowRowBadge);
   item.displayStyle |= shouldShowRowBadge ? kRowBadge : kNoRowBadge;
   item.userInfo = userInfoFor(*warranty, serialNumberOf(withDeviceInfo).value());

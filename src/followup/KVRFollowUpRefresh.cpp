@@ -15,18 +15,17 @@ void KVRFollowUpRefresh::performActivityForScheduler(const std::shared_ptr<KVRSc
                                                      ActivityHandler withCompletionHandler) {
   deviceInfosQuery_(
       LookupPolicy::kCacheOnly,
-      DeviceInfosAnswer(platform_.log, "KVRFollowUpRefresh",
-                        [self = shared_from_this(),
-                         withCompletionHandler](const std::optional<KVRDeviceInfoList>& list) {
-                          if (list) {
-                            self->refreshAndSchedule(*list);
-                            withCompletionHandler(ActivityResult::Finished);
-                          } else {
-                            self->platform_.log.standard(
-                                "Unable to load device info for followup refresh, defer");
-                            withCompletionHandler(ActivityResult::Deferred);
-                          }
-                        }));
+      DeviceInfosAnswer(
+          platform_.log, "KVRFollowUpRefresh",
+          [self = shared_from_this(), withCompletionHandler](const std::optional<KVRDeviceInfoList>& list) {
+            if (list) {
+              self->refreshAndSchedule(*list);
+              withCompletionHandler(ActivityResult::Finished);
+            } else {
+              self->platform_.log.standard("Unable to load device info for followup refresh, defer");
+              withCompletionHandler(ActivityResult::Deferred);
+            }
+          }));
 }
 
 void KVRFollowUpRefresh::refreshAndSchedule(const KVRDeviceInfoList& devicesInfo) {

@@ -50,17 +50,17 @@ std::optional<Error> ActivityTable::complaintAbout(const Value& tree) {
 void ActivityTable::adopt(const Value& tree) {
   if (!tree.isDictionary()) return;
   Value::Dictionary records = tree.dictionary();
-  const Value activities = tree[kActivities];
+  const Value& activities = tree[kActivities];
   records.erase(kActivities);
   records_.merge(records);
   if (!activities.isDictionary()) return;
   for (const auto& [identifier, value] : activities.dictionary()) {
     Entry& entry = entries_[identifier];
     if (entry.registration) continue;
-    entry.registration = Registration{{value[kDelay].asInteger(), value[kGracePeriod].asInteger(),
-                                       value[kRequiresNetwork].asBool()},
-                                      value[kRegisteredDate].date(),
-                                      value[kDueDate].date()};
+    entry.registration = Registration{
+        {value[kDelay].asInteger(), value[kGracePeriod].asInteger(), value[kRequiresNetwork].asBool()},
+        value[kRegisteredDate].date(),
+        value[kDueDate].date()};
     entry.registrationNumber = ++lastNumber_;
   }
 }

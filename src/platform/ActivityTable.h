@@ -29,8 +29,8 @@ class ActivityTable {
  public:
   /// The moment at which a question is asked.
   struct Now {
-    Date date;                     ///< by the wall clock
-    double uptime = 0;             ///< seconds by a clock that nobody moves and that counts while suspended
+    Date date;          ///< by the wall clock
+    double uptime = 0;  ///< seconds by a clock that nobody moves and that counts while suspended
     bool networkReachable = true;
   };
 

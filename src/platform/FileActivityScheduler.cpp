@@ -77,10 +77,7 @@ class FileActivityScheduler::Handle : public Activity {
 class FileActivityScheduler::RunEnd {
  public:
   RunEnd(FileActivityScheduler& scheduler, std::string identifier, std::uint64_t number)
-      : scheduler_(scheduler),
-        life_(scheduler.life_),
-        identifier_(std::move(identifier)),
-        number_(number) {}
+      : scheduler_(scheduler), life_(scheduler.life_), identifier_(std::move(identifier)), number_(number) {}
   RunEnd(const RunEnd&) = delete;
   RunEnd& operator=(const RunEnd&) = delete;
   ~RunEnd() {

@@ -88,11 +88,11 @@ class FileActivityScheduler : public ActivityScheduler {
   const ActivityOccasions occasions_;
   const std::shared_ptr<const bool> life_ = std::make_shared<const bool>(true);
 
-  std::mutex saving_;          ///< held while the file is written; taken before `mutex_`
-  mutable std::mutex mutex_;   ///< guards what follows
+  std::mutex saving_;         ///< held while the file is written; taken before `mutex_`
+  mutable std::mutex mutex_;  ///< guards what follows
   ActivityTable table_;
   bool loaded_ = false;
-  bool unreadable_ = false;    ///< the file, so far: nothing may be written in its place
+  bool unreadable_ = false;  ///< the file, so far: nothing may be written in its place
   bool registrationsLost_ = false;
   bool networkReachable_ = true;
   bool ending_ = false;

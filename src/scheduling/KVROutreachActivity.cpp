@@ -9,7 +9,7 @@ namespace kvr {
 std::string KVROutreachActivity::identifier() const { return activity::kOutreach; }
 
 void KVROutreachActivity::performActivityForScheduler(const std::shared_ptr<KVRScheduler>& scheduler,
-                                                  ActivityHandler withCompletionHandler) {
+                                                      ActivityHandler withCompletionHandler) {
   platform_.log.standard("%s: for general outreach",
                          "-[KVROutreachActivity performActivityForScheduler:withCompletionHandler:]");
   std::make_shared<KVROutreachActivityUtilities>(platform_)->performOutreachActivityForConversion(

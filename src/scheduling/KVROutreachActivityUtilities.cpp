@@ -47,9 +47,8 @@ void KVROutreachActivityUtilities::performOutreachActivityForConversion(
                              self->downloads_.leave();
                            }));
   }
-  downloads_.notify(
-      platform_.queues.concurrentQueue(Priority::Default),
-      [self, conversion, andCompletion] { self->finish(conversion, andCompletion); });
+  downloads_.notify(platform_.queues.concurrentQueue(Priority::Default),
+                    [self, conversion, andCompletion] { self->finish(conversion, andCompletion); });
 }
 
 void KVROutreachActivityUtilities::startDeferCheck(bool conversion,
@@ -71,8 +70,9 @@ void KVROutreachActivityUtilities::stopDeferCheck() {
   outReachTimer = nullptr;
 }
 
-void KVROutreachActivityUtilities::handleDownload(const std::optional<std::string>& serialNumber, bool success,
-                                                  const KVRWarrantyRef& warranty, bool conversion) {
+void KVROutreachActivityUtilities::handleDownload(const std::optional<std::string>& serialNumber,
+                                                  bool success, const KVRWarrantyRef& warranty,
+                                                  bool conversion) {
   auto& log = platform_.log;
   log.standard("serialNumber: %@ success: %d -- Conversion: %d", serialNumber, success, conversion);
   if (!success || !warranty) {

@@ -16,14 +16,15 @@ namespace kvr {
 /// One outreach run: downloads every device's warranty, finds the earliest date at which a follow-up is to be
 /// posted, and schedules the follow-up post activity for it.
 ///
-/// A device counts when its download succeeds, its warranty shows an offer and none of the phone's carriers is
-/// excluded from it. A run finishes whatever fails. Made for one run, and kept alive by it.
+/// A device counts when its download succeeds, its warranty shows an offer and none of the phone's carriers
+/// is excluded from it. A run finishes whatever fails. Made for one run, and kept alive by it.
 class KVROutreachActivityUtilities : public std::enable_shared_from_this<KVROutreachActivityUtilities> {
  public:
   explicit KVROutreachActivityUtilities(Platform& platform) : platform_(platform) {}
 
   /// Returns at once; answers on a background queue. `conversion` shows in the log lines only.
-  void performOutreachActivityForConversion(bool conversion, const std::shared_ptr<KVRScheduler>& withScheduler,
+  void performOutreachActivityForConversion(bool conversion,
+                                            const std::shared_ptr<KVRScheduler>& withScheduler,
                                             ActivityHandler andCompletion);
   /// False when one of this device's carriers is excluded from the offer.
   bool currentDeviceShouldReceiveOutreachForWarranty(const KVRWarranty& warranty) const;
@@ -36,8 +37,8 @@ class KVROutreachActivityUtilities : public std::enable_shared_from_this<KVROutr
   void startDeferCheck(bool conversion, const std::shared_ptr<KVRScheduler>& scheduler,
                        const ActivityHandler& completion);
   void stopDeferCheck();
-  void handleDownload(const std::optional<std::string>& serialNumber, bool success, const KVRWarrantyRef& warranty,
-                      bool conversion);
+  void handleDownload(const std::optional<std::string>& serialNumber, bool success,
+                      const KVRWarrantyRef& warranty, bool conversion);
   void finish(bool conversion, const ActivityHandler& completion);
   void answer(const ActivityHandler& completion, ActivityResult result);
 

@@ -41,7 +41,8 @@ void KVRPostUpgradeActivity::performFirstRun() {
   KVRScheduler::clearScheduledActivities(platform_);
   preferences.setObject(platform_.clock.now(), preference::kDefaultDeviceActivationDate);
   if (hasAccount) {
-    KVRScheduler::newSchedulerWithActivityDelegate(platform_, std::make_shared<KVROutreachActivity>(platform_))
+    KVRScheduler::newSchedulerWithActivityDelegate(platform_,
+                                                   std::make_shared<KVROutreachActivity>(platform_))
         ->scheduleActivityForDate(platform_.clock.now());
     preferences.setObject(true, preference::kInitialOutreachActivityScheduled);
   } else {

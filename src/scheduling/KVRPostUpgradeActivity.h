@@ -5,9 +5,9 @@
 
 namespace kvr {
 
-/// Runs after the first start and after every upgrade of the operating system. The first run clears all target
-/// dates and schedules the first outreach; every later one forces a conversion outreach when the OS version
-/// has gone up since the run before.
+/// Runs after the first start and after every upgrade of the operating system. The first run clears all
+/// target dates and schedules the first outreach; every later one forces a conversion outreach when the OS
+/// version has gone up since the run before.
 class KVRPostUpgradeActivity : public KVRSchedulerActivityDelegate {
  public:
   explicit KVRPostUpgradeActivity(Platform& platform) : platform_(platform) {}

@@ -7,9 +7,9 @@
 namespace kvr {
 namespace {
 
-constexpr double kHandBackDelay = 1;  // seconds
+constexpr double kHandBackDelay = 1;    // seconds
 constexpr double kLongestDelay = 1e15;  // seconds; the calendar's own limit
-constexpr double kGraceShare = 10;  // the grace period is this part of the delay
+constexpr double kGraceShare = 10;      // the grace period is this part of the delay
 
 /// From `delay`, 0 or more, in seconds.
 ActivityCriteria criteria(double delay, bool requiresNetwork) {
@@ -45,6 +45,7 @@ void KVRScheduler::clearScheduledActivities(Platform& platform) {
 void KVRScheduler::monitorForScheduledActivity() {
   platform_.log.standard("monitorForScheduledActivity for '%@'", identifier());
   activity_->setPreregistered(true);
+  if (const auto target = scheduledActivityDate()) activity_->setEarliestDate(*target);
   activity_->schedule([self = shared_from_this()](ActivityHandler handler) {
     self->performScheduledOutreachWithBlock(std::move(handler));
   });
@@ -97,9 +98,8 @@ void KVRScheduler::performScheduledOutreachWithBlock(ActivityHandler block) {
 void KVRScheduler::relay(ActivityResult result, const Value& startedFor, const ActivityHandler& block) {
   if (result == ActivityResult::Finished) {
     // A date other than the one this run started for belongs to the next run.
-    platform_.preferences.update(targetDateKey_, [&](const Value& stored) {
-      return stored == startedFor ? Value() : stored;
-    });
+    platform_.preferences.update(
+        targetDateKey_, [&](const Value& stored) { return stored == startedFor ? Value() : stored; });
   }
   platform_.queues.after(kHandBackDelay, platform_.queues.mainQueue(), [block, result] { block(result); });
 }

@@ -12,11 +12,11 @@ namespace kvr {
 
 /// Runs an activity no earlier than a target date that outlives the process.
 ///
-/// Scheduling stores the target date in the preferences and registers the activity with the platform. Whenever
-/// the platform runs the activity, the gate compares the stored date with the clock: before it, the run is
-/// deferred; from it on, and without a stored date, the delegate does the work. A delegate that reports
-/// `Finished` ends the date's life, unless the activity was scheduled for another date meanwhile. The platform
-/// learns the result a second later, on the main queue.
+/// Scheduling stores the target date in the preferences and registers the activity with the platform.
+/// Whenever the platform runs the activity, the gate compares the stored date with the clock: before it, the
+/// run is deferred; from it on, and without a stored date, the delegate does the work. A delegate that
+/// reports `Finished` ends the date's life, unless the activity was scheduled for another date meanwhile. The
+/// platform learns the result a second later, on the main queue.
 ///
 ///     KVRScheduler::newSchedulerWithActivityDelegate(platform, activity)->scheduleActivityForDate(date);
 ///

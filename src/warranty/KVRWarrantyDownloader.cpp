@@ -221,11 +221,12 @@ void KVRWarrantyDownloader::scheduleConversionOutreachFor(Date date) {
   scheduler->scheduleActivityForDate(date);
   // Another device's download may be here at the same time: the earliest date stays, and whoever finds that a
   // later one was scheduled over it sets that right.
-  platform_.preferences.update(preference::kConversionOutreachScheduledDate, [&](const Value& stored) -> Value {
-    const auto other = stored.dateIfAny();
-    if (other && *other < date) date = *other;
-    return date;
-  });
+  platform_.preferences.update(preference::kConversionOutreachScheduledDate,
+                               [&](const Value& stored) -> Value {
+                                 const auto other = stored.dateIfAny();
+                                 if (other && *other < date) date = *other;
+                                 return date;
+                               });
   const auto target = scheduler->scheduledActivityDate();
   if (target && *target > date) scheduler->scheduleActivityForDate(date);
 }

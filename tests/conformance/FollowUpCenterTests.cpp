@@ -23,7 +23,8 @@ class AFollowUpCenter : public InBothWorlds {
  protected:
   std::vector<std::string> pending() {
     std::vector<std::string> names;
-    for (const auto& item : *client->pendingItems()) names.push_back(*item.uniqueIdentifier);
+    const auto items = client->pendingItems();
+    for (const auto& item : *items) names.push_back(*item.uniqueIdentifier);
     return names;
   }
   void put(const Value& tree) { world.put(path, *writePropertyList(tree, PropertyListEncoding::XML)); }

@@ -80,8 +80,8 @@ class ALocalScheduler : public ::testing::Test {
   }
   Value stored() { return *readPropertyList(*world.get(path)); }
   void setNetwork(bool reachable) {
-    writeFile(device + "/Network.plist", *writePropertyList(Value::Dictionary{{"reachable", reachable}},
-                                                            PropertyListEncoding::XML));
+    writeFile(device + "/Network.plist",
+              *writePropertyList(Value::Dictionary{{"reachable", reachable}}, PropertyListEncoding::XML));
   }
 
   FileWorld world{true};
@@ -193,8 +193,9 @@ TEST(LocalCarriers, AreNamedByTheirIndex) {
   const DeviceRoot root(lists, world.log, world.path("device"));
   const LocalCarrierInfo carriers(root);
   EXPECT_THAT(carriers.subscriptions(), IsEmpty());
-  const Value list = Value::Array{Value::Dictionary{{"mobileCountryCode", "001"}, {"mobileNetworkCode", "01"}},
-                                  7, Value::Dictionary{{"mobileNetworkCode", 5}}};
+  const Value list =
+      Value::Array{Value::Dictionary{{"mobileCountryCode", "001"}, {"mobileNetworkCode", "01"}}, 7,
+                   Value::Dictionary{{"mobileNetworkCode", 5}}};
   world.put(root.pathOf("Carriers.plist"), *writePropertyList(list, PropertyListEncoding::XML));
   const auto subscriptions = carriers.subscriptions();
   ASSERT_THAT(subscriptions, SizeIs(2));

@@ -69,8 +69,7 @@ std::string LocalActivityScheduler::bootIdentifier() const {
 void LocalActivityScheduler::arm(std::optional<double> wait) {
   itimerspec time{};
   if (wait) {
-    const double end =
-        secondsOf(CLOCK_REALTIME) + std::clamp(*wait, 0.0, kLongestWait) + kMargin;
+    const double end = secondsOf(CLOCK_REALTIME) + std::clamp(*wait, 0.0, kLongestWait) + kMargin;
     time.it_value.tv_sec = static_cast<time_t>(end);
     time.it_value.tv_nsec = static_cast<long>((end - std::floor(end)) * 1e9);
   }

@@ -9,9 +9,8 @@ std::map<std::string, Carrier> LocalCarrierInfo::subscriptions() const {
   for (std::size_t index = 0; index < carriers.array().size(); ++index) {
     const Value& carrier = carriers.array()[index];
     if (!carrier.isDictionary()) continue;
-    subscriptions.emplace(
-        std::to_string(index),
-        Carrier{carrier["mobileCountryCode"].stringIfAny(), carrier["mobileNetworkCode"].stringIfAny()});
+    subscriptions.emplace(std::to_string(index), Carrier{carrier["mobileCountryCode"].stringIfAny(),
+                                                         carrier["mobileNetworkCode"].stringIfAny()});
   }
   return subscriptions;
 }

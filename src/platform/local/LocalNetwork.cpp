@@ -29,8 +29,7 @@ LocalNetwork::LocalNetwork(EventLoop& loop, const DeviceRoot& root, std::functio
     static_cast<LocalNetwork*>(self)->readEvents();
     return 0;
   };
-  const int result =
-      ::sd_event_add_io(loop.event(), &source_, inotify_.get(), EPOLLIN, readable, this);
+  const int result = ::sd_event_add_io(loop.event(), &source_, inotify_.get(), EPOLLIN, readable, this);
   if (result < 0) throw std::system_error(-result, std::generic_category(), "sd_event_add_io");
 }
 

@@ -63,16 +63,26 @@ struct LocalPlatform {
   LocalActivityScheduler activities;
   FileFollowUpCenter followUps{propertyLists, clock};
   LocalCarrierInfo carriers{root};
-  Platform platform{*log,          clock,
-                    queues,        files,
-                    propertyLists, preferences,
-                    locale,        random,
-                    http,          deviceProperties,
-                    featureFlags,  pairedDevices,
-                    accounts,      accountSession,
-                    attestation,   services,
-                    processes,     activities,
-                    followUps,     carriers,
+  Platform platform{*log,
+                    clock,
+                    queues,
+                    files,
+                    propertyLists,
+                    preferences,
+                    locale,
+                    random,
+                    http,
+                    deviceProperties,
+                    featureFlags,
+                    pairedDevices,
+                    accounts,
+                    accountSession,
+                    attestation,
+                    services,
+                    processes,
+                    activities,
+                    followUps,
+                    carriers,
                     kMainBundleIdentifier};
 
   static constexpr const char* kMainBundleIdentifier = "com.tarsil.kvragent";

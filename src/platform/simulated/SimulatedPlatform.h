@@ -73,21 +73,36 @@ struct SimulatedPlatform {
   SimulatedDeviceAttestation attestation{queues};
   SimulatedServiceListeners services{queues, log};
   SimulatedProcesses processes;
-  SimulatedActivityScheduler activities{
-      propertyLists, clock, queues, random, deviceProperties, log, kMainBundleIdentifier,
-      {"com.tarsil.kvragent.upgrade", "com.tarsil.kvragent.boot"}};
+  SimulatedActivityScheduler activities{propertyLists,
+                                        clock,
+                                        queues,
+                                        random,
+                                        deviceProperties,
+                                        log,
+                                        kMainBundleIdentifier,
+                                        {"com.tarsil.kvragent.upgrade", "com.tarsil.kvragent.boot"}};
   FileFollowUpCenter followUps{propertyLists, clock};
   SimulatedCarrierInfo carriers;
-  Platform platform{log,           clock,
-                    queues,        files,
-                    propertyLists, preferences,
-                    locale,        random,
-                    http,          deviceProperties,
-                    featureFlags,  pairedDevices,
-                    accounts,      accountSession,
-                    attestation,   services,
-                    processes,     activities,
-                    followUps,     carriers,
+  Platform platform{log,
+                    clock,
+                    queues,
+                    files,
+                    propertyLists,
+                    preferences,
+                    locale,
+                    random,
+                    http,
+                    deviceProperties,
+                    featureFlags,
+                    pairedDevices,
+                    accounts,
+                    accountSession,
+                    attestation,
+                    services,
+                    processes,
+                    activities,
+                    followUps,
+                    carriers,
                     kMainBundleIdentifier};
 };
 

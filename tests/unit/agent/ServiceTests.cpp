@@ -98,7 +98,8 @@ TEST_F(TheService, GivesEveryConnectionAnAgentThatGoesWithIt) {
 
 TEST_F(TheService, ServesEachMemberWithTheOperationBehindIt) {
   world.deviceProperties.answers = {{"SerialNumber", "LOCAL"}};
-  const Value device = Value::Dictionary{{"serialNumber", "LOCAL"}, {"deviceType", 0}};
+  const Value device = Value::Dictionary{
+      {"serialNumber", "LOCAL"}, {"deviceType", 0}, {"activationDate", world.clock.now()}};
   const Value unknown = Value::Dictionary{{"name", "<unknown>"}, {"serialNumber", "X"}, {"deviceType", 2}};
   const auto info = [](const Value& it) { return Value(Value::Dictionary{{"device", it}}); };
   struct Case {
@@ -109,7 +110,7 @@ TEST_F(TheService, ServesEachMemberWithTheOperationBehindIt) {
   const Case cases[] = {
       {"ScheduleOutreach", {}, true},
       {"ScheduleOutreachAfter", {5.0}, true},
-      {"TarsilAccountAdded", {}, false},
+      {"TarsilAccountAdded", {}, true},
       {"CheckIsAvailableInStore", {"b"}, {}},
       {"AppSupportAvailability", {"b"}, {}},
       {"ReadWebURLOverride", {}, {}},

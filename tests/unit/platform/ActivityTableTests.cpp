@@ -49,12 +49,17 @@ TEST_F(AnActivityTable, RunsAnActivityOnceAtThePointDrawnInItsWindow) {
     ActivityCriteria criteria;
     double draw;
     double due;
-  } cases[] = {
-      {{0, 0}, 0.5, 0}, {{3600, 360}, 0, 3600}, {{3600, 360}, 0.5, 3780}, {{-5, -5}, 0.5, 0}, {{15, 1}, 0.25, 15.25}};
+  } cases[] = {{{0, 0}, 0.5, 0},
+               {{3600, 360}, 0, 3600},
+               {{3600, 360}, 0.5, 3780},
+               {{-5, -5}, 0.5, 0},
+               {{15, 1}, 0.25, 15.25}};
   for (const auto& [criteria, draw, due] : cases) {
     table.add("a", criteria, kBlock, now, draw);
     EXPECT_THAT(table.secondsToNext(now), Optional(due));
-    if (due > 0) EXPECT_THAT(started(), IsEmpty());
+    if (due > 0) {
+      EXPECT_THAT(started(), IsEmpty());
+    }
     EXPECT_THAT(next(), ElementsAre("a"));
     EXPECT_TRUE(end("a", kFinished).changesTree);
     EXPECT_EQ(table.secondsToNext(now), std::nullopt);
@@ -155,10 +160,12 @@ TEST_F(AnActivityTable, TakesUpItsTreeAgainAndKeepsWhatNobodyChecksInFor) {
   ActivityTable next;
   next.adopt(table.tree());
   EXPECT_EQ(next.tree(), table.tree());
-  EXPECT_EQ(next.tree()["activities"]["a"],
-            Value(Value::Dictionary{{"delay", 3600}, {"gracePeriod", 360}, {"requiresNetwork", true},
-                                    {"priority", "utility"}, {"registeredDate", now.date},
-                                    {"dueDate", now.date + 3780}}));
+  EXPECT_EQ(next.tree()["activities"]["a"], Value(Value::Dictionary{{"delay", 3600},
+                                                                    {"gracePeriod", 360},
+                                                                    {"requiresNetwork", true},
+                                                                    {"priority", "utility"},
+                                                                    {"registeredDate", now.date},
+                                                                    {"dueDate", now.date + 3780}}));
   EXPECT_EQ(next.secondsToNext(now), std::nullopt);
   next.checkIn("a", kBlock);
   EXPECT_THAT(next.secondsToNext(now), Optional(3780.0));
@@ -192,7 +199,9 @@ TEST_F(AnActivityTable, HasAnOccasionWhenTheSystemVersionIsNotTheRecordedOne) {
     table.checkIn("upgrade", kBlock);
     table.noticeSystemVersion("upgrade", version);
     EXPECT_EQ(started().size(), runs ? 1U : 0U);
-    if (runs) EXPECT_TRUE(end("upgrade", kFinished).changesTree);
+    if (runs) {
+      EXPECT_TRUE(end("upgrade", kFinished).changesTree);
+    }
   }
   ActivityTable unknown;
   unknown.noticeSystemVersion("upgrade", none);

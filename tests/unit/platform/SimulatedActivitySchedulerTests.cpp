@@ -33,7 +33,8 @@ TEST_F(ASimulatedScheduler, RunsOnceInsideTheWindowInVirtualTime) {
   EXPECT_THAT(dates, ElementsAre(::testing::AllOf(::testing::Ge(3600), ::testing::Lt(3961))));
   simulated.queues.advance(1e7);
   EXPECT_THAT(dates, SizeIs(1));
-  EXPECT_THAT(simulated.files.getPropertyList("/home/user/Library/Activities/com.tarsil.kvragent.plist")["activities"],
+  EXPECT_THAT(simulated.files.getPropertyList(
+                  "/home/user/Library/Activities/com.tarsil.kvragent.plist")["activities"],
               Value(Value::Dictionary{}));
 }
 

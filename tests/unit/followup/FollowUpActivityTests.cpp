@@ -1,0 +1,156 @@
+#include "followup/KVRFollowUpPost.h"
+#include "followup/KVRFollowUpRefresh.h"
+#include "scheduling/KVRScheduler.h"
+#include "unit/followup/OfferWorld.h"
+
+#include <cmath>
+
+namespace kvr {
+namespace {
+
+class AFollowUpActivity : public AnOfferTest {
+ protected:
+  /// The date in days from now, to a thousandth.
+  std::optional<double> days(std::optional<Date> date) const {
+    if (!date) return std::nullopt;
+    return std::round((*date - world.clock.now()) / kDay * 1000) / 1000;
+  }
+  std::optional<double> targetDays(const char* identifier) {
+    return days(world.preferences.dateForKey(std::string(identifier) + ".TargetDate"));
+  }
+  /// Runs an activity whose devices are `list`; its result.
+  template <class Activity>
+  std::optional<ActivityResult> run(std::optional<KVRDeviceInfoList> list, std::uint64_t* policy = nullptr) {
+    std::optional<ActivityResult> result;
+    const auto activity =
+        std::make_shared<Activity>(world.platform, [&](std::uint64_t asked, const DeviceInfosAnswer& answer) {
+          if (policy != nullptr) *policy = asked;
+          answer(list);
+        });
+    activity->performActivityForScheduler(
+        KVRScheduler::newSchedulerWithActivityDelegate(world.platform, activity),
+        ActivityHandler(world.log, "test", [&](ActivityResult it) { result = it; }));
+    return result;
+  }
+};
+
+TEST_F(AFollowUpActivity, FindsTheNextPostDate) {
+  const auto off = Value::Dictionary{{"zubOfferEligibleUntil", inDays(-1).secondsSince1970}};
+  world.preferences.setObject(Value::Array{sha256Hash("posted")}, preference::kFollowUpPostedHashes);
+  const auto old = inDays(-100);
+  const struct {
+    KVRDeviceInfoList list;
+    std::optional<double> next;
+  } cases[] = {
+      {{}, {}},
+      {{info("A", shownInDays(5, 30), old), info("B", shownInDays(3, 30), old)}, 3},
+      {{info("A", shownInDays(4, 2), old)}, 2},
+      {{info("A", shownInDays(4, -2), old), info("B", shownInDays(3, -5), old)}, -2},  // ends the scan
+      {{info("posted", shownInDays(3, -5), old), info("B", off), info("C", {})}, {}},
+      {{info("A", shownInDays(3, 30), inDays(6))}, 6},
+      {{info("A", shownInDays(-3, 30))}, {}},  // activated now
+      {{info("A", shownInDays(3, 30))}, 3},
+      {{info("A", offer(30), inDays(7))}, 7},  // never the end less its duration
+      {{info("A", offer(30), old)}, {}},
+  };
+  for (const auto& test : cases) {
+    const auto next = KVRFollowUpPost::nextFollowUpPostDateWithDevicesInfo(world.platform, test.list);
+    EXPECT_EQ(days(next), test.next) << describe(test.list);
+  }
+}
+
+TEST_F(AFollowUpActivity, FindsTheNextRefreshDate) {
+  const auto old = inDays(-100);
+  const struct {
+    KVRDeviceInfoList list;
+    std::optional<double> initial;
+    double otherwise;
+  } cases[] = {
+      {{}, {}, 1},
+      {{info("A", shownInDays(-1, 2.5), old)}, 0.5, 0.5},
+      {{info("A", shownInDays(-1, 10. / 24), old)}, {}, 0.417},
+      {{info("A", shownInDays(3, 20), old)}, 3, 1},
+      {{info("A", shownInDays(0.25, 20), old)}, 0.25, 0.25},
+      {{info("A", shownInDays(-1, 20.75), old), info("B", shownInDays(-1, 3.25), old)}, 0.25, 0.25},
+      {{info("A", offer(-1), old), info("B", shownInDays(-1, 2.5), old)}, -1, -1},  // ends the scan
+      {{info("A", Value::Dictionary{}), info("B", {})}, {}, 1},
+      {{info("A", offer(2.5))}, {}, 0.5},  // shown from no known date
+  };
+  for (const auto& test : cases) {
+    for (const bool initial : {true, false}) {
+      const auto next =
+          KVRFollowUpRefresh::nextFollowUpRefreshDateWithDevicesInfo(world.platform, test.list, initial);
+      EXPECT_EQ(days(next), initial ? test.initial : test.otherwise) << describe(test.list);
+    }
+  }
+}
+
+TEST_F(AFollowUpActivity, PostsAndSchedulesWhatFollows) {
+  const std::string perform = "-[KVRFollowUpPost performActivityForScheduler:withCompletionHandler:]";
+  const auto old = inDays(-100);
+  const struct {
+    std::optional<KVRDeviceInfoList> list;
+    ActivityResult result;
+    std::optional<double> post, refresh;
+  } cases[] = {
+      {std::nullopt, ActivityResult::Deferred, {}, {}},
+      {KVRDeviceInfoList{}, ActivityResult::Finished, {}, {}},
+      {KVRDeviceInfoList{info("A", shownInDays(2, 30), old)}, ActivityResult::Finished, 2, {}},
+      {KVRDeviceInfoList{info("A", shownInDays(-2, 2.5), old)}, ActivityResult::Finished, {}, 0.5},
+      {KVRDeviceInfoList{info("A", shownInDays(-2, 0.25), old)}, ActivityResult::Finished, {}, 0.25},
+      {KVRDeviceInfoList{info("B", offer(-1), old)}, ActivityResult::Finished, 1, {}},  // not back to back
+  };
+  for (const auto& test : cases) {
+    KVRScheduler::clearScheduledActivities(world.platform);
+    world.log.clear();
+    std::uint64_t policy = 0;
+    EXPECT_EQ(run<KVRFollowUpPost>(test.list, &policy), test.result);
+    EXPECT_EQ(policy, 2U);
+    EXPECT_EQ(targetDays(activity::kFollowUpPost), test.post);
+    EXPECT_EQ(targetDays(activity::kFollowUpRefresh), test.refresh);
+    EXPECT_EQ(world.log.count(perform + " -> " + describe(test.list)), 1U);
+    EXPECT_EQ(world.log.count("Unable to load devices info, defer"), test.list ? 0U : 1U);
+    EXPECT_EQ(world.log.contains(perform + ": Re-schedule followUp post for: "), test.post.has_value());
+    EXPECT_EQ(world.log.contains(perform + ": Schedule refresh for: "), test.refresh.has_value());
+  }
+}
+
+TEST_F(AFollowUpActivity, DropsTheAnswerOfAPostRunThatWasDeferredMeanwhile) {
+  std::vector<DeviceInfosAnswer> held;
+  const auto post = std::make_shared<KVRFollowUpPost>(
+      world.platform, [&](std::uint64_t, const DeviceInfosAnswer& answer) { held.push_back(answer); });
+  KVRScheduler::newSchedulerWithActivityDelegate(world.platform, post)->scheduleActivityForDate(inDays(-1));
+  world.queues.run();
+  ASSERT_EQ(held.size(), 1U);
+  world.activities.setNetworkReachable(false);
+  world.queues.advance(2e9 + 10);
+  EXPECT_EQ(world.log.count("FollowUp Post activity deferred."), 1U);
+  EXPECT_EQ(post->followUpPostTimer(), nullptr);
+  held[0](KVRDeviceInfoList{info("A", due(5), inDays(-9))});
+  EXPECT_THAT(pendingSerials(), ::testing::ElementsAre("A")) << "the work is done all the same";
+  EXPECT_EQ(world.log.count("FollowUp Post activity was answered already, result 1 dropped"), 1U);
+  EXPECT_TRUE(world.preferences.dateForKey("com.tarsil.kvragent.followuppost.TargetDate").has_value());
+}
+
+TEST_F(AFollowUpActivity, RefreshesForAsLongAsAnythingIsShown) {
+  const auto ended = run<KVRFollowUpRefresh>(KVRDeviceInfoList{info("A", due(2.5))});
+  EXPECT_EQ(ended, ActivityResult::Finished);
+  EXPECT_EQ(world.log.count("No followups present, don't schedule another refresh"), 1U);
+  EXPECT_EQ(targetDays(activity::kFollowUpRefresh), std::nullopt);
+
+  run<KVRFollowUpPost>(KVRDeviceInfoList{info("A", due(2.5), inDays(-9))});
+  for (const double day : {86400., 0., -5., 1e-3}) {
+    world.preferences.setObject(day, preference::kOneDayInterval);
+    std::uint64_t policy = 0;
+    EXPECT_EQ(run<KVRFollowUpRefresh>(KVRDeviceInfoList{info("A", due(2.5), inDays(-9))}, &policy),
+              ActivityResult::Finished);
+    EXPECT_EQ(policy, 1U);
+    EXPECT_GE(targetDays(activity::kFollowUpRefresh), day > 60 ? 0.5 : std::round(60 / kDay * 1000) / 1000);
+  }
+  EXPECT_TRUE(world.log.contains("Schedule next refresh for " + describe(inDays(0.5))));
+  EXPECT_EQ(run<KVRFollowUpRefresh>(std::nullopt), ActivityResult::Deferred);
+  EXPECT_EQ(world.log.count("Unable to load device info for followup refresh, defer"), 1U);
+}
+
+}  // namespace
+}  // namespace kvr

@@ -1,0 +1,111 @@
+#include "followup/KVRFollowUp.h"
+#include "unit/followup/OfferWorld.h"
+
+namespace kvr {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::SizeIs;
+
+using AnItem = AnOfferTest;
+
+Value::Dictionary badged(Value::Dictionary offer, Value durationInDays) {
+  offer["featureToggleParameters"] =
+      Value::Dictionary{{"zubOfferDisplay", true}, {"zubOfferSettingsRowBadge", true}};
+  offer["zubOfferBadgeBeforeEndDate"] = std::move(durationInDays);
+  return offer;
+}
+
+TEST_F(AnItem, IsIdentifiedByTheHashOfItsSerialNumber) {
+  EXPECT_EQ(KVRFollowUp::uniqueIdentfierForSerialNumber("SN0000000001"),
+            "com.tarsil.Kavrel.50298c06e1f4205d8248e785cfbeba899b430877b206512d6072bee97d337187");
+  EXPECT_EQ(KVRFollowUp::uniqueIdentfierForSerialNumber(std::nullopt), "com.tarsil.Kavrel");
+}
+
+TEST_F(AnItem, HasEveryFieldOfItsDevice) {
+  const struct {
+    std::uint64_t type;
+    std::optional<std::string> target;
+  } cases[] = {{KVRDevice::kLocal, kFollowUpSettingsBundleIdentifier},
+               {KVRDevice::kWatch, "com.tarsil.Wristlink"},
+               {KVRDevice::kOther, std::nullopt}};
+  for (const auto& test : cases) {
+    const auto warranty = offer(3);
+    KVRFollowUp(world.platform).postFollowUpWithDeviceInfo(*info("SN", warranty, {}, test.type));
+    FollowUpItem expected;
+    expected.uniqueIdentifier = "com.tarsil.Kavrel." + sha256Hash("SN");
+    expected.groupIdentifier = "com.tarsil.followup.group.kvr";
+    expected.targetBundleIdentifier = test.target;
+    expected.extensionIdentifier = "com.tarsil.Kavrel.Extension";
+    expected.displayStyle = 18;
+    expected.title = "Zub";
+    expected.informativeFooterText = "3 days left";
+    expected.expirationDate = inDays(3) - 0.001;
+    expected.userInfo = {{"FollowupSerialNumber", "SN"},
+                         {kFollowUpRelativeDateCeilingKey, true},
+                         {kFollowUpRelativeDateSingleDayKey, "One day left"},
+                         {kFollowUpRelativeDatePluralDaysFormatKey, "%@ days left"}};
+    expected.actions = {{"Add", std::nullopt}};
+    EXPECT_THAT(pending(), ElementsAre(expected));
+  }
+}
+
+TEST_F(AnItem, CarriesABadgeNearTheEndAndNeverLosesABit) {
+  const auto unwanted = offer(3, {{"zubOfferBadgeBeforeEndDate", 5}});
+  const struct {
+    Value warranty;
+    std::uint64_t before;
+    bool shows;
+    std::uint64_t after;
+  } cases[] = {
+      {badged(offer(3), 5), 2, true, 3},
+      {badged(offer(3), 2), 2, false, 18},
+      {badged(offer(3), 3), 2, false, 18},
+      {badged(offer(3), 0), 2, false, 18},
+      {badged(offer(0), 5), 2, false, 18},
+      {badged(offer(-1), 5), 2, false, 18},
+      {unwanted, 2, false, 18},
+      {badged(offer(3), 2), 3, false, 19},
+      {badged({}, 5), 2, false, 18},
+      {badged(offer(3), 5), 18, true, 19},
+  };
+  for (const auto& test : cases) {
+    FollowUpItem item;
+    item.displayStyle = test.before;
+    world.log.clear();
+    KVRFollowUp(world.platform)._setupFollowUpItem(item, *info("SN", test.warranty));
+    EXPECT_EQ(item.displayStyle, test.after) << describe(test.warranty);
+    EXPECT_EQ(world.log.count(format(
+                  "-[KVRFollowUp _setupFollowUpItem:withDeviceInfo:]: shouldShowRowBadge: %d", test.shows)),
+              1U);
+  }
+}
+
+TEST_F(AnItem, LeavesOutTextsThatAreMissingOrNoTextAndKeepsItsRouting) {
+  const auto rest = info("SN", Value::Dictionary{{"zubLocalizedOfferLabel", 7},
+                                                 {"zubLocalizedOfferPluralDescFormat", Value::Array{}}});
+  FollowUpItem item;
+  item.uniqueIdentifier = "u";
+  item.groupIdentifier = "g";
+  item.targetBundleIdentifier = "t";
+  item.userInfo = {{"earlier", 1}};
+  item.actions = {{"a", "url"}, {"b", "url"}};
+  FollowUpItem expected = item;
+  expected.displayStyle = 16;
+  expected.userInfo = {{"FollowupSerialNumber", "SN"}, {kFollowUpRelativeDateCeilingKey, true}};
+  expected.actions = {{Value(), std::nullopt}};
+  KVRFollowUp(world.platform)._setupFollowUpItem(item, *rest);
+  EXPECT_EQ(item, expected);
+  EXPECT_EQ(world.log.count("Missing zubLocalizedOfferSingularDesc value"), 1U);
+  EXPECT_EQ(world.log.count("Missing zubLocalizedOfferPluralDescFormat value"), 1U);
+
+  world.log.clear();
+  auto noSingular = offer(3);
+  noSingular.erase("zubLocalizedOfferSingularDesc");
+  KVRFollowUp(world.platform)._setupFollowUpItem(item, *info("SN", noSingular));
+  EXPECT_THAT(item.userInfo, SizeIs(3));
+  EXPECT_THAT(world.log.texts(LogLevel::Error), ElementsAre("Missing zubLocalizedOfferSingularDesc value"));
+}
+
+}  // namespace
+}  // namespace kvr

@@ -1,0 +1,75 @@
+#pragma once
+
+#include "devices/KVRDeviceInfo.h"
+#include "followup/FollowUpKeys.h"
+#include "platform/FollowUpCenter.h"
+#include "unit/CoverageWorld.h"
+
+#include <algorithm>
+
+namespace kvr {
+
+/// A world with offers, whose dates are given in days from now.
+class AnOfferTest : public ::testing::Test {
+ protected:
+  static constexpr double kDay = 86400;
+
+  void TearDown() override {
+    world.queues.run();
+    EXPECT_THAT(world.faults(), ::testing::IsEmpty());
+  }
+
+  Date inDays(double days) const { return world.clock.now() + days * kDay; }
+
+  /// The dictionary of an offer with all its texts; `more` goes over it.
+  Value::Dictionary offer(double endsInDays, const Value::Dictionary& more = {}) const {
+    Value::Dictionary dictionary = more;
+    dictionary.merge(Value::Dictionary{
+        {"zubOfferEligibleUntil", inDays(endsInDays).secondsSince1970},
+        {"zubLocalizedOfferLabel", "Zub"},
+        {"zubLocalizedOfferSingularDesc", "One day left"},
+        {"zubLocalizedOfferPluralDescFormat", "%@ days left"},
+        {"zubLocalizedOfferCTA", "Add"},
+        {"featureToggleParameters", Value::Dictionary{{"zubOfferDisplay", true}}},
+    });
+    return dictionary;
+  }
+  Value::Dictionary shownInDays(double displayInDays, double endsInDays) const {
+    return offer(endsInDays, {{"zubOfferFollowupDisplayDate", inDays(displayInDays).secondsSince1970}});
+  }
+  /// One whose follow-up is due.
+  Value::Dictionary due(double endsInDays) const { return shownInDays(-1, endsInDays); }
+  KVRDeviceInfoRef info(const std::optional<std::string>& serialNumber, const Value& warranty,
+                        std::optional<Date> activation = {}, std::uint64_t type = KVRDevice::kLocal) {
+    return KVRDeviceInfo::deviceInfoWithDevice(KVRDevice::deviceWithName("D", serialNumber, activation, type),
+                                               KVRWarranty::initWithDictionary(world.platform, warranty));
+  }
+  std::vector<FollowUpItem> pending() {
+    auto items = world.followUps.newClient(kFollowUpClientIdentifier)->pendingItems();
+    return items ? *std::move(items) : std::vector<FollowUpItem>{};
+  }
+  std::vector<std::string> pendingSerials() {
+    std::vector<std::string> serials;
+    for (const auto& item : pending()) serials.push_back(item.userInfo.at(kFollowUpSerialNumberKey).string());
+    return serials;
+  }
+  /// The lines since the last call that are not about how an item is built, less the operation's name.
+  std::vector<std::string> newLines() {
+    std::vector<std::string> lines;
+    for (auto line : world.log.texts()) {
+      if (line.find("_setupFollowUpItem") != std::string::npos) continue;
+      const auto end = line.starts_with("-[") ? line.find("]: ") : std::string::npos;
+      lines.push_back(end == std::string::npos ? line : line.substr(end + 3));
+    }
+    world.log.clear();
+    return lines;
+  }
+  Value::Array hashes(const char* key) {
+    const auto list = world.preferences.objectForKey(key);
+    return list.isArray() ? list.array() : Value::Array{};
+  }
+
+  CoverageWorld world;
+};
+
+}  // namespace kvr

@@ -1,0 +1,270 @@
+#include "agent/AgentKeys.h"
+#include "agent/KVRAgent.h"
+#include "agent/StartUp.h"
+#include "followup/KVRFollowUpPost.h"
+#include "platform/JSON.h"
+#include "scheduling/KVRConversionOutreachActivity.h"
+#include "scheduling/KVROutreachActivity.h"
+#include "scheduling/KVROutreachActivityUtilities.h"
+#include "scheduling/KVRPostBootActivity.h"
+#include "scheduling/KVRPostUpgradeActivity.h"
+#include "scheduling/SchedulingKeys.h"
+#include "scheduling/VersionOrder.h"
+#include "unit/followup/OfferWorld.h"
+
+namespace kvr {
+namespace {
+
+using ::testing::Contains;
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+
+/// The agent's activities in a world whose coverage service answers from a table.
+class TheAgentsLife : public AnOfferTest {
+ protected:
+  std::map<std::string, Value> warranties;  ///< by serial number; the others' downloads fail
+
+  TheAgentsLife() {
+    world.featureFlags.enabled.insert({"Kavrel", "Bravik_3_0"});
+    world.preferences.setObject("https://assets.example/kvrV2.plist", preference::kServerVersionURL);
+    world.coverage = [this](const HTTPRequest& request) {
+      const auto found = warranties.find((*readJSON(request.body))["serialNumber"].string());
+      if (found == warranties.end() || found->second.isNull()) return HTTPResponse{500, {}, {}};
+      return HTTPResponse{200, *writeJSON(found->second), {}};
+    };
+  }
+  void pair(const std::string& serialNumber, double daysAgo) {
+    world.pairedDevices.devices.push_back({"Watch", "Model", serialNumber, inDays(-daysAgo), true, false});
+  }
+  std::optional<Date> target(const char* identifier) {
+    return world.preferences.dateForKey(std::string(identifier) + ".TargetDate");
+  }
+  void setTarget(const char* identifier, Date date) {
+    world.preferences.setObject(date, std::string(identifier) + ".TargetDate");
+  }
+  template <class Activity>
+  std::optional<ActivityResult> run() {
+    std::optional<ActivityResult> result;
+    const auto activity = std::make_shared<Activity>(world.platform);
+    world.log.clear();
+    activity->performActivityForScheduler(
+        KVRScheduler::newSchedulerWithActivityDelegate(world.platform, activity),
+        ActivityHandler(world.log, "test", [&](ActivityResult it) { result = it; }));
+    world.queues.runUntil([&] { return result.has_value(); });
+    return result;
+  }
+  void setOSVersions(const std::optional<std::string>& recorded, const std::optional<std::string>& current) {
+    world.preferences.setObject(recorded, preference::kPostUpgradeOSVersion);
+    world.deviceProperties.answers.erase("ProductVersion");
+    if (current) world.deviceProperties.answers["ProductVersion"] = *current;
+  }
+};
+
+TEST_F(TheAgentsLife, SchedulesThePostAtTheEarliestDateOfAnOutreach) {
+  auto excluded = shownInDays(1, 20);
+  excluded["featureToggleParameters"] =
+      Value::Dictionary{{"zubOfferDisplay", true}, {"zubOfferToggle", Value::Array{"00101"}}};
+  auto lasting = offer(20);
+  lasting["featureToggleParameters"] =
+      Value::Dictionary{{"zubOfferDisplay", true}, {"zubOfferDurationDaysBeforeEndDate", 15}};
+  const Value off = Value::Dictionary{}, none;
+  const Value in3 = shownInDays(3, 20), in10 = shownInDays(10, 20), before = shownInDays(-4, 20);
+  const std::tuple<Value, Value, std::optional<double>> cases[] = {
+      {in10, in3, 3},   {in10, lasting, 5}, {excluded, in3, 3},  {off, before, -4},
+      {none, in10, 10}, {none, none, {}},   {excluded, off, {}},
+  };
+  pair("W", 100);
+  world.carriers.carriers = {{"1", {}}, {"2", {"001", "01"}}};
+  for (const auto& [phone, watch, days] : cases) {
+    for (const bool conversion : {false, true}) {
+      KVRScheduler::clearScheduledActivities(world.platform);
+      warranties = {{"LOCAL", phone}, {"W", watch}};
+      const auto expected = days ? std::optional(inDays(*days)) : std::nullopt;
+      const auto outcome = days ? "Complete activity and schedule followUp post for: " + describe(expected)
+                                : "No devices eligible for followUp posts";
+      EXPECT_EQ(conversion ? run<KVRConversionOutreachActivity>() : run<KVROutreachActivity>(),
+                ActivityResult::Finished);
+      EXPECT_EQ(target(activity::kFollowUpPost), expected);
+      EXPECT_EQ(world.log.count(format("Conversion: %d -- %@", conversion, outcome)), 1U);
+      EXPECT_EQ(world.log.count("carrier matched"), phone == Value(excluded) ? 1U : 0U);
+      EXPECT_EQ(world.log.count("Warranty failed to download"),
+                (phone.isNull() ? 1U : 0U) + (watch.isNull() ? 1U : 0U));
+    }
+  }
+  for (const char* line :
+       {"serialNumber: W success: 1 -- Conversion: 1", "Warranty downloaded successfully",
+        "Coverage check shows device should display Zub offer, check on-device state",
+        "Configuration does not support current device. Complete activity without scheduling followup",
+        "Warranty shows device is ineligible, complete activity without scheduling followup",
+        "carrierID: (null)", "carrierID: 00101"}) {
+    EXPECT_EQ(world.log.count(line), std::string_view(line).starts_with("Warranty down") ? 2U : 1U) << line;
+  }
+  EXPECT_THAT(world.log.texts(LogLevel::Error),
+              Contains("No mobileCountryCode for networkInfo: {1 = (null)/(null); 2 = 001/01; }, carrier: "
+                       "(null)/(null)"));
+}
+
+TEST_F(TheAgentsLife, BeginsWithTheFirstPostUpgradeRun) {
+  for (const bool hasAccount : {true, false}) {
+    if (!hasAccount) world.accounts.primary.reset();
+    for (const char* key :
+         {preference::kPostUpgradeActivityCompleted, preference::kInitialOutreachActivityScheduled}) {
+      world.preferences.removeObject(key);
+    }
+    setTarget("old", inDays(3));
+    EXPECT_EQ(run<KVRPostBootActivity>(), ActivityResult::Finished);
+    EXPECT_EQ(world.log.count("post upgrade activity hasn't yet been performed, skip boot activity"), 1U);
+    EXPECT_EQ(run<KVRPostUpgradeActivity>(), ActivityResult::Finished);
+    EXPECT_EQ(target("old"), std::nullopt);
+    EXPECT_EQ(world.preferences.dateForKey("DefaultDeviceActivationDate"), world.clock.now());
+    EXPECT_EQ(target(activity::kOutreach), hasAccount ? std::optional(world.clock.now()) : std::nullopt);
+    EXPECT_EQ(world.preferences.boolForKey(preference::kInitialOutreachActivityScheduled), hasAccount);
+    EXPECT_TRUE(world.preferences.boolForKey(preference::kPostUpgradeActivityCompleted));
+    EXPECT_EQ(world.preferences.stringForKey(preference::kPostUpgradeOSVersion), "17.9");
+    EXPECT_EQ(world.log.count("No primary account detected. Finishing post upgrade activity without "
+                              "scheduling outreach"),
+              hasAccount ? 0U : 1U);
+    KVRScheduler::clearScheduledActivities(world.platform);
+  }
+}
+
+TEST_F(TheAgentsLife, ForcesAConversionOutreachWhenTheOSVersionHasGoneUp) {
+  const struct {
+    std::optional<std::string> recorded, current;
+    bool outreachPending, forces;
+  } cases[] = {{"17.9", "17.10", false, true},  {"17.9", "17.10", true, false},
+               {"17.9", "17.9", false, false},  {"17.10", "17.9", false, false},
+               {"17.9", "17.09", false, false}, {{}, "17.9", false, true},
+               {"17.9", {}, false, false},      {"17", "17.0.1", false, true}};
+  world.preferences.setObject(true, preference::kPostUpgradeActivityCompleted);
+  for (const auto& test : cases) {
+    KVRScheduler::clearScheduledActivities(world.platform);
+    setOSVersions(test.recorded, test.current);
+    if (test.outreachPending) setTarget(activity::kOutreach, inDays(1));
+    EXPECT_EQ(run<KVRPostUpgradeActivity>(), ActivityResult::Finished);
+    EXPECT_EQ(target(activity::kConversionOutreach).has_value(), test.forces);
+    EXPECT_EQ(world.log.count(test.forces ? "Forcing conversion outreach on upgrade"
+                                          : "post upgrade activity already performed"),
+              1U);
+    EXPECT_EQ(world.preferences.stringForKey(preference::kPostUpgradeOSVersion),
+              test.current ? test.current : test.recorded);
+    EXPECT_EQ(world.log.count("Unable to get OS version"), test.current ? 0U : 1U);
+  }
+}
+
+TEST_F(TheAgentsLife, RegistersAgainAfterABootWhatIsPendingAndNothingElse) {
+  world.preferences.setObject(true, preference::kPostUpgradeActivityCompleted);
+  setTarget(activity::kConversionOutreach, inDays(-2));
+  setTarget(activity::kFollowUpRefresh, inDays(4));
+  setTarget(activity::kFollowUpPost, inDays(4));
+  EXPECT_EQ(run<KVRPostBootActivity>(), ActivityResult::Finished);
+  EXPECT_EQ(world.preferences.dateForKey(preference::kConversionOutreachScheduledDate), inDays(-2));
+  const std::string conversion = activity::kConversionOutreach, refresh = activity::kFollowUpRefresh;
+  EXPECT_THAT(world.log.texts(),
+              ElementsAre("'" + conversion + "' not complete, rescheduling",
+                          format("scheduled '%@' with delay: -172800.00 (%@)", conversion, inDays(-2)),
+                          "'" + refresh + "' not complete, rescheduling",
+                          format("scheduled '%@' with delay: 345600.00 (%@)", refresh, inDays(4))));
+}
+
+TEST_F(TheAgentsLife, MovesTheConversionOutreachToEarlierDatesOnly) {
+  world.preferences.setObject(true, preference::kPostUpgradeActivityCompleted);
+  const struct {
+    std::optional<double> days;
+    double scheduled;
+    const char* line;
+  } cases[] = {{50, 50, "scheduling conversion outreach %"},    {60, 50, ""}, {{}, 50, ""}, {40, 50, ""},
+               {30, 30, "Re-scheduling conversion outreach %"}, {30, 30, ""}};
+  for (const auto& test : cases) {  // a record without a date is no reason to schedule, nor is one after it
+    Value::Dictionary warranty;
+    if (test.days) warranty["zubOfferConversionDate"] = inDays(*test.days).secondsSince1970;
+    warranties["LOCAL"] = warranty;
+    run<KVROutreachActivity>();
+    EXPECT_EQ(target(activity::kConversionOutreach), inDays(test.scheduled));
+    EXPECT_EQ(world.preferences.dateForKey(preference::kConversionOutreachScheduledDate),
+              inDays(test.scheduled));
+    std::string line = test.line;
+    if (!line.empty()) line.replace(line.size() - 1, 1, describe(inDays(test.scheduled)));
+    EXPECT_EQ(world.log.contains("cheduling conversion outreach"), !line.empty());
+    EXPECT_EQ(world.log.count(line), line.empty() ? 0U : 1U);
+  }
+}
+
+TEST_F(TheAgentsLife, GoesFromTheFirstStartToAPostedFollowUpAndItsRefresh) {
+  warranties["LOCAL"] = shownInDays(-1, 2.5);
+  const StartUp startUp(world.platform);
+  world.queues.advance(60);
+  ASSERT_THAT(pendingSerials(), ElementsAre("LOCAL"));
+  EXPECT_EQ(pending()[0].targetBundleIdentifier, kFollowUpSettingsBundleIdentifier);
+  EXPECT_EQ(pending()[0].displayStyle, 18U);
+  EXPECT_EQ(pending()[0].informativeFooterText, Value("3 days left"));
+  EXPECT_NEAR(*target(activity::kFollowUpRefresh) - inDays(0.5), -60, 1);
+  for (const char* done : {activity::kPostUpgrade, activity::kOutreach, activity::kFollowUpPost}) {
+    EXPECT_EQ(target(done), std::nullopt) << done;
+  }
+  world.queues.advance(0.6 * kDay);
+  EXPECT_EQ(pending()[0].informativeFooterText, Value("2 days left"));
+}
+
+TEST_F(TheAgentsLife, LosesNoDismissalThatComesDuringAPostRun) {
+  pair("W", 100);
+  warranties = {{"LOCAL", shownInDays(-1, 9)}, {"W", shownInDays(-1, 9)}};
+  const StartUp startUp(world.platform);
+  world.queues.advance(60);
+  const auto plain = world.http.handler;
+  std::vector<std::pair<HTTPRequest, SimulatedHTTP::Answer>> waiting;
+  world.http.handler = [&](const HTTPRequest& request, bool, const SimulatedHTTP::Answer& answer) {
+    waiting.emplace_back(request, answer);
+  };
+  KVRScheduler::newSchedulerWithActivityDelegate(world.platform,
+                                                 std::make_shared<KVRFollowUpPost>(world.platform))
+      ->scheduleActivityForDate(world.clock.now());
+  world.queues.run();
+  ASSERT_FALSE(waiting.empty());
+  const auto agent = KVRAgent::initWithCallingProcessBundleID(world.platform, "client");
+  bool replied = false;
+  for (const char* serialNumber : {"W", ""}) {
+    agent->dismissFollowUpForSerialNumber(serialNumber,
+                                          BoolReply(world.log, "test", [&](bool yes) { replied = yes; }));
+    EXPECT_TRUE(std::exchange(replied, false));
+  }
+  world.http.handler = plain;
+  for (const auto& [request, answer] : waiting) plain(request, false, answer);
+  world.queues.advance(60);
+  EXPECT_THAT(pendingSerials(), ElementsAre("LOCAL"));
+  EXPECT_THAT(hashes(preference::kFollowUpDismissedHashes), ElementsAre(sha256Hash("W")));
+  EXPECT_EQ(hashes(preference::kFollowUpPostedHashes).size(), 2U);
+}
+
+TEST_F(TheAgentsLife, NeverRunsAFollowUpActivityTwiceWithinAMinuteWithoutANewCause) {
+  pair("W0", 100);
+  pair("W1", 100);
+  warranties = {{"LOCAL", shownInDays(-1, 10.3)},  // shown until it ends: its last day gives no date
+                {"W0", shownInDays(5, 20.7)},
+                {"W1", shownInDays(8, 3)}};  // ends unposted
+  const StartUp startUp(world.platform);
+  std::map<std::string, double> last;
+  std::map<std::string, int> runs;
+  for (int second = 0; second < 30 * 86400; second += 20) {
+    world.queues.advance(20);
+    for (const auto& line : world.log.texts()) {
+      if (line.find(": Schedule refresh for: ") != line.npos) last.erase(activity::kFollowUpRefresh);
+      for (const char* identifier :
+           {activity::kFollowUpPost, activity::kFollowUpRefresh, activity::kOutreach}) {
+        if (line != format("target reached for '%@', trigger activity", identifier)) continue;
+        EXPECT_TRUE(!last.contains(identifier) || second - last[identifier] >= 60) << identifier << second;
+        last[identifier] = second;
+        ++runs[identifier];
+      }
+    }
+    world.log.clear();
+  }
+  EXPECT_THAT(pendingSerials(), IsEmpty());
+  EXPECT_GE(runs[activity::kFollowUpPost], 25) << "daily once an offer has ended unposted";
+  EXPECT_LE(runs[activity::kFollowUpPost], 35);
+  EXPECT_GE(runs[activity::kFollowUpRefresh], 15);
+  EXPECT_LE(runs[activity::kFollowUpRefresh], 70);
+}
+
+}  // namespace
+}  // namespace kvr
