@@ -26,8 +26,8 @@ StartUp::StartUp(Platform& platform) : delegate_(platform) {
   listener_->resume(agentServiceInterface());
 }
 
-void StartUp::monitor(Platform& platform, std::shared_ptr<KVRSchedulerActivityDelegate> activity) {
-  auto scheduler = KVRScheduler::newSchedulerWithActivityDelegate(platform, std::move(activity));
+void StartUp::monitor(Platform& platform, const std::shared_ptr<KVRSchedulerActivityDelegate>& activity) {
+  auto scheduler = KVRScheduler::newSchedulerWithActivityDelegate(platform, activity);
   scheduler->monitorForScheduledActivity();
   schedulers_.push_back(std::move(scheduler));
 }

@@ -18,7 +18,7 @@ class StartUp {
   explicit StartUp(Platform& platform);
 
  private:
-  void monitor(Platform& platform, std::shared_ptr<KVRSchedulerActivityDelegate> activity);
+  void monitor(Platform& platform, const std::shared_ptr<KVRSchedulerActivityDelegate>& activity);
 
   std::vector<std::shared_ptr<KVRScheduler>> schedulers_;
   std::shared_ptr<KVRAgent> agent_;

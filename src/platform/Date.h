@@ -10,7 +10,7 @@ namespace kvr {
 struct Date {
   double secondsSince1970 = 0;
 
-  friend auto operator<=>(const Date&, const Date&) = default;
+  friend auto operator<=>(const Date&, const Date&) = default;  // NOLINT(modernize-use-nullptr)
   friend Date operator+(Date date, double seconds) { return {date.secondsSince1970 + seconds}; }
   friend Date operator-(Date date, double seconds) { return {date.secondsSince1970 - seconds}; }
   /// Seconds from `right` until `left`; negative when `left` is the earlier one.

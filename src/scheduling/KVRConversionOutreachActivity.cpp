@@ -14,7 +14,7 @@ void KVRConversionOutreachActivity::performActivityForScheduler(
       "%s: for conversion outreach",
       "-[KVRConversionOutreachActivity performActivityForScheduler:withCompletionHandler:]");
   std::make_shared<KVROutreachActivityUtilities>(platform_)->performOutreachActivityForConversion(
-      true, scheduler, std::move(withCompletionHandler));
+      true, scheduler, withCompletionHandler);
 }
 
 }  // namespace kvr

@@ -13,7 +13,7 @@ void KVROutreachActivity::performActivityForScheduler(const std::shared_ptr<KVRS
   platform_.log.standard("%s: for general outreach",
                          "-[KVROutreachActivity performActivityForScheduler:withCompletionHandler:]");
   std::make_shared<KVROutreachActivityUtilities>(platform_)->performOutreachActivityForConversion(
-      false, scheduler, std::move(withCompletionHandler));
+      false, scheduler, withCompletionHandler);
 }
 
 }  // namespace kvr

@@ -23,7 +23,8 @@ std::string describeSubscriptions(const std::map<std::string, Carrier>& subscrip
 }  // namespace
 
 void KVROutreachActivityUtilities::performOutreachActivityForConversion(
-    bool conversion, const std::shared_ptr<KVRScheduler>& withScheduler, ActivityHandler andCompletion) {
+    bool conversion, const std::shared_ptr<KVRScheduler>& withScheduler,
+    const ActivityHandler& andCompletion) {
   outreachInProgress = true;
   startDeferCheck(conversion, withScheduler, andCompletion);
   std::vector<KVRDeviceRef> devices;

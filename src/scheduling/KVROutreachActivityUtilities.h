@@ -25,7 +25,7 @@ class KVROutreachActivityUtilities : public std::enable_shared_from_this<KVROutr
   /// Returns at once; answers on a background queue. `conversion` shows in the log lines only.
   void performOutreachActivityForConversion(bool conversion,
                                             const std::shared_ptr<KVRScheduler>& withScheduler,
-                                            ActivityHandler andCompletion);
+                                            const ActivityHandler& andCompletion);
   /// False when one of this device's carriers is excluded from the offer.
   bool currentDeviceShouldReceiveOutreachForWarranty(const KVRWarranty& warranty) const;
 

@@ -26,8 +26,8 @@ void KVRPostBootActivity::performActivityForScheduler(const std::shared_ptr<KVRS
 }
 
 std::optional<Date> KVRPostBootActivity::registerAgain(
-    std::shared_ptr<KVRSchedulerActivityDelegate> activity) {
-  const auto scheduler = KVRScheduler::newSchedulerWithActivityDelegate(platform_, std::move(activity));
+    const std::shared_ptr<KVRSchedulerActivityDelegate>& activity) {
+  const auto scheduler = KVRScheduler::newSchedulerWithActivityDelegate(platform_, activity);
   const auto date = scheduler->scheduledActivityDate();
   if (!date) return std::nullopt;
   platform_.log.standard("'%@' not complete, rescheduling", scheduler->identifier());

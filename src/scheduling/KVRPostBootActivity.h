@@ -18,7 +18,7 @@ class KVRPostBootActivity : public KVRSchedulerActivityDelegate {
 
  private:
   /// The date for which the activity was registered again, if it was.
-  std::optional<Date> registerAgain(std::shared_ptr<KVRSchedulerActivityDelegate> activity);
+  std::optional<Date> registerAgain(const std::shared_ptr<KVRSchedulerActivityDelegate>& activity);
 
   Platform& platform_;
 };

@@ -65,7 +65,7 @@ bool KVRPostUpgradeActivity::shouldTriggerWarrantyDownload() const {
   const auto current = platform_.deviceProperties.answer(DeviceProperties::kProductVersion);
   const auto recorded = platform_.preferences.stringForKey(preference::kPostUpgradeOSVersion);
   if (!current) return false;
-  if (recorded && compareVersions(*current, *recorded) <= 0) return false;
+  if (recorded && std::is_lteq(compareVersions(*current, *recorded))) return false;
   const auto outreach = KVRScheduler::newSchedulerWithActivityDelegate(
       platform_, std::make_shared<KVROutreachActivity>(platform_));
   return !outreach->scheduledActivityDate();

@@ -24,11 +24,12 @@ ActivityCriteria criteria(double delay, bool requiresNetwork) {
 }  // namespace
 
 std::shared_ptr<KVRScheduler> KVRScheduler::newSchedulerWithActivityDelegate(
-    Platform& platform, std::shared_ptr<KVRSchedulerActivityDelegate> activityDelegate) {
-  return std::make_shared<KVRScheduler>(platform, std::move(activityDelegate));
+    Platform& platform, const std::shared_ptr<KVRSchedulerActivityDelegate>& activityDelegate) {
+  return std::make_shared<KVRScheduler>(platform, activityDelegate);
 }
 
-KVRScheduler::KVRScheduler(Platform& platform, std::shared_ptr<KVRSchedulerActivityDelegate> theDelegate)
+KVRScheduler::KVRScheduler(Platform& platform,
+                           const std::shared_ptr<KVRSchedulerActivityDelegate>& theDelegate)
     : activityDelegate(theDelegate),
       platform_(platform),
       activity_(platform.activities.newActivity(theDelegate->identifier())),
@@ -46,8 +47,8 @@ void KVRScheduler::monitorForScheduledActivity() {
   platform_.log.standard("monitorForScheduledActivity for '%@'", identifier());
   activity_->setPreregistered(true);
   if (const auto target = scheduledActivityDate()) activity_->setEarliestDate(*target);
-  activity_->schedule([self = shared_from_this()](ActivityHandler handler) {
-    self->performScheduledOutreachWithBlock(std::move(handler));
+  activity_->schedule([self = shared_from_this()](const ActivityHandler& handler) {
+    self->performScheduledOutreachWithBlock(handler);
   });
 }
 
@@ -64,10 +65,10 @@ void KVRScheduler::_scheduleActivityWithDelay(double delay, std::optional<Date> 
   activity_->setPreregistered(false);
   activity_->setCriteria(criteria(delay > 0 ? delay : 0, activityDelegate()->requiresNetwork()));
   platform_.preferences.setObject(forDate, targetDateKey_);
-  activity_->schedule([self = shared_from_this()](ActivityHandler handler) {
+  activity_->schedule([self = shared_from_this()](const ActivityHandler& handler) {
     self->platform_.log.standard("Velt activity block occured '%@' at (%@)", self->identifier(),
                                  self->platform_.clock.now());
-    self->performScheduledOutreachWithBlock(std::move(handler));
+    self->performScheduledOutreachWithBlock(handler);
   });
 }
 
@@ -75,7 +76,7 @@ std::optional<Date> KVRScheduler::scheduledActivityDate() const {
   return platform_.preferences.dateForKey(targetDateKey_);
 }
 
-void KVRScheduler::performScheduledOutreachWithBlock(ActivityHandler block) {
+void KVRScheduler::performScheduledOutreachWithBlock(const ActivityHandler& block) {
   auto& log = platform_.log;
   const auto stored = platform_.preferences.objectForKey(targetDateKey_);
   const auto target = stored.dateIfAny();

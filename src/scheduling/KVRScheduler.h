@@ -24,9 +24,9 @@ namespace kvr {
 class KVRScheduler : public std::enable_shared_from_this<KVRScheduler> {
  public:
   static std::shared_ptr<KVRScheduler> newSchedulerWithActivityDelegate(
-      Platform& platform, std::shared_ptr<KVRSchedulerActivityDelegate> activityDelegate);
+      Platform& platform, const std::shared_ptr<KVRSchedulerActivityDelegate>& activityDelegate);
   /// Use `newSchedulerWithActivityDelegate`.
-  KVRScheduler(Platform& platform, std::shared_ptr<KVRSchedulerActivityDelegate> activityDelegate);
+  KVRScheduler(Platform& platform, const std::shared_ptr<KVRSchedulerActivityDelegate>& activityDelegate);
 
   /// Removes the target date of every activity. What the platform has registered stays registered.
   static void clearScheduledActivities(Platform& platform);
@@ -40,7 +40,7 @@ class KVRScheduler : public std::enable_shared_from_this<KVRScheduler> {
   /// The stored target date.
   std::optional<Date> scheduledActivityDate() const;
   /// The gate: one run by the platform. Answers `block` once.
-  void performScheduledOutreachWithBlock(ActivityHandler block);
+  void performScheduledOutreachWithBlock(const ActivityHandler& block);
 
   /// Whether the platform asks the running activity to stop and defer.
   bool shouldDefer() const { return activity_->shouldDefer(); }

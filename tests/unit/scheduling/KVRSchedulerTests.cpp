@@ -115,7 +115,8 @@ TEST_F(AScheduler, KeepsTheDateOfADeferredRunAndOneStoredDuringTheRun) {
   ASSERT_EQ(runs.size(), 3U);
   EXPECT_LE(runs[1], 100);
   EXPECT_GE(runs[2], 1000);
-  EXPECT_TRUE(simulated.log.contains("Velt activity block occured 'test' at (" + describe(start + 60).substr(0, 16)));
+  EXPECT_TRUE(
+      simulated.log.contains("Velt activity block occured 'test' at (" + describe(start + 60).substr(0, 16)));
 }
 
 TEST_F(AScheduler, WaitsOutAClockThatIsMovedBack) {
