@@ -267,14 +267,19 @@ TEST_P(WorkQueuesTest, WorkThatNeverRanIsReleasedAtTheEnd) {
   queues().after(1e6, queue, [held = marker] {});
   queues().after(INFINITY, queues().mainQueue(), [held = marker] {});
   const auto timer = queues().newRepeatingTimer(1e6, queue, [held = marker] {});
-  concurrent()->async([never = newSignal(), queue, held = marker] {
-    never->wait(std::nullopt);  // ends with the world: what follows comes too late
-    for (int i = 0; i < kMany; ++i) queue->async([held] {});
+  // This item's wait ends with the world. What stands behind it, or is handed over after it, comes too late.
+  const auto begun = newSignal();
+  std::atomic<int> late{0};
+  queue->async([&late, begun, never = newSignal(), queue, held = marker] {
+    begun->signal();
+    never->wait(std::nullopt);
+    queue->async([&late, held] { ++late; });
   });
-  flush(serial());
+  for (int i = 0; i < kMany; ++i) queue->async([&late, held = marker] { ++late; });
+  await(begun);
   timer->invalidate();
-  world->beginEnding();
   world.reset();
+  EXPECT_EQ(late, 0);
   EXPECT_EQ(marker.use_count(), 1);
 }
 

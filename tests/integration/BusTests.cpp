@@ -1,6 +1,6 @@
 #include "platform/local/PeerIdentity.h"
 #include "platform/local/bus/BusCodec.h"
-#include "support/BusFixture.h"
+#include "integration/support/BusFixture.h"
 
 #include <gmock/gmock.h>
 
@@ -24,7 +24,7 @@ TEST_F(AService, DeliversTheCallsOfAConnectionInTheirOrderFromTheVeryFirst) {
       reply(arguments.at(0));
     };
   };
-  serve();
+  const auto serving = serve();
   const RawBusClient client = newClient();
   for (std::uint64_t i = 1; i < kCalls; ++i) {
     ASSERT_GE(sd_bus_send(client.bus(), client.newCall("EchoNumber", "t", {i}).get(), nullptr), 0);
@@ -51,7 +51,7 @@ TEST_F(AService, GivesEveryConnectionAnObjectOfItsOwnThatMayBlockThatConnectionO
       reply(Value(number));
     };
   };
-  serve();
+  const auto serving = serve();
   const RawBusClient first = newClient();
   const RawBusClient second = newClient();
   EXPECT_EQ(first.value("t", first.call("EchoNumber", "t", {0})), Value(1));
@@ -70,7 +70,7 @@ TEST_F(AService, LetsGoOfTheObjectWithItsConnectionEvenInTheMiddleOfACall) {
         [&](const std::string&, const Value::Array&, const ServiceReply& reply) { begun.set_value(reply); };
   };
   onObjectGone = [&] { gone.set_value(); };
-  serve();
+  const auto serving = serve();
   RawBusClient client = newClient();
   ASSERT_GE(sd_bus_send(client.bus(), client.newCall("EchoText", "s", {"x"}).get(), nullptr), 0);
   ASSERT_GE(sd_bus_flush(client.bus()), 0);
@@ -93,7 +93,7 @@ TEST_F(AService, LetsGoOfTheObjectWithItsConnectionEvenInTheMiddleOfACall) {
 
 TEST_F(AService, RefusesAConnectionForGoodWhenItsProgramIsNotEntitled) {
   entitle("true");
-  serve();
+  const auto serving = serve();
   const RawBusClient client = newClient();
   const auto refused = client.call("EchoText", "s", {"x"});
   EXPECT_EQ(refused.error, "org.freedesktop.DBus.Error.AccessDenied");
@@ -108,7 +108,7 @@ TEST_F(AService, RefusesAConnectionForGoodWhenItsProgramIsNotEntitled) {
 
 TEST_F(AService, OpensItsDescriptionToThoseItRefuses) {
   entitle(false);
-  serve();
+  const auto serving = serve();
   const RawBusClient client = newClient();
   for (const auto& [interface, member, text] : {std::tuple{"org.freedesktop.DBus.Peer", "GetMachineId", ""},
                                                 {"org.freedesktop.DBus.Introspectable", "Introspect",
@@ -132,7 +132,7 @@ TEST_F(AService, AnswersWithAnErrorWhatItCannotServe) {
       if (arguments.at(0) == Value("text")) return reply(Value(std::string("a\0b", 3)));
     };
   };
-  serve();
+  const auto serving = serve();
   const RawBusClient client = newClient();
   struct {
     const char* member;
@@ -169,7 +169,7 @@ TEST_F(AService, TakesTheReplyFromAnyThreadAndSendsNoneThatIsNotExpected) {
       std::thread([reply = std::move(reply), value = arguments.at(0)] { reply(value); }).join();
     };
   };
-  serve();
+  const auto serving = serve();
   const RawBusClient client = newClient();
   const BusMessageRef unanswered = client.newCall("EchoText", "s", {"unanswered"});
   ASSERT_GE(sd_bus_message_set_expect_reply(unanswered.get(), 0), 0);
@@ -191,7 +191,7 @@ TEST_F(AService, AnswersTooLargeAReplyWithAnErrorAndServesOn) {
       reply(Value::Dictionary{{"data", arguments.at(1) == Value(0) ? fits : tooLarge}});
     };
   };
-  serve();
+  const auto serving = serve();
   const RawBusClient client = newClient();
   EXPECT_EQ(client.call("Record", "st", {"", 1}).error, "org.freedesktop.DBus.Error.Failed");
   EXPECT_EQ(client.value("a{sv}", client.call("Record", "st", {"", 0}))["data"], Value(fits));
@@ -200,7 +200,7 @@ TEST_F(AService, AnswersTooLargeAReplyWithAnErrorAndServesOn) {
 TEST_F(AService, ReportsTheLossOfTheBusOnce) {
   std::promise<void> gone;
   onObjectGone = [&] { gone.set_value(); };
-  serve();
+  const auto serving = serve();
   const RawBusClient client = newClient();
   client.call("EchoText", "s", {"x"});
   bus.kill();
@@ -230,7 +230,7 @@ TEST_F(AService, EndsByGivingItsNameUpAndAnsweringWhatItHasTaken) {
     return
         [&](const std::string&, const Value::Array&, const ServiceReply& reply) { begun.set_value(reply); };
   };
-  serve();
+  const auto serving = serve();
   const RawBusClient client = newClient();
   std::optional<std::string> answer;
   const auto handler = [](sd_bus_message* message, void* userdata, sd_bus_error*) {

@@ -2,8 +2,8 @@
 #include "platform/JSON.h"
 #include "platform/local/Descriptor.h"
 #include "platform/local/LocalCertificates.h"
-#include "support/ChildProcess.h"
-#include "support/TemporaryDirectory.h"
+#include "integration/support/ChildProcess.h"
+#include "integration/support/TemporaryDirectory.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -133,7 +133,8 @@ class ACoverageService : public ::testing::Test {
     address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
     EXPECT_EQ(connect(client.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
     std::string text = request.method + " " + request.path + " HTTP/1.1\r\nHost: a\r\nConnection: close\r\n";
-    for (const auto& [name, value] : request.headers) text += name + ": " + value + "\r\n";
+    for (const auto& [name, value] : request.headers)
+      text.append(name).append(": ").append(value).append("\r\n");
     text += "Content-Length: " + std::to_string(request.body.size()) + "\r\n\r\n" + request.body;
     EXPECT_EQ(::send(client.get(), text.data(), text.size(), MSG_NOSIGNAL),
               static_cast<ssize_t>(text.size()));
@@ -176,14 +177,14 @@ TEST_F(ACoverageService, RefusesEveryBrokenRuleWithAReason) {
   EXPECT_THAT(ask(renewed), StartsWith("HTTP/1.1 200"));
 
   using Change = std::function<void(Request&)>;
-  const auto set = [](const char* name, std::string value) {
+  const auto set = [](const char* name, const std::string& value) {
     return [=](Request& request) { request.set(name, value); };
   };
   const auto remove = [](const char* name) { return [=](Request& request) { request.remove(name); }; };
   const auto replace = [](const char* part, const char* other) {
     return [=](Request& request) { request.replaceInBody(part, other); };
   };
-  const auto chain = [&set](std::string bytes) { return set("X-Tarsil-Kest", base64(bytes)); };
+  const auto chain = [&set](const std::string& bytes) { return set("X-Tarsil-Kest", base64(bytes)); };
   struct Case {
     const char* reason;
     Change change;

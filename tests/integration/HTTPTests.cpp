@@ -1,7 +1,7 @@
 #include "platform/local/EventLoop.h"
 #include "platform/local/LocalHTTP.h"
 #include "platform/local/LocalWorkQueues.h"
-#include "support/RecordingLog.h"
+#include "integration/support/RecordingLog.h"
 
 #include <arpa/inet.h>
 #include <gmock/gmock.h>
@@ -415,6 +415,7 @@ TEST_F(OverHTTP, FiftyRequestsAtOnceShareSixConnections) {
     echo(peer);
   });
   std::vector<std::future<HTTPResponse>> replies;
+  replies.reserve(50);
   for (int i = 0; i < 50; ++i) replies.push_back(start(get(server.url("/" + std::to_string(i)))));
   for (int i = 0; i < 50; ++i) {
     const HTTPResponse got = replies[static_cast<std::size_t>(i)].get();
@@ -427,6 +428,7 @@ TEST_F(OverHTTP, FiftyRequestsAtOnceShareSixConnections) {
 TEST_F(OverHTTP, TheTimeSpentWaitingForAConnectionCounts) {
   const ScriptedServer server(keepSilent);
   std::vector<std::future<HTTPResponse>> pending;
+  pending.reserve(6);
   for (int i = 0; i < 6; ++i) pending.push_back(start(get(server.url())));
   HTTPRequest brief = get(server.url());
   brief.timeout = 0.05;

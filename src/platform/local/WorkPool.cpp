@@ -274,6 +274,11 @@ void WorkPool::runItem(Work& work) noexcept {
 
 void WorkPool::beginEnding() {
   const Lock lock(mutex_);
+  endWaits();
+}
+
+/// With the mutex held.
+void WorkPool::endWaits() {
   ending_ = true;
   for (auto* const wait : waits_) wait->notify_all();
 }
@@ -293,11 +298,11 @@ bool WorkPool::drain(double limit) {
 }
 
 void WorkPool::stop() {
-  beginEnding();
   std::deque<Turn> turns;
   std::deque<std::deque<Work>> items;
   Lock lock(mutex_);
   closed_ = true;
+  endWaits();
   turns.swap(ready_);
   std::move(readyInBackground_.begin(), readyInBackground_.end(), std::back_inserter(turns));
   readyInBackground_.clear();
