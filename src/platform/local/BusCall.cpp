@@ -11,7 +11,7 @@
 namespace kvr {
 namespace {
 
-constexpr std::size_t kLongestText = 4096;  // bytes
+constexpr std::size_t kLongestText = 1U << 20U;  // bytes
 
 Error invalidArguments(const ServiceMethod& method, const std::string& why) {
   return {SD_BUS_ERROR_INVALID_ARGS, EINVAL, std::string(method.member) + ": " + why};
