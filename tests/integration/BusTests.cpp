@@ -106,22 +106,6 @@ TEST_F(AService, RefusesAConnectionForGoodWhenItsProgramIsNotEntitled) {
   EXPECT_THAT(decisions, ElementsAre(Value("true"), Value(true)));
 }
 
-TEST_F(AService, OpensItsDescriptionToThoseItRefuses) {
-  entitle(false);
-  const auto serving = serve();
-  const RawBusClient client = newClient();
-  for (const auto& [interface, member, text] : {std::tuple{"org.freedesktop.DBus.Peer", "GetMachineId", ""},
-                                                {"org.freedesktop.DBus.Introspectable", "Introspect",
-                                                 R"(<arg type="t" name="number" direction="in"/>)"}}) {
-    sd_bus_message* message = nullptr;
-    sd_bus_message_new_method_call(client.bus(), &message, RawBusClient::kName, RawBusClient::kPath,
-                                   interface, member);
-    const auto reply = client.call(BusMessageRef(message));
-    EXPECT_THAT(client.value("s", reply).string(), HasSubstr(text)) << member;
-  }
-  EXPECT_TRUE(decisions.empty());
-}
-
 TEST_F(AService, AnswersWithAnErrorWhatItCannotServe) {
   std::atomic<int> served = 0;
   newBehaviour = [&] {
@@ -215,13 +199,6 @@ TEST_F(AService, IsLostWithoutItsName) {
   listener->resume({RawBusClient::kInterface, {}});
   EXPECT_TRUE(waitUntilLost());
   EXPECT_EQ(log.errorsWith("somebody else has it").size(), 1U);
-}
-
-TEST_F(AService, IsLostWithoutABus) {
-  bus.kill();
-  listener->resume({RawBusClient::kInterface, {}});
-  EXPECT_TRUE(waitUntilLost());
-  EXPECT_EQ(log.errorsWith("cannot be reached").size(), 1U);
 }
 
 TEST_F(AService, EndsByGivingItsNameUpAndAnsweringWhatItHasTaken) {
