@@ -93,7 +93,8 @@ TEST_F(TheAgent, DownloadsOnceAndThenAnswersFromTheCacheUntilTheLanguageChanges)
     EXPECT_THAT(entry.path().string(), Not(HasSubstr("SNPHONE")));
     EXPECT_THAT(entry.path().string(), Not(HasSubstr("SNWATCH")));
   }
-  for (const auto& [key, value] : world.preferences().dictionary()) EXPECT_THAT(key, Not(HasSubstr("SN")));
+  const Value preferences = world.preferences();
+  for (const auto& [key, value] : preferences.dictionary()) EXPECT_THAT(key, Not(HasSubstr("SN")));
 }
 
 TEST_F(TheAgent, RenewsTheTokenAfterA401AndTriesThreeTimesAtMost) {

@@ -129,7 +129,7 @@ TEST_F(AService, AnswersWithAnErrorWhatItCannotServe) {
       {"EchoText", "s", {"throw"}, "org.freedesktop.DBus.Error.Failed", true},
       {"EchoText", "s", {"kind"}, "org.freedesktop.DBus.Error.Failed", true},
       {"EchoText", "s", {"text"}, "org.freedesktop.DBus.Error.Failed", true},
-      {"EchoText", "s", {std::string(5000, 'x')}, "org.freedesktop.DBus.Error.InvalidArgs", false},
+      {"EchoText", "s", {std::string((1U << 20U) + 1, 'x')}, "org.freedesktop.DBus.Error.InvalidArgs", false},
       {"EchoText", "t", {1}, "org.freedesktop.DBus.Error.InvalidArgs", false},
       {"EchoText", "ss", {"a", "b"}, "org.freedesktop.DBus.Error.InvalidArgs", false},
       {"EchoText", "", {}, "org.freedesktop.DBus.Error.InvalidArgs", false},

@@ -72,7 +72,8 @@ TEST(ATree, ThatXMLCannotHoldIsHeldByTheBinaryEncoding) {
       {Date{-1.1e15}, "XML holds no date outside the calendar"},
   };
   for (const auto& [value, message] : kCases) {
-    std::vector<Value> trees{Value::Array{1, value}};
+    std::vector<Value> trees;
+    trees.emplace_back(Value::Array{1, value});
     if (value.isString()) trees.emplace_back(Value::Dictionary{{value.string(), 1}});
     for (const auto& tree : trees) {
       const auto xml = writePropertyList(tree, kXML);
