@@ -139,7 +139,8 @@ TEST_F(TheAgent, ServesOthersWhileSomeWaitForRenewalsAndAttestations) {
   for (int i = 0; i < 20; ++i) {
     EXPECT_EQ(label(World::info(polite, World::kFirstWatch, World::CacheOnly)), Value("Warranty"));
   }
-  EXPECT_EQ(world.agent().terminate(), 0) << "the end does not wait for remote answers";
+  EXPECT_EQ(world.agent().terminate(), 0) << "the end does not wait for remote answers\n"
+                                          << world.agent().errorOutput();
 }
 
 TEST_F(TheAgent, SendsTheRequestWithWhateverAttestationHeadersCouldBeMade) {
