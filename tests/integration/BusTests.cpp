@@ -1,6 +1,6 @@
+#include "integration/support/BusFixture.h"
 #include "platform/local/PeerIdentity.h"
 #include "platform/local/bus/BusCodec.h"
-#include "integration/support/BusFixture.h"
 
 #include <gmock/gmock.h>
 

@@ -1,9 +1,9 @@
+#include "integration/support/ChildProcess.h"
+#include "integration/support/TemporaryDirectory.h"
 #include "platform/Base64.h"
 #include "platform/JSON.h"
 #include "platform/local/Descriptor.h"
 #include "platform/local/LocalCertificates.h"
-#include "integration/support/ChildProcess.h"
-#include "integration/support/TemporaryDirectory.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>

@@ -1,7 +1,7 @@
+#include "integration/support/RecordingLog.h"
 #include "platform/local/EventLoop.h"
 #include "platform/local/LocalHTTP.h"
 #include "platform/local/LocalWorkQueues.h"
-#include "integration/support/RecordingLog.h"
 
 #include <arpa/inet.h>
 #include <gmock/gmock.h>

@@ -1,6 +1,6 @@
-#include "platform/JSON.h"
 #include "integration/support/BusFixture.h"
 #include "integration/support/ChildProcess.h"
+#include "platform/JSON.h"
 
 #include <gmock/gmock.h>
 

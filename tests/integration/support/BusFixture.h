@@ -1,14 +1,14 @@
 #pragma once
 
+#include "integration/support/PrivateBus.h"
+#include "integration/support/RawBusClient.h"
+#include "integration/support/RecordingLog.h"
+#include "integration/support/TemporaryDirectory.h"
 #include "platform/local/EventLoop.h"
 #include "platform/local/LocalClock.h"
 #include "platform/local/LocalFiles.h"
 #include "platform/local/LocalServiceListeners.h"
 #include "platform/local/LocalWorkQueues.h"
-#include "integration/support/PrivateBus.h"
-#include "integration/support/RawBusClient.h"
-#include "integration/support/RecordingLog.h"
-#include "integration/support/TemporaryDirectory.h"
 
 #include <gtest/gtest.h>
 
