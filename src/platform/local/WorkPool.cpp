@@ -13,7 +13,8 @@ namespace kvr {
 
 namespace {
 
-constexpr std::size_t kStackSize = std::size_t{512} << 10;
+/// Enough to let go of, compare and write the deepest tree in any build; only what is used costs memory.
+constexpr std::size_t kStackSize = std::size_t{4} << 20;
 constexpr unsigned kMostPassedOver = 16;
 constexpr double kLongestWait = 1e9;  // seconds; a longer wait is one without a limit
 
