@@ -164,12 +164,12 @@ void KVRAgent::getAllDeviceInfosUsingPolicy(std::uint64_t policy, bool updateFol
   };
   const auto results = std::make_shared<Results>();
   const auto self = shared_from_this();
-  for (const auto& [serialNumber, device] : deviceProvider()->allDevices()) {
+  for (const auto& entry : deviceProvider()->allDevices()) {
     group_.enter();
     getWarrantyUsingPolicy(
-        policy, serialNumber,
+        policy, entry.first,
         WarrantyReply(platform_.log, "getAllDeviceInfosUsingPolicy",
-                      [self, results, device = device](const KVRWarrantyRef& warranty) {
+                      [self, results, device = entry.second](const KVRWarrantyRef& warranty) {
                         {
                           const std::lock_guard lock(results->mutex);
                           results->list.push_back(KVRDeviceInfo::deviceInfoWithDevice(device, warranty));

@@ -49,9 +49,9 @@ class KVRAgent : public KVRAgentProtocol, public std::enable_shared_from_this<KV
   /// thread on which the download finishes. A serial number that no device can have is refused with an error
   /// line and answered with nothing.
   void getWarrantyUsingPolicy(std::uint64_t policy, const std::optional<std::string>& serialNumber,
-                              WarrantyReply withReply);
+                              const WarrantyReply& withReply);
   /// The same for the local device.
-  void getWarrantyUsingPolicy(std::uint64_t policy, WarrantyReply withReply);
+  void getWarrantyUsingPolicy(std::uint64_t policy, const WarrantyReply& withReply);
 
   AtomicProperty<std::shared_ptr<KVRAgentWarrantyProvider>> warrantyProvider;
   AtomicProperty<std::shared_ptr<KVRAgentDeviceProvider>> deviceProvider;

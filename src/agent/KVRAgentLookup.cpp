@@ -76,7 +76,7 @@ std::optional<double> KVRAgent::secondsFresh(KVRAgentWarrantyProvider& provider,
 }
 
 void KVRAgent::getWarrantyUsingPolicy(std::uint64_t policy, const std::optional<std::string>& serialNumber,
-                                      WarrantyReply withReply) {
+                                      const WarrantyReply& withReply) {
   auto& log = platform_.log;
   if (const auto* fault = serialNumber ? faultOfSerialNumber(*serialNumber) : "is missing") {
     log.error("%s: serial number refused, it %s", kOperation, fault);
@@ -116,8 +116,8 @@ void KVRAgent::getWarrantyUsingPolicy(std::uint64_t policy, const std::optional<
                          [complete](bool, const KVRWarrantyRef& downloaded) { complete(downloaded); }));
 }
 
-void KVRAgent::getWarrantyUsingPolicy(std::uint64_t policy, WarrantyReply withReply) {
-  getWarrantyUsingPolicy(policy, deviceProvider()->defaultDevice()->serialNumber(), std::move(withReply));
+void KVRAgent::getWarrantyUsingPolicy(std::uint64_t policy, const WarrantyReply& withReply) {
+  getWarrantyUsingPolicy(policy, deviceProvider()->defaultDevice()->serialNumber(), withReply);
 }
 
 }  // namespace kvr

@@ -186,6 +186,7 @@ Result<std::string> Report::json(const Device& device) const {
 
 Result<std::string> Report::json(const std::vector<Device>& devices) const {
   std::vector<Result<std::string>> elements;
+  elements.reserve(devices.size());
   for (const Device& device : devices) elements.push_back(writeJSON(treeOf(device)));
   const Result<std::string> content = list(elements);
   if (!content) return content.error();

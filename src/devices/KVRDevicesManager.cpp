@@ -29,11 +29,11 @@ KVRDeviceRef KVRDevicesManager::defaultDevice() {
 
 std::optional<std::string> KVRDevicesManager::localSerialNumber() const {
   if (KVRUtilities::isInternal(platform_)) {
-    const auto override = platform_.preferences.stringForKey(preference::kSerialNumber);
+    auto override = platform_.preferences.stringForKey(preference::kSerialNumber);
     platform_.log.standard("default device SerialNumber Override = %{private}@", override);
     if (override) return override;
   }
-  const auto serialNumber = platform_.deviceProperties.answer(DeviceProperties::kSerialNumber);
+  auto serialNumber = platform_.deviceProperties.answer(DeviceProperties::kSerialNumber);
   platform_.log.standard("default device SerialNumber: '%{private}@'", serialNumber);
   return serialNumber;
 }

@@ -39,7 +39,8 @@ class AccountStore {
 
   virtual ~AccountStore() = default;
   virtual std::optional<CloudAccount> primaryAccount() const = 0;
-  virtual std::optional<AuthenticationAccount> authenticationAccountFor(const CloudAccount& account) const = 0;
+  virtual std::optional<AuthenticationAccount> authenticationAccountFor(
+      const CloudAccount& account) const = 0;
   virtual std::optional<StoreAccount> storeAccountFor(const CloudAccount& account) const = 0;
   /// The token of the credential held for a service, or nothing.
   virtual std::optional<std::string> tokenFor(const AuthenticationAccount& account,

@@ -54,7 +54,8 @@ class DeviceAttestation {
   static constexpr std::string_view kAccessControls = "AccessControls";
   static constexpr std::string_view kDeviceOSInformation = "DeviceOSInformation";
 
-  using Reply = std::function<void(AttestedKeyRef key, std::optional<CertificateChain> chain, std::optional<Error> error)>;
+  using Reply = std::function<void(AttestedKeyRef key, std::optional<CertificateChain> chain,
+                                   std::optional<Error> error)>;
 
   virtual ~DeviceAttestation() = default;
   virtual bool isSupported() const = 0;

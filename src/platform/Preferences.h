@@ -35,7 +35,9 @@ class Preferences {
   virtual void update(std::string_view key, const std::function<Value(const Value&)>& change) = 0;
 
   // Typed readings; a value of another kind counts as absent, or reads as a stored setting does.
-  std::optional<std::string> stringForKey(std::string_view key) const { return objectForKey(key).stringIfAny(); }
+  std::optional<std::string> stringForKey(std::string_view key) const {
+    return objectForKey(key).stringIfAny();
+  }
   std::optional<Date> dateForKey(std::string_view key) const { return objectForKey(key).dateIfAny(); }
   bool boolForKey(std::string_view key) const { return objectForKey(key).asBool(); }
   double doubleForKey(std::string_view key) const { return objectForKey(key).asDouble(); }

@@ -71,7 +71,8 @@ class ServiceListener {
   virtual ~ServiceListener() = default;
   /// The delegate must outlive the listener.
   virtual void setDelegate(ServiceListenerDelegate& delegate) = 0;
-  /// Takes the name and lets connections arrive. The interface that is offered for introspection is `interface`.
+  /// Takes the name and lets connections arrive. The interface that is offered for introspection is
+  /// `interface`.
   virtual void resume(const ServiceInterface& interface) = 0;
 };
 

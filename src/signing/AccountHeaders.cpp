@@ -163,7 +163,9 @@ std::string _userAgent(Platform& platform) {
 
 std::string headerDescription(const HTTPRequest& request) {
   std::string text = "{";
-  for (const auto& [name, value] : request.headers.fields()) text += name + " = \"" + value + "\"; ";
+  for (const auto& [name, value] : request.headers.fields()) {
+    text.append(name).append(" = \"").append(value).append("\"; ");
+  }
   return text + "}";
 }
 

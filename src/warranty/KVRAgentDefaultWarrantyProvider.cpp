@@ -40,7 +40,7 @@ void KVRAgentDefaultWarrantyProvider::migrateLegacyFollowUpIfNeededWithDeviceInf
 void KVRAgentDefaultWarrantyProvider::downloadWarrantyForSerialNumber(const std::string& serialNumber,
                                                                       DownloadCompletion completionHandler) {
   const auto downloader = std::make_shared<KVRWarrantyDownloader>(platform_, callingProcessBundleID_);
-  downloader->downloadWarrantyForSerialNumber(serialNumber, std::move(completionHandler));
+  downloader->downloadWarrantyForSerialNumber(serialNumber, completionHandler);
 }
 
 KVRWarrantyRef KVRAgentDefaultWarrantyProvider::cachedWarrantyForSerialNumber(

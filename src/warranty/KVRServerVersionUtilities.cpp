@@ -97,7 +97,7 @@ std::string VersionSet::description() const {
   return "{" + list + "}";
 }
 
-void KVRServerVersionUtilities::serverVersionSupported(Platform& platform, BoolCompletion completion) {
+void KVRServerVersionUtilities::serverVersionSupported(Platform& platform, const BoolCompletion& completion) {
   _supportedVersionsForClientAndServer(
       platform, kRefresh,
       VersionsCompletion(platform.log, "serverVersionSupported", [&platform, completion](const auto& shared) {
@@ -108,7 +108,7 @@ void KVRServerVersionUtilities::serverVersionSupported(Platform& platform, BoolC
 }
 
 void KVRServerVersionUtilities::isHighServerVersionFeaturesetEnabled(Platform& platform, std::uint64_t policy,
-                                                                     BoolCompletion withCompletion) {
+                                                                     const BoolCompletion& withCompletion) {
   _supportedVersionsForClientAndServer(
       platform, policy,
       VersionsCompletion(
@@ -122,8 +122,8 @@ void KVRServerVersionUtilities::isHighServerVersionFeaturesetEnabled(Platform& p
 }
 
 void KVRServerVersionUtilities::isHighServerVersionFeaturesetEnabled(Platform& platform,
-                                                                     BoolCompletion completion) {
-  isHighServerVersionFeaturesetEnabled(platform, kDefault, std::move(completion));
+                                                                     const BoolCompletion& completion) {
+  isHighServerVersionFeaturesetEnabled(platform, kDefault, completion);
 }
 
 bool KVRServerVersionUtilities::isHighServerVersionFeaturesetEnabled(Platform& platform) {
@@ -147,8 +147,8 @@ Value KVRServerVersionUtilities::_getValidServerVersionCache(Platform& platform)
   return {};
 }
 
-void KVRServerVersionUtilities::_supportedVersionsForClientAndServer(Platform& platform, std::uint64_t policy,
-                                                                     VersionsCompletion withCompletion) {
+void KVRServerVersionUtilities::_supportedVersionsForClientAndServer(
+    Platform& platform, std::uint64_t policy, const VersionsCompletion& withCompletion) {
   const auto override = platform.preferences.objectForKey(preference::kServerVersionOverride);
   platform.log.standard(" Server lookup policy:%ld", policy);
   if (!override.isNull()) {
@@ -239,7 +239,7 @@ Fetched bodyOf(const HTTPResponse& response) {
 }  // namespace
 
 void KVRServerVersionUtilities::_dictionaryFromURL(Platform& platform, const Value& url, bool shouldRetry,
-                                                   DictionaryCompletion withCompletion) {
+                                                   const DictionaryCompletion& withCompletion) {
   const auto target = url.isString() ? URL::parse(url.string()) : std::nullopt;
   const auto handle = [&platform, url, shouldRetry, withCompletion](const Fetched& fetched) {
     handleFetched(platform, url, shouldRetry, fetched, withCompletion);

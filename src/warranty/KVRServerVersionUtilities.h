@@ -49,23 +49,23 @@ class KVRServerVersionUtilities {
   using DictionaryCompletion = Completion<Value>;
 
   /// Whether client and service share a version, by the asset of this moment.
-  static void serverVersionSupported(Platform& platform, BoolCompletion completion);
+  static void serverVersionSupported(Platform& platform, const BoolCompletion& completion);
   /// Whether the shared versions hold the client's highest, whose feature set is the paired watches.
   static void isHighServerVersionFeaturesetEnabled(Platform& platform, std::uint64_t policy,
-                                                   BoolCompletion withCompletion);
-  static void isHighServerVersionFeaturesetEnabled(Platform& platform, BoolCompletion completion);
+                                                   const BoolCompletion& withCompletion);
+  static void isHighServerVersionFeaturesetEnabled(Platform& platform, const BoolCompletion& completion);
   /// The same by what is known already; never sends a request.
   static bool isHighServerVersionFeaturesetEnabled(Platform& platform);
   /// The "WebFlowURL" preference, of whatever kind it is.
   static Value readWebURLOverride(Platform& platform);
 
   static void _supportedVersionsForClientAndServer(Platform& platform, std::uint64_t policy,
-                                                   VersionsCompletion withCompletion);
+                                                   const VersionsCompletion& withCompletion);
   /// The cached pair, or null; a cache entry that is no dictionary is removed.
   static Value _getValidServerVersionCache(Platform& platform);
   /// Fetches a dictionary; one that is not a dictionary is asked for once more, past every cache.
   static void _dictionaryFromURL(Platform& platform, const Value& url, bool shouldRetry,
-                                 DictionaryCompletion withCompletion);
+                                 const DictionaryCompletion& withCompletion);
 };
 
 }  // namespace kvr

@@ -48,7 +48,7 @@ KVRWarrantyDownloader::KVRWarrantyDownloader(Platform& platform, std::string cal
 }
 
 void KVRWarrantyDownloader::downloadWarrantyForSerialNumber(const std::optional<std::string>& serialNumber,
-                                                            DownloadCompletion completionHandler) {
+                                                            const DownloadCompletion& completionHandler) {
   platform_.log.standard("%s: %{private}@",
                          "-[KVRWarrantyDownloader downloadWarrantyForSerialNumber:completionHandler:]",
                          serialNumber);
@@ -73,7 +73,7 @@ bool KVRWarrantyDownloader::isLocalDevice(const std::optional<std::string>& seri
 }
 
 void KVRWarrantyDownloader::_downloadWarrantyForSerialNumber(const std::optional<std::string>& serialNumber,
-                                                             DownloadCompletion withCompletion) {
+                                                             const DownloadCompletion& withCompletion) {
   const auto* key =
       isLocalDevice(serialNumber) ? preference::kWarrantyURL : preference::kWearablesWarrantyURL;
   const Value endpoint = platform_.preferences.objectForKey(key);
@@ -102,7 +102,7 @@ void KVRWarrantyDownloader::_downloadWarrantyForSerialNumber(const std::optional
 void KVRWarrantyDownloader::_downloadWarrantyFromServerURL(const URL& url,
                                                            const std::optional<std::string>& serialNumber,
                                                            std::int32_t withRetries,
-                                                           AttemptCompletion completionBlock) {
+                                                           const AttemptCompletion& completionBlock) {
   auto& log = platform_.log;
   log.standard("%{private}@ : warranty download attempt (%d/%d)", serialNumber, kRetries - withRetries,
                kRetries);

@@ -29,14 +29,14 @@ class KVRWarrantyDownloader : public std::enable_shared_from_this<KVRWarrantyDow
   /// Answers once: later, on a background queue, or before it returns when a version override rejects the
   /// service. Never blocks the caller on the network or on a renewal.
   void downloadWarrantyForSerialNumber(const std::optional<std::string>& serialNumber,
-                                       DownloadCompletion completionHandler);
+                                       const DownloadCompletion& completionHandler);
 
   /// The download without the version gate.
   void _downloadWarrantyForSerialNumber(const std::optional<std::string>& serialNumber,
-                                        DownloadCompletion withCompletion);
+                                        const DownloadCompletion& withCompletion);
   /// One attempt with `withRetries` more in reserve. Blocks while the request is signed.
   void _downloadWarrantyFromServerURL(const URL& url, const std::optional<std::string>& serialNumber,
-                                      std::int32_t withRetries, AttemptCompletion completionBlock);
+                                      std::int32_t withRetries, const AttemptCompletion& completionBlock);
   /// What the file, or its variant for this serial number beside it, holds; null for nothing.
   Value dictionaryFromURL(const URL& url, const std::optional<std::string>& forSerialNumber) const;
   void _scheduleConversionOutreachIfRequiredForWarranty(const KVRWarrantyRef& warranty,

@@ -141,28 +141,6 @@ TEST_F(ADevice, HasThePropertiesStatedElseThoseOfItsHost) {
   EXPECT_THAT(errors(), IsEmpty());
 }
 
-TEST_F(ADevice, HasTheFeaturesThatAreSwitchedOnByABool) {
-  const LocalFeatureFlags flags(root);
-  EXPECT_FALSE(flags.isEnabled("D", "on"));
-  put("FeatureFlags.plist",
-      Dictionary{{"D", Dictionary{{"on", true}, {"off", false}, {"one", 1}}}, {"E", true}});
-  EXPECT_TRUE(flags.isEnabled("D", "on"));
-  for (const auto* feature : {"off", "one", "missing"}) EXPECT_FALSE(flags.isEnabled("D", feature));
-  EXPECT_FALSE(flags.isEnabled("E", "on"));
-}
-
-TEST_F(ADevice, IsPairedWithTheListedWatches) {
-  const LocalPairedDeviceRegistry registry(root);
-  const auto all = [](const PairedDeviceEntry&) { return true; };
-  EXPECT_THAT(registry.allDevicesPassing(all), IsEmpty());
-  const Value watch = Dictionary{{"name", "A"},         {"localizedModel", "M"}, {"serialNumber", "S"},
-                                 {"isArchived", false}, {"isPaired", true},      {"pairedDate", Date{5}}};
-  put("PairedDevices.plist",
-      Value::Array{watch, "no watch", Dictionary{{"name", 1}, {"pairedDate", "today"}}});
-  EXPECT_EQ(describe(registry.allDevicesPassing(all)), "(" + describe(watch) + ", {})");
-  EXPECT_THAT(registry.allDevicesPassing([](const auto& entry) { return entry.name == "A"; }), SizeIs(1));
-}
-
 TEST_F(ADevice, EntitlesTheFilesThatThePathsLeadTo) {
   const LocalEntitlements entitlements(root);
   writeFile(pathOf("program"), "1");
@@ -273,17 +251,6 @@ TEST_F(ADevice, SpeaksTheLanguageStatedElseThatOfTheEnvironment) {
   EXPECT_THAT(errors(), IsEmpty());
 }
 
-TEST_F(ADevice, KnowsTheOffsetOfItsTimeZoneAtADate) {
-  const LocalUserLocale locale(root, log);
-  const Variable zone("TZ", "CET-1CEST,M3.5.0,M10.5.0/3");
-  EXPECT_EQ(locale.secondsFromGMT(Date{1768000000}), 3600);  // January
-  EXPECT_EQ(locale.secondsFromGMT(Date{1784000000}), 7200);  // July
-  zone.set("IST-5:30");
-  for (const double seconds : {1768000000.9, std::nan(""), -1e300, 1e300}) {
-    EXPECT_EQ(locale.secondsFromGMT(Date{seconds}), 19800);
-  }
-}
-
 class AnAccount : public ADevice {
  protected:
   using Outcome = std::pair<std::int64_t, std::string>;
@@ -340,18 +307,6 @@ TEST_F(AnAccount, IsTheOneThatTheFileHolds) {
   EXPECT_THAT(errors(), SizeIs(1));
 }
 
-TEST_F(AnAccount, BringsItsSessionsHeaders) {
-  const LocalAccountSession session(root);
-  HTTPRequest request;
-  session.addClientInfoHeader(request);
-  EXPECT_THAT(request.headers.fields(), IsEmpty());
-  put("Accounts.plist", tree({}));
-  session.addClientInfoHeader(request);
-  session.addDeviceIdentifierHeader(request);
-  EXPECT_THAT(request.headers.fields(), ElementsAre(Pair("X-Client", "c"), Pair("X-Device", "d")));
-  EXPECT_THAT(session.authenticationHeadersFor(request), ElementsAre(Pair("X-A", "1"), Pair("X-B", "2")));
-}
-
 TEST_F(AnAccount, IsRenewedAsScripted) {
   const Value tokens = Dictionary{{"s", "new"}, {"t", 1}};
   const double kNaN = std::nan("");
@@ -393,28 +348,6 @@ TEST_F(AnAccount, HoldsRenewedTokensUntilTheFileChangesOrTheStoreGoes) {
     late = renew(store);
   }
   EXPECT_EQ(late.get(), Outcome(LocalAccountStore::kEnding, "the agent is ending"));
-}
-
-TEST(DelayedAnswersTo, SeveralQuestionsAreGivenInOrderOnAnotherThreadAndNoneIsOwedAtTheEnd) {
-  SimulatedLog log;
-  std::vector<std::string> given;  // by one thread, which is joined
-  std::promise<std::thread::id> thread;
-  {
-    DelayedAnswers answers(log);
-    const auto add = [&](double delay, const std::string& name) {
-      answers.after(delay,
-                    [&given, name](bool ending) { given.push_back(name + (ending ? " at the end" : "")); });
-    };
-    add(std::numeric_limits<double>::infinity(), "never");
-    add(3600, "in an hour");
-    answers.after(0, [](bool) { throw std::runtime_error("fault"); });
-    add(-1, "first");
-    add(std::nan(""), "second");
-    answers.after(0.001, [&](bool) { thread.set_value(std::this_thread::get_id()); });
-    EXPECT_NE(thread.get_future().get(), std::this_thread::get_id());
-  }
-  EXPECT_THAT(given, ElementsAre("first", "second", "in an hour at the end", "never at the end"));
-  EXPECT_THAT(log.texts(LogLevel::Error), ElementsAre("a delayed answer failed: fault"));
 }
 
 }  // namespace

@@ -1,6 +1,6 @@
+#include "integration/support/BusFixture.h"
 #include "platform/local/PeerIdentity.h"
 #include "platform/local/bus/BusCodec.h"
-#include "support/BusFixture.h"
 
 #include <gmock/gmock.h>
 
@@ -24,7 +24,7 @@ TEST_F(AService, DeliversTheCallsOfAConnectionInTheirOrderFromTheVeryFirst) {
       reply(arguments.at(0));
     };
   };
-  serve();
+  const auto serving = serve();
   const RawBusClient client = newClient();
   for (std::uint64_t i = 1; i < kCalls; ++i) {
     ASSERT_GE(sd_bus_send(client.bus(), client.newCall("EchoNumber", "t", {i}).get(), nullptr), 0);
@@ -51,7 +51,7 @@ TEST_F(AService, GivesEveryConnectionAnObjectOfItsOwnThatMayBlockThatConnectionO
       reply(Value(number));
     };
   };
-  serve();
+  const auto serving = serve();
   const RawBusClient first = newClient();
   const RawBusClient second = newClient();
   EXPECT_EQ(first.value("t", first.call("EchoNumber", "t", {0})), Value(1));
@@ -70,7 +70,7 @@ TEST_F(AService, LetsGoOfTheObjectWithItsConnectionEvenInTheMiddleOfACall) {
         [&](const std::string&, const Value::Array&, const ServiceReply& reply) { begun.set_value(reply); };
   };
   onObjectGone = [&] { gone.set_value(); };
-  serve();
+  const auto serving = serve();
   RawBusClient client = newClient();
   ASSERT_GE(sd_bus_send(client.bus(), client.newCall("EchoText", "s", {"x"}).get(), nullptr), 0);
   ASSERT_GE(sd_bus_flush(client.bus()), 0);
@@ -93,7 +93,7 @@ TEST_F(AService, LetsGoOfTheObjectWithItsConnectionEvenInTheMiddleOfACall) {
 
 TEST_F(AService, RefusesAConnectionForGoodWhenItsProgramIsNotEntitled) {
   entitle("true");
-  serve();
+  const auto serving = serve();
   const RawBusClient client = newClient();
   const auto refused = client.call("EchoText", "s", {"x"});
   EXPECT_EQ(refused.error, "org.freedesktop.DBus.Error.AccessDenied");
@@ -106,22 +106,6 @@ TEST_F(AService, RefusesAConnectionForGoodWhenItsProgramIsNotEntitled) {
   EXPECT_THAT(decisions, ElementsAre(Value("true"), Value(true)));
 }
 
-TEST_F(AService, OpensItsDescriptionToThoseItRefuses) {
-  entitle(false);
-  serve();
-  const RawBusClient client = newClient();
-  for (const auto& [interface, member, text] : {std::tuple{"org.freedesktop.DBus.Peer", "GetMachineId", ""},
-                                                {"org.freedesktop.DBus.Introspectable", "Introspect",
-                                                 R"(<arg type="t" name="number" direction="in"/>)"}}) {
-    sd_bus_message* message = nullptr;
-    sd_bus_message_new_method_call(client.bus(), &message, RawBusClient::kName, RawBusClient::kPath,
-                                   interface, member);
-    const auto reply = client.call(BusMessageRef(message));
-    EXPECT_THAT(client.value("s", reply).string(), HasSubstr(text)) << member;
-  }
-  EXPECT_TRUE(decisions.empty());
-}
-
 TEST_F(AService, AnswersWithAnErrorWhatItCannotServe) {
   std::atomic<int> served = 0;
   newBehaviour = [&] {
@@ -132,7 +116,7 @@ TEST_F(AService, AnswersWithAnErrorWhatItCannotServe) {
       if (arguments.at(0) == Value("text")) return reply(Value(std::string("a\0b", 3)));
     };
   };
-  serve();
+  const auto serving = serve();
   const RawBusClient client = newClient();
   struct {
     const char* member;
@@ -145,7 +129,7 @@ TEST_F(AService, AnswersWithAnErrorWhatItCannotServe) {
       {"EchoText", "s", {"throw"}, "org.freedesktop.DBus.Error.Failed", true},
       {"EchoText", "s", {"kind"}, "org.freedesktop.DBus.Error.Failed", true},
       {"EchoText", "s", {"text"}, "org.freedesktop.DBus.Error.Failed", true},
-      {"EchoText", "s", {std::string(5000, 'x')}, "org.freedesktop.DBus.Error.InvalidArgs", false},
+      {"EchoText", "s", {std::string((1U << 20U) + 1, 'x')}, "org.freedesktop.DBus.Error.InvalidArgs", false},
       {"EchoText", "t", {1}, "org.freedesktop.DBus.Error.InvalidArgs", false},
       {"EchoText", "ss", {"a", "b"}, "org.freedesktop.DBus.Error.InvalidArgs", false},
       {"EchoText", "", {}, "org.freedesktop.DBus.Error.InvalidArgs", false},
@@ -169,7 +153,7 @@ TEST_F(AService, TakesTheReplyFromAnyThreadAndSendsNoneThatIsNotExpected) {
       std::thread([reply = std::move(reply), value = arguments.at(0)] { reply(value); }).join();
     };
   };
-  serve();
+  const auto serving = serve();
   const RawBusClient client = newClient();
   const BusMessageRef unanswered = client.newCall("EchoText", "s", {"unanswered"});
   ASSERT_GE(sd_bus_message_set_expect_reply(unanswered.get(), 0), 0);
@@ -191,7 +175,7 @@ TEST_F(AService, AnswersTooLargeAReplyWithAnErrorAndServesOn) {
       reply(Value::Dictionary{{"data", arguments.at(1) == Value(0) ? fits : tooLarge}});
     };
   };
-  serve();
+  const auto serving = serve();
   const RawBusClient client = newClient();
   EXPECT_EQ(client.call("Record", "st", {"", 1}).error, "org.freedesktop.DBus.Error.Failed");
   EXPECT_EQ(client.value("a{sv}", client.call("Record", "st", {"", 0}))["data"], Value(fits));
@@ -200,7 +184,7 @@ TEST_F(AService, AnswersTooLargeAReplyWithAnErrorAndServesOn) {
 TEST_F(AService, ReportsTheLossOfTheBusOnce) {
   std::promise<void> gone;
   onObjectGone = [&] { gone.set_value(); };
-  serve();
+  const auto serving = serve();
   const RawBusClient client = newClient();
   client.call("EchoText", "s", {"x"});
   bus.kill();
@@ -217,20 +201,13 @@ TEST_F(AService, IsLostWithoutItsName) {
   EXPECT_EQ(log.errorsWith("somebody else has it").size(), 1U);
 }
 
-TEST_F(AService, IsLostWithoutABus) {
-  bus.kill();
-  listener->resume({RawBusClient::kInterface, {}});
-  EXPECT_TRUE(waitUntilLost());
-  EXPECT_EQ(log.errorsWith("cannot be reached").size(), 1U);
-}
-
 TEST_F(AService, EndsByGivingItsNameUpAndAnsweringWhatItHasTaken) {
   std::promise<ServiceReply> begun;
   newBehaviour = [&] {
     return
         [&](const std::string&, const Value::Array&, const ServiceReply& reply) { begun.set_value(reply); };
   };
-  serve();
+  const auto serving = serve();
   const RawBusClient client = newClient();
   std::optional<std::string> answer;
   const auto handler = [](sd_bus_message* message, void* userdata, sd_bus_error*) {

@@ -1,4 +1,4 @@
-#include "support/BusFixture.h"
+#include "integration/support/BusFixture.h"
 
 #include <cmath>
 #include <limits>
@@ -71,7 +71,7 @@ Value::Dictionary hardValues() {
 using AValueOnTheBus = BusFixture;
 
 TEST_F(AValueOnTheBus, ComesBackAsItWasWherever) {
-  serve();
+  const auto serving = serve();
   const RawBusClient client = newClient();
   const auto echo = [&](const Value& record) {
     return client.value("a{sv}", client.call("EchoRecord", "a{sv}", {record}));
@@ -97,7 +97,7 @@ TEST_F(AValueOnTheBus, ComesBackAsItWasWherever) {
 }
 
 TEST_F(AValueOnTheBus, MayBeNestedToAnyDepthWithoutBreakingTheConnection) {
-  serve();
+  const auto serving = serve();
   const RawBusClient client = newClient();
   for (int depth = 1; depth <= 70; ++depth) {
     for (const bool inArrays : {false, true}) {
@@ -160,7 +160,7 @@ TEST_F(AValueOnTheBus, HasTheTypesThatOtherClientsCountOn) {
       {unusual, {"warranty"}, "a{sv}"},
       {unusual, {"warranty", "DictionaryRepresentation"}, "ay"},
   };
-  serve();
+  const auto serving = serve();
   const RawBusClient client = newClient();
   for (const auto& one : cases) {
     const Value info =
@@ -173,7 +173,7 @@ TEST_F(AValueOnTheBus, HasTheTypesThatOtherClientsCountOn) {
 }
 
 TEST_F(AValueOnTheBus, ReadsAsNullWhereItsKindIsUnknown) {
-  serve();
+  const auto serving = serve();
   const RawBusClient client = newClient();
   const BusMessageRef call = client.newCall("EchoRecord");
   ASSERT_GE(sd_bus_message_append(call.get(), "a{sv}", 6, "small", "y", 7, "path", "o", "/a", "list", "as", 1,

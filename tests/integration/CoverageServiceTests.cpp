@@ -1,9 +1,9 @@
+#include "integration/support/ChildProcess.h"
+#include "integration/support/TemporaryDirectory.h"
 #include "platform/Base64.h"
 #include "platform/JSON.h"
 #include "platform/local/Descriptor.h"
 #include "platform/local/LocalCertificates.h"
-#include "support/ChildProcess.h"
-#include "support/TemporaryDirectory.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -133,7 +133,8 @@ class ACoverageService : public ::testing::Test {
     address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
     EXPECT_EQ(connect(client.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
     std::string text = request.method + " " + request.path + " HTTP/1.1\r\nHost: a\r\nConnection: close\r\n";
-    for (const auto& [name, value] : request.headers) text += name + ": " + value + "\r\n";
+    for (const auto& [name, value] : request.headers)
+      text.append(name).append(": ").append(value).append("\r\n");
     text += "Content-Length: " + std::to_string(request.body.size()) + "\r\n\r\n" + request.body;
     EXPECT_EQ(::send(client.get(), text.data(), text.size(), MSG_NOSIGNAL),
               static_cast<ssize_t>(text.size()));
@@ -176,14 +177,14 @@ TEST_F(ACoverageService, RefusesEveryBrokenRuleWithAReason) {
   EXPECT_THAT(ask(renewed), StartsWith("HTTP/1.1 200"));
 
   using Change = std::function<void(Request&)>;
-  const auto set = [](const char* name, std::string value) {
+  const auto set = [](const char* name, const std::string& value) {
     return [=](Request& request) { request.set(name, value); };
   };
   const auto remove = [](const char* name) { return [=](Request& request) { request.remove(name); }; };
   const auto replace = [](const char* part, const char* other) {
     return [=](Request& request) { request.replaceInBody(part, other); };
   };
-  const auto chain = [&set](std::string bytes) { return set("X-Tarsil-Kest", base64(bytes)); };
+  const auto chain = [&set](const std::string& bytes) { return set("X-Tarsil-Kest", base64(bytes)); };
   struct Case {
     const char* reason;
     Change change;
@@ -257,78 +258,6 @@ TEST_F(ACoverageService, ChecksAnAttestationThatNobodyAskedFor) {
   EXPECT_THAT(ask(request), StartsWith("HTTP/1.1 200"));
   request.replaceInBody("S1", "S2");
   EXPECT_THAT(ask(request), StartsWith("HTTP/1.1 400"));
-}
-
-TEST_F(ACoverageService, AnswersFromTheFileThatFitsBest) {
-  start();
-  const auto answerAbout = [this](const std::string& serialNumber, const std::string& locale) {
-    Request request = goodRequest();
-    request.replaceInBody("S1", serialNumber);
-    request.replaceInBody("en_US", locale);
-    return ask(request);
-  };
-  EXPECT_THAT(answerAbout("S1", "de_DE"), HasSubstr(R"({"from":"S1 de_DE"})"));
-  EXPECT_THAT(answerAbout("S1", "en_US"), HasSubstr(R"({"from":"S1"})"));
-  EXPECT_THAT(answerAbout("S1", "../../secret"), HasSubstr(R"({"from":"S1"})"));
-  EXPECT_THAT(answerAbout("S2", "en_US"), HasSubstr(R"({"from":"default"})"));
-  EXPECT_THAT(answerAbout("../secret", "en_US"), HasSubstr(R"({"from":"default"})"));
-  directory().write("coverage/S1.json", R"({"from":"new S1"})");
-  EXPECT_THAT(answerAbout("S1", "en_US"), HasSubstr(R"({"from":"new S1"})"));
-  EXPECT_THAT(ask({"GET", "/library/TARSIL/asset/kvrV2.plist", {}, ""}), HasSubstr("\r\n\r\nasset"));
-}
-
-TEST_F(ACoverageService, MisbehavesAsItIsTold) {
-  start();
-  Request other = goodRequest();
-  other.replaceInBody("S1", "S2");
-  EXPECT_THAT(
-      tell(R"({"coverage":[{"status":401,"times":2,"serialNumber":"S1"},{"every":2,"body":"garbage"}]})"),
-      StartsWith("HTTP/1.1 200"));
-  EXPECT_THAT(ask(other), HasSubstr(R"({"from":"default"})"));
-  for (const char* status : {"401", "401", "200", "200"}) {
-    EXPECT_THAT(ask(goodRequest()), StartsWith(std::string("HTTP/1.1 ") + status));
-  }
-  EXPECT_THAT(ask(other), HasSubstr("neither JSON"));
-  EXPECT_THAT(
-      tell(R"({"coverage":[{"body":"truncated","times":1},{"body":"oversize","times":1},{"redirect":"b"}]})"),
-      StartsWith("HTTP/1.1 200"));
-  EXPECT_THAT(ask(goodRequest()), ::testing::EndsWith("\r\n\r\n{\"from"));
-  EXPECT_GT(ask(goodRequest()).size(), std::size_t{1} << 20);
-  EXPECT_THAT(ask(goodRequest()), AllOf(StartsWith("HTTP/1.1 302"), HasSubstr("Location: b\r\n")));
-  for (const char* bad :
-       {"[]", "{\"a\":[]}", R"({"asset":[{"statos":401}]})", R"({"asset":[{"status":"401"}]})"}) {
-    EXPECT_THAT(tell(bad), StartsWith("HTTP/1.1 400")) << bad;
-  }
-}
-
-TEST_F(ACoverageService, HoldsARequestWithoutHoldingUpOthersAndEndsWhenAsked) {
-  start();
-  EXPECT_THAT(tell(R"({"coverage":[{"never":true}]})"), StartsWith("HTTP/1.1 200"));
-  const Descriptor held = send(goodRequest());
-  EXPECT_THAT(ask({"GET", "/library/TARSIL/asset/kvrV2.plist", {}, ""}), StartsWith("HTTP/1.1 200"));
-  EXPECT_EQ(service().terminate(), 0);
-  EXPECT_EQ(answer(held), "");
-}
-
-TEST_F(ACoverageService, RecordsWhatItWasSentAndWhatItAnswered) {
-  start();
-  Request request = goodRequest();
-  EXPECT_THAT(ask(request), StartsWith("HTTP/1.1 200"));
-  request.set("X-Odd", "%41\xFF");
-  request.body = "\xFF";
-  EXPECT_THAT(ask(request), StartsWith("HTTP/1.1 400"));
-  EXPECT_THAT(ask({"GET", "/control/requests", {}, ""}), HasSubstr(R"({"count":2})"));
-  const Value first = record("000001.json");
-  EXPECT_EQ(first["status"], Value(200));
-  EXPECT_EQ(first["path"], Value(kLocal));
-  EXPECT_EQ(first["body"], Value(goodRequest().body));
-  EXPECT_EQ(first["headers"].array().at(2), Value(Value::Array{"X-Tarsil-Vornic-Token", "token"}));
-  EXPECT_EQ(first["headers"].array().at(4), Value(Value::Array{"altDSID", "000-1"}));
-  const Value second = record("000002.json");
-  EXPECT_EQ(second["status"], Value(400));
-  EXPECT_THAT(second["reason"].string(), HasSubstr("the body is not JSON"));
-  EXPECT_EQ(second["bodyBase64"], Value("/w=="));
-  EXPECT_EQ(second["headers"].array().at(8), Value(Value::Array{"X-Odd", "%41\xC3\xBF"}));
 }
 
 }  // namespace

@@ -1,7 +1,7 @@
+#include "integration/support/RecordingLog.h"
 #include "platform/local/EventLoop.h"
 #include "platform/local/LocalHTTP.h"
 #include "platform/local/LocalWorkQueues.h"
-#include "support/RecordingLog.h"
 
 #include <arpa/inet.h>
 #include <gmock/gmock.h>
@@ -227,18 +227,6 @@ TEST_F(OverHTTP, ARequestIsSentExactlyAsItWasGiven) {
   EXPECT_EQ(server.connections(), 1U);
 }
 
-TEST_F(OverHTTP, ALargeBodyIsSentWithoutAskingFirst) {
-  std::promise<std::string> got;
-  const ScriptedServer server([&got](Peer& peer) {
-    got.set_value(peer.request());
-    peer.write(response("200 OK", ""));
-  });
-  EXPECT_EQ(exchange(post(server.url(), std::string(3 * kMebibyte, 'a'))).status, 200);
-  const std::string request = got.get_future().get();
-  EXPECT_EQ(request.find("Expect"), std::string::npos);
-  EXPECT_TRUE(request.ends_with("\r\n\r\n" + std::string(3 * kMebibyte, 'a')));
-}
-
 TEST_F(OverHTTP, AResponseIsTakenOnlyWhole) {
   struct Case {
     const char* name;
@@ -415,6 +403,7 @@ TEST_F(OverHTTP, FiftyRequestsAtOnceShareSixConnections) {
     echo(peer);
   });
   std::vector<std::future<HTTPResponse>> replies;
+  replies.reserve(50);
   for (int i = 0; i < 50; ++i) replies.push_back(start(get(server.url("/" + std::to_string(i)))));
   for (int i = 0; i < 50; ++i) {
     const HTTPResponse got = replies[static_cast<std::size_t>(i)].get();
@@ -427,6 +416,7 @@ TEST_F(OverHTTP, FiftyRequestsAtOnceShareSixConnections) {
 TEST_F(OverHTTP, TheTimeSpentWaitingForAConnectionCounts) {
   const ScriptedServer server(keepSilent);
   std::vector<std::future<HTTPResponse>> pending;
+  pending.reserve(6);
   for (int i = 0; i < 6; ++i) pending.push_back(start(get(server.url())));
   HTTPRequest brief = get(server.url());
   brief.timeout = 0.05;
@@ -464,27 +454,6 @@ TEST_F(OverHTTP, EndingFailsWhatIsPendingAndWhatComesLater) {
   endHTTP();
   EXPECT_EQ(start(*session, get(server.url())).get().error.value_or(Error{}).code, kAborted);
   EXPECT_EQ(server.connections(), 1U);
-}
-
-TEST_F(OverHTTP, AProxyIsNotAskedForALoopbackAddress) {
-  const ScriptedServer proxy(echo);
-  const ScriptedServer server(echo);
-  for (const auto* name : {"http_proxy", "https_proxy", "all_proxy"}) setenv(name, proxy.url().c_str(), 1);
-  const int status = exchange(get(server.url())).status;
-  EXPECT_NE(exchange(get("https://a.invalid/")).error, std::nullopt);
-  for (const auto* name : {"http_proxy", "https_proxy", "all_proxy"}) unsetenv(name);
-  EXPECT_EQ(status, 200);
-  EXPECT_EQ(proxy.connections(), 1U);
-}
-
-TEST_F(OverHTTP, AConnectionThatWentStaleIsReplaced) {
-  const ScriptedServer server([](Peer& peer) {
-    peer.request();
-    peer.write(response("200 OK", "once"));
-  });
-  EXPECT_EQ(exchange(get(server.url())).body, "once");
-  EXPECT_EQ(exchange(post(server.url(), "{}")).body, "once");
-  EXPECT_EQ(server.connections(), 2U);
 }
 
 }  // namespace

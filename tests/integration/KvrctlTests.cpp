@@ -1,6 +1,6 @@
+#include "integration/support/BusFixture.h"
+#include "integration/support/ChildProcess.h"
 #include "platform/JSON.h"
-#include "support/BusFixture.h"
-#include "support/ChildProcess.h"
 
 #include <gmock/gmock.h>
 
@@ -24,8 +24,7 @@ class Kvrctl : public BusFixture {
     entitle(true, kProgram);
     newBehaviour = [this] {
       return [this](const std::string& member, const Value::Array& arguments, const ServiceReply& reply) {
-        asked = member + describe(Value(arguments));
-        reply(answers[member]);
+        reply(answerTo(member, arguments));
       };
     };
   }
@@ -37,20 +36,41 @@ class Kvrctl : public BusFixture {
     return {status, program.output(), program.errorOutput()};
   }
 
-  void serveAgent() {
-    serve({RawBusClient::kInterface,
-           {{"DefaultDevice", {}, {"device", "a{sv}"}},
-            {"PairedDevices", {}, {"devices", "aa{sv}"}},
-            {"GetDefaultDeviceInfoUsingPolicy", {{"policy", "t"}}, {"info", "a{sv}"}},
-            {"GetDeviceInfoForSerialNumber", {{"serialNumber", "s"}, {"policy", "t"}}, {"info", "a{sv}"}},
-            {"GetAllDeviceInfosUsingPolicy",
-             {{"policy", "t"}, {"updateFollowUps", "b"}},
-             {"infos", "aa{sv}"}}}});
+  std::shared_ptr<void> serveAgent() {
+    return serve(
+        {RawBusClient::kInterface,
+         {{"DefaultDevice", {}, {"device", "a{sv}"}},
+          {"PairedDevices", {}, {"devices", "aa{sv}"}},
+          {"GetDefaultDeviceInfoUsingPolicy", {{"policy", "t"}}, {"info", "a{sv}"}},
+          {"GetDeviceInfoForSerialNumber", {{"serialNumber", "s"}, {"policy", "t"}}, {"info", "a{sv}"}},
+          {"GetAllDeviceInfosUsingPolicy",
+           {{"policy", "t"}, {"updateFollowUps", "b"}},
+           {"infos", "aa{sv}"}}}});
+  }
+
+  /// What the agent replies from now on.
+  void setAnswer(const std::string& member, const Value& value) {
+    const std::lock_guard lock(mutex_);
+    answers_[member] = value;
+  }
+  /// The last call and its arguments.
+  std::string asked() const {
+    const std::lock_guard lock(mutex_);
+    return asked_;
   }
 
   static constexpr const char* kProgram = KVR_PROGRAMS "/kvrctl";
-  std::map<std::string, Value> answers;
-  std::string asked;
+
+ private:
+  Value answerTo(const std::string& member, const Value::Array& arguments) {
+    const std::lock_guard lock(mutex_);
+    asked_ = member + describe(Value(arguments));
+    return answers_[member];
+  }
+
+  mutable std::mutex mutex_;
+  std::map<std::string, Value> answers_;
+  std::string asked_;
 };
 
 Value device(const std::string& name) {
@@ -65,11 +85,11 @@ Value info(const Value& warranty) {
 }
 
 TEST_F(Kvrctl, AsksWhatItIsTold) {
-  serveAgent();
-  answers["GetDeviceInfoForSerialNumber"] = info(Value::Dictionary{{"covered", true}});
-  answers["GetDefaultDeviceInfoUsingPolicy"] = info(Value());
-  answers["GetAllDeviceInfosUsingPolicy"] = Value::Array{info(Value()), info(Value::Dictionary{})};
-  answers["DefaultDevice"] = Value::Dictionary{{"name", 7}, {"deviceType", "x"}};
+  const auto serving = serveAgent();
+  setAnswer("GetDeviceInfoForSerialNumber", info(Value::Dictionary{{"covered", true}}));
+  setAnswer("GetDefaultDeviceInfoUsingPolicy", info(Value()));
+  setAnswer("GetAllDeviceInfosUsingPolicy", Value::Array{info(Value()), info(Value::Dictionary{})});
+  setAnswer("DefaultDevice", Value::Dictionary{{"name", 7}, {"deviceType", "x"}});
   struct {
     std::vector<std::string> arguments;
     const char* asked;
@@ -84,14 +104,14 @@ TEST_F(Kvrctl, AsksWhatItIsTold) {
   for (const auto& one : cases) {
     const Outcome outcome = run(one.arguments);
     EXPECT_EQ(outcome.status, one.status) << outcome.errors;
-    EXPECT_EQ(asked, one.asked);
+    EXPECT_EQ(asked(), one.asked);
     EXPECT_EQ(outcome.errors, "");
   }
 }
 
 TEST_F(Kvrctl, TellsWhyItGotNoAnswer) {
   EXPECT_EQ(run({"device"}).status, 3);
-  serveAgent();
+  const auto serving = serveAgent();
   entitle(true, "/proc/self/exe");
   const Outcome refused = run({"device"});
   EXPECT_EQ(refused.status, 4);
@@ -111,9 +131,11 @@ TEST_F(Kvrctl, TellsWhyItGotNoAnswer) {
 }
 
 TEST_F(Kvrctl, PrintsTextThatCannotCommandATerminal) {
-  serveAgent();
-  answers["GetDefaultDeviceInfoUsingPolicy"] = info(Value::Dictionary{
-      {"covered", true}, {"coverageLocalizedLabel", "\x1B]0;owned\x07 \u009B2J\r\nCovered: no\u202E"}});
+  const auto serving = serveAgent();
+  setAnswer(
+      "GetDefaultDeviceInfoUsingPolicy",
+      info(Value::Dictionary{{"covered", true},
+                             {"coverageLocalizedLabel", "\x1B]0;owned\x07 \u009B2J\r\nCovered: no\u202E"}}));
   const Outcome text = run({"info"});
   EXPECT_THAT(text.output,
               HasSubstr("Coverage:      \\u001b]0;owned\\u0007 \\u009b2J\\u000d\\u000aCovered: no\\u202e\n"));
@@ -124,12 +146,12 @@ TEST_F(Kvrctl, PrintsTextThatCannotCommandATerminal) {
 }
 
 TEST_F(Kvrctl, WritesOneJSONDocumentOfEverythingTheAgentKnows) {
-  serveAgent();
+  const auto serving = serveAgent();
   const Value warranty = Value::Dictionary{{"since", Date{86400.5}},
                                            {"data", Value::Bytes{1, 2, 3}},
                                            {"null", Value()},
                                            {"big", ~std::uint64_t{0}}};
-  answers["GetAllDeviceInfosUsingPolicy"] = Value::Array{info(warranty), info(Value())};
+  setAnswer("GetAllDeviceInfosUsingPolicy", Value::Array{info(warranty), info(Value())});
   const Result<Value> document = readJSON(run({"info", "--all", "--json", "--show-serial"}).output);
   ASSERT_TRUE(document) << describe(document.error());
   const Value told = Value::Dictionary{{"name", "a watch"},
@@ -147,10 +169,10 @@ TEST_F(Kvrctl, WritesOneJSONDocumentOfEverythingTheAgentKnows) {
 }
 
 TEST_F(Kvrctl, WritesTheDeepestWarrantyThatThereIs) {
-  serveAgent();
+  const auto serving = serveAgent();
   Value tree = 1;
   for (int depth = 1; depth < 512; ++depth) tree = Value::Array{tree};
-  answers["GetDefaultDeviceInfoUsingPolicy"] = info(Value::Dictionary{{"tree", tree}});
+  setAnswer("GetDefaultDeviceInfoUsingPolicy", info(Value::Dictionary{{"tree", tree}}));
   const Outcome outcome = run({"info", "--json"});
   EXPECT_EQ(outcome.status, 0) << outcome.errors;
   EXPECT_THAT(outcome.output, HasSubstr(std::string(511, '[') + "1" + std::string(511, ']')));

@@ -7,6 +7,7 @@
 #include <algorithm>
 #include <charconv>
 #include <chrono>
+#include <cinttypes>
 #include <cstdio>
 #include <filesystem>
 #include <fstream>
@@ -62,7 +63,7 @@ void RequestRecords::add(const ReceivedRequest& request, int status,
   if (!text) throw std::runtime_error(text.error().message);
   const std::lock_guard lock(mutex_);
   char name[32];
-  std::snprintf(name, sizeof name, "%06lld", static_cast<long long>(count_ + 1));
+  std::snprintf(name, sizeof name, "%06" PRId64, count_ + 1);
   const std::string temporary = directory_ + "/." + name + ".new";
   std::ofstream out(temporary, std::ios::binary | std::ios::trunc);
   out << *text;

@@ -51,7 +51,7 @@ void write(httplib::Response& response, std::string body, const char* type, Beha
           });
       return;
   }
-  response.set_content(std::move(body), type);
+  response.set_content(body, type);
 }
 
 }  // namespace

@@ -11,7 +11,7 @@
 namespace kvr {
 namespace {
 
-constexpr std::size_t kLongestText = 4096;  // bytes
+constexpr std::size_t kLongestText = 1U << 20U;  // bytes
 
 Error invalidArguments(const ServiceMethod& method, const std::string& why) {
   return {SD_BUS_ERROR_INVALID_ARGS, EINVAL, std::string(method.member) + ": " + why};
@@ -62,7 +62,7 @@ Result<BusCall> readBusCall(sd_bus_message* message, const ServiceInterface& int
 
 std::optional<Error> replyToBusCall(sd_bus_message* call, const char* type, const Value& value) {
   if (sd_bus_message_get_expect_reply(call) <= 0) return std::nullopt;
-  const auto error = sendReply(call, type, value);
+  auto error = sendReply(call, type, value);
   if (error) failBusCall(call, kBusErrorFailed, error->message);
   return error;
 }

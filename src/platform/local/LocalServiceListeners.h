@@ -23,8 +23,8 @@ class BusService;
 /// listener is resumed. Listeners must be gone before this is.
 class LocalServiceListeners : public ServiceListeners {
  public:
-  /// `busLost` is called once, on the bus thread, when the bus cannot be reached, is lost, or does not give or
-  /// leave a listener its name; an error line has said so then. It must not wait for this object.
+  /// `busLost` is called once, on the bus thread, when the bus cannot be reached, is lost, or does not give
+  /// or leave a listener its name; an error line has said so then. It must not wait for this object.
   LocalServiceListeners(WorkQueues& queues, Log& log, const LocalEntitlements& entitlements,
                         std::function<void()> busLost);
   /// What has been answered is sent, if the bus takes it within some seconds.
@@ -32,9 +32,9 @@ class LocalServiceListeners : public ServiceListeners {
 
   std::unique_ptr<ServiceListener> newListener(std::string name) override;
 
-  /// Gives the names up, so that a new call starts or finds another agent, and returns when every call that came
-  /// through them is on its way; later ones are answered with an error. Waits for the bus some seconds at
-  /// most. Not on the bus thread.
+  /// Gives the names up, so that a new call starts or finds another agent, and returns when every call that
+  /// came through them is on its way; later ones are answered with an error. Waits for the bus some seconds
+  /// at most. Not on the bus thread.
   void beginEnding();
   /// How many calls have come and are not answered yet. Any thread.
   std::size_t openCalls() const { return *openCalls_; }

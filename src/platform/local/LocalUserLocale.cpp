@@ -8,6 +8,7 @@
 #include <cmath>
 #include <cstdlib>
 #include <ctime>
+#include <mutex>
 
 namespace kvr {
 namespace {
@@ -49,6 +50,9 @@ long LocalUserLocale::secondsFromGMT(Date date) const {
   const double seconds =
       std::isnan(date.secondsSince1970) ? 0 : std::clamp(date.secondsSince1970, -kLast, kLast);
   const auto time = static_cast<std::time_t>(std::floor(seconds));
+  // The C library's zone is the process's.
+  static std::mutex zoneMutex;
+  const std::lock_guard lock(zoneMutex);
   ::tzset();
   std::tm local{};
   return ::localtime_r(&time, &local) == nullptr ? 0 : local.tm_gmtoff;

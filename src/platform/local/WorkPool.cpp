@@ -13,7 +13,8 @@ namespace kvr {
 
 namespace {
 
-constexpr std::size_t kStackSize = std::size_t{512} << 10;
+/// Enough to let go of, compare and write the deepest tree in any build; only what is used costs memory.
+constexpr std::size_t kStackSize = std::size_t{4} << 20;
 constexpr unsigned kMostPassedOver = 16;
 constexpr double kLongestWait = 1e9;  // seconds; a longer wait is one without a limit
 
@@ -274,6 +275,11 @@ void WorkPool::runItem(Work& work) noexcept {
 
 void WorkPool::beginEnding() {
   const Lock lock(mutex_);
+  endWaits();
+}
+
+/// With the mutex held.
+void WorkPool::endWaits() {
   ending_ = true;
   for (auto* const wait : waits_) wait->notify_all();
 }
@@ -293,11 +299,11 @@ bool WorkPool::drain(double limit) {
 }
 
 void WorkPool::stop() {
-  beginEnding();
   std::deque<Turn> turns;
   std::deque<std::deque<Work>> items;
   Lock lock(mutex_);
   closed_ = true;
+  endWaits();
   turns.swap(ready_);
   std::move(readyInBackground_.begin(), readyInBackground_.end(), std::back_inserter(turns));
   readyInBackground_.clear();

@@ -74,6 +74,7 @@ class WorkPool : public std::enable_shared_from_this<WorkPool> {
   void submit(Lock& lock, std::deque<Turn>& turns, Turn turn);
   std::size_t busy() const { return threads_ - idle_ - blocked_; }
   bool provideThread();
+  void endWaits();
   bool startThread();
 
   Log& log_;

@@ -69,6 +69,9 @@ AgentWorld::AgentWorld(Attestation attestation) {
 }
 
 void AgentWorld::startAgent() {
+  for (const auto* path : {"Library", "Library/Preferences"}) {
+    std::filesystem::permissions(home() / path, std::filesystem::perms::owner_all);
+  }
   const RawBusClient watcher = newClient();
   bool isOwned = false;
   const auto handler = [](sd_bus_message*, void* userdata, sd_bus_error*) {

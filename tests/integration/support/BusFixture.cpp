@@ -1,4 +1,4 @@
-#include "support/BusFixture.h"
+#include "integration/support/BusFixture.h"
 
 #include <stdlib.h>
 
@@ -51,7 +51,9 @@ BusFixture::BusFixture()
   listener->setDelegate(*this);
 }
 
-BusFixture::~BusFixture() {
+BusFixture::~BusFixture() { stop(); }
+
+void BusFixture::stop() {
   log.beginEnding();
   listener.reset();
   listeners.reset();
@@ -67,7 +69,7 @@ void BusFixture::entitle(const Value& value, const std::string& program) {
   if (problem) throw std::runtime_error(describe(*problem));
 }
 
-void BusFixture::serve(const ServiceInterface& interface) {
+std::shared_ptr<void> BusFixture::serve(const ServiceInterface& interface) {
   interface_ = interface;
   const RawBusClient watcher = newClient();
   const auto handler = [](sd_bus_message*, void* userdata, sd_bus_error*) {
@@ -88,6 +90,7 @@ void BusFixture::serve(const ServiceInterface& interface) {
       throw std::runtime_error("the name never came");
     }
   }
+  return {nullptr, [this](void*) { stop(); }};
 }
 
 bool BusFixture::shouldAcceptNewConnection(ServiceConnection& connection) {

@@ -1,14 +1,14 @@
 #pragma once
 
+#include "integration/support/PrivateBus.h"
+#include "integration/support/RawBusClient.h"
+#include "integration/support/RecordingLog.h"
+#include "integration/support/TemporaryDirectory.h"
 #include "platform/local/EventLoop.h"
 #include "platform/local/LocalClock.h"
 #include "platform/local/LocalFiles.h"
 #include "platform/local/LocalServiceListeners.h"
 #include "platform/local/LocalWorkQueues.h"
-#include "support/PrivateBus.h"
-#include "support/RawBusClient.h"
-#include "support/RecordingLog.h"
-#include "support/TemporaryDirectory.h"
 
 #include <gtest/gtest.h>
 
@@ -37,8 +37,10 @@ class BusFixture : public ::testing::Test, public ServiceListenerDelegate {
 
   /// States the entitlement's value for a program, by default this one, and for no other.
   void entitle(const Value& value, const std::string& program = "/proc/self/exe");
-  /// Serves the name on the bus; returns once it is there. By default with operations that echo every type.
-  void serve(const ServiceInterface& interface = echoInterface());
+  /// Serves the name on the bus until what is returned goes, by default with operations that echo every type.
+  /// The name is there on return; after the end nothing of the test is touched any more.
+  [[nodiscard]] std::shared_ptr<void> serve(const ServiceInterface& interface = echoInterface());
+  void stop();
   RawBusClient newClient() const { return RawBusClient(bus.address()); }
   bool waitUntilLost() { return lost_.get_future().wait_for(kLimit) == std::future_status::ready; }
 

@@ -1,4 +1,4 @@
-#include "support/ChildProcess.h"
+#include "integration/support/ChildProcess.h"
 
 #include <fcntl.h>
 #include <poll.h>
@@ -42,7 +42,7 @@ std::vector<std::string> environmentWith(const ChildProcess::Environment& change
     if (!changes.contains(std::string(text.substr(0, text.find('='))))) result.emplace_back(text);
   }
   for (const auto& [name, value] : changes) {
-    if (!value.empty()) result.push_back(name + "=" + value);
+    if (!value.empty()) result.emplace_back(name).append("=").append(value);
   }
   return result;
 }

@@ -1,4 +1,4 @@
-#include "support/PrivateBus.h"
+#include "integration/support/PrivateBus.h"
 
 namespace kvr::testing {
 namespace {

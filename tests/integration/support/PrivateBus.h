@@ -1,7 +1,7 @@
 #pragma once
 
-#include "support/ChildProcess.h"
-#include "support/TemporaryDirectory.h"
+#include "integration/support/ChildProcess.h"
+#include "integration/support/TemporaryDirectory.h"
 
 #include <string>
 

@@ -1,4 +1,4 @@
-#include "support/RawBusClient.h"
+#include "integration/support/RawBusClient.h"
 
 #include "platform/local/bus/BusCodec.h"
 

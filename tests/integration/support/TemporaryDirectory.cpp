@@ -1,4 +1,4 @@
-#include "support/TemporaryDirectory.h"
+#include "integration/support/TemporaryDirectory.h"
 
 #include <stdlib.h>
 
@@ -20,7 +20,7 @@ TemporaryDirectory::~TemporaryDirectory() {
 }
 
 std::filesystem::path TemporaryDirectory::write(std::string_view name, std::string_view content) const {
-  const auto path = path_ / name;
+  auto path = path_ / name;
   std::filesystem::create_directories(path.parent_path());
   std::ofstream file(path, std::ios::binary | std::ios::trunc);
   file.write(content.data(), static_cast<std::streamsize>(content.size()));

@@ -134,16 +134,6 @@ TEST(ABinaryPropertyList, IsRefusedForAnyFault) {
   }
 }
 
-TEST(ABinaryPropertyList, MayShareObjects) {
-  const auto shared = readPropertyList(listOf(doublingArrays(10, kKey)));
-  ASSERT_TRUE(shared) << shared.error().message;
-  Value expected = "k";
-  for (int i = 0; i < 10; ++i) expected = Value::Array{expected, expected};
-  EXPECT_EQ(*shared, expected);
-  EXPECT_EQ(*readPropertyList(listOf({"\xD2\x00\x01\x00\x01\x00\x02\x00\x01"s, kKey, kOne})),
-            (Value::Dictionary{{"k", "k"}}));
-}
-
 TEST(ABinaryPropertyList, IsRefusedForAnyFaultOfItsTrailer) {
   constexpr std::uint64_t kHuge = ~0ULL;
   constexpr std::uint64_t kTable = 10;

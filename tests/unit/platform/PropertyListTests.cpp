@@ -72,7 +72,8 @@ TEST(ATree, ThatXMLCannotHoldIsHeldByTheBinaryEncoding) {
       {Date{-1.1e15}, "XML holds no date outside the calendar"},
   };
   for (const auto& [value, message] : kCases) {
-    std::vector<Value> trees{Value::Array{1, value}};
+    std::vector<Value> trees;
+    trees.emplace_back(Value::Array{1, value});
     if (value.isString()) trees.emplace_back(Value::Dictionary{{value.string(), 1}});
     for (const auto& tree : trees) {
       const auto xml = writePropertyList(tree, kXML);
@@ -85,29 +86,12 @@ TEST(ATree, ThatXMLCannotHoldIsHeldByTheBinaryEncoding) {
   }
 }
 
-TEST(ATree, WithTextThatIsNotUTF8IsNotWritten) {
-  for (const auto* text :
-       {"\x80", "a\xC3", "\xC0\x80", "\xE0\x80\x80", "\xED\xA0\x80", "\xF4\x90\x80\x80", "\xFF"}) {
-    for (const auto encoding : {kXML, kBinary}) {
-      EXPECT_FALSE(writePropertyList(text, encoding));
-      EXPECT_FALSE(writePropertyList(Value::Dictionary{{text, 1}}, encoding));
-    }
-  }
-}
-
 TEST(ATree, IsWrittenUpToTheNestingThatIsRead) {
   for (const auto encoding : {kXML, kBinary}) {
     const auto deepest = nestedArrays(kMaximumDepth);
     EXPECT_EQ(*readPropertyList(*writePropertyList(deepest, encoding)), deepest);
     EXPECT_FALSE(writePropertyList(nestedArrays(kMaximumDepth + 1), encoding));
   }
-}
-
-TEST(ATree, ThatUnfoldsWithoutEndIsNotWritten) {
-  Value tree = 1;
-  for (int i = 0; i < 100; ++i) tree = Value::Array{tree, tree};
-  EXPECT_FALSE(writePropertyList(tree, kXML));
-  EXPECT_FALSE(writePropertyList(tree, kBinary));
 }
 
 TEST(APropertyList, IsToldByItsStart) {

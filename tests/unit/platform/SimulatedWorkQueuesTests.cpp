@@ -47,8 +47,8 @@ TEST_F(SimulatedQueues, RunInAnOrderThatTheSeedDecides) {
 
 TEST_F(SimulatedQueues, LetTimePassOnlyWhenAskedTo) {
   constexpr double kYear = 366 * 86400.0;
-  queues.after(kYear, concurrent, [&] { record.push_back("a year later"); });
-  concurrent->async([&] { record.push_back(queues.newSignal()->wait(60) ? "signalled" : "over"); });
+  queues.after(kYear, concurrent, [&] { record.emplace_back("a year later"); });
+  concurrent->async([&] { record.emplace_back(queues.newSignal()->wait(60) ? "signalled" : "over"); });
   queues.run();
   EXPECT_EQ(clock.elapsed(), 0);
   EXPECT_EQ(queues.waiting(), 1U);

@@ -98,14 +98,15 @@ TEST(AFileURL, IsReadBackToItsPath) {
   }
 }
 
-TEST(HTTPHeaderFields, KeepTheirPlaceWhenTheyAreSetAgain) {
+TEST(HTTPHeaderFields, KeepTheirPlaceWhenTheyAreSetAgainAndGoWithoutAValue) {
   HTTPHeaders headers;
   headers.set("First", "1");
   headers.set("Second", "2");
   headers.set("absent", std::nullopt);
   headers.set("fIRST", "3");
-  headers.set("Second", std::nullopt);
-  EXPECT_EQ(headers.fields(), (std::vector<HTTPHeaders::Field>{{"fIRST", "3"}, {"Second", "2"}}));
+  headers.set("Third", "4");
+  headers.set("SECOND", std::nullopt);
+  EXPECT_EQ(headers.fields(), (std::vector<HTTPHeaders::Field>{{"fIRST", "3"}, {"Third", "4"}}));
   EXPECT_EQ(headers.value("FIRST"), "3");
   EXPECT_EQ(headers.value("absent"), std::nullopt);
 }

@@ -301,30 +301,12 @@ TEST_F(DeviceAttestationHeaders, EscapeEverySlashOfTheChain) {
   EXPECT_EQ(inflated(decoded(bytes)), R"({"certs":[")" + slashes + R"(",")" + slashes + R"("]})");
 }
 
-TEST_F(DeviceAttestationHeaders, SayWhyAListCannotBeEncoded) {
-  const auto compressed = KVRKestManager(simulated.platform)._compressCertificates({"\xff"});
-  ASSERT_FALSE(compressed);
-  EXPECT_EQ(compressed.error().domain, "json");
-  EXPECT_THAT(errorLines(),
-              ElementsAre("Unable to create attestation data with error: " + compressed.error().message));
-}
-
 TEST_F(DeviceAttestationHeaders, CompressOnlyWhatDoesNotGrow) {
   const KVRKestManager manager(simulated.platform);
   for (const std::string& data : {std::string(), std::string("abc"), certificate(3)}) {
     EXPECT_FALSE(manager._zlibCompressionForData(data)) << data.size();
   }
   EXPECT_EQ(inflated(*manager._zlibCompressionForData(std::string(60000, 'a'))), std::string(60000, 'a'));
-}
-
-TEST_F(DeviceAttestationHeaders, CanLeaveTheirCertificatesBehind) {
-  simulated.files.put("/tmp/leafCertificate", "earlier");
-  const KVRKestManager manager(simulated.platform);
-  manager.writeCertsToDevice({"leaf"});
-  EXPECT_EQ(simulated.files.get("/tmp/leafCertificate"), "earlier");
-  manager.writeCertsToDevice({"leaf", "issuer", "root"});
-  EXPECT_EQ(simulated.files.get("/tmp/leafCertificate"), "leaf");
-  EXPECT_EQ(simulated.files.get("/tmp/intermediateCertificate"), "issuer");
 }
 
 TEST(ASerialHash, IsTheSHA256OfTheTextUpToItsFirstNUL) {

@@ -149,8 +149,8 @@ TEST_F(TheVersionNegotiation, GoesOnWithTheNextSourceAfterAnyFailedFetch) {
       {[](auto& world) { world.http.respond(200, "<html>"); }, 1,
        "Error serializing plist file from URL '" + url + "'"},
       {[](auto& world) {
-         world.http.respond(200, asset(Value::Array{1}));
-         world.http.respond(200, asset(Value::Array{2}));
+         world.http.respond(200, "(1)");
+         world.http.respond(200, "(2)");
        },
        2,
        "Incorrect format in response detected from URL '" + url +

@@ -185,7 +185,8 @@ inline void Exchange::setHeaders() {
   }
   for (const auto& [name, value] : request_.headers.fields()) {
     const bool isBlank = value.find_first_not_of(" \t") == std::string::npos;
-    append(isBlank ? name + ";" : name + ": " + value);
+    std::string line = name;
+    append(isBlank ? line += ";" : line.append(": ").append(value));
   }
   set(CURLOPT_HTTPHEADER, headers_.get());
 }

@@ -89,11 +89,13 @@ CurlTransfers::~CurlTransfers() {
 
 void CurlTransfers::start(HTTPRequest request, Done done) {
   auto exchange = std::make_unique<Exchange>(std::move(request), std::move(done));
-  {
-    const std::lock_guard lock(mutex_);
-    if (!ending_) incoming_.push_back(std::move(exchange));
+  std::unique_lock lock(mutex_);
+  if (ending_) {
+    lock.unlock();
+    return exchange->fail(CURLE_ABORTED_BY_CALLBACK, kEnding);
   }
-  if (exchange) return exchange->fail(CURLE_ABORTED_BY_CALLBACK, kEnding);
+  incoming_.push_back(std::move(exchange));
+  lock.unlock();
   changed_.notify_one();
   curl_multi_wakeup(multi_.get());
 }
