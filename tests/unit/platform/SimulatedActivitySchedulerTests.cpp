@@ -1,4 +1,4 @@
-#include "SimulatedTest.h"
+#include "unit/SimulatedTest.h"
 
 namespace kvr {
 namespace {
