@@ -2,6 +2,7 @@
 
 #include "agent/AgentKeys.h"
 #include "agent/Configuration.h"
+#include "followup/KVRFollowUpPost.h"
 #include "followup/KVRFollowUpRefresh.h"
 #include "scheduling/KVRConversionOutreachActivity.h"
 #include "scheduling/KVROutreachActivity.h"
@@ -18,12 +19,21 @@ StartUp::StartUp(Platform& platform) : delegate_(platform) {
   monitor(platform, std::make_shared<KVROutreachActivity>(platform));
   monitor(platform, std::make_shared<KVRConversionOutreachActivity>(platform));
   monitor(platform, std::make_shared<KVRFollowUpRefresh>(platform));
+  resumeFollowUpPost(platform);
   agent_ = KVRAgent::initWithCallingProcessBundleID(platform, kPreferencesBundleID);
   // Migration runs here, synchronously; then the locale monitor and the paired-devices monitor start with
   // this agent.
   listener_ = platform.services.newListener(kServiceName);
   listener_->setDelegate(delegate_);
   listener_->resume(agentServiceInterface());
+}
+
+/// The follow-up post activity is no long-lived one: it exists only while it is scheduled. What an earlier start
+/// scheduled has to come to its run in this one, or its follow-ups would be lost.
+void StartUp::resumeFollowUpPost(Platform& platform) {
+  const auto scheduler =
+      KVRScheduler::newSchedulerWithActivityDelegate(platform, std::make_shared<KVRFollowUpPost>(platform));
+  if (scheduler->scheduledActivityDate()) scheduler->monitorForScheduledActivity();
 }
 
 void StartUp::monitor(Platform& platform, const std::shared_ptr<KVRSchedulerActivityDelegate>& activity) {

@@ -18,6 +18,7 @@ class StartUp {
   explicit StartUp(Platform& platform);
 
  private:
+  static void resumeFollowUpPost(Platform& platform);
   void monitor(Platform& platform, const std::shared_ptr<KVRSchedulerActivityDelegate>& activity);
 
   std::vector<std::shared_ptr<KVRScheduler>> schedulers_;

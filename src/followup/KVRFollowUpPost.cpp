@@ -47,7 +47,9 @@ void KVRFollowUpPost::performActivityForScheduler(const std::shared_ptr<KVRSched
   deviceInfosQuery_(
       LookupPolicy::kRefresh,
       DeviceInfosAnswer(platform_.log, "KVRFollowUpPost",
-                        [self = shared_from_this(), run](const std::optional<KVRDeviceInfoList>& list) {
+                        [self = shared_from_this(), run,
+                         scheduler](const std::optional<KVRDeviceInfoList>& list) {
+                          if (scheduler->isEnding()) return self->defer(*run);
                           self->handle(list, *run);
                         }));
 }
@@ -57,11 +59,14 @@ void KVRFollowUpPost::startDeferCheck(const std::shared_ptr<Run>& run,
   followUpPostTimer = platform_.queues.newRepeatingTimer(
       kDeferCheckInterval, platform_.queues.mainQueue(), [activity = weak_from_this(), run, scheduler] {
         const auto self = activity.lock();
-        if (!self || !self->followUpPostInProgress || !scheduler->shouldDefer()) return;
-        self->platform_.log.standard("FollowUp Post activity deferred.");
-        self->stopDeferCheck();
-        run->answer(ActivityResult::Deferred);
+        if (self && self->followUpPostInProgress && scheduler->shouldDefer()) self->defer(*run);
       });
+}
+
+void KVRFollowUpPost::defer(Run& run) {
+  platform_.log.standard("FollowUp Post activity deferred.");
+  stopDeferCheck();
+  run.answer(ActivityResult::Deferred);
 }
 
 void KVRFollowUpPost::stopDeferCheck() {

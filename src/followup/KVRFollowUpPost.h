@@ -38,6 +38,7 @@ class KVRFollowUpPost : public KVRSchedulerActivityDelegate,
  private:
   class Run;
   void startDeferCheck(const std::shared_ptr<Run>& run, const std::shared_ptr<KVRScheduler>& scheduler);
+  void defer(Run& run);
   void stopDeferCheck();
   void handle(const std::optional<KVRDeviceInfoList>& devicesInfo, Run& run);
   void postAndSchedule(const KVRDeviceInfoList& devicesInfo);

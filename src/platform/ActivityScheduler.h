@@ -22,6 +22,14 @@ struct ActivityCriteria {
   friend bool operator==(const ActivityCriteria&, const ActivityCriteria&) = default;
 };
 
+enum class DeferralReason { NetworkLost, ProcessEnding };
+
+/// What a client that checks in knows of its activity's registration.
+struct ActivityExpectation {
+  Date date;                  ///< from when it may run
+  ActivityCriteria criteria;  ///< with which to register it now, if it is not registered for that date
+};
+
 /// The answer to one run, given once, on any thread.
 using ActivityHandler = Completion<ActivityResult>;
 /// Runs an activity. Called on a thread of the platform's choosing, where it may block.
@@ -45,12 +53,14 @@ class Activity {
   /// whose run is under way included, is replaced, and the end of that run leaves the new registration alone.
   /// The platform holds the block until the activity has finished or is registered anew.
   virtual void schedule(ActivityBlock block) = 0;
+  /// Set before `schedule`, for a preregistered activity: what its client holds it to be registered for. Should
+  /// the platform have lost that registration, or never got it, the activity is registered so.
+  virtual void setExpectation(const ActivityExpectation& expectation) = 0;
   /// Tells the platform, during a run that is about to be deferred, the date before which running again is of
-  /// no use. Set before `schedule`, for a preregistered activity: the date for which its client has it
-  /// scheduled; should the platform have lost the registration, it is registered for that date.
+  /// no use.
   virtual void setEarliestDate(Date date) = 0;
-  /// Whether the platform asks the running activity to stop and defer.
-  virtual bool shouldDefer() const = 0;
+  /// Why the platform asks the running activity to stop and defer, if it does.
+  virtual std::optional<DeferralReason> shouldDefer() const = 0;
 };
 
 /// The platform's scheduler of named background activities. It runs an activity once, no earlier than its

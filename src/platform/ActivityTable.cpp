@@ -18,6 +18,9 @@ constexpr const char* kPriority = "priority";
 constexpr const char* kRegisteredDate = "registeredDate";
 constexpr const char* kDueDate = "dueDate";
 
+/// What whole seconds, and the moments between a date's being stored and registered, may put between the two.
+constexpr double kRounding = 2;
+
 /// The one priority at which activities run.
 constexpr const char* kUtility = "utility";
 
@@ -98,9 +101,13 @@ ActivityBlock ActivityTable::checkIn(const std::string& identifier, ActivityBloc
   return std::exchange(entries_[identifier].block, std::move(block));
 }
 
-bool ActivityTable::isRegistered(const std::string& identifier) const {
+bool ActivityTable::isRegisteredFor(const std::string& identifier, Date date) const {
   const auto found = entries_.find(identifier);
-  return found != entries_.end() && found->second.registration;
+  if (found == entries_.end() || !found->second.registration) return false;
+  const auto& [criteria, registered, due] = *found->second.registration;
+  const Date opens = registered + seconds(criteria.delay);
+  // A date that had passed when it was registered opened its window at once.
+  return opens <= std::max(date, registered) + kRounding;
 }
 
 // Occasions.
@@ -260,12 +267,6 @@ void ActivityTable::defer(Entry& entry, const UnderWay& run, const Now& now) {
   if (run.needsNetwork && (run.lostNetwork || !now.networkReachable)) return;
   entry.backOff = entry.backOff == 0 ? kFirstBackOff : std::min(2 * entry.backOff, kLongestBackOff);
   entry.notBefore = now.uptime + entry.backOff;
-}
-
-std::vector<ActivityBlock> ActivityTable::releaseBlocks() {
-  std::vector<ActivityBlock> blocks;
-  for (auto& [identifier, entry] : entries_) blocks.push_back(std::exchange(entry.block, nullptr));
-  return blocks;
 }
 
 }  // namespace kvr

@@ -67,7 +67,8 @@ class ActivityTable {
                     const Now& now, double draw);
   /// Brings a block for whatever the identifier is or will be due for. Returns the block that was replaced.
   ActivityBlock checkIn(const std::string& identifier, ActivityBlock block);
-  bool isRegistered(const std::string& identifier) const;
+  /// Whether the activity is registered to run from `date` on (or earlier), and within its grace period.
+  bool isRegisteredFor(const std::string& identifier, Date date) const;
 
   /// An occasion when none or another version is recorded. Nothing as the version (it cannot be found out) is
   /// one only when none is recorded. The version is recorded once the run has finished.
@@ -89,9 +90,6 @@ class ActivityTable {
   bool isRunThatNeedsNetwork(const std::string& identifier) const;
   std::size_t runsUnderWay() const;
   Ending end(const std::string& identifier, std::uint64_t number, ActivityResult result, const Now& now);
-
-  /// Gives back every block.
-  std::vector<ActivityBlock> releaseBlocks();
 
  private:
   struct Registration {

@@ -11,14 +11,6 @@ namespace {
 constexpr auto kDictionary = PropertyListFiles::Expected::Dictionary;
 constexpr auto kSetAside = PropertyListFiles::WhenDamaged::SetAside;
 
-constexpr double kLongestDelay = 1e15;  // seconds; whatever lies further ahead never comes
-
-/// Whole seconds from `now` until `date`, not negative.
-std::int64_t wholeSeconds(Date date, Date now) {
-  const double seconds = date - now;
-  return seconds > 0 ? static_cast<std::int64_t>(std::min(seconds, kLongestDelay)) : 0;
-}
-
 }  // namespace
 
 class FileActivityScheduler::Handle : public Activity {
@@ -40,27 +32,24 @@ class FileActivityScheduler::Handle : public Activity {
     {
       const std::lock_guard lock(mutex_);
       preregistered = preregistered_;
-      scheduled_ = true;
     }
     preregistered ? scheduler_.checkIn(*this, std::move(block))
                   : scheduler_.registerAnew(*this, std::move(block));
   }
-  void setEarliestDate(Date date) override {
-    {
-      const std::lock_guard lock(mutex_);
-      if (!scheduled_) expected_ = date;
-    }
-    scheduler_.setEarliestDate(identifier_, date);
+  void setExpectation(const ActivityExpectation& expectation) override {
+    const std::lock_guard lock(mutex_);
+    expectation_ = expectation;
   }
-  bool shouldDefer() const override { return scheduler_.shouldDefer(identifier_); }
+  void setEarliestDate(Date date) override { scheduler_.setEarliestDate(identifier_, date); }
+  std::optional<DeferralReason> shouldDefer() const override { return scheduler_.shouldDefer(identifier_); }
 
   ActivityCriteria criteria() const {
     const std::lock_guard lock(mutex_);
     return criteria_;
   }
-  std::optional<Date> expectedDate() const {
+  std::optional<ActivityExpectation> expectation() const {
     const std::lock_guard lock(mutex_);
-    return expected_;
+    return expectation_;
   }
 
  private:
@@ -68,9 +57,8 @@ class FileActivityScheduler::Handle : public Activity {
   const std::string identifier_;
   mutable std::mutex mutex_;  ///< guards what follows
   bool preregistered_ = false;
-  bool scheduled_ = false;
   ActivityCriteria criteria_;
-  std::optional<Date> expected_;  ///< told before the check-in
+  std::optional<ActivityExpectation> expectation_;
 };
 
 /// The other end of a run's handler. A handler that goes without an answer defers its run.
@@ -122,7 +110,8 @@ std::unique_ptr<Activity> FileActivityScheduler::newActivity(std::string identif
 
 void FileActivityScheduler::checkIn(const Handle& handle, ActivityBlock block) {
   const std::string& identifier = handle.identifier();
-  const auto expected = handle.expectedDate();
+  const auto expected = handle.expectation();
+  const double fraction = draw();
   std::optional<std::string> version;
   if (identifier == occasions_.afterUpgrade) version = device_.answer(DeviceProperties::kProductVersion);
   bool changed = false;
@@ -130,11 +119,8 @@ void FileActivityScheduler::checkIn(const Handle& handle, ActivityBlock block) {
   {
     const std::lock_guard lock(mutex_);
     load();
-    if (expected && !table_.isRegistered(identifier)) {
-      const auto moment = now();
-      const ActivityCriteria criteria{wholeSeconds(*expected, moment.date), 0,
-                                      handle.criteria().requiresNetwork};
-      replaced = table_.add(identifier, criteria, std::move(block), moment, 0);
+    if (expected && !table_.isRegisteredFor(identifier, expected->date)) {
+      replaced = table_.add(identifier, expected->criteria, std::move(block), now(), fraction);
       changed = true;
     } else {
       replaced = table_.checkIn(identifier, std::move(block));
@@ -166,9 +152,11 @@ void FileActivityScheduler::setEarliestDate(const std::string& identifier, Date 
   table_.setEarliestDate(identifier, date, now());
 }
 
-bool FileActivityScheduler::shouldDefer(const std::string& identifier) const {
+std::optional<DeferralReason> FileActivityScheduler::shouldDefer(const std::string& identifier) const {
   const std::lock_guard lock(mutex_);
-  return ending_ || (!networkReachable_ && table_.isRunThatNeedsNetwork(identifier));
+  if (ending_) return DeferralReason::ProcessEnding;
+  if (!networkReachable_ && table_.isRunThatNeedsNetwork(identifier)) return DeferralReason::NetworkLost;
+  return std::nullopt;
 }
 
 void FileActivityScheduler::setNetworkReachable(bool reachable) {

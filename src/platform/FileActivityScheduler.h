@@ -68,7 +68,7 @@ class FileActivityScheduler : public ActivityScheduler {
   void checkIn(const Handle& handle, ActivityBlock block);
   void registerAnew(const Handle& handle, ActivityBlock block);
   void setEarliestDate(const std::string& identifier, Date date);
-  bool shouldDefer(const std::string& identifier) const;
+  std::optional<DeferralReason> shouldDefer(const std::string& identifier) const;
   void end(const std::string& identifier, std::uint64_t number, ActivityResult result);
 
   ActivityTable::Now now() const;

@@ -49,7 +49,10 @@ void KVROutreachActivityUtilities::performOutreachActivityForConversion(
                            }));
   }
   downloads_.notify(platform_.queues.concurrentQueue(Priority::Default),
-                    [self, conversion, andCompletion] { self->finish(conversion, andCompletion); });
+                    [self, conversion, withScheduler, andCompletion] {
+                      if (withScheduler->isEnding()) return self->defer(conversion, andCompletion);
+                      self->finish(conversion, andCompletion);
+                    });
 }
 
 void KVROutreachActivityUtilities::startDeferCheck(bool conversion,
@@ -59,11 +62,14 @@ void KVROutreachActivityUtilities::startDeferCheck(bool conversion,
       kDeferCheckInterval, platform_.queues.mainQueue(),
       [run = weak_from_this(), conversion, scheduler, completion] {
         const auto self = run.lock();
-        if (!self || !self->outreachInProgress || !scheduler->shouldDefer()) return;
-        self->platform_.log.standard("Warranty download activity deferred. Conversion: %d", conversion);
-        self->stopDeferCheck();
-        self->answer(completion, ActivityResult::Deferred);
+        if (self && self->outreachInProgress && scheduler->shouldDefer()) self->defer(conversion, completion);
       });
+}
+
+void KVROutreachActivityUtilities::defer(bool conversion, const ActivityHandler& completion) {
+  platform_.log.standard("Warranty download activity deferred. Conversion: %d", conversion);
+  stopDeferCheck();
+  answer(completion, ActivityResult::Deferred);
 }
 
 void KVROutreachActivityUtilities::stopDeferCheck() {

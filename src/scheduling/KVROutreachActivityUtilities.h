@@ -36,6 +36,7 @@ class KVROutreachActivityUtilities : public std::enable_shared_from_this<KVROutr
  private:
   void startDeferCheck(bool conversion, const std::shared_ptr<KVRScheduler>& scheduler,
                        const ActivityHandler& completion);
+  void defer(bool conversion, const ActivityHandler& completion);
   void stopDeferCheck();
   void handleDownload(const std::optional<std::string>& serialNumber, bool success,
                       const KVRWarrantyRef& warranty, bool conversion);

@@ -11,9 +11,9 @@ constexpr double kHandBackDelay = 1;    // seconds
 constexpr double kLongestDelay = 1e15;  // seconds; the calendar's own limit
 constexpr double kGraceShare = 10;      // the grace period is this part of the delay
 
-/// From `delay`, 0 or more, in seconds.
+/// From `delay` in seconds; one below zero counts as none.
 ActivityCriteria criteria(double delay, bool requiresNetwork) {
-  delay = std::min(delay, kLongestDelay);
+  delay = delay > 0 ? std::min(delay, kLongestDelay) : 0;
   ActivityCriteria criteria;
   criteria.gracePeriod = static_cast<std::int64_t>(delay / kGraceShare);
   criteria.delay = static_cast<std::int64_t>(delay);
@@ -46,7 +46,10 @@ void KVRScheduler::clearScheduledActivities(Platform& platform) {
 void KVRScheduler::monitorForScheduledActivity() {
   platform_.log.standard("monitorForScheduledActivity for '%@'", identifier());
   activity_->setPreregistered(true);
-  if (const auto target = scheduledActivityDate()) activity_->setEarliestDate(*target);
+  if (const auto target = scheduledActivityDate()) {
+    activity_->setExpectation(
+        {*target, criteria(*target - platform_.clock.now(), activityDelegate()->requiresNetwork())});
+  }
   activity_->schedule([self = shared_from_this()](const ActivityHandler& handler) {
     self->performScheduledOutreachWithBlock(handler);
   });
@@ -63,7 +66,7 @@ void KVRScheduler::scheduleActivityForDate(std::optional<Date> date) {
 void KVRScheduler::_scheduleActivityWithDelay(double delay, std::optional<Date> forDate) {
   platform_.log.standard("scheduled '%@' with delay: %.02f (%@)", identifier(), delay, forDate);
   activity_->setPreregistered(false);
-  activity_->setCriteria(criteria(delay > 0 ? delay : 0, activityDelegate()->requiresNetwork()));
+  activity_->setCriteria(criteria(delay, activityDelegate()->requiresNetwork()));
   platform_.preferences.setObject(forDate, targetDateKey_);
   activity_->schedule([self = shared_from_this()](const ActivityHandler& handler) {
     self->platform_.log.standard("Velt activity block occured '%@' at (%@)", self->identifier(),

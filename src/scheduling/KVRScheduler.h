@@ -43,7 +43,10 @@ class KVRScheduler : public std::enable_shared_from_this<KVRScheduler> {
   void performScheduledOutreachWithBlock(const ActivityHandler& block);
 
   /// Whether the platform asks the running activity to stop and defer.
-  bool shouldDefer() const { return activity_->shouldDefer(); }
+  bool shouldDefer() const { return activity_->shouldDefer().has_value(); }
+  /// Whether it asks because the process is ending. What a run is told from then on, that a download failed for
+  /// one, may be the end's doing: it must not count as the run's outcome.
+  bool isEnding() const { return activity_->shouldDefer() == DeferralReason::ProcessEnding; }
   const std::string& identifier() const { return activity_->identifier(); }
 
   AtomicProperty<std::shared_ptr<KVRSchedulerActivityDelegate>> activityDelegate;

@@ -27,7 +27,7 @@ struct Start {
         root(lists, world.log, device),
         queues(loop, world.log),
         scheduler(loop, root, clock, queues, random, properties, world.log, "com.tarsil.kvragent",
-                  {kUpgrade, kBoot}, device + "/boot_id") {}
+                  {kUpgrade, kBoot}, {device + "/boot_id", device + "/netif"}) {}
   ~Start() {
     scheduler.beginEnding();
     queues.beginEnding();
@@ -143,6 +143,16 @@ TEST_F(ALocalScheduler, WaitsForTheNetworkWithoutAskingAgain) {
   EXPECT_THAT(local->finish(), ElementsAre("a"));
 }
 
+TEST_F(ALocalScheduler, BelievesTheHostsNetworkServiceWhereTheDeviceDoesNotSay) {
+  writeFile(device + "/netif", "# networkd\nCARRIER_STATE=no-carrier\nOPER_STATE=no-carrier\n");
+  const auto local = start();
+  local->add("a", {0, 0, true});
+  EXPECT_EQ(local->scheduler.runsUnderWay(), 0U);
+  writeFile(device + "/netif", "OPER_STATE=routable\n");
+  local->loop.run();
+  EXPECT_THAT(local->finish(), ElementsAre("a"));
+}
+
 TEST_F(ALocalScheduler, NoticesThatTheDeviceDirectoryHasGone) {
   setNetwork(false);
   const auto local = start();
@@ -178,8 +188,7 @@ TEST_F(ALocalScheduler, RegistersAnewWhatItsClientSaysIsScheduled) {
     const auto local = start();
     const auto activity = local->scheduler.newActivity("a");
     activity->setPreregistered(true);
-    activity->setCriteria({0, 0, true});
-    activity->setEarliestDate(world.clock.now() + 500);
+    activity->setExpectation({world.clock.now() + 500, {500, 0, true}});
     activity->schedule(local->recorder("a"));
     EXPECT_THAT(local->finish(), IsEmpty());
   }

@@ -39,12 +39,12 @@ LocalActivityScheduler::LocalActivityScheduler(EventLoop& loop, const DeviceRoot
                                                WorkQueues& queues, Random& random,
                                                const DeviceProperties& device, Log& log,
                                                const std::string& mainBundleIdentifier,
-                                               ActivityOccasions occasions, std::string bootIdentifierPath)
+                                               ActivityOccasions occasions, HostFiles host)
     : FileActivityScheduler(root.lists(), clock, queues, random, device, log, mainBundleIdentifier,
                             std::move(occasions)),
-      bootIdentifierPath_(std::move(bootIdentifierPath)),
+      host_(std::move(host)),
       timer_(wallClockTimer()),
-      network_(loop, root, [this](bool reachable) { networkChanged(reachable); }) {
+      network_(loop, root, [this](bool reachable) { networkChanged(reachable); }, host_.networkState) {
   const auto ended = [](sd_event_source*, int, std::uint32_t, void* self) {
     static_cast<LocalActivityScheduler*>(self)->timerEnded();
     return 0;
@@ -60,7 +60,7 @@ double LocalActivityScheduler::uptime() const { return secondsOf(CLOCK_BOOTTIME)
 
 /// Empty when the kernel does not tell, which then is one boot for ever.
 std::string LocalActivityScheduler::bootIdentifier() const {
-  std::ifstream file(bootIdentifierPath_);
+  std::ifstream file(host_.bootIdentifier);
   std::string identifier;
   file >> identifier;
   return identifier;

@@ -13,14 +13,17 @@ namespace kvr {
 /// and destroyed on the loop's thread.
 class LocalActivityScheduler : public FileActivityScheduler {
  public:
-  /// Where the kernel tells the identifier of this boot.
-  static constexpr const char* kBootIdentifierPath = "/proc/sys/kernel/random/boot_id";
+  /// Where the host tells its own facts.
+  struct HostFiles {
+    std::string bootIdentifier = "/proc/sys/kernel/random/boot_id";
+    std::string networkState = LocalNetwork::kHostState;
+  };
 
   /// Throws std::system_error when the kernel refuses a descriptor.
   LocalActivityScheduler(EventLoop& loop, const DeviceRoot& root, const Clock& clock, WorkQueues& queues,
                          Random& random, const DeviceProperties& device, Log& log,
                          const std::string& mainBundleIdentifier, ActivityOccasions occasions,
-                         std::string bootIdentifierPath = kBootIdentifierPath);
+                         HostFiles host);
   ~LocalActivityScheduler() override;
   LocalActivityScheduler(const LocalActivityScheduler&) = delete;
   LocalActivityScheduler& operator=(const LocalActivityScheduler&) = delete;
@@ -34,7 +37,7 @@ class LocalActivityScheduler : public FileActivityScheduler {
   void timerEnded() noexcept;
   void networkChanged(bool reachable) noexcept;
 
-  const std::string bootIdentifierPath_;
+  const HostFiles host_;
   const Descriptor timer_;
   sd_event_source* source_ = nullptr;
   LocalNetwork network_;

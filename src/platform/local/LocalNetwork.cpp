@@ -1,14 +1,9 @@
 #include "platform/local/LocalNetwork.h"
 
-#include <sys/inotify.h>
-#include <systemd/sd-event.h>
-#include <unistd.h>
-
+#include <algorithm>
 #include <array>
-#include <cerrno>
-#include <cstring>
-#include <filesystem>
-#include <system_error>
+#include <fstream>
+#include <string_view>
 #include <utility>
 
 namespace kvr {
@@ -16,64 +11,32 @@ namespace {
 
 constexpr const char* kFile = "Network.plist";
 
-constexpr std::uint32_t kChanges = IN_CLOSE_WRITE | IN_CREATE | IN_DELETE | IN_MOVED_FROM | IN_MOVED_TO;
-constexpr std::uint32_t kOwnEnd = IN_DELETE_SELF | IN_MOVE_SELF;
+constexpr std::string_view kOperationalState = "OPER_STATE=";
+/// The operational states in which no link has an address of its own.
+constexpr std::array<std::string_view, 6> kUnreachable{"missing", "off",     "no-carrier",
+                                                       "dormant", "carrier", "degraded-carrier"};
+
+bool isHostReachable(const std::string& path) {
+  std::ifstream state(path);
+  for (std::string line; std::getline(state, line);) {
+    if (!line.starts_with(kOperationalState)) continue;
+    return std::ranges::find(kUnreachable, line.substr(kOperationalState.size())) == kUnreachable.end();
+  }
+  return true;
+}
 
 }  // namespace
 
-LocalNetwork::LocalNetwork(EventLoop& loop, const DeviceRoot& root, std::function<void(bool)> changed)
-    : root_(root), changed_(std::move(changed)), inotify_(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC)) {
-  if (!inotify_) throw std::system_error(errno, std::generic_category(), "inotify_init1");
-  watch();
-  const auto readable = [](sd_event_source*, int, std::uint32_t, void* self) {
-    static_cast<LocalNetwork*>(self)->readEvents();
-    return 0;
-  };
-  const int result = ::sd_event_add_io(loop.event(), &source_, inotify_.get(), EPOLLIN, readable, this);
-  if (result < 0) throw std::system_error(-result, std::generic_category(), "sd_event_add_io");
-}
-
-LocalNetwork::~LocalNetwork() { ::sd_event_source_disable_unref(source_); }
+LocalNetwork::LocalNetwork(EventLoop& loop, const DeviceRoot& root, std::function<void(bool)> changed,
+                           std::string hostState)
+    : root_(root),
+      hostState_(std::move(hostState)),
+      ownWatch_(loop, root.pathOf(kFile), [this, changed] { changed(isReachable()); }),
+      hostWatch_(loop, hostState_, [this, changed] { changed(isReachable()); }) {}
 
 bool LocalNetwork::isReachable() const {
   const auto reachable = root_.dictionary(kFile)["reachable"];
-  return !reachable.isBool() || reachable.boolean();
-}
-
-void LocalNetwork::watch() {
-  if (watch_ >= 0) ::inotify_rm_watch(inotify_.get(), watch_);
-  watch_ = -1;
-  const auto directory = std::filesystem::path(root_.pathOf(kFile)).parent_path();
-  isWatchingRoot_ = true;
-  for (auto path = directory;; path = path.parent_path()) {
-    const std::uint32_t events = isWatchingRoot_ ? kChanges : IN_CREATE | IN_MOVED_TO;
-    watch_ = ::inotify_add_watch(inotify_.get(), path.c_str(), events | kOwnEnd | IN_ONLYDIR);
-    if (watch_ >= 0 || !path.has_relative_path()) return;
-    isWatchingRoot_ = false;
-  }
-}
-
-void LocalNetwork::readEvents() {
-  alignas(inotify_event) std::array<char, 16384> buffer{};
-  bool concerns = false;
-  bool isWatchLost = false;
-  for (;;) {
-    const auto size = ::read(inotify_.get(), buffer.data(), buffer.size());
-    if (size <= 0) break;
-    for (std::size_t at = 0; at < static_cast<std::size_t>(size);) {
-      inotify_event event{};
-      std::memcpy(&event, buffer.data() + at, sizeof event);
-      const char* const name = buffer.data() + at + sizeof event;
-      // An older watch's last words concern nobody; a lost event (which names none) may be any.
-      if (event.wd == watch_ || event.wd == -1) {
-        if (event.len == 0 || std::strcmp(name, kFile) == 0) concerns = true;
-        if (!isWatchingRoot_ || (event.mask & (kOwnEnd | IN_IGNORED)) != 0) isWatchLost = true;
-      }
-      at += sizeof event + event.len;
-    }
-  }
-  if (isWatchLost) watch();
-  if (concerns || isWatchLost) changed_(isReachable());
+  return reachable.isBool() ? reachable.boolean() : isHostReachable(hostState_);
 }
 
 }  // namespace kvr

@@ -6,7 +6,7 @@ LocalPlatform::LocalPlatform(EventLoop& mainLoop, std::function<void()> busLost)
     : queues(mainLoop, *log),
       services(queues, *log, entitlements, std::move(busLost)),
       activities(mainLoop, root, clock, queues, random, deviceProperties, *log, kMainBundleIdentifier,
-                 {"com.tarsil.kvragent.upgrade", "com.tarsil.kvragent.boot"}) {}
+                 {"com.tarsil.kvragent.upgrade", "com.tarsil.kvragent.boot"}, {}) {}
 
 bool LocalPlatform::end(double limit) {
   log->beginEnding();

@@ -74,7 +74,7 @@ std::optional<FileStamp> SimulatedFiles::stamp(const std::string& path) {
 
 std::optional<Error> SimulatedFiles::replace(const std::string& path, const std::string& bytes) {
   const std::lock_guard lock(mutex_);
-  if (auto fault = writeFaults_.of(path)) return fault;
+  if (auto fault = writeFaultOf(path)) return fault;
   if (directories_.contains(path)) return failure(EISDIR, path);
   if (!directories_.contains(directoryOf(path))) return failure(ENOENT, path);
   store(path, bytes);
@@ -85,7 +85,7 @@ std::optional<Error> SimulatedFiles::replace(const std::string& path, const std:
 std::optional<Error> SimulatedFiles::createDirectory(const std::string& path) {
   const std::lock_guard lock(mutex_);
   if (directories_.contains(path)) return std::nullopt;
-  if (auto fault = writeFaults_.of(path)) return fault;
+  if (auto fault = writeFaultOf(path)) return fault;
   for (std::string part = path; part != "/"; part = directoryOf(part)) {
     if (files_.contains(part)) return failure(ENOTDIR, part);
   }
@@ -95,7 +95,7 @@ std::optional<Error> SimulatedFiles::createDirectory(const std::string& path) {
 
 std::optional<Error> SimulatedFiles::remove(const std::string& path) {
   const std::lock_guard lock(mutex_);
-  if (auto fault = writeFaults_.of(path)) return fault;
+  if (auto fault = writeFaultOf(path)) return fault;
   if (directories_.contains(path)) return failure(EISDIR, path);
   if (files_.erase(path) == 0) return failure(ENOENT, path);
   ++writes_;
@@ -112,8 +112,8 @@ std::optional<Error> SimulatedFiles::renameToUnused(const std::string& from, con
 
 std::optional<Error> SimulatedFiles::move(const std::string& from, const std::string& to, bool replaces) {
   const std::lock_guard lock(mutex_);
-  if (auto fault = writeFaults_.of(from)) return fault;
-  if (auto fault = writeFaults_.of(to)) return fault;
+  if (auto fault = writeFaultOf(from)) return fault;
+  if (auto fault = writeFaultOf(to)) return fault;
   const auto found = files_.find(from);
   if (found == files_.end()) return failure(directories_.contains(from) ? EISDIR : ENOENT, from);
   if (!replaces && (files_.contains(to) || directories_.contains(to))) return failure(EEXIST, to);
@@ -195,6 +195,28 @@ void SimulatedFiles::setWriteFault(std::optional<Error> error) {
 void SimulatedFiles::setWriteFault(const std::string& path, std::optional<Error> error) {
   const std::lock_guard lock(mutex_);
   writeFaults_.set(path, std::move(error));
+}
+
+void SimulatedFiles::killAfterWrites(std::size_t count) {
+  const std::lock_guard lock(mutex_);
+  lastWrite_ = writes_ + count;
+}
+
+bool SimulatedFiles::isKilled() const {
+  const std::lock_guard lock(mutex_);
+  return lastWrite_ && writes_ >= *lastWrite_;
+}
+
+void SimulatedFiles::takeOver(const SimulatedFiles& other) {
+  const std::scoped_lock lock(mutex_, other.mutex_);
+  files_ = other.files_;
+  directories_ = other.directories_;
+  lastInode_ = other.lastInode_;
+}
+
+std::optional<Error> SimulatedFiles::writeFaultOf(const std::string& path) const {
+  if (lastWrite_ && writes_ >= *lastWrite_) return failure(EIO, path);
+  return writeFaults_.of(path);
 }
 
 std::size_t SimulatedFiles::writeCount() const {

@@ -50,6 +50,12 @@ class SimulatedFiles : public Files {
   void setWriteFault(std::optional<Error> error);
   void setWriteFault(const std::string& path, std::optional<Error> error);
 
+  /// The end of the process at a point between two changes: after `count` more, no change reaches a file.
+  void killAfterWrites(std::size_t count);
+  bool isKilled() const;
+  /// The files as another instance has them, in the place of these.
+  void takeOver(const SimulatedFiles& other);
+
   /// How often a file was replaced, renamed or removed so far, and how often one was read as a whole.
   std::size_t writeCount() const;
   std::size_t readCount() const;
@@ -67,6 +73,7 @@ class SimulatedFiles : public Files {
     std::optional<Error> of(const std::string& path) const;
   };
 
+  std::optional<Error> writeFaultOf(const std::string& path) const;
   void store(const std::string& path, std::string bytes);
   void addDirectories(std::string path);
   std::optional<Error> move(const std::string& from, const std::string& to, bool replaces);
@@ -78,6 +85,7 @@ class SimulatedFiles : public Files {
   std::uint64_t lastInode_ = 0;
   Faults readFaults_;
   Faults writeFaults_;
+  std::optional<std::size_t> lastWrite_;
   std::size_t writes_ = 0;
   std::size_t reads_ = 0;
   std::map<std::string, std::recursive_mutex> locks_;

@@ -18,6 +18,8 @@ namespace {
 constexpr std::uint64_t kLimitMicroseconds = 60'000'000;  // only ever spent on a failure
 constexpr const char* kAuthority = "home/Library/Keys/com.tarsil.kvragent.kestCertificates/authority.pem";
 
+constexpr const char* kActivities = "Library/Activities/com.tarsil.kvragent.plist";
+
 std::string contentOf(const std::filesystem::path& path) {
   std::ifstream file(path, std::ios::binary);
   return {std::istreambuf_iterator<char>(file), {}};
@@ -61,6 +63,7 @@ AgentWorld::AgentWorld(Attestation attestation) {
   service_ = std::make_unique<ChildProcess>(command);
   constexpr std::string_view kListening = "listening on ";
   serviceURL_ = service_->waitForOutput(kListening).substr(kListening.size());
+  directory.write(std::string("home/") + kActivities, "{ OSVersion = \"17.9\"; activities = {}; }");
   directory.write(
       "home/Library/Preferences/com.tarsil.kvragent.plist",
       binary(Value::Dictionary{{"ServerVersionURL", serviceURL_ + "/library/TARSIL/asset/kvrV2.plist"},
@@ -68,8 +71,10 @@ AgentWorld::AgentWorld(Attestation attestation) {
                                {"WearablesWarrantyURL", serviceURL_ + "/api/v2/coverage/summary"}}));
 }
 
+void AgentWorld::becomeNewDevice() const { std::filesystem::remove(home() / kActivities); }
+
 void AgentWorld::startAgent() {
-  for (const auto* path : {"Library", "Library/Preferences"}) {
+  for (const auto* path : {"Library", "Library/Preferences", "Library/Activities"}) {
     std::filesystem::permissions(home() / path, std::filesystem::perms::owner_all);
   }
   const RawBusClient watcher = newClient();

@@ -15,7 +15,8 @@ namespace kvr::testing {
 /// A phone with two watches, its coverage service and its agent: the real programs on a bus of their own. The
 /// test is the client.
 ///
-/// The agent is started by `startAgent`, so that a test may change the device before.
+/// The agent is started by `startAgent`, so that a test may change the device before. It finds a device that it
+/// has set up earlier, and so does nothing of its own accord.
 class AgentWorld {
  public:
   static constexpr const char* kPhone = "SNPHONE00001";
@@ -28,7 +29,9 @@ class AgentWorld {
 
   explicit AgentWorld(Attestation attestation = Attestation::Required);
 
-  /// Starts the agent and returns once it has its name on the bus.
+  /// From here on it is the device's first start.
+  void becomeNewDevice() const;
+  /// Starts the agent, after killing one that runs, and returns once it has its name on the bus.
   void startAgent();
   ChildProcess& agent() { return *agent_; }
   RawBusClient newClient() const { return RawBusClient(bus.address()); }

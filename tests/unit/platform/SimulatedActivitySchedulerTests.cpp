@@ -62,9 +62,9 @@ TEST_F(ASimulatedScheduler, AsksARunToDeferWhenItsNetworkIsGone) {
   bool after = false;
   add("a", {0, 0, true}, [&](const ActivityHandler& handler) {
     const auto activity = simulated.activities.newActivity("a");
-    before = activity->shouldDefer();
+    before = activity->shouldDefer().has_value();
     simulated.activities.setNetworkReachable(false);
-    after = activity->shouldDefer();
+    after = activity->shouldDefer().has_value();
     simulated.activities.setNetworkReachable(true);
     handler(ActivityResult::Finished);
   });

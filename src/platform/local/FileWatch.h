@@ -1,0 +1,39 @@
+#pragma once
+
+#include "platform/local/Descriptor.h"
+#include "platform/local/EventLoop.h"
+
+#include <filesystem>
+#include <functional>
+#include <string>
+
+namespace kvr {
+
+/// Notices that a file may have changed, come or gone.
+///
+/// The file's directory is watched, not asked again and again; one that does not exist yet is waited for in the
+/// nearest one that does. A file that is written in place counts once it is closed. Built and destroyed on the
+/// loop's thread.
+class FileWatch {
+ public:
+  /// `changed` is called on the loop's thread; it may be called without a change, and must not throw. Throws
+  /// std::system_error when the kernel refuses.
+  FileWatch(EventLoop& loop, std::filesystem::path path, std::function<void()> changed);
+  ~FileWatch();
+  FileWatch(const FileWatch&) = delete;
+  FileWatch& operator=(const FileWatch&) = delete;
+
+ private:
+  void watch();
+  void readEvents();
+
+  const std::filesystem::path path_;
+  const std::string name_;
+  const std::function<void()> changed_;
+  Descriptor inotify_;
+  sd_event_source* source_ = nullptr;
+  int watch_ = -1;
+  bool isInPlace_ = false;  ///< whether it is the file's own directory that is watched
+};
+
+}  // namespace kvr
