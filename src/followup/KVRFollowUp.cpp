@@ -21,7 +21,9 @@ KVRFollowUp::KVRFollowUp(Platform& platform)
     : KVRFollowUp(platform, std::make_shared<KVRDefaultFolllowUpProvider>(platform)) {}
 
 KVRFollowUp::KVRFollowUp(Platform& platform, std::shared_ptr<KVRFollowUpProvider> theFollowUpProvider)
-    : followUpProvider(std::move(theFollowUpProvider)), platform_(platform) {}
+    : followUpProvider(std::move(theFollowUpProvider)),
+      platform_(platform),
+      turn_(platform.sharedObjects.get<Turn>([] { return new Turn; })) {}
 
 std::vector<FollowUpItem> KVRFollowUp::pendingItems() {
   auto items = followUpProvider()->pendingFollowUpItems();
@@ -37,6 +39,7 @@ bool KVRFollowUp::postFollowUpWithDevicesInfo(const KVRDeviceInfoList& devicesIn
 }
 
 bool KVRFollowUp::_postFollowUpWithDevicesInfo(const KVRDeviceInfoList& devicesInfo, bool repostAllowed) {
+  const auto turn = takeTurn();
   KVRDeviceInfoList toPost;
   for (const auto& info : devicesInfo) {
     if (isToPost(*info, repostAllowed)) toPost.push_back(info);
@@ -88,6 +91,7 @@ bool KVRFollowUp::isDue(const KVRDeviceInfo& deviceInfo) {
 }
 
 void KVRFollowUp::postFollowUpWithDeviceInfo(const KVRDeviceInfo& deviceInfo) {
+  const auto turn = takeTurn();
   const auto warranty = deviceInfo.warranty();
   const auto serialNumber = serialNumberOf(deviceInfo);
   if (!warranty || !warranty->zubOfferDisplay() || !serialNumber) {
@@ -129,6 +133,7 @@ void KVRFollowUp::dismissFollowUpForSerialNumber(const std::string& serialNumber
                         fault);
     return;
   }
+  const auto turn = takeTurn();
   const auto error = followUpProvider()->clearPendingFollowUpItemsWithUniqueIdentifiers(
       {uniqueIdentfierForSerialNumber(serialNumber)});
   platform_.log.standard("Dismissed follow-up: %@", outcomeText(error));
@@ -139,6 +144,7 @@ void KVRFollowUp::dismissFollowUpForSerialNumber(const std::string& serialNumber
 }
 
 void KVRFollowUp::_clearFollowUpWithDevices(const std::vector<KVRDeviceRef>& devices) {
+  const auto turn = takeTurn();
   std::vector<std::string> identifiers;
   identifiers.reserve(devices.size());
   for (const auto& device : devices) {
@@ -149,6 +155,7 @@ void KVRFollowUp::_clearFollowUpWithDevices(const std::vector<KVRDeviceRef>& dev
 }
 
 void KVRFollowUp::migrateLegacyFollowUpIfNeededWithDeviceInfo(const KVRDeviceInfo& deviceInfo) {
+  const auto turn = takeTurn();
   auto& log = platform_.log;
   auto items = pendingItems();
   if (items.size() != 1 || items[0].uniqueIdentifier != kFollowUpClientIdentifier) return;

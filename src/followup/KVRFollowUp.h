@@ -7,6 +7,7 @@
 
 #include <cstddef>
 #include <memory>
+#include <mutex>
 #include <optional>
 #include <string>
 #include <vector>
@@ -23,7 +24,9 @@ namespace kvr {
 ///     KVRFollowUp(platform).refreshFollowupWithDeviceInfos(infos);
 ///
 /// Made for one call; everything that lasts is elsewhere. Failures of the centre are logged and otherwise
-/// ignored; the preferences then stay as they are. Any thread, synchronously.
+/// ignored; the preferences then stay as they are. Any thread, synchronously; operations of one platform take
+/// turns, so that what one decides on still holds when it acts: a dismissal comes before a refresh or after
+/// it, never in between, where the refresh would bring the item back.
 class KVRFollowUp {
  public:
   explicit KVRFollowUp(Platform& platform);
@@ -72,7 +75,11 @@ class KVRFollowUp {
   bool isDue(const KVRDeviceInfo& deviceInfo);
   KVRDeviceInfoList updateItems(std::vector<FollowUpItem>& pending, const KVRDeviceInfoList& deviceInfos);
 
+  using Turn = std::recursive_mutex;
+  std::unique_lock<Turn> takeTurn() const { return std::unique_lock(*turn_); }
+
   Platform& platform_;
+  const std::shared_ptr<Turn> turn_;
 };
 
 }  // namespace kvr

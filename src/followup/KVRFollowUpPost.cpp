@@ -44,14 +44,13 @@ void KVRFollowUpPost::performActivityForScheduler(const std::shared_ptr<KVRSched
   followUpPostInProgress = true;
   const auto run = std::make_shared<Run>(platform_.log, std::move(withCompletionHandler));
   startDeferCheck(run, scheduler);
-  deviceInfosQuery_(
-      LookupPolicy::kRefresh,
-      DeviceInfosAnswer(platform_.log, "KVRFollowUpPost",
-                        [self = shared_from_this(), run,
-                         scheduler](const std::optional<KVRDeviceInfoList>& list) {
-                          if (scheduler->isEnding()) return self->defer(*run);
-                          self->handle(list, *run);
-                        }));
+  deviceInfosQuery_(LookupPolicy::kRefresh,
+                    DeviceInfosAnswer(platform_.log, "KVRFollowUpPost",
+                                      [self = shared_from_this(), run,
+                                       scheduler](const std::optional<KVRDeviceInfoList>& list) {
+                                        if (scheduler->isEnding()) return self->defer(*run);
+                                        self->handle(list, *run);
+                                      }));
 }
 
 void KVRFollowUpPost::startDeferCheck(const std::shared_ptr<Run>& run,

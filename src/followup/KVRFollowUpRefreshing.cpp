@@ -59,6 +59,7 @@ KVRDeviceInfoList KVRFollowUp::refreshFollowupWithDeviceInfo(const KVRDeviceInfo
 KVRDeviceInfoList KVRFollowUp::refreshFollowupWithDeviceInfos(const KVRDeviceInfoList& deviceInfos,
                                                               bool clearUntrackedDeviceFollowups,
                                                               bool allowForcePost) {
+  const auto turn = takeTurn();
   auto& log = platform_.log;
   auto pending = pendingItems();
   std::set<std::string> pendingSerials;

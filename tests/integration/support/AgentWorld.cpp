@@ -164,9 +164,9 @@ std::vector<Value> AgentWorld::coverageRequests() const {
   return all;
 }
 
-Value AgentWorld::preferences() const {
-  return *readPropertyList(contentOf(home() / "Library/Preferences/com.tarsil.kvragent.plist"));
-}
+Value AgentWorld::file(const std::string& path) const { return *readPropertyList(contentOf(home() / path)); }
+
+Value AgentWorld::preferences() const { return file("Library/Preferences/com.tarsil.kvragent.plist"); }
 
 std::string AgentWorld::cacheFileOf(const std::string& serialNumber) const {
   return (home() / "Library/Application Support/com.tarsil.Kavrel" /

@@ -51,6 +51,8 @@ class AgentWorld {
   std::vector<Value> requests() const;
   /// Those for coverage.
   std::vector<Value> coverageRequests() const;
+  /// A property list below the home directory.
+  Value file(const std::string& path) const;
   Value preferences() const;
   std::string cacheFileOf(const std::string& serialNumber) const;
   std::filesystem::path home() const { return directory / "home"; }

@@ -1,0 +1,83 @@
+#include "integration/support/AgentWorld.h"
+#include "platform/JSON.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <chrono>
+
+namespace kvr::testing {
+namespace {
+
+using ::testing::SizeIs;
+using ::testing::UnorderedElementsAre;
+
+using World = AgentWorld;
+
+constexpr double kDay = 86400;
+
+/// A device on which the agent has never run, whose every warranty carries an offer that is due.
+class ANewDevice : public ::testing::Test {
+ protected:
+  ANewDevice() {
+    using Seconds = std::chrono::duration<double>;
+    const auto now = std::chrono::duration_cast<Seconds>(std::chrono::system_clock::now().time_since_epoch());
+    const Value offer =
+        Value::Dictionary{{"zubOfferEligibleUntil", now.count() + 10 * kDay},
+                          {"zubOfferFollowupDisplayDate", now.count() - kDay},
+                          {"zubLocalizedOfferLabel", "Zub"},
+                          {"zubLocalizedOfferDesc", "Add it"},
+                          {"zubLocalizedOfferSingularDesc", "One day left"},
+                          {"zubLocalizedOfferPluralDescFormat", "%@ days left"},
+                          {"zubLocalizedOfferCTA", "Add"},
+                          {"featureToggleParameters", Value::Dictionary{{"zubOfferDisplay", true}}}};
+    world.setCoverage("default", *writeJSON(offer));
+    world.becomeNewDevice();
+  }
+  std::vector<std::string> pendingSerials() const {
+    std::vector<std::string> serials;
+    const auto tree = world.file("Library/FollowUps/com.tarsil.Kavrel.plist");
+    for (const auto& item : tree["items"].array()) {
+      serials.push_back(item["userInfo"]["FollowupSerialNumber"].string());
+    }
+    return serials;
+  }
+
+  AgentWorld world;
+};
+
+TEST_F(ANewDevice, GetsItsFollowUpsWhereverTheAgentIsKilledOnTheWay) {
+  for (const auto* line : {"launched", "launched", "perform upgrade activity"}) {
+    world.startAgent();
+    world.agent().waitForErrorOutput(line);
+    world.agent().kill();
+  }
+  world.startAgent();
+  // It may have done all its work before the last kill.
+  world.newClient().call("ScheduleOutreach");
+  world.agent().waitForErrorOutput("Schedule refresh for: ");
+  EXPECT_THAT(pendingSerials(), UnorderedElementsAre(World::kPhone, World::kFirstWatch, World::kSecondWatch));
+  EXPECT_THAT(world.preferences()["FollowupPostedSerialNumberHashes"].array(), SizeIs(3));
+
+  world.newClient().call("DismissFollowUpForSerialNumber", "s", {World::kPhone});
+  EXPECT_THAT(pendingSerials(), UnorderedElementsAre(World::kFirstWatch, World::kSecondWatch));
+  EXPECT_EQ(world.agent().terminate(), 0);
+}
+
+TEST_F(ANewDevice, IsDoneWithTwoHundredWatchesThoughEverySecondDownloadFails) {
+  std::vector<std::string> watches;
+  for (int index = 0; index < 200; ++index) watches.push_back("WATCH" + std::to_string(index));
+  world.pair(watches);
+  world.misbehave(R"([{"every":2,"status":500}])");
+  world.startAgent();
+  world.agent().waitForErrorOutput("Complete activity and schedule followUp post for");
+  const auto log = world.agent().errorOutput();
+  std::size_t failed = 0;
+  for (std::size_t at = log.find("Warranty failed to download"); at != std::string::npos; ++failed) {
+    at = log.find("Warranty failed to download", at + 1);
+  }
+  EXPECT_EQ(failed, 100U);
+}
+
+}  // namespace
+}  // namespace kvr::testing
