@@ -118,6 +118,17 @@ Result<std::string> list(const std::vector<Result<std::string>>& elements) {
   return text + "]";
 }
 
+template <class Element, class TreeOf>
+Result<std::string> listed(std::string_view name, const std::vector<Element>& elements,
+                           const TreeOf& treeOf) {
+  std::vector<Result<std::string>> texts;
+  texts.reserve(elements.size());
+  for (const Element& element : elements) texts.push_back(writeJSON(treeOf(element)));
+  const Result<std::string> content = list(texts);
+  if (!content) return content.error();
+  return document(name, *content);
+}
+
 }  // namespace
 
 std::string printable(std::string_view text) {
@@ -170,6 +181,32 @@ std::string Report::text(const std::vector<DeviceInfo>& infos) const {
   return text;
 }
 
+std::string Report::text(const std::vector<FollowUp>& followUps) const {
+  std::string text;
+  for (const FollowUp& followUp : followUps) {
+    Lines lines{{"Follow-up", followUp.title.value_or("untitled")},
+                {"Serial number", followUp.serialNumber ? serial(*followUp.serialNumber) : "unknown"}};
+    if (followUp.text) lines.emplace_back("Text", *followUp.text);
+    lines.emplace_back("Shown by", followUp.targetBundleIdentifier.value_or("nobody"));
+    lines.emplace_back("Badge", followUp.hasBadge ? "yes" : "no");
+    if (followUp.expirationDate) lines.emplace_back("Shown until", shown(followUp.expirationDate));
+    text += (text.empty() ? "" : "\n") + aligned(lines);
+  }
+  return text;
+}
+
+std::string Report::text(const std::vector<Activity>& activities) const {
+  std::string text;
+  for (const Activity& activity : activities) {
+    Lines lines{{"Activity", activity.identifier}};
+    if (activity.targetDate) lines.emplace_back("Not before", shown(activity.targetDate));
+    if (activity.dueDate) lines.emplace_back("Due", shown(activity.dueDate));
+    lines.emplace_back("Network", activity.requiresNetwork ? "needed" : "not needed");
+    text += (text.empty() ? "" : "\n") + aligned(lines);
+  }
+  return text;
+}
+
 Value Report::treeOf(const Device& device) const {
   Value::Dictionary tree{{"deviceType", device.deviceType}, {"type", nameOfType(device.deviceType)}};
   if (device.name) tree.emplace("name", *device.name);
@@ -184,13 +221,34 @@ Result<std::string> Report::json(const Device& device) const {
   return document("device", *content);
 }
 
+Value Report::treeOf(const FollowUp& followUp) const {
+  Value::Dictionary tree{{"hasBadge", followUp.hasBadge}};
+  if (followUp.serialNumber) tree.emplace("serialNumber", serial(*followUp.serialNumber));
+  if (followUp.title) tree.emplace("title", *followUp.title);
+  if (followUp.text) tree.emplace("text", *followUp.text);
+  if (followUp.targetBundleIdentifier)
+    tree.emplace("targetBundleIdentifier", *followUp.targetBundleIdentifier);
+  if (followUp.expirationDate) tree.emplace("expirationDate", *followUp.expirationDate);
+  return plain(tree);
+}
+
+Value Report::treeOf(const Activity& activity) {
+  Value::Dictionary tree{{"identifier", activity.identifier}, {"requiresNetwork", activity.requiresNetwork}};
+  if (activity.targetDate) tree.emplace("targetDate", *activity.targetDate);
+  if (activity.dueDate) tree.emplace("dueDate", *activity.dueDate);
+  return plain(tree);
+}
+
 Result<std::string> Report::json(const std::vector<Device>& devices) const {
-  std::vector<Result<std::string>> elements;
-  elements.reserve(devices.size());
-  for (const Device& device : devices) elements.push_back(writeJSON(treeOf(device)));
-  const Result<std::string> content = list(elements);
-  if (!content) return content.error();
-  return document("devices", *content);
+  return listed("devices", devices, [this](const Device& device) { return treeOf(device); });
+}
+
+Result<std::string> Report::json(const std::vector<FollowUp>& followUps) const {
+  return listed("followUps", followUps, [this](const FollowUp& followUp) { return treeOf(followUp); });
+}
+
+Result<std::string> Report::json(const std::vector<Activity>& activities) const {
+  return listed("activities", activities, [](const Activity& activity) { return treeOf(activity); });
 }
 
 Result<std::string> Report::json(const std::vector<DeviceInfo>& infos) const {

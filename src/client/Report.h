@@ -1,5 +1,6 @@
 #pragma once
 
+#include "client/LocalState.h"
 #include "client/Records.h"
 #include "platform/Error.h"
 
@@ -12,8 +13,7 @@ namespace kvr::client {
 /// What a person, or a program, is shown of the agent's answers.
 ///
 /// The text comes from servers and paired devices, so whatever could command a terminal is written as an
-/// escape,
-/// `\u001b`, in both forms. Serial numbers are shortened to their end unless asked for whole.
+/// escape, `\u001b`, in both forms. Serial numbers are shortened to their end unless asked for whole.
 class Report {
  public:
   enum class Serials { Shortened, Whole };
@@ -23,12 +23,16 @@ class Report {
   // For people: lines of a name and a value, records set apart by an empty line.
   std::string text(const std::vector<Device>& devices) const;
   std::string text(const std::vector<DeviceInfo>& infos) const;
+  std::string text(const std::vector<FollowUp>& followUps) const;
+  std::string text(const std::vector<Activity>& activities) const;
 
   // For programs: one JSON document on one line, with its format's version under "version". Dates are ISO
   // 8601 in UTC, data is base64; a number that is not finite and a date outside the calendar are null.
   Result<std::string> json(const Device& device) const;
   Result<std::string> json(const std::vector<Device>& devices) const;
   Result<std::string> json(const std::vector<DeviceInfo>& infos) const;
+  Result<std::string> json(const std::vector<FollowUp>& followUps) const;
+  Result<std::string> json(const std::vector<Activity>& activities) const;
 
  private:
   using Lines = std::vector<std::pair<std::string, std::string>>;
@@ -36,6 +40,8 @@ class Report {
   std::string serial(const std::string& whole) const;
   Lines linesOf(const Device& device) const;
   Value treeOf(const Device& device) const;
+  Value treeOf(const FollowUp& followUp) const;
+  static Value treeOf(const Activity& activity);
 
   const Serials serials_;
 };

@@ -75,8 +75,10 @@ class KVRFollowUp {
   bool isDue(const KVRDeviceInfo& deviceInfo);
   KVRDeviceInfoList updateItems(std::vector<FollowUpItem>& pending, const KVRDeviceInfoList& deviceInfos);
 
-  using Turn = std::recursive_mutex;
-  std::unique_lock<Turn> takeTurn() const { return std::unique_lock(*turn_); }
+  struct Turn {
+    std::recursive_mutex mutex;
+  };
+  std::unique_lock<std::recursive_mutex> takeTurn() const { return std::unique_lock(turn_->mutex); }
 
   Platform& platform_;
   const std::shared_ptr<Turn> turn_;

@@ -48,7 +48,7 @@ class Activity {
   virtual void setPreregistered(bool preregistered) = 0;
   /// Set before `schedule`, for an activity that is not preregistered.
   virtual void setCriteria(const ActivityCriteria& criteria) = 0;
-  /// Installs the run block, in the place of an earlier one of this identifier. Not preregistered: registers
+  /// Installs the run block. Preregistered: for what the platform knows without a block. Not preregistered: registers
   /// the activity anew with its criteria, counted from now; an earlier registration of the identifier, one
   /// whose run is under way included, is replaced, and the end of that run leaves the new registration alone.
   /// The platform holds the block until the activity has finished or is registered anew.

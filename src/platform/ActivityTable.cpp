@@ -98,7 +98,9 @@ ActivityBlock ActivityTable::add(const std::string& identifier, const ActivityCr
 }
 
 ActivityBlock ActivityTable::checkIn(const std::string& identifier, ActivityBlock block) {
-  return std::exchange(entries_[identifier].block, std::move(block));
+  Entry& entry = entries_[identifier];
+  if (entry.registration && entry.block) return block;
+  return std::exchange(entry.block, std::move(block));
 }
 
 bool ActivityTable::isRegisteredFor(const std::string& identifier, Date date) const {

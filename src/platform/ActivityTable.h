@@ -65,7 +65,8 @@ class ActivityTable {
   /// replaced. A run that is under way goes on and no longer concerns the registration.
   ActivityBlock add(const std::string& identifier, const ActivityCriteria& criteria, ActivityBlock block,
                     const Now& now, double draw);
-  /// Brings a block for whatever the identifier is or will be due for. Returns the block that was replaced.
+  /// Brings a block for whatever the identifier is or will be due for; a registration that was made with a block
+  /// keeps its own. Returns the block that is not needed.
   ActivityBlock checkIn(const std::string& identifier, ActivityBlock block);
   /// Whether the activity is registered to run from `date` on (or earlier), and within its grace period.
   bool isRegisteredFor(const std::string& identifier, Date date) const;

@@ -12,6 +12,8 @@
 #include "warranty/KVRServerVersionUtilities.h"
 #include "warranty/WarrantyKeys.h"
 
+#include <mutex>
+
 namespace kvr {
 namespace {
 
@@ -38,6 +40,11 @@ std::optional<std::string> contentOf(Platform& platform, const std::string& path
   if (!contents || !*contents || (*contents)->bytes.empty()) return std::nullopt;
   return (*contents)->bytes;
 }
+
+/// Held while the conversion outreach is scheduled.
+struct ConversionOutreachTurn {
+  std::mutex mutex;
+};
 
 }  // namespace
 
@@ -205,6 +212,10 @@ void KVRWarrantyDownloader::_scheduleConversionOutreachIfRequiredForWarranty(
     if (!cachedDate || !date || *cachedDate == *date) return;
   }
   if (!date) return;
+  // Downloads of several devices come here at once; of two dates, the earlier one has to stay.
+  const auto turn =
+      platform_.sharedObjects.get<ConversionOutreachTurn>([] { return new ConversionOutreachTurn; });
+  const std::lock_guard lock(turn->mutex);
   const auto scheduled = platform_.preferences.dateForKey(preference::kConversionOutreachScheduledDate);
   if (scheduled && *date >= *scheduled) return;
   if (scheduled) {
@@ -212,23 +223,10 @@ void KVRWarrantyDownloader::_scheduleConversionOutreachIfRequiredForWarranty(
   } else {
     platform_.log.standard("scheduling conversion outreach %@", *date);
   }
-  scheduleConversionOutreachFor(*date);
-}
-
-void KVRWarrantyDownloader::scheduleConversionOutreachFor(Date date) {
-  const auto scheduler = KVRScheduler::newSchedulerWithActivityDelegate(
-      platform_, std::make_shared<KVRConversionOutreachActivity>(platform_));
-  scheduler->scheduleActivityForDate(date);
-  // Another device's download may be here at the same time: the earliest date stays, and whoever finds that a
-  // later one was scheduled over it sets that right.
-  platform_.preferences.update(preference::kConversionOutreachScheduledDate,
-                               [&](const Value& stored) -> Value {
-                                 const auto other = stored.dateIfAny();
-                                 if (other && *other < date) date = *other;
-                                 return date;
-                               });
-  const auto target = scheduler->scheduledActivityDate();
-  if (target && *target > date) scheduler->scheduleActivityForDate(date);
+  KVRScheduler::newSchedulerWithActivityDelegate(platform_,
+                                                 std::make_shared<KVRConversionOutreachActivity>(platform_))
+      ->scheduleActivityForDate(date);
+  platform_.preferences.setObject(*date, preference::kConversionOutreachScheduledDate);
 }
 
 }  // namespace kvr

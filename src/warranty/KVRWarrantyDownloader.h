@@ -49,7 +49,6 @@ class KVRWarrantyDownloader : public std::enable_shared_from_this<KVRWarrantyDow
                       const AttemptCompletion& completion);
   void finish(const Value& answer, const std::optional<std::string>& serialNumber,
               const DownloadCompletion& completion);
-  void scheduleConversionOutreachFor(Date date);
   void store(const KVRWarranty& warranty, const std::optional<std::string>& serialNumber);
 
   Platform& platform_;

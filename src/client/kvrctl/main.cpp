@@ -1,6 +1,7 @@
 // kvrctl: asks the agent about this device, its paired devices and their warranties.
 
 #include "client/AgentClient.h"
+#include "client/LocalState.h"
 #include "client/Report.h"
 
 #include <CLI/CLI.hpp>
@@ -58,17 +59,26 @@ int print(const Result<std::string>& text, int status) {
   return text ? print(*text, status) : fail(text.error());
 }
 
-int showDevice(const AgentClient& agent, const Options& options, const Report& report) {
-  const Result<Device> device = agent.defaultDevice();
-  if (!device) return fail(device.error());
-  return options.json ? print(report.json(*device), kFine) : print(report.text(std::vector{*device}), kFine);
+/// Writes an answer's text, or its JSON; `none` in the place of a text without anything.
+template <class Answer>
+int show(const Result<Answer>& answer, const Options& options, const std::string& none) {
+  if (!answer) return fail(answer.error());
+  const Report report(options.showSerial ? Report::Serials::Whole : Report::Serials::Shortened);
+  if (options.json) return print(report.json(*answer), kFine);
+  const std::string text = report.text(*answer);
+  return print(text.empty() ? none + "\n" : text, kFine);
 }
 
-int showPaired(const AgentClient& agent, const Options& options, const Report& report) {
-  const Result<std::vector<Device>> devices = agent.pairedDevices();
-  if (!devices) return fail(devices.error());
-  if (options.json) return print(report.json(*devices), kFine);
-  return print(devices->empty() ? "No paired devices\n" : report.text(*devices), kFine);
+int showDevice(const AgentClient& agent, const Options& options) {
+  const Result<Device> device = agent.defaultDevice();
+  if (!device) return fail(device.error());
+  if (!options.json) return show(Result(std::vector{*device}), options, {});
+  return print(Report(options.showSerial ? Report::Serials::Whole : Report::Serials::Shortened).json(*device),
+               kFine);
+}
+
+int showPaired(const AgentClient& agent, const Options& options) {
+  return show(agent.pairedDevices(), options, "No paired devices");
 }
 
 Result<std::vector<DeviceInfo>> infosFor(const AgentClient& agent, const Options& options) {
@@ -80,16 +90,26 @@ Result<std::vector<DeviceInfo>> infosFor(const AgentClient& agent, const Options
   return std::vector{*std::move(info)};
 }
 
-int showInfo(const AgentClient& agent, const Options& options, const Report& report) {
+int showInfo(const AgentClient& agent, const Options& options) {
   const Result<std::vector<DeviceInfo>> infos = infosFor(agent, options);
-  if (!infos) return fail(infos.error());
+  const int shown = show(infos, options, {});
+  if (shown != kFine) return shown;
   const bool isKnown = std::any_of(infos->begin(), infos->end(),
                                    [](const DeviceInfo& info) { return !info.warranty.isNull(); });
-  const int status = isKnown ? kFine : kNothingKnown;
-  return options.json ? print(report.json(*infos), status) : print(report.text(*infos), status);
+  return isKnown ? kFine : kNothingKnown;
 }
 
-using Command = int (*)(const AgentClient&, const Options&, const Report&);
+int dismiss(const AgentClient& agent, const Options& options) {
+  const Result<bool> answer = agent.dismissFollowUp(options.serialNumber);
+  return answer ? kFine : fail(answer.error());
+}
+
+using AgentCommand = int (*)(const AgentClient&, const Options&);
+
+int withAgent(AgentCommand command, const Options& options) {
+  const Result<AgentClient> agent = AgentClient::connect();
+  return agent ? command(*agent, options) : fail(agent.error());
+}
 
 CLI::App* addCommand(CLI::App& app, const char* name, const char* description, Options& options) {
   CLI::App* const command = app.add_subcommand(name, description);
@@ -108,6 +128,11 @@ int run(int argumentCount, char** arguments) {
       "1 anything else.");
   CLI::App* const device = addCommand(app, "device", "This device", options);
   const CLI::App* const paired = addCommand(app, "paired", "The paired devices", options);
+  const CLI::App* const followUps = addCommand(app, "follow-ups", "The offers that are shown", options);
+  const CLI::App* const activities =
+      addCommand(app, "activities", "The background activities to come", options);
+  CLI::App* const dismissal = app.add_subcommand("dismiss", "Takes a device's offer away");
+  dismissal->add_option("SERIAL", options.serialNumber, "The device's serial number")->required();
   CLI::App* const info = addCommand(app, "info", "A device and its warranty", options);
   CLI::Option* const serial =
       info->add_option("SERIAL", options.serialNumber, "Another device's serial number")
@@ -125,11 +150,10 @@ int run(int argumentCount, char** arguments) {
   }
   if (policy == "cache") options.policy = Policy::CacheOnly;
   if (policy == "refresh") options.policy = Policy::Refresh;
-  const Command command = device->parsed() ? showDevice : paired->parsed() ? showPaired : showInfo;
-  const Result<AgentClient> agent = AgentClient::connect();
-  if (!agent) return fail(agent.error());
-  return command(*agent, options,
-                 Report(options.showSerial ? Report::Serials::Whole : Report::Serials::Shortened));
+  if (followUps->parsed()) return show(LocalState().followUps(), options, "No follow-ups");
+  if (activities->parsed()) return show(LocalState().activities(), options, "No activities");
+  if (dismissal->parsed()) return withAgent(dismiss, options);
+  return withAgent(device->parsed() ? showDevice : paired->parsed() ? showPaired : showInfo, options);
 }
 
 }  // namespace

@@ -1,0 +1,99 @@
+#include "client/LocalState.h"
+
+#include "client/AgentClient.h"
+#include "platform/PropertyList.h"
+
+#include <pwd.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdlib>
+#include <fstream>
+#include <iterator>
+#include <map>
+#include <system_error>
+
+namespace kvr::client {
+namespace {
+
+constexpr const char* kFollowUps = "Library/FollowUps/com.tarsil.Kavrel.plist";
+constexpr const char* kActivities = "Library/Activities/com.tarsil.kvragent.plist";
+constexpr const char* kPreferences = "Library/Preferences/com.tarsil.kvragent.plist";
+constexpr std::string_view kTargetDate = ".TargetDate";
+constexpr std::int64_t kBadge = 1;  // of the display style
+
+}  // namespace
+
+FollowUp FollowUp::from(const Value& entry) {
+  return {entry["userInfo"]["FollowupSerialNumber"].stringIfAny(),
+          entry["title"].stringIfAny(),
+          entry["informativeFooterText"].stringIfAny(),
+          entry["targetBundleIdentifier"].stringIfAny(),
+          (entry["displayStyle"].asInteger() & kBadge) != 0,
+          entry["expirationDate"].dateIfAny()};
+}
+
+LocalState::LocalState(std::string homeDirectory) : homeDirectory_(std::move(homeDirectory)) {}
+
+std::string LocalState::homeDirectoryOfUser() {
+  if (const char* home = std::getenv("HOME"); home != nullptr && *home != '\0') return home;
+  const passwd* const user = ::getpwuid(::getuid());
+  return user != nullptr && user->pw_dir != nullptr ? user->pw_dir : "/";
+}
+
+Result<Value> LocalState::dictionaryIn(const std::string& path) const {
+  const std::string whole = homeDirectory_ + "/" + path;
+  std::ifstream file(whole, std::ios::binary);
+  if (!file) {
+    const int reason = errno;
+    if (reason == ENOENT || reason == ENOTDIR) return Value();
+    return Error{std::string(kErrorDomain), OtherFailure,
+                 whole + " cannot be read: " + std::generic_category().message(reason)};
+  }
+  const std::string bytes{std::istreambuf_iterator<char>(file), {}};
+  auto tree = readPropertyList(bytes);
+  if (tree && tree->isDictionary()) return tree;
+  return Error{std::string(kErrorDomain), OtherFailure,
+               whole + " is damaged: " + (tree ? "it holds no dictionary" : tree.error().message)};
+}
+
+Result<std::vector<FollowUp>> LocalState::followUps() const {
+  const auto tree = dictionaryIn(kFollowUps);
+  if (!tree) return tree.error();
+  std::vector<FollowUp> followUps;
+  if (!(*tree)["items"].isArray()) return followUps;
+  for (const auto& entry : (*tree)["items"].array()) followUps.push_back(FollowUp::from(entry));
+  return followUps;
+}
+
+Result<std::vector<Activity>> LocalState::activities() const {
+  const auto registered = dictionaryIn(kActivities);
+  const auto preferences = dictionaryIn(kPreferences);
+  if (!registered || !preferences) return registered ? preferences.error() : registered.error();
+  std::map<std::string, Activity> activities;
+  if (const Value& all = (*registered)["activities"]; all.isDictionary()) {
+    for (const auto& [identifier, entry] : all.dictionary()) {
+      activities[identifier].dueDate = entry["dueDate"].dateIfAny();
+      activities[identifier].requiresNetwork = entry["requiresNetwork"].asBool();
+    }
+  }
+  if (preferences->isDictionary()) {
+    for (const auto& [key, value] : preferences->dictionary()) {
+      if (!key.ends_with(kTargetDate)) continue;
+      activities[key.substr(0, key.size() - kTargetDate.size())].targetDate = value.dateIfAny();
+    }
+  }
+  std::vector<Activity> sorted;
+  for (auto& [identifier, activity] : activities) {
+    activity.identifier = identifier;
+    sorted.push_back(std::move(activity));
+  }
+  const auto dateOf = [](const Activity& activity) {
+    return std::max(activity.targetDate.value_or(Date{}), activity.dueDate.value_or(Date{}));
+  };
+  std::ranges::stable_sort(sorted, {}, dateOf);
+  return sorted;
+}
+
+}  // namespace kvr::client
