@@ -7,12 +7,19 @@
 #include "devices/KVRDevicesManager.h"
 #include "scheduling/KVROutreachActivity.h"
 #include "scheduling/KVRScheduler.h"
+#include "support/KVRTarsilSupportManager.h"
 #include "warranty/KVRAgentDefaultWarrantyProvider.h"
 #include "warranty/KVRServerVersionUtilities.h"
 
 #include <mutex>
 
 namespace kvr {
+namespace {
+
+/// The migration level of the present data layout; 1, and 0 for none stored, are that of a single device.
+constexpr std::int32_t kCurrentLayout = 2;
+
+}  // namespace
 
 std::shared_ptr<KVRAgent> KVRAgent::initWithCallingProcessBundleID(Platform& platform,
                                                                    std::optional<std::string> bundleID) {
@@ -74,14 +81,26 @@ void KVRAgent::tarsilAccountAdded(BoolReply withReply) {
 
 void KVRAgent::checkIsAvailableInStore(const std::string& bundleIdentifier, DictionaryReply withReply) {
   platform_.log.standard("Checking for %@ in the Quillmart", bundleIdentifier);
-  // A new KVRTarsilSupportManager answers here, once it is connected; until then nothing is known.
-  withReply({});
+  KVRTarsilSupportManager(platform_).checkIsAvailableInStore(bundleIdentifier, withReply);
 }
 
 void KVRAgent::appSupportAvailability(const std::string& bundleIdentifier, DictionaryReply withReply) {
   platform_.log.standard("Availability for %@", bundleIdentifier);
-  // A new KVRTarsilSupportManager answers here, once it is connected; until then nothing is known.
-  withReply({});
+  KVRTarsilSupportManager(platform_).appSupportAvailability(bundleIdentifier, withReply);
+}
+
+void KVRAgent::performMigrationIfNeeded() {
+  const auto provider = warrantyProvider();
+  if (provider->migrationVersion() >= kCurrentLayout) return;
+  const auto device = deviceProvider()->defaultDevice();
+  const auto serialNumber = device->serialNumber();
+  KVRWarrantyRef warranty;
+  if (serialNumber && faultOfSerialNumber(*serialNumber) == nullptr) {
+    warranty = provider->migrateLegacyCachedWarrantyIfNeededForSerialNumber(*serialNumber);
+  }
+  provider->migrateLegacyFollowUpIfNeededWithDeviceInfo(
+      KVRDeviceInfo::deviceInfoWithDevice(device, warranty));
+  provider->setMigrationVersion(kCurrentLayout);
 }
 
 void KVRAgent::readWebURLOverride(std::optional<StringReply> reply) {

@@ -45,6 +45,10 @@ class KVRAgent : public KVRAgentProtocol, public std::enable_shared_from_this<KV
                                     DeviceInfosReply withReply) override;
   void dismissFollowUpForSerialNumber(const std::string& serialNumber, BoolReply completion) override;
 
+  /// Brings a device from the single-device layout of earlier versions to the present one, once. Synchronous;
+  /// to be called before anything else reads the cache.
+  void performMigrationIfNeeded();
+
   /// The lookup policy for one device. Replies before it returns when nothing is downloaded, else on the
   /// thread on which the download finishes. A serial number that no device can have is refused with an error
   /// line and answered with nothing.

@@ -21,15 +21,18 @@ StartUp::StartUp(Platform& platform) : delegate_(platform) {
   monitor(platform, std::make_shared<KVRFollowUpRefresh>(platform));
   resumeFollowUpPost(platform);
   agent_ = KVRAgent::initWithCallingProcessBundleID(platform, kPreferencesBundleID);
-  // Migration runs here, synchronously; then the locale monitor and the paired-devices monitor start with
-  // this agent.
+  agent_->performMigrationIfNeeded();
+  localeMonitor_ = KVRLocaleMonitor::initWithAgent(platform, agent_);
+  localeMonitor_->start();
+  pairedDevicesMonitor_ = KVRPairedDevicesMonitor::initWithAgent(platform, agent_);
+  pairedDevicesMonitor_->start();
   listener_ = platform.services.newListener(kServiceName);
   listener_->setDelegate(delegate_);
   listener_->resume(agentServiceInterface());
 }
 
-/// The follow-up post activity is no long-lived one: it exists only while it is scheduled. What an earlier start
-/// scheduled has to come to its run in this one, or its follow-ups would be lost.
+/// The follow-up post activity is no long-lived one: it exists only while it is scheduled. What an earlier
+/// start scheduled has to come to its run in this one, or its follow-ups would be lost.
 void StartUp::resumeFollowUpPost(Platform& platform) {
   const auto scheduler =
       KVRScheduler::newSchedulerWithActivityDelegate(platform, std::make_shared<KVRFollowUpPost>(platform));

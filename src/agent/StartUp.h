@@ -2,6 +2,8 @@
 
 #include "agent/KVRAgent.h"
 #include "agent/ServiceDelegate.h"
+#include "devices/KVRLocaleMonitor.h"
+#include "devices/KVRPairedDevicesMonitor.h"
 #include "platform/Platform.h"
 #include "scheduling/KVRScheduler.h"
 
@@ -23,6 +25,8 @@ class StartUp {
 
   std::vector<std::shared_ptr<KVRScheduler>> schedulers_;
   std::shared_ptr<KVRAgent> agent_;
+  std::shared_ptr<KVRLocaleMonitor> localeMonitor_;
+  std::shared_ptr<KVRPairedDevicesMonitor> pairedDevicesMonitor_;
   ServiceDelegate delegate_;
   std::unique_ptr<ServiceListener> listener_;
 };

@@ -23,6 +23,10 @@ std::string describe(const PairedDeviceEntry& entry);
 
 class PairedDeviceRegistry {
  public:
+  /// Notifications that a watch was paired, or unpaired.
+  static constexpr const char* kDeviceDidPair = "com.tarsil.pairedregistry.device-did-pair";
+  static constexpr const char* kDeviceDidUnpair = "com.tarsil.pairedregistry.device-did-unpair";
+
   using Predicate = std::function<bool(const PairedDeviceEntry&)>;
 
   virtual ~PairedDeviceRegistry() = default;

@@ -2,7 +2,9 @@
 
 #include "platform/AccountStore.h"
 #include "platform/ActivityScheduler.h"
+#include "platform/ApplicationRegistry.h"
 #include "platform/CarrierInfo.h"
+#include "platform/CleanExit.h"
 #include "platform/Clock.h"
 #include "platform/DeviceAttestation.h"
 #include "platform/DeviceProperties.h"
@@ -10,6 +12,7 @@
 #include "platform/FollowUpCenter.h"
 #include "platform/HTTP.h"
 #include "platform/Log.h"
+#include "platform/Notifications.h"
 #include "platform/PairedDeviceRegistry.h"
 #include "platform/Preferences.h"
 #include "platform/Processes.h"
@@ -17,6 +20,8 @@
 #include "platform/Random.h"
 #include "platform/ServiceListener.h"
 #include "platform/SharedObjects.h"
+#include "platform/StoreLookup.h"
+#include "platform/StringTables.h"
 #include "platform/UserLocale.h"
 #include "platform/WorkQueues.h"
 
@@ -49,6 +54,11 @@ struct Platform {
   ActivityScheduler& activities;
   FollowUpCenter& followUps;
   CarrierInfo& carriers;
+  Notifications& notifications;
+  CleanExit& cleanExit;
+  ApplicationRegistry& applications;
+  StoreLookup& store;
+  StringTables& stringTables;
   std::string mainBundleIdentifier;
   SharedObjects sharedObjects{};
 };

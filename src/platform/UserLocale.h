@@ -10,6 +10,9 @@ namespace kvr {
 /// The user's language, number format and time zone, read afresh at every question. Any thread.
 class UserLocale {
  public:
+  /// Notification that the preferred locale has changed.
+  static constexpr const char* kLanguageChanged = "com.tarsil.language.changed";
+
   virtual ~UserLocale() = default;
   /// The preferred locale's identifier, such as "en_US".
   virtual std::string preferredIdentifier() const = 0;

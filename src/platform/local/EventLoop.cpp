@@ -89,6 +89,11 @@ void EventLoop::cancel(const TimerKey& key) {
   cancelled = timers_.extract(key);
 }
 
+std::size_t EventLoop::delayed() const {
+  const std::lock_guard lock(mutex_);
+  return timers_.size();
+}
+
 std::size_t EventLoop::pending() const {
   const std::lock_guard lock(mutex_);
   return posted_.size();

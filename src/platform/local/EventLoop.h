@@ -42,6 +42,8 @@ class EventLoop {
   TimerKey after(double delay, Work work);
   /// Releases delayed work that has not begun; no effect on other. Any thread.
   void cancel(const TimerKey& key);
+  /// How much delayed work has not begun. Any thread.
+  std::size_t delayed() const;
   /// How much posted work has not begun. Any thread.
   std::size_t pending() const;
   /// Runs until `exit`; returns its status. What was posted or delayed and has not run is released then, and

@@ -19,7 +19,8 @@ constexpr std::uint32_t kOwnEnd = IN_DELETE_SELF | IN_MOVE_SELF;
 }  // namespace
 
 FileWatch::FileWatch(EventLoop& loop, std::filesystem::path path, std::function<void()> changed)
-    : path_(std::move(path)),
+    : loop_(loop),
+      path_(std::move(path)),
       name_(path_.filename().string()),
       changed_(std::move(changed)),
       inotify_(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC)) {
@@ -67,7 +68,7 @@ void FileWatch::readEvents() {
     }
   }
   if (isWatchLost) watch();
-  if (concerns || isWatchLost) changed_();
+  if (concerns || isWatchLost) loop_.post(changed_);
 }
 
 }  // namespace kvr

@@ -11,13 +11,13 @@ namespace kvr {
 
 /// Notices that a file may have changed, come or gone.
 ///
-/// The file's directory is watched, not asked again and again; one that does not exist yet is waited for in the
-/// nearest one that does. A file that is written in place counts once it is closed. Built and destroyed on the
-/// loop's thread.
+/// The file's directory is watched, not asked again and again; one that does not exist yet is waited for in
+/// the nearest one that does. A file that is written in place counts once it is closed. Built and destroyed
+/// on the loop's thread.
 class FileWatch {
  public:
-  /// `changed` is called on the loop's thread; it may be called without a change, and must not throw. Throws
-  /// std::system_error when the kernel refuses.
+  /// `changed` is posted to the loop; it may be called without a change. Throws std::system_error when the
+  /// kernel refuses.
   FileWatch(EventLoop& loop, std::filesystem::path path, std::function<void()> changed);
   ~FileWatch();
   FileWatch(const FileWatch&) = delete;
@@ -27,6 +27,7 @@ class FileWatch {
   void watch();
   void readEvents();
 
+  EventLoop& loop_;
   const std::filesystem::path path_;
   const std::string name_;
   const std::function<void()> changed_;

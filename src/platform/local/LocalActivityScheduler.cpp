@@ -44,7 +44,8 @@ LocalActivityScheduler::LocalActivityScheduler(EventLoop& loop, const DeviceRoot
                             std::move(occasions)),
       host_(std::move(host)),
       timer_(wallClockTimer()),
-      network_(loop, root, [this](bool reachable) { networkChanged(reachable); }, host_.networkState) {
+      network_(
+          loop, root, [this](bool reachable) { setNetworkReachable(reachable); }, host_.networkState) {
   const auto ended = [](sd_event_source*, int, std::uint32_t, void* self) {
     static_cast<LocalActivityScheduler*>(self)->timerEnded();
     return 0;
@@ -82,14 +83,6 @@ void LocalActivityScheduler::timerEnded() noexcept {
   [[maybe_unused]] const auto size = ::read(timer_.get(), &count, sizeof count);
   try {
     startDue();
-  } catch (const std::exception& error) {
-    log().error("activities are not started: %@", std::string(error.what()));
-  }
-}
-
-void LocalActivityScheduler::networkChanged(bool reachable) noexcept {
-  try {
-    setNetworkReachable(reachable);
   } catch (const std::exception& error) {
     log().error("activities are not started: %@", std::string(error.what()));
   }

@@ -35,7 +35,6 @@ class LocalActivityScheduler : public FileActivityScheduler {
 
  private:
   void timerEnded() noexcept;
-  void networkChanged(bool reachable) noexcept;
 
   const HostFiles host_;
   const Descriptor timer_;

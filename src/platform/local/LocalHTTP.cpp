@@ -4,6 +4,7 @@
 #include "platform/local/http/HTTPTransfers.h"
 
 #include <algorithm>
+#include <atomic>
 #include <mutex>
 #include <utility>
 
@@ -61,9 +62,12 @@ class LocalHTTP::Transport {
   Transport(WorkQueues& queues, Log& log) : queues_(queues), log_(log) {}
 
   void send(HTTPRequest request, HTTPSession::Reply reply) {
-    HTTPTransfers::Done done = [queue = queues_.concurrentQueue(Priority::Default),
+    // Counts for as long as the reply is there.
+    const std::shared_ptr<void> counted(nullptr, [open = openRequests_](void*) { --*open; });
+    ++*openRequests_;
+    HTTPTransfers::Done done = [queue = queues_.concurrentQueue(Priority::Default), counted,
                                 reply = std::move(reply)](HTTPResponse response) mutable {
-      queue->async([reply = std::move(reply), response = std::move(response)]() mutable {
+      queue->async([counted, reply = std::move(reply), response = std::move(response)]() mutable {
         reply(std::move(response));
       });
     };
@@ -72,6 +76,8 @@ class LocalHTTP::Transport {
     if (!transfers) return done({0, std::nullopt, transfers.error()});
     (*transfers)->start(std::move(request), std::move(done));
   }
+
+  std::size_t openRequests() const { return *openRequests_; }
 
   void beginEnding() {
     Transfers transfers;
@@ -111,6 +117,8 @@ class LocalHTTP::Transport {
 
   WorkQueues& queues_;
   Log& log_;
+  const std::shared_ptr<std::atomic<std::size_t>> openRequests_ =
+      std::make_shared<std::atomic<std::size_t>>(0);
   std::mutex mutex_;  ///< guards what follows
   Transfers transfers_;
   std::optional<Error> fault_;  ///< why there are no transfers, once that is known
@@ -146,6 +154,8 @@ HTTPSession& LocalHTTP::sharedSession() { return *sharedSession_; }
 std::shared_ptr<HTTPSession> LocalHTTP::newUncachedSession() {
   return std::make_shared<Session>(transport_, true);
 }
+
+std::size_t LocalHTTP::openRequests() const { return transport_->openRequests(); }
 
 void LocalHTTP::beginEnding() { transport_->beginEnding(); }
 

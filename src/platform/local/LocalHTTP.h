@@ -24,6 +24,8 @@ class LocalHTTP : public HTTP {
   HTTPSession& sharedSession() override;
   std::shared_ptr<HTTPSession> newUncachedSession() override;
 
+  /// Requests that have no answer yet, or one that is being handled. Any thread.
+  std::size_t openRequests() const;
   /// Every request under way, and every later one, fails at once. Any thread.
   void beginEnding();
 

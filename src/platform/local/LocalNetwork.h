@@ -8,15 +8,15 @@
 
 namespace kvr {
 
-/// Whether the network can be reached: as "Network.plist" says, else as the host's network service does, else it
-/// can. Built and destroyed on the loop's thread.
+/// Whether the network can be reached: as "Network.plist" says, else as the host's network service does, else
+/// it can. Built and destroyed on the loop's thread.
 class LocalNetwork {
  public:
   /// Where systemd-networkd publishes the state of all links together.
   static constexpr const char* kHostState = "/run/systemd/netif/state";
 
-  /// `changed` is called on the loop's thread, with the answer, when it may have changed; it must not throw.
-  /// Throws std::system_error when the kernel refuses.
+  /// `changed` is called on the loop's thread, with the answer, when it may have changed. Throws
+  /// std::system_error when the kernel refuses.
   LocalNetwork(EventLoop& loop, const DeviceRoot& root, std::function<void(bool reachable)> changed,
                std::string hostState = kHostState);
 

@@ -6,11 +6,14 @@ LocalPlatform::LocalPlatform(EventLoop& mainLoop, std::function<void()> busLost)
     : queues(mainLoop, *log),
       services(queues, *log, entitlements, std::move(busLost)),
       activities(mainLoop, root, clock, queues, random, deviceProperties, *log, kMainBundleIdentifier,
-                 {"com.tarsil.kvragent.upgrade", "com.tarsil.kvragent.boot"}, {}) {}
+                 {"com.tarsil.kvragent.upgrade", "com.tarsil.kvragent.boot"}, {}),
+      changes(mainLoop, root, locale, pairedDevices, notifications),
+      cleanExit(mainLoop, queues, activities, http, services, *log, kMainBundleIdentifier) {}
 
 bool LocalPlatform::end(double limit) {
   log->beginEnding();
   activities.beginEnding();
+  notifications.beginEnding();
   services.beginEnding();
   http.beginEnding();
   queues.beginEnding();

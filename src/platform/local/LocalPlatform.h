@@ -8,7 +8,10 @@
 #include "platform/local/LocalAccountSession.h"
 #include "platform/local/LocalAccountStore.h"
 #include "platform/local/LocalActivityScheduler.h"
+#include "platform/local/LocalApplicationRegistry.h"
 #include "platform/local/LocalCarrierInfo.h"
+#include "platform/local/LocalChanges.h"
+#include "platform/local/LocalCleanExit.h"
 #include "platform/local/LocalClock.h"
 #include "platform/local/LocalDeviceAttestation.h"
 #include "platform/local/LocalDeviceProperties.h"
@@ -17,10 +20,13 @@
 #include "platform/local/LocalFiles.h"
 #include "platform/local/LocalHTTP.h"
 #include "platform/local/LocalLog.h"
+#include "platform/local/LocalNotifications.h"
 #include "platform/local/LocalPairedDeviceRegistry.h"
 #include "platform/local/LocalProcesses.h"
 #include "platform/local/LocalRandom.h"
 #include "platform/local/LocalServiceListeners.h"
+#include "platform/local/LocalStore.h"
+#include "platform/local/LocalStringTables.h"
 #include "platform/local/LocalUserLocale.h"
 #include "platform/local/LocalWorkQueues.h"
 
@@ -63,27 +69,25 @@ struct LocalPlatform {
   LocalActivityScheduler activities;
   FileFollowUpCenter followUps{propertyLists, clock};
   LocalCarrierInfo carriers{root};
-  Platform platform{*log,
-                    clock,
-                    queues,
-                    files,
-                    propertyLists,
-                    preferences,
-                    locale,
-                    random,
-                    http,
-                    deviceProperties,
-                    featureFlags,
-                    pairedDevices,
-                    accounts,
-                    accountSession,
-                    attestation,
-                    services,
-                    processes,
-                    activities,
-                    followUps,
-                    carriers,
-                    kMainBundleIdentifier};
+  LocalNotifications notifications{services.connection(), queues, *log};
+  LocalChanges changes;
+  LocalCleanExit cleanExit;
+  LocalApplicationRegistry applications{root};
+  LocalStore store{root, *log};
+  LocalStringTables stringTables{root, locale};
+  Platform platform{*log,          clock,
+                    queues,        files,
+                    propertyLists, preferences,
+                    locale,        random,
+                    http,          deviceProperties,
+                    featureFlags,  pairedDevices,
+                    accounts,      accountSession,
+                    attestation,   services,
+                    processes,     activities,
+                    followUps,     carriers,
+                    notifications, cleanExit,
+                    applications,  store,
+                    stringTables,  kMainBundleIdentifier};
 
   static constexpr const char* kMainBundleIdentifier = "com.tarsil.kvragent";
 };

@@ -3,6 +3,7 @@
 #include "platform/local/BusService.h"
 
 #include <chrono>
+#include <cstdlib>
 #include <future>
 #include <utility>
 
@@ -83,6 +84,30 @@ void LocalServiceListeners::lose(const Error& error) {
   log_.error("The agent cannot serve any more: %@", error);
   for (const auto& service : services_) service->close();
   busLost();
+}
+
+bool LocalServiceListeners::isActivatable(const std::string& name) {
+  const auto answer = std::make_shared<std::promise<bool>>();
+  std::future<bool> future = answer->get_future();
+  connection_.thread()->post([this, name, answer] {
+    sd_bus* const bus = connection_.bus();
+    sd_bus_message* made = nullptr;
+    char** names = nullptr;
+    bool found = false;
+    if (bus != nullptr &&
+        sd_bus_call_method(bus, "org.freedesktop.DBus", "/org/freedesktop/DBus", "org.freedesktop.DBus",
+                           "ListActivatableNames", nullptr, &made, "") >= 0 &&
+        sd_bus_message_read_strv(made, &names) >= 0) {
+      for (char** each = names; each != nullptr && *each != nullptr; ++each) {
+        found = found || name == *each;
+        std::free(*each);
+      }
+      std::free(static_cast<void*>(names));
+    }
+    const BusMessageRef reply(made);
+    answer->set_value(found);
+  });
+  return future.wait_for(kEndingLimit) == std::future_status::ready && future.get();
 }
 
 void LocalServiceListeners::beginEnding() {

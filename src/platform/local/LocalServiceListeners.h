@@ -36,6 +36,11 @@ class LocalServiceListeners : public ServiceListeners {
   /// came through them is on its way; later ones are answered with an error. Waits for the bus some seconds
   /// at most. Not on the bus thread.
   void beginEnding();
+  /// The connection that all of it shares, for others that live on the bus and end before this does.
+  BusConnection& connection() { return connection_; }
+  /// Whether the bus, or the service manager behind it, starts an agent when somebody calls this name. Waits
+  /// for the bus some seconds at most. Not on the bus thread.
+  bool isActivatable(const std::string& name);
   /// How many calls have come and are not answered yet. Any thread.
   std::size_t openCalls() const { return *openCalls_; }
 

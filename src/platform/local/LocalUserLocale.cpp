@@ -40,9 +40,14 @@ std::string identifierFromEnvironment() {
 
 }  // namespace
 
+std::optional<std::string> LocalUserLocale::statedByDevice() const {
+  auto stated = root_.dictionary("Locale.plist")["identifier"].stringIfAny();
+  return stated && isIdentifier(*stated) ? stated : std::nullopt;
+}
+
 std::string LocalUserLocale::preferredIdentifier() const {
-  const auto stated = root_.dictionary("Locale.plist")["identifier"].stringIfAny();
-  return stated && isIdentifier(*stated) ? *stated : identifierFromEnvironment();
+  const auto stated = statedByDevice();
+  return stated ? *stated : identifierFromEnvironment();
 }
 
 long LocalUserLocale::secondsFromGMT(Date date) const {

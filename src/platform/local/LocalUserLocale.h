@@ -4,6 +4,8 @@
 #include "platform/local/DeviceRoot.h"
 
 #include <mutex>
+#include <optional>
+#include <string>
 
 namespace kvr {
 
@@ -14,11 +16,15 @@ class LocalUserLocale : public UserLocale {
   LocalUserLocale(const DeviceRoot& root, Log& log) : root_(root), log_(log) {}
 
   std::string preferredIdentifier() const override;
+  /// Whether it is "Locale.plist" that names the locale.
+  bool isStatedByDevice() const { return statedByDevice().has_value(); }
   long secondsFromGMT(Date date) const override;
   /// Plain digits when the library that knows the locales cannot be had, which is one error line.
   std::string decimalString(std::uint64_t number) const override;
 
  private:
+  std::optional<std::string> statedByDevice() const;
+
   const DeviceRoot& root_;
   Log& log_;
   mutable std::once_flag loaded_;

@@ -6,6 +6,7 @@
 #include "platform/simulated/SimulatedAccountStore.h"
 #include "platform/simulated/SimulatedActivityScheduler.h"
 #include "platform/simulated/SimulatedCarrierInfo.h"
+#include "platform/simulated/SimulatedCleanExit.h"
 #include "platform/simulated/SimulatedClock.h"
 #include "platform/simulated/SimulatedDeviceAttestation.h"
 #include "platform/simulated/SimulatedDeviceProperties.h"
@@ -13,10 +14,12 @@
 #include "platform/simulated/SimulatedFiles.h"
 #include "platform/simulated/SimulatedHTTP.h"
 #include "platform/simulated/SimulatedLog.h"
+#include "platform/simulated/SimulatedNotifications.h"
 #include "platform/simulated/SimulatedPairedDeviceRegistry.h"
 #include "platform/simulated/SimulatedProcesses.h"
 #include "platform/simulated/SimulatedRandom.h"
 #include "platform/simulated/SimulatedServiceListeners.h"
+#include "platform/simulated/SimulatedStore.h"
 #include "platform/simulated/SimulatedUserLocale.h"
 #include "platform/simulated/SimulatedWorkQueues.h"
 
@@ -43,6 +46,7 @@ struct SimulatedPlatform {
   ~SimulatedPlatform() {
     log.beginEnding();
     activities.beginEnding();
+    notifications.end();
     queues.end();
   }
   SimulatedPlatform(const SimulatedPlatform&) = delete;
@@ -83,27 +87,24 @@ struct SimulatedPlatform {
                                         {"com.tarsil.kvragent.upgrade", "com.tarsil.kvragent.boot"}};
   FileFollowUpCenter followUps{propertyLists, clock};
   SimulatedCarrierInfo carriers;
-  Platform platform{log,
-                    clock,
-                    queues,
-                    files,
-                    propertyLists,
-                    preferences,
-                    locale,
-                    random,
-                    http,
-                    deviceProperties,
-                    featureFlags,
-                    pairedDevices,
-                    accounts,
-                    accountSession,
-                    attestation,
-                    services,
-                    processes,
-                    activities,
-                    followUps,
-                    carriers,
-                    kMainBundleIdentifier};
+  SimulatedNotifications notifications{queues};
+  SimulatedCleanExit cleanExit{clock};
+  SimulatedApplicationRegistry applications;
+  SimulatedStore store{queues};
+  SimulatedStringTables stringTables;
+  Platform platform{log,           clock,
+                    queues,        files,
+                    propertyLists, preferences,
+                    locale,        random,
+                    http,          deviceProperties,
+                    featureFlags,  pairedDevices,
+                    accounts,      accountSession,
+                    attestation,   services,
+                    processes,     activities,
+                    followUps,     carriers,
+                    notifications, cleanExit,
+                    applications,  store,
+                    stringTables,  kMainBundleIdentifier};
 };
 
 }  // namespace kvr

@@ -1,0 +1,44 @@
+#include "devices/KVRLocaleMonitor.h"
+
+#include "agent/LookupPolicy.h"
+#include "followup/KVRFollowUp.h"
+
+namespace kvr {
+namespace {
+
+constexpr double kCheckDelay = 5;  // seconds
+
+}  // namespace
+
+std::shared_ptr<KVRLocaleMonitor> KVRLocaleMonitor::initWithAgent(Platform& platform,
+                                                                  std::shared_ptr<KVRAgentProtocol> agent) {
+  return std::make_shared<KVRLocaleMonitor>(platform, std::move(agent));
+}
+
+KVRLocaleMonitor::KVRLocaleMonitor(Platform& platform, std::shared_ptr<KVRAgentProtocol> theAgent)
+    : agent(std::move(theAgent)), platform_(platform) {}
+
+KVRLocaleMonitor::~KVRLocaleMonitor() { platform_.notifications.cancel(_languageNotifyToken); }
+
+void KVRLocaleMonitor::start() {
+  _languageNotifyToken = platform_.notifications.registerFor(
+      UserLocale::kLanguageChanged, [&platform = platform_, monitor = weak_from_this()] {
+        platform.queues.after(kCheckDelay, platform.queues.mainQueue(), [monitor] {
+          if (const auto self = monitor.lock()) self->localeDidChange();
+        });
+      });
+}
+
+void KVRLocaleMonitor::localeDidChange() {
+  if (KVRFollowUp(platform_).pendingFollowUpCount() == 0) return platform_.cleanExit.requestWhenIdle();
+  platform_.log.standard(
+      "Locale changed and one or more followups are being displayed. Refresh warranty if needed.");
+  agent()->getAllDeviceInfosUsingPolicy(
+      LookupPolicy::kDefault, true,
+      DeviceInfosReply(platform_.log, "localeDidChange", [&platform = platform_](const KVRDeviceInfoList&) {
+        platform.log.standard("Device infos refreshed after locale change");
+        platform.cleanExit.requestWhenIdle();
+      }));
+}
+
+}  // namespace kvr

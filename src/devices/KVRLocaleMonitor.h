@@ -1,0 +1,36 @@
+#pragma once
+
+#include "agent/KVRAgentProtocol.h"
+#include "platform/AtomicProperty.h"
+#include "platform/Platform.h"
+
+#include <memory>
+
+namespace kvr {
+
+/// Keeps the texts of follow-ups in the user's language: 5 seconds after every change of it, the warranties
+/// are looked up anew while a follow-up is shown. Then, or when none is, the process may end once it is idle,
+/// so that its next start is in the new language altogether. Every notification counts for itself.
+class KVRLocaleMonitor : public std::enable_shared_from_this<KVRLocaleMonitor> {
+ public:
+  static std::shared_ptr<KVRLocaleMonitor> initWithAgent(Platform& platform,
+                                                         std::shared_ptr<KVRAgentProtocol> agent);
+  /// Use `initWithAgent`.
+  KVRLocaleMonitor(Platform& platform, std::shared_ptr<KVRAgentProtocol> agent);
+  ~KVRLocaleMonitor();
+  KVRLocaleMonitor(const KVRLocaleMonitor&) = delete;
+  KVRLocaleMonitor& operator=(const KVRLocaleMonitor&) = delete;
+
+  /// Once.
+  void start();
+  /// The check. On the main queue.
+  void localeDidChange();
+
+  AtomicProperty<std::shared_ptr<KVRAgentProtocol>> agent;
+
+ private:
+  Platform& platform_;
+  Notifications::Token _languageNotifyToken = 0;
+};
+
+}  // namespace kvr

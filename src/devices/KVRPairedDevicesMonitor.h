@@ -1,0 +1,43 @@
+#pragma once
+
+#include "agent/KVRAgentProtocol.h"
+#include "platform/AtomicProperty.h"
+#include "platform/Platform.h"
+
+#include <atomic>
+#include <memory>
+
+namespace kvr {
+
+/// Keeps the follow-ups in step with the watches that are paired: whenever one is paired or unpaired, all
+/// devices are looked up and their follow-ups refreshed, and the follow-up post activity is scheduled when
+/// one of them is waiting for its follow-up. Every notification counts for itself.
+///
+/// Its registrations keep it alive until they are let go.
+class KVRPairedDevicesMonitor : public std::enable_shared_from_this<KVRPairedDevicesMonitor> {
+ public:
+  static std::shared_ptr<KVRPairedDevicesMonitor> initWithAgent(Platform& platform,
+                                                                std::shared_ptr<KVRAgentProtocol> agent);
+  /// Use `initWithAgent`.
+  KVRPairedDevicesMonitor(Platform& platform, std::shared_ptr<KVRAgentProtocol> agent);
+  ~KVRPairedDevicesMonitor();
+  KVRPairedDevicesMonitor(const KVRPairedDevicesMonitor&) = delete;
+  KVRPairedDevicesMonitor& operator=(const KVRPairedDevicesMonitor&) = delete;
+
+  /// Once.
+  void start();
+  /// On the main queue.
+  void _pairedOrActiveDevicesDidChange();
+  void _updatePariedDevicesFollowUp();
+
+  std::atomic<Notifications::Token> pairNotifyToken{0};
+  std::atomic<Notifications::Token> unpairNotifyToken{0};
+  AtomicProperty<std::shared_ptr<KVRAgentProtocol>> agent;
+
+ private:
+  void schedulePost(const KVRDeviceInfoList& deviceInfos);
+
+  Platform& platform_;
+};
+
+}  // namespace kvr

@@ -1,0 +1,63 @@
+#include "platform/local/LocalChanges.h"
+
+#include <algorithm>
+#include <fstream>
+#include <iterator>
+#include <utility>
+
+namespace kvr {
+namespace {
+
+bool containsAll(const std::set<std::string>& whole, const std::set<std::string>& part) {
+  return std::ranges::includes(whole, part);
+}
+
+}  // namespace
+
+LocalChanges::LocalChanges(EventLoop& loop, const DeviceRoot& root, const LocalUserLocale& locale,
+                           const LocalPairedDeviceRegistry& pairedDevices, LocalNotifications& notifications,
+                           const std::vector<std::string>& hostLocale)
+    : locale_(locale),
+      pairedDevices_(pairedDevices),
+      notifications_(notifications),
+      hostLocale_(hostLocale),
+      language_(languageNow()),
+      watches_(watchesNow()) {
+  const auto watch = [&](const std::string& path, void (LocalChanges::*notice)()) {
+    fileWatches_.push_back(std::make_unique<FileWatch>(loop, path, [this, notice] { (this->*notice)(); }));
+  };
+  watch(root.pathOf("Locale.plist"), &LocalChanges::noticeLanguage);
+  for (const auto& path : hostLocale_) watch(path, &LocalChanges::noticeLanguage);
+  watch(root.pathOf("PairedDevices.plist"), &LocalChanges::noticeWatches);
+}
+
+std::string LocalChanges::languageNow() const {
+  std::string language = locale_.preferredIdentifier();
+  if (locale_.isStatedByDevice()) return language;
+  for (const auto& path : hostLocale_) {
+    std::ifstream file(path);
+    language.append("\n").append(std::istreambuf_iterator<char>(file), {});
+  }
+  return language;
+}
+
+std::set<std::string> LocalChanges::watchesNow() const {
+  const auto paired = pairedDevices_.allDevicesPassing([](const PairedDeviceEntry& entry) {
+    return entry.isPaired.value_or(false) && !entry.isArchived.value_or(false);
+  });
+  std::set<std::string> watches;
+  for (const auto& entry : paired) watches.insert(entry.serialNumber.value_or(entry.name.value_or("")));
+  return watches;
+}
+
+void LocalChanges::noticeLanguage() {
+  if (std::exchange(language_, languageNow()) != language_) notifications_.post(UserLocale::kLanguageChanged);
+}
+
+void LocalChanges::noticeWatches() {
+  const auto before = std::exchange(watches_, watchesNow());
+  if (!containsAll(before, watches_)) notifications_.post(PairedDeviceRegistry::kDeviceDidPair);
+  if (!containsAll(watches_, before)) notifications_.post(PairedDeviceRegistry::kDeviceDidUnpair);
+}
+
+}  // namespace kvr

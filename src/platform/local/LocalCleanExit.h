@@ -1,0 +1,53 @@
+#pragma once
+
+#include "platform/CleanExit.h"
+#include "platform/Log.h"
+#include "platform/local/EventLoop.h"
+#include "platform/local/LocalActivityScheduler.h"
+#include "platform/local/LocalHTTP.h"
+#include "platform/local/LocalServiceListeners.h"
+#include "platform/local/LocalWorkQueues.h"
+
+#include <string>
+
+namespace kvr {
+
+/// Ends the main loop, with status 0, once nothing is under way: no call, request, activity run or delayed
+/// work.
+///
+/// The name on the bus is given up first; calls that have come through it are still served, later ones start
+/// the next agent. An agent that nothing would start again stays: whatever it knows of its surroundings is
+/// read afresh at every question anyhow.
+class LocalCleanExit : public CleanExit {
+ public:
+  /// `name` is the agent's on the bus. All must outlive this; on the loop's thread.
+  LocalCleanExit(EventLoop& loop, LocalWorkQueues& queues, const LocalActivityScheduler& activities,
+                 const LocalHTTP& http, LocalServiceListeners& services, Log& log, std::string name)
+      : loop_(loop),
+        queues_(queues),
+        activities_(activities),
+        http_(http),
+        services_(services),
+        log_(log),
+        name_(std::move(name)) {}
+
+  void requestWhenIdle() override;
+
+ private:
+  bool wouldBeStartedAgain();
+  bool isIdle() const;
+  void begin();
+  void look(double patience);
+
+  EventLoop& loop_;
+  LocalWorkQueues& queues_;
+  const LocalActivityScheduler& activities_;
+  const LocalHTTP& http_;
+  LocalServiceListeners& services_;
+  Log& log_;
+  const std::string name_;
+  bool requested_ = false;
+  bool nameGivenUp_ = false;
+};
+
+}  // namespace kvr

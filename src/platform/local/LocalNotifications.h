@@ -1,0 +1,48 @@
+#pragma once
+
+#include "platform/Log.h"
+#include "platform/Notifications.h"
+#include "platform/WorkQueues.h"
+#include "platform/local/BusConnection.h"
+
+#include <cstddef>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <vector>
+
+namespace kvr {
+
+/// Notifications as signals on the session bus, which anyone on it may send:
+/// `com.tarsil.NotificationCenter.Posted` from `/com/tarsil/NotificationCenter`, with the name.
+///
+/// The bus is asked for them from the first registration on. Handlers that wait for the main queue are
+/// limited: what comes beyond is dropped, with an error line, so that whoever floods the bus fills nothing
+/// here.
+class LocalNotifications : public Notifications {
+ public:
+  static constexpr std::size_t kMostWaiting = 4096;
+
+  /// The bus must outlive this.
+  LocalNotifications(BusConnection& bus, WorkQueues& queues, Log& log);
+  ~LocalNotifications() override;
+  LocalNotifications(const LocalNotifications&) = delete;
+  LocalNotifications& operator=(const LocalNotifications&) = delete;
+
+  Token registerFor(const std::string& name, std::function<void()> handler) override;
+  void cancel(Token token) override;
+  /// Sends a notification to everyone on the bus, registrations here included.
+  void post(const std::string& name);
+  /// Lets all handlers go.
+  void beginEnding();
+
+ private:
+  struct State;
+  static int handlePosted(sd_bus_message* message, void* userdata, sd_bus_error* error);
+
+  BusConnection& bus_;
+  const std::shared_ptr<State> state_;
+};
+
+}  // namespace kvr

@@ -1,0 +1,24 @@
+#pragma once
+
+#include "platform/StoreLookup.h"
+#include "platform/local/DelayedAnswers.h"
+#include "platform/local/DeviceRoot.h"
+
+namespace kvr {
+
+/// The store that "Store.plist" describes. Its purchases are those of whatever account is asked about.
+class LocalStore : public StoreLookup {
+ public:
+  LocalStore(const DeviceRoot& root, Log& log) : root_(root), answers_(log) {}
+
+  void purchaseHistory(std::int64_t storeAccountIdentifier, std::vector<std::string> bundleIdentifiers,
+                       PurchasesReply reply) override;
+  void lookUp(std::vector<std::string> bundleIdentifiers, const std::string& caller,
+              CatalogueReply reply) override;
+
+ private:
+  const DeviceRoot& root_;
+  DelayedAnswers answers_;  ///< ends before the rest
+};
+
+}  // namespace kvr
