@@ -1,9 +1,7 @@
 #include "integration/support/BusFixture.h"
+#include "unit/platform/Trees.h"
 
 #include <cmath>
-#include <limits>
-#include <string>
-#include <vector>
 
 namespace kvr::testing {
 namespace {
@@ -16,67 +14,33 @@ Value nested(int depth, bool inArrays, Value innermost) {
   return innermost;
 }
 
-std::string everyPlane() {
-  std::string text;
-  for (unsigned plane = 0; plane <= 16; ++plane) {
-    const unsigned point = plane * 0x10000 + 0x1234;
-    if (plane == 0) {
-      text += "\xE1\x88\xB4";
-      continue;
-    }
-    for (const unsigned shift : {18U, 12U, 6U, 0U}) {
-      text += static_cast<char>(shift == 18 ? 0xF0 | point >> 18U : 0x80 | (point >> shift & 0x3FU));
-    }
-  }
-  return text;
-}
+using AValueOnTheBus = BusFixture;
 
-/// Values by name that a tree may hold, each of which some encoding or other would damage.
-Value::Dictionary hardValues() {
-  const double infinity = std::numeric_limits<double>::infinity();
+TEST_F(AValueOnTheBus, ComesBackAsItWasWherever) {
   const std::string startOfList = "bplist00 and more";
-  return {
-      {"true", true},
-      {"least integer", std::numeric_limits<std::int64_t>::min()},
-      {"greatest integer", std::numeric_limits<std::int64_t>::max()},
-      {"greatest unsigned", std::numeric_limits<std::uint64_t>::max()},
-      {"one tenth", 0.1},
-      {"large", 1e300},
-      {"negative zero", -0.0},
+  Value::Dictionary hard = {
       {"not a number", std::nan("")},
-      {"infinite", -infinity},
-      {"whole real", 3.0},
-      {"date", Date{-0.25}},
-      {"far date", Date{64092211200.5}},
-      {"empty text", ""},
-      {"line breaks", "a\r\nb\n\u2028c\t\x7F\x01"},
-      {"every plane", everyPlane()},
-      {"no characters", "\uFFFE \uFDD0 \U0010FFFF"},
-      {"text with NUL", std::string("a\0b", 3)},
-      {"empty data", Value::Bytes{}},
-      {"data", Value::Bytes{0, 255, 'b'}},
+      {"infinite", -std::numeric_limits<double>::infinity()},
+      {"dates", Value::Array{Date{-0.25}, Date{64092211200.5}}},
+      {"no characters", "\uFFFE \uFDD0 \U0010FFFF\x7F\x01"},
+      {"NUL", std::string("a\0b", 3)},
+      {"data", Value::Array{Value::Bytes{}, Value::Bytes{0, 255, 'b'}}},
       {"data like a list", Value::Bytes(startOfList.begin(), startOfList.end())},
       {"null", Value()},
-      {"empty array", Value::Array{}},
-      {"array", Value::Array{1, "two", 3.5, Value::Array{}, Value::Dictionary{}}},
       {"array with null", Value::Array{1, Value(), 3}},
-      {"empty dictionary", Value::Dictionary{}},
-      {"dictionary", Value::Dictionary{{"", 1}, {"\u00E9", Value::Dictionary{{"deviceType", 1}}}}},
       {"dictionary with NUL in a key", Value::Dictionary{{std::string("a\0b", 3), 1}}},
       {"deep arrays", nested(512, true, 1)},
       {"deep dictionaries", nested(512, false, Date{1})},
   };
-}
+  const Value others = treeForEveryEncoding();
+  hard.insert(others.dictionary().begin(), others.dictionary().end());
 
-using AValueOnTheBus = BusFixture;
-
-TEST_F(AValueOnTheBus, ComesBackAsItWasWherever) {
   const auto serving = serve();
   const RawBusClient client = newClient();
   const auto echo = [&](const Value& record) {
     return client.value("a{sv}", client.call("EchoRecord", "a{sv}", {record}));
   };
-  for (const auto& [name, value] : hardValues()) {
+  for (const auto& [name, value] : hard) {
     const Value property = Value::Dictionary{{"property", value}};
     const Value inRecord = Value::Dictionary{{"record", property}};
     EXPECT_EQ(echo(property), property) << name;
@@ -86,13 +50,9 @@ TEST_F(AValueOnTheBus, ComesBackAsItWasWherever) {
     EXPECT_EQ(echo(inTree), inTree) << name;
   }
   EXPECT_TRUE(std::signbit(echo(Value::Dictionary{{"zero", -0.0}})["zero"].real()));
-
-  const Value records =
-      Value::Array{hardValues(), Value::Dictionary{}, Value::Dictionary{{"record", hardValues()}}};
+  const Value records = Value::Array{hard, Value::Dictionary{}, Value::Dictionary{{"record", hard}}};
   EXPECT_EQ(client.value("aa{sv}", client.call("EchoRecords", "aa{sv}", {records})), records);
-  for (const std::string& text : {std::string(), everyPlane(), std::string("a\r\nb")}) {
-    EXPECT_EQ(client.value("s", client.call("EchoText", "s", {text})), Value(text));
-  }
+  EXPECT_EQ(client.value("s", client.call("EchoText", "s", {"a\r\n\U0001F600"})), Value("a\r\n\U0001F600"));
   EXPECT_EQ(client.value("d", client.call("EchoReal", "d", {0.1})), Value(0.1));
 }
 
@@ -137,39 +97,32 @@ std::string signatureUnder(sd_bus_message* message, const std::vector<std::strin
 }
 
 TEST_F(AValueOnTheBus, HasTheTypesThatOtherClientsCountOn) {
-  const Value device = Value::Dictionary{
-      {"name", "a watch"}, {"serialNumber", "S"}, {"activationDate", Date{1}}, {"deviceType", 1}};
-  const Value plain = Value::Dictionary{{"covered", true}, {"n", 1}, {"big", ~std::uint64_t{0}}, {"r", 1.0}};
-  const Value unusual = Value::Dictionary{{"covered", Value()}};
-  struct {
-    Value representation;
-    std::vector<std::string> path;
-    const char* signature;
-  } const cases[] = {
-      {plain, {"device"}, "a{sv}"},
-      {plain, {"device", "name"}, "s"},
-      {plain, {"device", "activationDate"}, "(d)"},
-      {plain, {"device", "deviceType"}, "t"},
-      {plain, {"warranty"}, "a{sv}"},
-      {plain, {"warranty", "DictionaryRepresentation"}, "a{sv}"},
-      {plain, {"warranty", "DictionaryRepresentation", "covered"}, "b"},
-      {plain, {"warranty", "DictionaryRepresentation", "n"}, "x"},
-      {plain, {"warranty", "DictionaryRepresentation", "big"}, "t"},
-      {plain, {"warranty", "DictionaryRepresentation", "r"}, "d"},
-      {unusual, {"device", "name"}, "s"},
-      {unusual, {"warranty"}, "a{sv}"},
-      {unusual, {"warranty", "DictionaryRepresentation"}, "ay"},
-  };
   const auto serving = serve();
   const RawBusClient client = newClient();
-  for (const auto& one : cases) {
-    const Value info =
-        Value::Dictionary{{"device", device},
-                          {"warranty", Value::Dictionary{{"DictionaryRepresentation", one.representation}}}};
+  const auto signatureIn = [&](const Value& representation, const std::vector<std::string>& path) {
+    const Value device =
+        Value::Dictionary{{"name", "a watch"}, {"activationDate", Date{1}}, {"deviceType", 1}};
+    const Value warranty = Value::Dictionary{{"DictionaryRepresentation", representation}};
+    const Value info = Value::Dictionary{{"device", device}, {"warranty", warranty}};
     const auto reply = client.call("EchoRecord", "a{sv}", {info});
-    ASSERT_TRUE(reply.message) << reply.errorText;
-    EXPECT_EQ(signatureUnder(reply.message.get(), one.path), one.signature) << one.path.back();
-  }
+    return reply.message ? signatureUnder(reply.message.get(), path) : reply.errorText;
+  };
+  const Value plain = Value::Dictionary{{"covered", true}, {"n", 1}, {"big", ~std::uint64_t{0}}, {"r", 1.0}};
+  const std::pair<std::vector<std::string>, const char*> cases[] = {
+      {{"device"}, "a{sv}"},
+      {{"device", "name"}, "s"},
+      {{"device", "activationDate"}, "(d)"},
+      {{"device", "deviceType"}, "t"},
+      {{"warranty", "DictionaryRepresentation"}, "a{sv}"},
+      {{"warranty", "DictionaryRepresentation", "covered"}, "b"},
+      {{"warranty", "DictionaryRepresentation", "n"}, "x"},
+      {{"warranty", "DictionaryRepresentation", "big"}, "t"},
+      {{"warranty", "DictionaryRepresentation", "r"}, "d"},
+  };
+  for (const auto& [path, signature] : cases) EXPECT_EQ(signatureIn(plain, path), signature) << path.back();
+  const Value unusual = Value::Dictionary{{"covered", Value()}};
+  EXPECT_EQ(signatureIn(unusual, {"warranty"}), "a{sv}");
+  EXPECT_EQ(signatureIn(unusual, {"warranty", "DictionaryRepresentation"}), "ay");
 }
 
 TEST_F(AValueOnTheBus, ReadsAsNullWhereItsKindIsUnknown) {

@@ -1,6 +1,5 @@
 #include "integration/support/BusFixture.h"
-#include "integration/support/ChildProcess.h"
-#include "platform/JSON.h"
+#include "unit/platform/Trees.h"
 
 #include <gmock/gmock.h>
 
@@ -24,7 +23,9 @@ class Kvrctl : public BusFixture {
     entitle(true, kProgram);
     newBehaviour = [this] {
       return [this](const std::string& member, const Value::Array& arguments, const ServiceReply& reply) {
-        reply(answerTo(member, arguments));
+        const std::lock_guard lock(mutex_);
+        asked_ = member + describe(Value(arguments));
+        reply(answers_[member]);
       };
     };
   }
@@ -62,12 +63,6 @@ class Kvrctl : public BusFixture {
   static constexpr const char* kProgram = KVR_PROGRAMS "/kvrctl";
 
  private:
-  Value answerTo(const std::string& member, const Value::Array& arguments) {
-    const std::lock_guard lock(mutex_);
-    asked_ = member + describe(Value(arguments));
-    return answers_[member];
-  }
-
   mutable std::mutex mutex_;
   std::map<std::string, Value> answers_;
   std::string asked_;
@@ -90,11 +85,11 @@ TEST_F(Kvrctl, AsksWhatItIsTold) {
   setAnswer("GetDefaultDeviceInfoUsingPolicy", info(Value()));
   setAnswer("GetAllDeviceInfosUsingPolicy", Value::Array{info(Value()), info(Value::Dictionary{})});
   setAnswer("DefaultDevice", Value::Dictionary{{"name", 7}, {"deviceType", "x"}});
-  struct {
+  const struct {
     std::vector<std::string> arguments;
     const char* asked;
     int status;
-  } const cases[] = {
+  } cases[] = {
       {{"device"}, "DefaultDevice()", 0},
       {{"paired"}, "PairedDevices()", 0},
       {{"info"}, "GetDefaultDeviceInfoUsingPolicy(0)", 2},
@@ -117,15 +112,9 @@ TEST_F(Kvrctl, TellsWhyItGotNoAnswer) {
   EXPECT_EQ(refused.status, 4);
   EXPECT_EQ(refused.output, "");
   EXPECT_THAT(refused.errors, AllOf(HasSubstr(std::string(kEntitlement)), HasSubstr("Entitlements.plist")));
-  for (const std::vector<std::string>& wrong :
-       std::vector<std::vector<std::string>>{{},
-                                             {"devices"},
-                                             {"info", "S", "--all"},
-                                             {"info", "--policy", "7"},
-                                             {"info", ""},
-                                             {"info", "\xFF"}}) {
-    EXPECT_EQ(run(wrong).status, 1);
-  }
+  const std::vector<std::string> misuses[] = {
+      {}, {"devices"}, {"info", "S", "--all"}, {"info", "--policy", "7"}, {"info", ""}, {"info", "\xFF"}};
+  for (const auto& misuse : misuses) EXPECT_EQ(run(misuse).status, 1);
   bus.kill();
   EXPECT_EQ(run({"device"}).status, 3);
 }
@@ -170,12 +159,10 @@ TEST_F(Kvrctl, WritesOneJSONDocumentOfEverythingTheAgentKnows) {
 
 TEST_F(Kvrctl, WritesTheDeepestWarrantyThatThereIs) {
   const auto serving = serveAgent();
-  Value tree = 1;
-  for (int depth = 1; depth < 512; ++depth) tree = Value::Array{tree};
-  setAnswer("GetDefaultDeviceInfoUsingPolicy", info(Value::Dictionary{{"tree", tree}}));
+  setAnswer("GetDefaultDeviceInfoUsingPolicy", info(Value::Dictionary{{"tree", nestedArrays(511)}}));
   const Outcome outcome = run({"info", "--json"});
   EXPECT_EQ(outcome.status, 0) << outcome.errors;
-  EXPECT_THAT(outcome.output, HasSubstr(std::string(511, '[') + "1" + std::string(511, ']')));
+  EXPECT_THAT(outcome.output, HasSubstr(std::string(511, '[') + "\"innermost\"" + std::string(511, ']')));
 }
 
 }  // namespace
