@@ -197,15 +197,6 @@ TEST_F(AnAttestation, FailsAndKeepsEverythingWhenItsFilesCannotBeRead) {
   EXPECT_EQ(issued().chain, before.chain);
 }
 
-TEST_F(AnAttestation, RefusesALabelThatLeadsElsewhere) {
-  for (const char* label : {"", "..", "../../Preferences", "/tmp/keys"}) {
-    auto strange = options();
-    strange.label = label;
-    EXPECT_TRUE(Process(*this).ask(strange).get().error) << label;
-  }
-  EXPECT_FALSE(fs::exists(home() + "/Library"));
-}
-
 TEST_F(AnAttestation, IsTheSameForAllWhoAskAtOnceInTwoProcesses) {
   Process processes[] = {Process(*this), Process(*this)};
   std::vector<std::future<Answer>> asked;

@@ -243,13 +243,10 @@ TEST_F(AnAccount, IsTheOneThatTheFileHolds) {
   put("Accounts.plist", tree({}));
   const auto cloud = store.primaryAccount();
   ASSERT_TRUE(cloud);
-  EXPECT_EQ(cloud->altDSID, "alt");
   EXPECT_EQ(store.authenticationAccountFor(*cloud)->alternateDSID, "auth");
   EXPECT_EQ(store.storeAccountFor(*cloud)->identifier, 42);
-  EXPECT_EQ(store.storeAccountFor(*cloud)->storefront, "143441");
   EXPECT_EQ(store.tokenFor(account, "number"), std::nullopt);
   EXPECT_EQ(store.tokenFor({"another"}, "s"), std::nullopt);
-
   put("Accounts.plist", tree({}, "another"));
   EXPECT_FALSE(store.authenticationAccountFor(*cloud));
   EXPECT_FALSE(store.storeAccountFor(*cloud));

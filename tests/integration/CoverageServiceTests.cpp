@@ -151,7 +151,7 @@ TEST_F(ACoverageService, RefusesEveryBrokenRuleWithAReason) {
       {"the chain is not base64", set("X-Tarsil-Kest", "!")},
       {"not one raw DEFLATE stream", chain(deflated(identity.chain(), MAX_WBITS))},
       {"not become smaller", chain(deflated(identity.chain(), -MAX_WBITS, Z_NO_COMPRESSION))},
-      {"not compact with each", chain(deflated(identity.chain(JSONSlashes::Plain) + " ", -MAX_WBITS))},
+      {"not compact with each", chain(deflated(identity.chain(JSONSlashes::Plain), -MAX_WBITS))},
       {"not the leaf's over the body", chain(deflated(stranger.chain(), -MAX_WBITS))},
       {"does not lead to the authority", [&](auto& request) { stranger.attest(request); }},
   };

@@ -1,4 +1,5 @@
 #include "integration/support/RecordingLog.h"
+#include "platform/local/Descriptor.h"
 #include "platform/local/EventLoop.h"
 #include "platform/local/LocalHTTP.h"
 #include "platform/local/LocalWorkQueues.h"
@@ -8,14 +9,12 @@
 #include <gtest/gtest.h>
 #include <netinet/in.h>
 #include <sys/socket.h>
-#include <unistd.h>
 
-#include <cstdlib>
+#include <atomic>
 #include <functional>
 #include <future>
 #include <latch>
 #include <list>
-#include <mutex>
 #include <thread>
 
 namespace kvr::testing {
@@ -68,74 +67,67 @@ class Peer {
   std::string unread_;
 };
 
-/// A server on a loopback port that treats every connection as its script says; a connection is closed when
-/// the script returns.
+/// A server on a loopback port that treats every connection as its script says; a connection ends when the
+/// script returns.
 class ScriptedServer {
  public:
   using Script = std::function<void(Peer&)>;
 
-  explicit ScriptedServer(Script script)
-      : script_(std::move(script)), listener_(socket(AF_INET, SOCK_STREAM, 0)) {
+  explicit ScriptedServer(Script script) : script_(std::move(script)) {
     sockaddr_in address{};
     address.sin_family = AF_INET;
     address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
     socklen_t size = sizeof address;
-    EXPECT_EQ(bind(listener_, reinterpret_cast<sockaddr*>(&address), size), 0);
-    EXPECT_EQ(listen(listener_, 64), 0);
-    getsockname(listener_, reinterpret_cast<sockaddr*>(&address), &size);
+    EXPECT_EQ(bind(listener_.get(), reinterpret_cast<sockaddr*>(&address), size), 0);
+    EXPECT_EQ(listen(listener_.get(), 64), 0);
+    getsockname(listener_.get(), reinterpret_cast<sockaddr*>(&address), &size);
     host_ = "127.0.0.1:" + std::to_string(ntohs(address.sin_port));
     acceptor_ = std::thread([this] { accept(); });
   }
   ~ScriptedServer() {
-    shutdown(listener_, SHUT_RDWR);
+    shutdown(listener_.get(), SHUT_RDWR);
     acceptor_.join();
-    {
-      const std::lock_guard lock(mutex_);
-      for (const int descriptor : open_) shutdown(descriptor, SHUT_RDWR);
-    }
-    for (auto& thread : threads_) thread.join();
-    close(listener_);
+    for (const auto& connection : connections_) shutdown(connection.descriptor.get(), SHUT_RDWR);
+    for (auto& connection : connections_) connection.thread.join();
   }
   ScriptedServer(const ScriptedServer&) = delete;
   ScriptedServer& operator=(const ScriptedServer&) = delete;
 
   const std::string& host() const { return host_; }
   std::string url(const std::string& path = "/") const { return "http://" + host_ + path; }
-  std::size_t connections() const {
-    const std::lock_guard lock(mutex_);
-    return threads_.size();
-  }
-  std::size_t mostConnectionsAtOnce() const {
-    const std::lock_guard lock(mutex_);
-    return mostOpen_;
-  }
+  int connections() const { return accepted_; }
+  int mostConnectionsAtOnce() const { return mostOpen_; }
 
  private:
+  struct Connection {
+    Descriptor descriptor;
+    std::thread thread;
+  };
+
   void accept() {
     while (true) {
-      const int descriptor = ::accept(listener_, nullptr, nullptr);
+      const int descriptor = ::accept(listener_.get(), nullptr, nullptr);
       if (descriptor < 0) return;
-      const std::lock_guard lock(mutex_);
-      open_.push_back(descriptor);
-      mostOpen_ = std::max(mostOpen_, open_.size());
-      threads_.emplace_back([this, descriptor] { serve(descriptor); });
+      ++accepted_;
+      mostOpen_ = std::max<int>(mostOpen_, ++open_);
+      auto& connection = connections_.emplace_back();
+      connection.descriptor = Descriptor(descriptor);
+      connection.thread = std::thread([this, descriptor] {
+        Peer peer(descriptor);
+        script_(peer);
+        --open_;
+        shutdown(descriptor, SHUT_RDWR);
+      });
     }
-  }
-  void serve(int descriptor) {
-    Peer peer(descriptor);
-    script_(peer);
-    const std::lock_guard lock(mutex_);
-    open_.remove(descriptor);
-    close(descriptor);
   }
 
   const Script script_;
-  const int listener_;
+  const Descriptor listener_{socket(AF_INET, SOCK_STREAM, 0)};
   std::string host_;
-  mutable std::mutex mutex_;
-  std::list<int> open_;
-  std::size_t mostOpen_ = 0;
-  std::list<std::thread> threads_;
+  std::atomic<int> accepted_{0};
+  std::atomic<int> open_{0};
+  std::atomic<int> mostOpen_{0};
+  std::list<Connection> connections_;
   std::thread acceptor_;
 };
 
@@ -237,7 +229,7 @@ TEST_F(OverHTTP, ARequestIsSentExactlyAsItWasGiven) {
   EXPECT_EQ(exchange(getWithBody).body, "GET / HTTP/1.1\r\n" + host + "Content-Length: 1\r\n\r\nb");
   EXPECT_EQ(start(*http().newUncachedSession(), get(server.url())).get().body,
             "GET / HTTP/1.1\r\n" + host + "Cache-Control: no-cache\r\nPragma: no-cache\r\n\r\n");
-  EXPECT_EQ(server.connections(), 1U);
+  EXPECT_EQ(server.connections(), 1);
 }
 
 TEST_F(OverHTTP, AResponseIsTakenOnlyWhole) {
@@ -359,7 +351,7 @@ TEST_F(OverHTTP, WhatMustNotBeSentFailsWithoutAConnection) {
     EXPECT_EQ(got.body, std::nullopt) << request.url;
     EXPECT_NE(codeOf(got), 0) << request.url;
   }
-  EXPECT_EQ(server.connections(), 0U);
+  EXPECT_EQ(server.connections(), 0);
 }
 
 TEST_F(OverHTTP, FiftyRequestsAtOnceShareSixConnections) {
@@ -377,7 +369,7 @@ TEST_F(OverHTTP, FiftyRequestsAtOnceShareSixConnections) {
     EXPECT_EQ(got.status, 200) << i;
     EXPECT_THAT(got.body.value_or(""), HasSubstr("GET /" + std::to_string(i) + " "));
   }
-  EXPECT_EQ(server.mostConnectionsAtOnce(), 6U);
+  EXPECT_EQ(server.mostConnectionsAtOnce(), 6);
 }
 
 TEST_F(OverHTTP, TheTimeSpentWaitingForAConnectionCounts) {
@@ -420,7 +412,7 @@ TEST_F(OverHTTP, EndingFailsWhatIsPendingAndWhatComesLater) {
   const auto session = http().newUncachedSession();
   endHTTP();
   EXPECT_EQ(codeOf(start(*session, get(server.url())).get()), kAborted);
-  EXPECT_EQ(server.connections(), 1U);
+  EXPECT_EQ(server.connections(), 1);
 }
 
 }  // namespace

@@ -28,10 +28,10 @@ class AnAgent : public ::testing::Test {
     return (*readJSON(request.body))["serialNumber"].string();
   }
   /// The reply that will be there once the queues have run.
-  std::shared_ptr<std::optional<KVRDeviceInfoList>> allInfos(std::uint64_t policy) {
+  std::shared_ptr<std::optional<KVRDeviceInfoList>> allInfos() {
     auto reply = std::make_shared<std::optional<KVRDeviceInfoList>>();
     agent->getAllDeviceInfosUsingPolicy(
-        policy, true,
+        LookupPolicy::kRefresh, true,
         DeviceInfosReply(world.log, "test", [reply](const KVRDeviceInfoList& list) { *reply = list; }));
     return reply;
   }
@@ -63,8 +63,8 @@ TEST_F(AnAgent, AnswersOneRecordADeviceWhateverFails) {
     return ++asked % 2 == 0 ? HTTPResponse{500, "{}", {}}
                             : HTTPResponse{200, "{\"quorURL\":\"" + serialNumberIn(request) + "\"}", {}};
   };
-  const auto first = allInfos(2);
-  const auto second = allInfos(2);
+  const auto first = allInfos();
+  const auto second = allInfos();
   EXPECT_FALSE(first->has_value());
   world.queues.run();
   ASSERT_TRUE(first->has_value() && second->has_value());
@@ -91,10 +91,10 @@ TEST_F(AnAgent, AnswersOverlappingCallsAfterTheLookupsOfBoth) {
   world.http.handler = [&](const HTTPRequest& request, bool uncached, const SimulatedHTTP::Answer& answer) {
     slow&& request.method == "POST" ? held.push_back(answer) : plain(request, uncached, answer);
   };
-  const auto first = allInfos(2);
+  const auto first = allInfos();
   world.queues.run();
   slow = false;
-  const auto second = allInfos(2);
+  const auto second = allInfos();
   world.queues.run();
   EXPECT_FALSE(first->has_value());
   EXPECT_FALSE(second->has_value()) << "the group is the agent's";

