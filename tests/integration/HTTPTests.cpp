@@ -15,6 +15,7 @@
 #include <future>
 #include <latch>
 #include <list>
+#include <map>
 #include <thread>
 
 namespace kvr::testing {
@@ -321,21 +322,14 @@ TEST_F(OverHTTP, WhatMustNotBeSentFailsWithoutAConnection) {
   const ScriptedServer server(echo);
   using namespace std::string_literals;
   std::vector<HTTPRequest> refused;
-  const std::pair<std::string, std::string> headers[] = {{"X-A", "a\r\nX-B: b"},
-                                                         {"X-A", "a\nb"},
-                                                         {"X-A", "a\rb"},
-                                                         {"X-A", "a\0b"s},
-                                                         {"", "a"},
-                                                         {"X A", "a"},
-                                                         {"X-A:", "a"},
-                                                         {"X-A\r\nX-B", "a"},
-                                                         {"X-A\0"s, "a"},
-                                                         {"X-\xC3\xA4", "a"},
-                                                         {"Content-Length", "0"},
-                                                         {"transfer-encoding", "chunked"}};
-  for (const auto& [name, value] : headers) {
+  for (const auto& value : {"a\r\nX-B: b"s, "a\nb"s, "a\rb"s, "a\0b"s}) {
     refused.push_back(get(server.url()));
-    refused.back().headers.set(name, value);
+    refused.back().headers.set("X-A", value);
+  }
+  for (const auto& name : {""s, "X A"s, "X-A:"s, "X-A\r\nX-B"s, "X-A\0"s, "X-\xC3\xA4"s, "Content-Length"s,
+                           "transfer-encoding"s}) {
+    refused.push_back(get(server.url()));
+    refused.back().headers.set(name, "0");
   }
   for (const auto* method : {"", "GET /x HTTP/1.1\r\nX:", "G T"}) {
     refused.push_back(get(server.url()));
@@ -361,21 +355,18 @@ TEST_F(OverHTTP, FiftyRequestsAtOnceShareSixConnections) {
     if (waiting++ < 6) sixAtOnce.arrive_and_wait();
     echo(peer);
   });
-  std::vector<std::future<HTTPResponse>> replies;
-  replies.reserve(50);
-  for (int i = 0; i < 50; ++i) replies.push_back(start(get(server.url("/" + std::to_string(i)))));
+  std::map<std::string, std::future<HTTPResponse>> replies;
   for (int i = 0; i < 50; ++i) {
-    const HTTPResponse got = replies[static_cast<std::size_t>(i)].get();
-    EXPECT_EQ(got.status, 200) << i;
-    EXPECT_THAT(got.body.value_or(""), HasSubstr("GET /" + std::to_string(i) + " "));
+    const std::string path = "/" + std::to_string(i);
+    replies[path] = start(get(server.url(path)));
   }
+  for (auto& [path, reply] : replies) EXPECT_THAT(*reply.get().body, HasSubstr("GET " + path + " "));
   EXPECT_EQ(server.mostConnectionsAtOnce(), 6);
 }
 
 TEST_F(OverHTTP, TheTimeSpentWaitingForAConnectionCounts) {
   const ScriptedServer server(keepSilent);
   std::vector<std::future<HTTPResponse>> pending;
-  pending.reserve(6);
   for (int i = 0; i < 6; ++i) pending.push_back(start(get(server.url())));
   HTTPRequest brief = get(server.url());
   brief.timeout = 0.05;

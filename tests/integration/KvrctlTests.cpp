@@ -1,3 +1,4 @@
+#include "agent/KVRAgentProtocol.h"
 #include "integration/support/BusFixture.h"
 #include "unit/platform/Trees.h"
 
@@ -37,18 +38,7 @@ class Kvrctl : public BusFixture {
     return {status, program.output(), program.errorOutput()};
   }
 
-  std::shared_ptr<void> serveAgent() {
-    return serve(
-        {RawBusClient::kInterface,
-         {{"DefaultDevice", {}, {"device", "a{sv}"}},
-          {"PairedDevices", {}, {"devices", "aa{sv}"}},
-          {"GetDefaultDeviceInfoUsingPolicy", {{"policy", "t"}}, {"info", "a{sv}"}},
-          {"GetDeviceInfoForSerialNumber", {{"serialNumber", "s"}, {"policy", "t"}}, {"info", "a{sv}"}},
-          {"GetAllDeviceInfosUsingPolicy",
-           {{"policy", "t"}, {"updateFollowUps", "b"}},
-           {"infos", "aa{sv}"}}}});
-  }
-
+  std::shared_ptr<void> serveAgent() { return serve(agentServiceInterface()); }
   /// What the agent replies from now on.
   void setAnswer(const std::string& member, const Value& value) {
     const std::lock_guard lock(mutex_);

@@ -138,7 +138,7 @@ TEST_F(DeviceAttestationHeaders, AreLeftOutAndTheReasonLoggedWhenTheyCannotBeMad
       },
       ungenerated, {fellBack(-4)});
   expect([](auto& a) { a.preferred.delay = 60.001; }, timedOut, {});
-  // Both issues share one limit.
+  // Both attempts share one limit.
   expect(
       [](auto& a) {
         a.preferred = Attestation::failed(-11, 31);

@@ -11,7 +11,6 @@ namespace kvr {
 namespace {
 
 using ::testing::Each;
-using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 using ::testing::Not;
 
