@@ -1,6 +1,6 @@
 #include "agent/KVRAgentProtocol.h"
 #include "integration/support/BusFixture.h"
-#include "unit/platform/Trees.h"
+#include "platform/JSON.h"
 
 #include <gmock/gmock.h>
 
@@ -145,14 +145,6 @@ TEST_F(Kvrctl, WritesOneJSONDocumentOfEverythingTheAgentKnows) {
                 {"version", 1},
                 {"deviceInfos", Value::Array{Value::Dictionary{{"device", told}, {"warranty", known}},
                                              Value::Dictionary{{"device", told}, {"warranty", Value()}}}}}));
-}
-
-TEST_F(Kvrctl, WritesTheDeepestWarrantyThatThereIs) {
-  const auto serving = serveAgent();
-  setAnswer("GetDefaultDeviceInfoUsingPolicy", info(Value::Dictionary{{"tree", nestedArrays(511)}}));
-  const Outcome outcome = run({"info", "--json"});
-  EXPECT_EQ(outcome.status, 0) << outcome.errors;
-  EXPECT_THAT(outcome.output, HasSubstr(std::string(511, '[') + "\"innermost\"" + std::string(511, ']')));
 }
 
 }  // namespace
