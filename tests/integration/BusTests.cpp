@@ -1,17 +1,19 @@
 #include "integration/support/BusFixture.h"
 #include "platform/local/PeerIdentity.h"
 #include "platform/local/bus/BusCodec.h"
+#include "unit/platform/Trees.h"
 
 #include <gmock/gmock.h>
 
 #include <atomic>
+#include <cmath>
+#include <limits>
 #include <numeric>
 
 namespace kvr::testing {
 namespace {
 
 using ::testing::ElementsAre;
-using ::testing::HasSubstr;
 
 using AService = BusFixture;
 
@@ -36,39 +38,30 @@ TEST_F(AService, DeliversTheCallsOfAConnectionInTheirOrderFromTheVeryFirst) {
   EXPECT_EQ(decisions.size(), 1U);
 }
 
-TEST_F(AService, GivesEveryConnectionAnObjectOfItsOwnThatMayBlockThatConnectionOnly) {
-  std::promise<void> release;
-  const std::shared_future<void> released = release.get_future().share();
-  std::promise<void> entered;
+TEST_F(AService, GivesEveryConnectionAnObjectOfItsOwn) {
   std::atomic<int> objects = 0;
   newBehaviour = [&] {
-    const int number = ++objects;
-    return [&, number](const std::string& member, const Value::Array&, const ServiceReply& reply) {
-      if (member == "EchoFlag") {
-        entered.set_value();
-        released.wait();
-      }
+    return [number = ++objects](const std::string&, const Value::Array&, const ServiceReply& reply) {
       reply(Value(number));
     };
   };
   const auto serving = serve();
-  const RawBusClient first = newClient();
-  const RawBusClient second = newClient();
-  EXPECT_EQ(first.value("t", first.call("EchoNumber", "t", {0})), Value(1));
-  ASSERT_GE(sd_bus_send(first.bus(), first.newCall("EchoFlag", "b", {true}).get(), nullptr), 0);
-  ASSERT_GE(sd_bus_flush(first.bus()), 0);
-  entered.get_future().wait();
-  EXPECT_EQ(second.value("t", second.call("EchoNumber", "t", {0})), Value(2));
-  release.set_value();
+  const RawBusClient clients[] = {newClient(), newClient()};
+  for (int round = 0; round < 2; ++round) {
+    for (const int number : {0, 1}) {
+      const auto& client = clients[number];
+      EXPECT_EQ(client.value("t", client.call("EchoNumber", "t", {0})), Value(number + 1));
+    }
+  }
 }
 
 TEST_F(AService, LetsGoOfTheObjectWithItsConnectionEvenInTheMiddleOfACall) {
   std::promise<ServiceReply> begun;
-  std::promise<void> gone;
   newBehaviour = [&] {
     return
         [&](const std::string&, const Value::Array&, const ServiceReply& reply) { begun.set_value(reply); };
   };
+  std::promise<void> gone;
   onObjectGone = [&] { gone.set_value(); };
   const auto serving = serve();
   RawBusClient client = newClient();
@@ -81,29 +74,7 @@ TEST_F(AService, LetsGoOfTheObjectWithItsConnectionEvenInTheMiddleOfACall) {
   ASSERT_EQ(gone.get_future().wait_for(kLimit), std::future_status::ready);
   EXPECT_EQ(listeners->openCalls(), 0U);
   late(Value("too late"));
-
-  newBehaviour = [] {
-    return [](const std::string&, const Value::Array&, const ServiceReply& reply) { reply(Value("served")); };
-  };
-  onObjectGone = [] {};
-  const RawBusClient other = newClient();
-  EXPECT_EQ(other.value("s", other.call("EchoText", "s", {"x"})), Value("served"));
   EXPECT_THAT(log.errorsWith(""), ElementsAre());
-}
-
-TEST_F(AService, RefusesAConnectionForGoodWhenItsProgramIsNotEntitled) {
-  entitle("true");
-  const auto serving = serve();
-  const RawBusClient client = newClient();
-  const auto refused = client.call("EchoText", "s", {"x"});
-  EXPECT_EQ(refused.error, "org.freedesktop.DBus.Error.AccessDenied");
-  EXPECT_THAT(refused.errorText, HasSubstr(std::string(kEntitlement)));
-
-  entitle(true);
-  EXPECT_EQ(client.call("EchoText", "s", {"x"}).error, "org.freedesktop.DBus.Error.AccessDenied");
-  const RawBusClient other = newClient();
-  EXPECT_EQ(other.value("s", other.call("EchoText", "s", {"x"})), Value("x"));
-  EXPECT_THAT(decisions, ElementsAre(Value("true"), Value(true)));
 }
 
 TEST_F(AService, AnswersWithAnErrorWhatItCannotServe) {
@@ -114,34 +85,23 @@ TEST_F(AService, AnswersWithAnErrorWhatItCannotServe) {
       if (arguments.at(0) == Value("throw")) throw std::runtime_error("a fault");
       if (arguments.at(0) == Value("kind")) return reply(Value(7));
       if (arguments.at(0) == Value("text")) return reply(Value(std::string("a\0b", 3)));
+      if (arguments.at(0) == Value("large")) return reply(Value(std::string(kMaximumBusValueSize + 1, 'x')));
     };
   };
   const auto serving = serve();
   const RawBusClient client = newClient();
-  struct {
-    const char* member;
-    const char* signature;
-    Value::Array arguments;
-    const char* error;
-    bool isServed;
-  } const cases[] = {
-      {"EchoText", "s", {"dropped"}, "org.freedesktop.DBus.Error.Failed", true},
-      {"EchoText", "s", {"throw"}, "org.freedesktop.DBus.Error.Failed", true},
-      {"EchoText", "s", {"kind"}, "org.freedesktop.DBus.Error.Failed", true},
-      {"EchoText", "s", {"text"}, "org.freedesktop.DBus.Error.Failed", true},
-      {"EchoText", "s", {std::string((1U << 20U) + 1, 'x')}, "org.freedesktop.DBus.Error.InvalidArgs", false},
-      {"EchoText", "t", {1}, "org.freedesktop.DBus.Error.InvalidArgs", false},
-      {"EchoText", "ss", {"a", "b"}, "org.freedesktop.DBus.Error.InvalidArgs", false},
-      {"EchoText", "", {}, "org.freedesktop.DBus.Error.InvalidArgs", false},
-      {"EchoNothing", "", {}, "org.freedesktop.DBus.Error.UnknownMethod", false},
-  };
-  for (const auto& one : cases) {
-    const int before = served;
-    const std::string name =
-        std::string(one.member) + "(" + describe(Value(one.arguments)).substr(0, 20) + ")";
-    EXPECT_EQ(client.call(one.member, one.signature, one.arguments).error, one.error) << name;
-    EXPECT_EQ(served - before, one.isServed ? 1 : 0) << name;
+  const std::string failed = "org.freedesktop.DBus.Error.Failed";
+  const std::string invalid = "org.freedesktop.DBus.Error.InvalidArgs";
+  for (const char* fault : {"dropped", "throw", "kind", "text", "large"}) {
+    EXPECT_EQ(client.call("EchoText", "s", {fault}).error, failed) << fault;
   }
+  EXPECT_EQ(served, 5);
+  EXPECT_EQ(client.call("EchoText", "s", {std::string((1U << 20U) + 1, 'x')}).error, invalid);
+  EXPECT_EQ(client.call("EchoText", "t", {1}).error, invalid);
+  EXPECT_EQ(client.call("EchoText", "ss", {"a", "b"}).error, invalid);
+  EXPECT_EQ(client.call("EchoText").error, invalid);
+  EXPECT_EQ(client.call("EchoNothing").error, "org.freedesktop.DBus.Error.UnknownMethod");
+  EXPECT_EQ(served, 5);
   EXPECT_EQ(decisions.size(), 1U);
 }
 
@@ -165,32 +125,6 @@ TEST_F(AService, TakesTheReplyFromAnyThreadAndSendsNoneThatIsNotExpected) {
     const BusMessageRef held(surplus);
     EXPECT_TRUE(!surplus || sd_bus_message_is_signal(surplus, nullptr, nullptr));
   }
-}
-
-TEST_F(AService, AnswersTooLargeAReplyWithAnErrorAndServesOn) {
-  const Value::Bytes fits(kMaximumBusValueSize - 200);
-  const Value::Bytes tooLarge(kMaximumBusValueSize + 1);
-  newBehaviour = [&] {
-    return [&](const std::string&, const Value::Array& arguments, const ServiceReply& reply) {
-      reply(Value::Dictionary{{"data", arguments.at(1) == Value(0) ? fits : tooLarge}});
-    };
-  };
-  const auto serving = serve();
-  const RawBusClient client = newClient();
-  EXPECT_EQ(client.call("Record", "st", {"", 1}).error, "org.freedesktop.DBus.Error.Failed");
-  EXPECT_EQ(client.value("a{sv}", client.call("Record", "st", {"", 0}))["data"], Value(fits));
-}
-
-TEST_F(AService, ReportsTheLossOfTheBusOnce) {
-  std::promise<void> gone;
-  onObjectGone = [&] { gone.set_value(); };
-  const auto serving = serve();
-  const RawBusClient client = newClient();
-  client.call("EchoText", "s", {"x"});
-  bus.kill();
-  EXPECT_TRUE(waitUntilLost());
-  EXPECT_EQ(gone.get_future().wait_for(kLimit), std::future_status::ready);
-  EXPECT_EQ(log.errorsWith("cannot serve any more").size(), 1U);
 }
 
 TEST_F(AService, IsLostWithoutItsName) {
@@ -231,6 +165,140 @@ TEST_F(AService, EndsByGivingItsNameUpAndAnsweringWhatItHasTaken) {
     }
   }
   EXPECT_EQ(answer, "the last");
+}
+
+Value nested(int depth, bool inArrays, Value innermost) {
+  for (int i = 1; i < depth; ++i) {
+    innermost = inArrays ? Value(Value::Array{std::move(innermost)})
+                         : Value(Value::Dictionary{{"k", std::move(innermost)}});
+  }
+  return innermost;
+}
+
+using AValueOnTheBus = BusFixture;
+
+TEST_F(AValueOnTheBus, ComesBackAsItWasWherever) {
+  const std::string startOfList = "bplist00 and more";
+  Value::Dictionary hard = {
+      {"not a number", std::nan("")},
+      {"infinite", -std::numeric_limits<double>::infinity()},
+      {"dates", Value::Array{Date{-0.25}, Date{64092211200.5}}},
+      {"no characters", "\uFFFE \uFDD0 \U0010FFFF\x7F\x01"},
+      {"NUL", std::string("a\0b", 3)},
+      {"data", Value::Array{Value::Bytes{}, Value::Bytes{0, 255, 'b'}}},
+      {"data like a list", Value::Bytes(startOfList.begin(), startOfList.end())},
+      {"null", Value()},
+      {"array with null", Value::Array{1, Value(), 3}},
+      {"dictionary with NUL in a key", Value::Dictionary{{std::string("a\0b", 3), 1}}},
+      {"deep arrays", nested(512, true, 1)},
+      {"deep dictionaries", nested(512, false, Date{1})},
+  };
+  const Value others = treeForEveryEncoding();
+  hard.insert(others.dictionary().begin(), others.dictionary().end());
+
+  const auto serving = serve();
+  const RawBusClient client = newClient();
+  const auto echo = [&](const Value& record) {
+    return client.value("a{sv}", client.call("EchoRecord", "a{sv}", {record}));
+  };
+  for (const auto& [name, value] : hard) {
+    const Value property = Value::Dictionary{{"property", value}};
+    const Value inRecord = Value::Dictionary{{"record", property}};
+    EXPECT_EQ(echo(property), property) << name;
+    EXPECT_EQ(echo(inRecord), inRecord) << name;
+    if (name.starts_with("deep")) continue;
+    const Value inTree = Value::Dictionary{{"record", Value::Dictionary{{"tree", Value::Array{property}}}}};
+    EXPECT_EQ(echo(inTree), inTree) << name;
+  }
+  EXPECT_TRUE(std::signbit(echo(Value::Dictionary{{"zero", -0.0}})["zero"].real()));
+  const Value records = Value::Array{hard, Value::Dictionary{}, Value::Dictionary{{"record", hard}}};
+  EXPECT_EQ(client.value("aa{sv}", client.call("EchoRecords", "aa{sv}", {records})), records);
+  EXPECT_EQ(client.value("s", client.call("EchoText", "s", {"a\r\n\U0001F600"})), Value("a\r\n\U0001F600"));
+  EXPECT_EQ(client.value("d", client.call("EchoReal", "d", {0.1})), Value(0.1));
+}
+
+TEST_F(AValueOnTheBus, MayBeNestedToAnyDepthWithoutBreakingTheConnection) {
+  const auto serving = serve();
+  const RawBusClient client = newClient();
+  for (int depth = 1; depth <= 70; ++depth) {
+    for (const bool inArrays : {false, true}) {
+      const Value innermost = depth % 2 ? Value(Date{1}) : Value(Value::Bytes{1});
+      const Value tree =
+          Value::Dictionary{{"warranty", Value::Dictionary{{"tree", nested(depth, inArrays, innermost)}}}};
+      const Value records = Value::Array{tree};
+      ASSERT_EQ(client.value("aa{sv}", client.call("EchoRecords", "aa{sv}", {records})), records) << depth;
+    }
+  }
+  const Value tooDeep = Value::Dictionary{{"tree", nested(513, true, Value::Array{})}};
+  newBehaviour = [&] {
+    return [&](const std::string&, const Value::Array&, const ServiceReply& reply) { reply(tooDeep); };
+  };
+  const RawBusClient other = newClient();
+  for (int i = 0; i < 2; ++i) {
+    EXPECT_EQ(other.call("Record", "st", {"", 0}).error, "org.freedesktop.DBus.Error.Failed");
+  }
+}
+
+/// The signature of what stands under a path of keys in a record.
+std::string signatureUnder(sd_bus_message* message, const std::vector<std::string>& path) {
+  const char* contents = nullptr;
+  for (std::size_t i = 0; i < path.size(); ++i) {
+    if (i > 0) sd_bus_message_enter_container(message, 'v', "a{sv}");
+    sd_bus_message_enter_container(message, 'a', "{sv}");
+    const char* key = nullptr;
+    while (sd_bus_message_enter_container(message, 'e', "sv") > 0) {
+      sd_bus_message_read(message, "s", &key);
+      if (key == path[i]) break;
+      sd_bus_message_skip(message, "v");
+      sd_bus_message_exit_container(message);
+    }
+  }
+  sd_bus_message_peek_type(message, nullptr, &contents);
+  return contents ? contents : "";
+}
+
+TEST_F(AValueOnTheBus, HasTheTypesThatOtherClientsCountOn) {
+  const auto serving = serve();
+  const RawBusClient client = newClient();
+  const auto signatureIn = [&](const Value& representation, const std::vector<std::string>& path) {
+    const Value device =
+        Value::Dictionary{{"name", "a watch"}, {"activationDate", Date{1}}, {"deviceType", 1}};
+    const Value warranty = Value::Dictionary{{"DictionaryRepresentation", representation}};
+    const Value info = Value::Dictionary{{"device", device}, {"warranty", warranty}};
+    const auto reply = client.call("EchoRecord", "a{sv}", {info});
+    return reply.message ? signatureUnder(reply.message.get(), path) : reply.errorText;
+  };
+  const Value plain = Value::Dictionary{{"covered", true}, {"n", 1}, {"big", ~std::uint64_t{0}}, {"r", 1.0}};
+  const std::pair<std::vector<std::string>, const char*> cases[] = {
+      {{"device"}, "a{sv}"},
+      {{"device", "name"}, "s"},
+      {{"device", "activationDate"}, "(d)"},
+      {{"device", "deviceType"}, "t"},
+      {{"warranty", "DictionaryRepresentation"}, "a{sv}"},
+      {{"warranty", "DictionaryRepresentation", "covered"}, "b"},
+      {{"warranty", "DictionaryRepresentation", "n"}, "x"},
+      {{"warranty", "DictionaryRepresentation", "big"}, "t"},
+      {{"warranty", "DictionaryRepresentation", "r"}, "d"},
+  };
+  for (const auto& [path, signature] : cases) EXPECT_EQ(signatureIn(plain, path), signature) << path.back();
+  const Value unusual = Value::Dictionary{{"covered", Value()}};
+  EXPECT_EQ(signatureIn(unusual, {"warranty"}), "a{sv}");
+  EXPECT_EQ(signatureIn(unusual, {"warranty", "DictionaryRepresentation"}), "ay");
+}
+
+TEST_F(AValueOnTheBus, ReadsAsNullWhereItsKindIsUnknown) {
+  const auto serving = serve();
+  const RawBusClient client = newClient();
+  const BusMessageRef call = client.newCall("EchoRecord");
+  ASSERT_GE(sd_bus_message_append(call.get(), "a{sv}", 6, "small", "y", 7, "path", "o", "/a", "list", "as", 1,
+                                  "x", "struct", "(si)", "x", 1, "variant", "v", "s", "x", "last", "s", "x"),
+            0);
+  EXPECT_EQ(client.value("a{sv}", client.call(call)), Value(Value::Dictionary{{"small", 7},
+                                                                              {"path", "/a"},
+                                                                              {"list", Value()},
+                                                                              {"struct", Value()},
+                                                                              {"variant", Value()},
+                                                                              {"last", "x"}}));
 }
 
 TEST(APeer, IsHeldToItsVeryProcess) {

@@ -1,4 +1,5 @@
 #include "integration/support/RecordingLog.h"
+#include "platform/local/Descriptor.h"
 #include "platform/local/EventLoop.h"
 #include "platform/local/LocalHTTP.h"
 #include "platform/local/LocalWorkQueues.h"
@@ -8,14 +9,13 @@
 #include <gtest/gtest.h>
 #include <netinet/in.h>
 #include <sys/socket.h>
-#include <unistd.h>
 
-#include <cstdlib>
+#include <atomic>
 #include <functional>
 #include <future>
 #include <latch>
 #include <list>
-#include <mutex>
+#include <map>
 #include <thread>
 
 namespace kvr::testing {
@@ -62,90 +62,87 @@ class Peer {
     }
     return true;
   }
-  void reset() const {
-    const linger abrupt{1, 0};
-    setsockopt(descriptor_, SOL_SOCKET, SO_LINGER, &abrupt, sizeof abrupt);
-  }
 
  private:
   const int descriptor_;
   std::string unread_;
 };
 
-/// A server on a loopback port that treats every connection as its script says; a connection is closed when
-/// the script returns.
+/// A server on a loopback port that treats every connection as its script says; a connection ends when the
+/// script returns.
 class ScriptedServer {
  public:
   using Script = std::function<void(Peer&)>;
 
-  explicit ScriptedServer(Script script)
-      : script_(std::move(script)), listener_(socket(AF_INET, SOCK_STREAM, 0)) {
+  explicit ScriptedServer(Script script) : script_(std::move(script)) {
     sockaddr_in address{};
     address.sin_family = AF_INET;
     address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
     socklen_t size = sizeof address;
-    EXPECT_EQ(bind(listener_, reinterpret_cast<sockaddr*>(&address), size), 0);
-    EXPECT_EQ(listen(listener_, 64), 0);
-    getsockname(listener_, reinterpret_cast<sockaddr*>(&address), &size);
+    EXPECT_EQ(bind(listener_.get(), reinterpret_cast<sockaddr*>(&address), size), 0);
+    EXPECT_EQ(listen(listener_.get(), 64), 0);
+    getsockname(listener_.get(), reinterpret_cast<sockaddr*>(&address), &size);
     host_ = "127.0.0.1:" + std::to_string(ntohs(address.sin_port));
     acceptor_ = std::thread([this] { accept(); });
   }
   ~ScriptedServer() {
-    shutdown(listener_, SHUT_RDWR);
+    shutdown(listener_.get(), SHUT_RDWR);
     acceptor_.join();
-    {
-      const std::lock_guard lock(mutex_);
-      for (const int descriptor : open_) shutdown(descriptor, SHUT_RDWR);
-    }
-    for (auto& thread : threads_) thread.join();
-    close(listener_);
+    for (const auto& connection : connections_) shutdown(connection.descriptor.get(), SHUT_RDWR);
+    for (auto& connection : connections_) connection.thread.join();
   }
   ScriptedServer(const ScriptedServer&) = delete;
   ScriptedServer& operator=(const ScriptedServer&) = delete;
 
   const std::string& host() const { return host_; }
   std::string url(const std::string& path = "/") const { return "http://" + host_ + path; }
-  std::size_t connections() const {
-    const std::lock_guard lock(mutex_);
-    return threads_.size();
-  }
-  std::size_t mostConnectionsAtOnce() const {
-    const std::lock_guard lock(mutex_);
-    return mostOpen_;
-  }
+  int connections() const { return accepted_; }
+  int mostConnectionsAtOnce() const { return mostOpen_; }
 
  private:
+  struct Connection {
+    Descriptor descriptor;
+    std::thread thread;
+  };
+
   void accept() {
     while (true) {
-      const int descriptor = ::accept(listener_, nullptr, nullptr);
+      const int descriptor = ::accept(listener_.get(), nullptr, nullptr);
       if (descriptor < 0) return;
-      const std::lock_guard lock(mutex_);
-      open_.push_back(descriptor);
-      mostOpen_ = std::max(mostOpen_, open_.size());
-      threads_.emplace_back([this, descriptor] { serve(descriptor); });
+      ++accepted_;
+      mostOpen_ = std::max<int>(mostOpen_, ++open_);
+      auto& connection = connections_.emplace_back();
+      connection.descriptor = Descriptor(descriptor);
+      connection.thread = std::thread([this, descriptor] {
+        Peer peer(descriptor);
+        script_(peer);
+        --open_;
+        shutdown(descriptor, SHUT_RDWR);
+      });
     }
-  }
-  void serve(int descriptor) {
-    Peer peer(descriptor);
-    script_(peer);
-    const std::lock_guard lock(mutex_);
-    open_.remove(descriptor);
-    close(descriptor);
   }
 
   const Script script_;
-  const int listener_;
+  const Descriptor listener_{socket(AF_INET, SOCK_STREAM, 0)};
   std::string host_;
-  mutable std::mutex mutex_;
-  std::list<int> open_;
-  std::size_t mostOpen_ = 0;
-  std::list<std::thread> threads_;
+  std::atomic<int> accepted_{0};
+  std::atomic<int> open_{0};
+  std::atomic<int> mostOpen_{0};
+  std::list<Connection> connections_;
   std::thread acceptor_;
 };
 
 std::string response(std::string_view status, std::string_view body) {
   return "HTTP/1.1 " + std::string(status) + "\r\nContent-Length: " + std::to_string(body.size()) +
          "\r\n\r\n" + std::string(body);
+}
+
+/// Answers the first request of a connection with these bytes.
+ScriptedServer::Script sends(std::string bytes) {
+  return [bytes = std::move(bytes)](Peer& peer) {
+    peer.request();
+    peer.write(bytes);
+  };
 }
 
 /// Answers every request of a connection with what was asked.
@@ -164,9 +161,9 @@ void keepSilent(Peer& peer) {
 class OverHTTP : public ::testing::Test {
  protected:
   std::future<HTTPResponse> start(HTTPRequest request) {
-    return start(http().sharedSession(), std::move(request));
+    return start(http_->sharedSession(), std::move(request));
   }
-  std::future<HTTPResponse> start(HTTPSession& session, HTTPRequest request) {
+  static std::future<HTTPResponse> start(HTTPSession& session, HTTPRequest request) {
     auto promise = std::make_shared<std::promise<HTTPResponse>>();
     auto future = promise->get_future();
     // A second reply would throw.
@@ -183,6 +180,15 @@ class OverHTTP : public ::testing::Test {
   LocalWorkQueues queues_{loop_, log_};
   std::unique_ptr<LocalHTTP> http_ = std::make_unique<LocalHTTP>(queues_, log_);
 };
+
+/// The error's code, 0 without an error.
+std::int64_t codeOf(const HTTPResponse& response) {
+  EXPECT_EQ(response.error.has_value(), !response.body.has_value());
+  if (!response.error) return 0;
+  EXPECT_EQ(response.error->domain, "http");
+  EXPECT_FALSE(response.error->message.empty());
+  return response.error->code;
+}
 
 HTTPRequest get(std::string url) {
   HTTPRequest request;
@@ -224,137 +230,91 @@ TEST_F(OverHTTP, ARequestIsSentExactlyAsItWasGiven) {
   EXPECT_EQ(exchange(getWithBody).body, "GET / HTTP/1.1\r\n" + host + "Content-Length: 1\r\n\r\nb");
   EXPECT_EQ(start(*http().newUncachedSession(), get(server.url())).get().body,
             "GET / HTTP/1.1\r\n" + host + "Cache-Control: no-cache\r\nPragma: no-cache\r\n\r\n");
-  EXPECT_EQ(server.connections(), 1U);
+  EXPECT_EQ(server.connections(), 1);
 }
 
 TEST_F(OverHTTP, AResponseIsTakenOnlyWhole) {
-  struct Case {
+  const std::string mebibyte(kMebibyte, 'a');
+  const std::string untilClosed = "HTTP/1.1 200 OK\r\n\r\n";
+  const std::string chunked = "HTTP/1.1 200 OK\r\nTransfer-Encoding: chunked\r\n\r\n";
+  const std::string oneChunk = chunked + "100000\r\n" + mebibyte + "\r\n";
+  const std::string fiveBytes = "HTTP/1.1 200 OK\r\nContent-Length: 5\r\n\r\n";
+  const auto movedTo = [](const std::string& location) {
+    return "HTTP/1.1 301 Moved\r\nLocation: " + location + "\r\nContent-Length: 1\r\n\r\nr";
+  };
+  const std::optional<std::string> none;
+  const struct {
     const char* name;
-    HTTPRequest request;
-    ScriptedServer::Script script;
+    std::string sent;
     int status;
     std::optional<std::string> body;
-    int code;  ///< any when negative
+    int code;
+  } cases[] = {
+      {"plain", response("404 Not Found", "no"), 404, "no", 0},
+      {"until closed", untilClosed + "all", 200, "all", 0},
+      {"exactly 1 MiB", response("200 OK", mebibyte), 200, mebibyte, 0},
+      {"a byte more", response("401 Unauthorized", mebibyte + "a"), 401, none, kTooLarge},
+      {"1 MiB in chunks", oneChunk + "0\r\n\r\n", 200, mebibyte, 0},
+      {"a chunk more", oneChunk + "1\r\na\r\n0\r\n\r\n", 200, none, kTooLarge},
+      {"a byte more, until closed", untilClosed + mebibyte + "a", 200, none, kTooLarge},
+      {"compressed unasked", "HTTP/1.1 200 OK\r\nContent-Encoding: gzip\r\n\r\nz", 200, "z", 0},
+      {"shorter than it says", fiveBytes + "four", 0, none, 18},
+      {"broken chunk", chunked + "zz\r\n", 0, none, 56},
+      {"not HTTP", "hello\r\n\r\n", 0, none, 1},
+      {"nothing", "", 0, none, 52},
+      {"redirect to plain http", movedTo("http://127.0.0.1:1/"), 301, none, 1},
+      {"redirect to a file", movedTo("file:///etc/hosts"), 301, none, 1},
+      {"redirect to https", movedTo("https://127.0.0.1:1/"), 0, none, kCouldNotConnect},
+      {"another answer with a location",
+       "HTTP/1.1 201 Created\r\nLocation: https://127.0.0.1:1/\r\nContent-Length: 1\r\n\r\nc", 201, "c", 0},
   };
-  const auto send = [](std::string bytes) {
-    return [bytes = std::move(bytes)](Peer& peer) { peer.write(bytes); };
-  };
-  const std::string mebibyte(kMebibyte, 'a');
-  HTTPRequest brief = get("");
-  brief.timeout = 0.05;
-  HTTPRequest unfollowed = get("");
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.name);
+    const ScriptedServer server(sends(c.sent));
+    const HTTPResponse got = exchange(get(server.url()));
+    EXPECT_EQ(got.status, c.status);
+    EXPECT_TRUE(got.body == c.body) << got.body.value_or("none").substr(0, 100);
+    EXPECT_EQ(codeOf(got), c.code);
+  }
+  const ScriptedServer server(sends(movedTo("https://127.0.0.1:1/")));
+  HTTPRequest unfollowed = get(server.url());
   unfollowed.followsRedirects = false;
-  const std::string chunked = "HTTP/1.1 200 OK\r\nTransfer-Encoding: chunked\r\n\r\n";
-  const std::string redirect =
-      "HTTP/1.1 302 Found\r\nLocation: http://127.0.0.1:1/\r\nContent-Length: 1\r\n\r\nr";
-  const std::vector<Case> cases = {
-      {"plain", get(""), send(response("404 Not Found", "no")), 404, "no", 0},
-      {"until closed", get(""), send("HTTP/1.1 200 OK\r\n\r\nall"), 200, "all", 0},
-      {"exactly 1 MiB", get(""), send(response("200 OK", mebibyte)), 200, mebibyte, 0},
-      {"a byte more", get(""), send(response("401 Unauthorized", mebibyte + "a")), 401, {}, kTooLarge},
-      {"1 MiB in chunks", get(""), send(chunked + "100000\r\n" + mebibyte + "\r\n0\r\n\r\n"), 200, mebibyte,
-       0},
-      {"a chunk more",
-       get(""),
-       send(chunked + "100000\r\n" + mebibyte + "\r\n1\r\na\r\n0\r\n\r\n"),
-       200,
-       {},
-       kTooLarge},
-      {"a byte more, until closed",
-       get(""),
-       send("HTTP/1.1 200 OK\r\n\r\n" + mebibyte + "a"),
-       200,
-       {},
-       kTooLarge},
-      {"compressed unasked", get(""), send("HTTP/1.1 200 OK\r\nContent-Encoding: gzip\r\n\r\nz"), 200, "z",
-       0},
-      {"shorter than it says", get(""), send("HTTP/1.1 200 OK\r\nContent-Length: 5\r\n\r\nfour"), 0, {}, 18},
-      {"broken chunk", get(""), send(chunked + "zz\r\n"), 0, {}, 56},
-      {"not HTTP", get(""), send("hello\r\n\r\n"), 0, {}, 1},
-      {"nothing", get(""), send(""), 0, {}, 52},
-      {"reset in the middle",
-       get(""),
-       [](Peer& peer) {
-         peer.write("HTTP/1.1 200 OK\r\nContent-Length: 5\r\n\r\nf");
-         peer.reset();
-       },
-       0,
-       {},
-       -1},
-      {"endless headers",
-       get(""),
-       [](Peer& peer) {
-         peer.write("HTTP/1.1 200 OK\r\n");
-         while (peer.write("X-More: " + std::string(1000, 'a') + "\r\n")) {
-         }
-       },
-       0,
-       {},
-       kTooLarge},
-      {"one endless header",
-       get(""),
-       [](Peer& peer) {
-         peer.write("HTTP/1.1 200 OK\r\nX-More: ");
-         while (peer.write(std::string(1000, 'a'))) {
-         }
-       },
-       0,
-       {},
-       -1},
-      {"endless informational responses",
-       get(""),
-       [](Peer& peer) {
-         while (peer.write("HTTP/1.1 103 Early Hints\r\nX-More: " + std::string(1000, 'a') + "\r\n\r\n")) {
-         }
-       },
-       0,
-       {},
-       kTooLarge},
-      {"never", brief, keepSilent, 0, {}, kTimedOut},
-      {"never the end",
-       brief,
+  EXPECT_EQ(exchange(unfollowed).body, "r");
+  EXPECT_EQ(exchange(post(server.url(), "{}")).body, "r");
+}
+
+TEST_F(OverHTTP, AResponseWithoutEndIsGivenUp) {
+  const auto endless = [](std::string start, std::string repeated) {
+    return [=](const Peer& peer) {
+      peer.write(start);
+      while (peer.write(repeated)) {
+      }
+    };
+  };
+  const std::string kilobyte(1000, 'a');
+  const std::pair<double, ScriptedServer::Script> cases[] = {
+      {60, endless("HTTP/1.1 200 OK\r\n", "X-More: " + kilobyte + "\r\n")},
+      {60, endless("HTTP/1.1 200 OK\r\nX-More: ", kilobyte)},
+      {60, endless("", "HTTP/1.1 103 Early Hints\r\nX-More: " + kilobyte + "\r\n\r\n")},
+      {0.05, keepSilent},
+      {0.05,
        [](Peer& peer) {
          peer.write("HTTP/1.1 200 OK\r\nContent-Length: 5\r\n\r\nf");
          keepSilent(peer);
-       },
-       0,
-       {},
-       kTimedOut},
-      {"redirected POST", post("", "{}"), send(redirect), 302, "r", 0},
-      {"redirect not to be followed", unfollowed, send(redirect), 302, "r", 0},
-      {"redirect to plain http", get(""), send(redirect), 302, {}, 1},
-      {"redirect to a file",
-       get(""),
-       send("HTTP/1.1 301 Moved\r\nLocation: file:///etc/hosts\r\n\r\n"),
-       301,
-       {},
-       1},
-      {"redirect to https",
-       get(""),
-       send("HTTP/1.1 301 Moved\r\nLocation: https://127.0.0.1:1/\r\n\r\n"),
-       0,
-       {},
-       kCouldNotConnect},
-      {"another answer with a location", get(""),
-       send("HTTP/1.1 201 Created\r\nLocation: https://127.0.0.1:1/\r\nContent-Length: 1\r\n\r\nc"), 201, "c",
-       0},
+       }},
   };
-  for (const Case& c : cases) {
-    SCOPED_TRACE(c.name);
-    const ScriptedServer server([&c](Peer& peer) {
+  for (const auto& [limit, script] : cases) {
+    const ScriptedServer server([&script = script](Peer& peer) {
       peer.request();
-      c.script(peer);
+      script(peer);
     });
-    HTTPRequest request = c.request;
-    request.url = server.url();
+    HTTPRequest request = get(server.url());
+    request.timeout = limit;
     const HTTPResponse got = exchange(request);
-    EXPECT_EQ(got.status, c.status);
-    EXPECT_TRUE(got.body == c.body) << got.body.value_or("none").substr(0, 100);
-    EXPECT_EQ(got.error.has_value(), !c.body.has_value());
-    if (!got.error) continue;
-    EXPECT_EQ(got.error->domain, "http");
-    EXPECT_FALSE(got.error->message.empty());
-    EXPECT_TRUE(c.code < 0 || got.error->code == c.code) << describe(*got.error);
+    EXPECT_EQ(got.status, 0);
+    EXPECT_EQ(got.body, std::nullopt);
+    EXPECT_EQ(codeOf(got) == kTimedOut, limit < 60);
+    EXPECT_NE(codeOf(got), 0);
   }
 }
 
@@ -362,27 +322,20 @@ TEST_F(OverHTTP, WhatMustNotBeSentFailsWithoutAConnection) {
   const ScriptedServer server(echo);
   using namespace std::string_literals;
   std::vector<HTTPRequest> refused;
-  for (const auto& [name, value] :
-       std::vector<std::pair<std::string, std::string>>{{"X-A", "a\r\nX-B: b"},
-                                                        {"X-A", "a\nb"},
-                                                        {"X-A", "a\rb"},
-                                                        {"X-A", "a\0b"s},
-                                                        {"", "a"},
-                                                        {"X A", "a"},
-                                                        {"X-A:", "a"},
-                                                        {"X-A\r\nX-B", "a"},
-                                                        {"X-A\0"s, "a"},
-                                                        {"X-\xC3\xA4", "a"},
-                                                        {"Content-Length", "0"},
-                                                        {"transfer-encoding", "chunked"}}) {
+  for (const auto& value : {"a\r\nX-B: b"s, "a\nb"s, "a\rb"s, "a\0b"s}) {
     refused.push_back(get(server.url()));
-    refused.back().headers.set(name, value);
+    refused.back().headers.set("X-A", value);
+  }
+  for (const auto& name : {""s, "X A"s, "X-A:"s, "X-A\r\nX-B"s, "X-A\0"s, "X-\xC3\xA4"s, "Content-Length"s,
+                           "transfer-encoding"s}) {
+    refused.push_back(get(server.url()));
+    refused.back().headers.set(name, "0");
   }
   for (const auto* method : {"", "GET /x HTTP/1.1\r\nX:", "G T"}) {
     refused.push_back(get(server.url()));
     refused.back().method = method;
   }
-  for (const auto& url : {"file:///etc/hosts"s, "ftp://127.0.0.1/"s, "http://a.example/"s, "none"s, ""s,
+  for (const auto& url : {"file:///etc/hosts"s, "ftp://127.0.0.1/"s, "http://a.example/"s, ""s,
                           "http://localhost@a.example/"s, server.url("/ HTTP/1.1\r\nX: y")}) {
     refused.push_back(get(url));
   }
@@ -390,9 +343,9 @@ TEST_F(OverHTTP, WhatMustNotBeSentFailsWithoutAConnection) {
     const HTTPResponse got = exchange(request);
     EXPECT_EQ(got.status, 0) << request.url;
     EXPECT_EQ(got.body, std::nullopt) << request.url;
-    EXPECT_TRUE(got.error && got.error->domain == "http" && got.error->code != 0) << request.url;
+    EXPECT_NE(codeOf(got), 0) << request.url;
   }
-  EXPECT_EQ(server.connections(), 0U);
+  EXPECT_EQ(server.connections(), 0);
 }
 
 TEST_F(OverHTTP, FiftyRequestsAtOnceShareSixConnections) {
@@ -402,27 +355,24 @@ TEST_F(OverHTTP, FiftyRequestsAtOnceShareSixConnections) {
     if (waiting++ < 6) sixAtOnce.arrive_and_wait();
     echo(peer);
   });
-  std::vector<std::future<HTTPResponse>> replies;
-  replies.reserve(50);
-  for (int i = 0; i < 50; ++i) replies.push_back(start(get(server.url("/" + std::to_string(i)))));
+  std::map<std::string, std::future<HTTPResponse>> replies;
   for (int i = 0; i < 50; ++i) {
-    const HTTPResponse got = replies[static_cast<std::size_t>(i)].get();
-    EXPECT_EQ(got.status, 200) << i;
-    EXPECT_THAT(got.body.value_or(""), HasSubstr("GET /" + std::to_string(i) + " "));
+    const std::string path = "/" + std::to_string(i);
+    replies[path] = start(get(server.url(path)));
   }
-  EXPECT_EQ(server.mostConnectionsAtOnce(), 6U);
+  for (auto& [path, reply] : replies) EXPECT_THAT(*reply.get().body, HasSubstr("GET " + path + " "));
+  EXPECT_EQ(server.mostConnectionsAtOnce(), 6);
 }
 
 TEST_F(OverHTTP, TheTimeSpentWaitingForAConnectionCounts) {
   const ScriptedServer server(keepSilent);
   std::vector<std::future<HTTPResponse>> pending;
-  pending.reserve(6);
   for (int i = 0; i < 6; ++i) pending.push_back(start(get(server.url())));
   HTTPRequest brief = get(server.url());
   brief.timeout = 0.05;
-  EXPECT_EQ(exchange(brief).error.value_or(Error{}).code, kTimedOut);
+  EXPECT_EQ(codeOf(exchange(brief)), kTimedOut);
   endHTTP();
-  for (auto& reply : pending) EXPECT_EQ(reply.get().error.value_or(Error{}).code, kAborted);
+  for (auto& reply : pending) EXPECT_EQ(codeOf(reply.get()), kAborted);
 }
 
 TEST_F(OverHTTP, AReplyThatBlocksHoldsUpNobody) {
@@ -448,12 +398,12 @@ TEST_F(OverHTTP, EndingFailsWhatIsPendingAndWhatComesLater) {
   auto pending = start(get(server.url()));
   silent.wait();
   http().beginEnding();
-  EXPECT_EQ(pending.get().error.value_or(Error{}).code, kAborted);
-  EXPECT_EQ(exchange(get(server.url())).error.value_or(Error{}).code, kAborted);
+  EXPECT_EQ(codeOf(pending.get()), kAborted);
+  EXPECT_EQ(codeOf(exchange(get(server.url()))), kAborted);
   const auto session = http().newUncachedSession();
   endHTTP();
-  EXPECT_EQ(start(*session, get(server.url())).get().error.value_or(Error{}).code, kAborted);
-  EXPECT_EQ(server.connections(), 1U);
+  EXPECT_EQ(codeOf(start(*session, get(server.url())).get()), kAborted);
+  EXPECT_EQ(server.connections(), 1);
 }
 
 }  // namespace

@@ -10,19 +10,14 @@ using ::testing::IsEmpty;
 using ::testing::Key;
 
 TEST(ADevice, KeepsItsPropertiesThroughItsCodedForm) {
-  const KVRDevice device("Watch", "SN1", Date{86400}, KVRDevice::kWatch);
-  const auto decoded = KVRDevice::initWithCoder(device.encodeWithCoder());
-  EXPECT_EQ(decoded->name(), "Watch");
-  EXPECT_EQ(decoded->serialNumber(), "SN1");
-  EXPECT_EQ(decoded->activationDate(), Date{86400});
-  EXPECT_EQ(decoded->deviceType(), KVRDevice::kWatch);
-  EXPECT_EQ(device.description(), "Watch (SN1) (1970-01-02 00:00:00 +0000) - Watch");
+  const KVRDevice watch("Watch", "SN1", Date{86400}, KVRDevice::kWatch);
+  EXPECT_EQ(watch.description(), "Watch (SN1) (1970-01-02 00:00:00 +0000) - Watch");
+  EXPECT_EQ(KVRDevice::initWithCoder(watch.encodeWithCoder())->description(), watch.description());
 
   const KVRDevice bare(std::nullopt, std::nullopt, std::nullopt, 0xFFFFFFFFFFFFFFFF);
   EXPECT_EQ(bare.encodeWithCoder(), Value(Value::Dictionary{{"deviceType", 0xFFFFFFFFFFFFFFFF}}));
   EXPECT_EQ(KVRDevice::initWithCoder(bare.encodeWithCoder())->deviceType(), 0xFFFFFFFFFFFFFFFF);
   EXPECT_EQ(bare.description(), "(null) ((null)) ((null)) - Default");
-  EXPECT_STREQ(KVRDevice({}, {}, {}, KVRDevice::kOther).deviceTypeString(), "Other");
 
   const auto wrong = KVRDevice::initWithCoder(Value::Dictionary{
       {"name", 7}, {"serialNumber", Value::Array{}}, {"activationDate", 5}, {"deviceType", "1"}});
@@ -39,33 +34,15 @@ class ADeviceInfo : public SimulatedTest {
   }
 };
 
-TEST_F(ADeviceInfo, IsEqualForTheSameDeviceAndAnEqualWarranty) {
-  const auto device = KVRDevice::deviceWithName("P", "S", {}, 0);
-  const auto twin = KVRDevice::deviceWithName("P", "S", {}, 0);
-  const KVRDeviceInfo info(device, warranty(true));
-  EXPECT_TRUE(info.isEqual(KVRDeviceInfo(device, warranty(true))));
-  EXPECT_FALSE(info.isEqual(KVRDeviceInfo(device, warranty(false))));
-  EXPECT_FALSE(info.isEqual(KVRDeviceInfo(twin, warranty(true))));
-  const KVRDeviceInfo without(device, nullptr);
-  EXPECT_FALSE(without.isEqual(without));
-  EXPECT_FALSE(without.isEqual(info));
-  const KVRDeviceInfo nothing(nullptr, nullptr);
-  EXPECT_FALSE(nothing.isEqual(nothing));
-}
-
 TEST_F(ADeviceInfo, TellsItsOfferAndDecodesPartByPart) {
   const auto device = KVRDevice::deviceWithName("P", "S", {}, 0);
-  EXPECT_EQ(KVRDeviceInfo(device, warranty(true)).description(),
-            "P (S) ((null)) - Default: Eligible until 1970-01-02 00:00:00 +0000");
   EXPECT_EQ(KVRDeviceInfo(device, warranty(false)).description(), "P (S) ((null)) - Default: No offer");
   EXPECT_EQ(KVRDeviceInfo(device, nullptr).description(), "P (S) ((null)) - Default: No offer");
-
-  const KVRDeviceInfo info(device, warranty(true));
-  const auto decoded = KVRDeviceInfo::initWithCoder(simulated.platform, info.encodeWithCoder());
-  EXPECT_EQ(decoded->description(), info.description());
-  const auto half = KVRDeviceInfo::initWithCoder(
-      simulated.platform,
-      Value::Dictionary{{"device", "x"}, {"warranty", warranty(true)->encodeWithCoder()}});
+  Value coded = KVRDeviceInfo(device, warranty(true)).encodeWithCoder();
+  EXPECT_EQ(KVRDeviceInfo::initWithCoder(simulated.platform, coded)->description(),
+            "P (S) ((null)) - Default: Eligible until 1970-01-02 00:00:00 +0000");
+  coded = Value::Dictionary{{"device", "x"}, {"warranty", coded["warranty"]}};
+  const auto half = KVRDeviceInfo::initWithCoder(simulated.platform, coded);
   EXPECT_EQ(half->device(), nullptr);
   EXPECT_NE(half->warranty(), nullptr);
 }
@@ -88,13 +65,6 @@ class TheDevicesManager : public ::testing::Test {
 
   CoverageWorld world;
 };
-
-TEST_F(TheDevicesManager, IsOneForAPlatformAndBuildsNewRecords) {
-  EXPECT_EQ(&manager(), &manager());
-  CoverageWorld other;
-  EXPECT_NE(&manager(), KVRDevicesManager::sharedManager(other.platform).get());
-  EXPECT_NE(manager().defaultDevice(), manager().defaultDevice());
-}
 
 TEST_F(TheDevicesManager, FindsTheWatchesThatArePairedNow) {
   world.preferences.setObject(Date{77}, "DefaultDeviceActivationDate");

@@ -11,7 +11,6 @@ struct Described {
 
 TEST(AMessage, IsFilledInItsOwnOrder) {
   const char* const absent = nullptr;
-  EXPECT_EQ(format("nothing to fill"), "nothing to fill");
   EXPECT_EQ(format("%s: %d, %ld and %lu", "name", -1, std::int64_t{-5'000'000'000}, ~0ULL),
             "name: -1, -5000000000 and 18446744073709551615");
   EXPECT_EQ(format("%d%d", true, std::uint8_t{200}), "1200");
@@ -23,17 +22,6 @@ TEST(AMessage, IsFilledInItsOwnOrder) {
   EXPECT_EQ(format("%@ %@", std::optional<std::string>("there"), std::optional<Date>()), "there (null)");
   EXPECT_EQ(format("%@%@", std::vector<std::string>{"a", "b"}, std::vector<Described>{}), "(a, b)()");
   EXPECT_EQ(format("%@", Error{"files", 2, "missing"}), "Error Domain=files Code=2 \"missing\"");
-}
-
-TEST(APrivateValue, IsWrittenOnlyWhenRevealed) {
-  const std::string secret = "secret";
-  const auto filled = [&](bool reveal) {
-    const format_detail::Argument arguments[] = {format_detail::argument(secret),
-                                                 format_detail::argument("open")};
-    return format_detail::fill("%{private}@ and %@", arguments, reveal);
-  };
-  EXPECT_EQ(filled(false), "<private> and open");
-  EXPECT_EQ(filled(true), "secret and open");
 }
 
 }  // namespace

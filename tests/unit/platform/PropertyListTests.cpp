@@ -1,11 +1,14 @@
 #include "platform/PropertyList.h"
 #include "unit/platform/Trees.h"
 
+#include <cmath>
+
 namespace kvr {
 namespace {
 
 constexpr auto kXML = PropertyListEncoding::XML;
 constexpr auto kBinary = PropertyListEncoding::Binary;
+constexpr auto kInfinity = std::numeric_limits<double>::infinity();
 
 /// ASCII text as UTF-16 with a byte order mark.
 std::string utf16(std::string_view text, bool bigEndian) {
@@ -18,57 +21,38 @@ std::string utf16(std::string_view text, bool bigEndian) {
   return out;
 }
 
+Value throughPropertyList(const Value& tree, PropertyListEncoding encoding) {
+  const auto written = writePropertyList(tree, encoding);
+  if (!written) return written.error().message;
+  const auto read = readPropertyList(*written);
+  return read ? *read : Value(read.error().message);
+}
+
 TEST(ATree, ComesBackEqualThroughEveryEncoding) {
   const auto tree = treeForEveryEncoding();
   const auto json = writeJSON(tree);
-  ASSERT_TRUE(json);
-  const auto fromJSON = readJSON(*json);
-  ASSERT_TRUE(fromJSON);
-  const auto xml = writePropertyList(*fromJSON, kXML);
-  ASSERT_TRUE(xml) << xml.error().message;
-  const auto fromXML = readPropertyList(*xml);
-  ASSERT_TRUE(fromXML) << fromXML.error().message;
-  const auto binary = writePropertyList(*fromXML, kBinary);
-  ASSERT_TRUE(binary) << binary.error().message;
-  const auto fromBinary = readPropertyList(*binary);
-  ASSERT_TRUE(fromBinary) << fromBinary.error().message;
-  EXPECT_TRUE(*fromBinary == tree);
+  const auto read = throughPropertyList(throughPropertyList(*readJSON(*json), kXML), kBinary);
+  EXPECT_TRUE(read == tree);
   // The text also tells -0.0 from 0.0 and 1.0 from 1, which compare equal.
-  EXPECT_TRUE(*writeJSON(*fromBinary) == *json);
+  EXPECT_TRUE(*writeJSON(read) == *json);
 }
 
 TEST(ATree, WithDatesDataAndSpecialRealsComesBackEqualFromPropertyLists) {
-  Value::Bytes bytes;
-  for (unsigned i = 0; i < 256; ++i) bytes.push_back(static_cast<std::uint8_t>(i));
-  constexpr auto kInfinity = std::numeric_limits<double>::infinity();
   const Value tree = Value::Dictionary{
-      {"data",
-       Value::Array{Value::Bytes{}, Value::Bytes{1}, Value::Bytes{1, 2}, Value::Bytes{1, 2, 3}, bytes}},
-      {"dates", Value::Array{Date{0}, Date{-1}, Date{1764000106}, Date{32503680000}, Date{-62167219201},
-                             Date{1e15}, Date{-1e15}}},
+      {"data", Value::Array{Value::Bytes{}, Value::Bytes{1}, Value::Bytes{1, 2}, Value::Bytes(256, 0xFF)}},
+      {"dates", Value::Array{Date{-1}, Date{1764000106}, Date{-62167219201}, Date{1e15}, Date{-1e15}}},
       {"reals", Value::Array{std::numeric_limits<double>::quiet_NaN(), kInfinity, -kInfinity}},
   };
-  for (const auto encoding : {kXML, kBinary}) {
-    const auto read = readPropertyList(*writePropertyList(tree, encoding));
-    ASSERT_TRUE(read) << read.error().message;
-    EXPECT_EQ(*read, tree);
-  }
+  for (const auto encoding : {kXML, kBinary}) EXPECT_EQ(throughPropertyList(tree, encoding), tree);
 }
 
 TEST(ATree, ThatXMLCannotHoldIsHeldByTheBinaryEncoding) {
-  const struct {
-    Value value;
-    std::string_view message;
-  } kCases[] = {
+  const std::pair<Value, std::string> kCases[] = {
       {Value(), "XML holds no null"},
       {std::string("\0", 1), "XML holds no such character"},
       {"\x01", "XML holds no such character"},
-      {"\x0b", "XML holds no such character"},
-      {"\x1f", "XML holds no such character"},
-      {"\uFFFE", "XML holds no such character"},
       {"\uFFFF", "XML holds no such character"},
       {Date{std::numeric_limits<double>::infinity()}, "XML holds no date outside the calendar"},
-      {Date{std::numeric_limits<double>::quiet_NaN()}, "XML holds no date outside the calendar"},
       {Date{-1.1e15}, "XML holds no date outside the calendar"},
   };
   for (const auto& [value, message] : kCases) {
@@ -78,18 +62,16 @@ TEST(ATree, ThatXMLCannotHoldIsHeldByTheBinaryEncoding) {
     for (const auto& tree : trees) {
       const auto xml = writePropertyList(tree, kXML);
       ASSERT_FALSE(xml);
-      EXPECT_EQ(xml.error(), (Error{"plist", 0, std::string(message)}));
-      const auto binary = writePropertyList(tree, kBinary);
-      ASSERT_TRUE(binary);
-      EXPECT_EQ(*readPropertyList(*binary), tree);
+      EXPECT_EQ(xml.error(), (Error{"plist", 0, message}));
+      EXPECT_EQ(throughPropertyList(tree, kBinary), tree);
     }
   }
 }
 
 TEST(ATree, IsWrittenUpToTheNestingThatIsRead) {
+  const auto deepest = nestedArrays(kMaximumDepth);
   for (const auto encoding : {kXML, kBinary}) {
-    const auto deepest = nestedArrays(kMaximumDepth);
-    EXPECT_EQ(*readPropertyList(*writePropertyList(deepest, encoding)), deepest);
+    EXPECT_EQ(throughPropertyList(deepest, encoding), deepest);
     EXPECT_FALSE(writePropertyList(nestedArrays(kMaximumDepth + 1), encoding));
   }
 }
@@ -133,6 +115,149 @@ TEST(APropertyList, IsNoneWhenItIsSomethingElse) {
       EXPECT_EQ(tree.error().domain, "plist");
     }
   }
+}
+
+TEST(AnASCIIPropertyList, IsReadAsStringsAndData) {
+  const TreesByText cases = {
+      {"{ a = 1; 'b c' = (x, \"y z\", ); d = { }; }",
+       Value::Dictionary{{"a", "1"}, {"b c", Value::Array{"x", "y z"}}, {"d", Value::Dictionary{}}}},
+      {"{a=1;a=2;}", Value::Dictionary{{"a", "2"}}},
+      {"(<0fbd77 1c2735AE>, <>)",
+       Value::Array{Value::Bytes{0x0f, 0xbd, 0x77, 0x1c, 0x27, 0x35, 0xae}, Value::Bytes{}}},
+      {"/path/to_it.x-$1:2", "/path/to_it.x-$1:2"},
+      {R"("\n\t\"\\\'\101\012\Ud83d\UDE00\U00e9\351\/")", "\n\t\"\\'A\n\U0001F600\u00e9\u00d8/"},
+      {"/* a */ { // b\n k /* = */ = v; } // c", Value::Dictionary{{"k", "v"}}},
+      {"\"KEY\" = \"text\";\n/* c */ OTHER = { a = (b); };\n",
+       Value::Dictionary{{"KEY", "text"}, {"OTHER", Value::Dictionary{{"a", Value::Array{"b"}}}}}},
+  };
+  expectTrees(readPropertyList, cases);
+}
+
+TEST(AnASCIIPropertyList, IsRefusedWithThePlaceOfItsFault) {
+  const FaultsByText cases = {
+      {"two words", "byte 4: more text after the end of the value"},
+      {"{ a = 1 }", "byte 8: no ';' after a dictionary's value"},
+      {"{ a 1; }", "byte 4: no '=' after a key"},
+      {"{ a = 1;", "byte 8: the text ends too early"},
+      {"(a b)", "byte 3: no ',' or ')' after an array's element"},
+      {"<0f0>", "byte 5: half a byte of data"},
+      {"<0g>", "byte 2: unexpected character in data"},
+      {R"("\q")", "byte 3: unknown escape"},
+      {R"("\U00g0")", "byte 5: \\U without four digits"},
+      {R"("\Ud83d\U0041")", "byte 13: half a character"},
+      {R"("\Ude00")", "byte 7: half a character"},
+      {"\"\xC3\"", "neither a binary nor an XML property list, and not text"},
+  };
+  expectFaults(readPropertyList, "plist", cases);
+}
+
+TEST(AnASCIIPropertyList, ThatIsHostileDoesNoHarm) {
+  for (const auto* start : {"(", "{k=", "a=(", "/*", "\"\\"}) {
+    EXPECT_FALSE(readPropertyList(repeated(start, 100'000)));
+  }
+  EXPECT_TRUE(readPropertyList(repeated("(", kMaximumDepth) + repeated(")", kMaximumDepth)));
+  EXPECT_FALSE(readPropertyList(repeated("(", kMaximumDepth + 1) + repeated(")", kMaximumDepth + 1)));
+  expectDamageIsHarmless("{ a = (1, \"\\U00e9\\101 \u00e9\", <0aFf 01>); /* c */ 'b' = { c = d; }; }",
+                         readPropertyList);
+}
+
+std::string document(std::string_view content) {
+  return "<plist version=\"1.0\">" + std::string(content) + "</plist>";
+}
+
+TEST(AnXMLElement, IsReadAsItsKind) {
+  const TreesByText cases = {
+      {"<integer>-0x1F</integer>", -31},
+      {"<integer>0XffffFFFFffffFFFF</integer>", std::numeric_limits<std::uint64_t>::max()},
+      {"<integer>-9223372036854775808</integer>", std::numeric_limits<std::int64_t>::min()},
+      {"<real>-.5e1</real>", -5.0},
+      {"<real>1e-400</real>", 0.0},
+      {"<real>NaN</real>", std::nan("")},
+      {"<real>+inf</real>", kInfinity},
+      {"<false> </false>", false},
+      {"<string> a&lt;&#13;&#x1F600;<![CDATA[<b>]]><!-- no --> </string>", " a<\r\U0001F600<b> "},
+      {"<date>2024-02-29T23:59:59Z</date>", Date{1709251199}},
+      {"<date>0000-01-01T00:00:00Z</date>", Date{-62167219200}},
+      {"<date>-0001-12-31T23:59:59Z</date>", Date{-62167219201}},
+      {"<date> 12345-06-07T08:09:10Z </date>", Date{327416976550}},
+      {"<data>\n\tAQID\r\n BA = =\n</data>", Value::Bytes{1, 2, 3, 4}},
+      {"<array><dict/><array></array></array>", Value::Array{Value::Dictionary{}, Value::Array{}}},
+      {"<dict><key>a</key><integer>1</integer><key/><true/><key>a</key><integer>2</integer></dict>",
+       Value::Dictionary{{"", true}, {"a", 2}}},
+  };
+  expectTrees([](std::string_view content) { return readPropertyList(document(content)); }, cases);
+}
+
+TEST(AnXMLElement, IsRefusedForATextOfAnotherKind) {
+  const std::pair<std::string, std::vector<std::string>> kCases[] = {
+      {"integer", {"", "abc", "1 2", "1.0", "--1", "0x", "18446744073709551616", "-9223372036854775809"}},
+      {"real", {"", "0,5", "1e999", "--1", "nano", "1x"}},
+      {"date", {"", "2024-01-01", "2024-01-01T00:00:00", "24-01-01T00:00:00Z", "2023-02-29T00:00:00Z"}},
+      {"date", {"2024-13-01T00:00:00Z", "2024-01-01T24:00:00Z", "2024-01-01T00:00:60Z"}},
+      {"date", {"99999999-01-01T00:00:00Z", "9999999999999999999-01-01T00:00:00Z"}},
+      {"data", {"A", "AQI", "AQ==AQID", "A===", "AQ*=", "AR=="}},
+      {"string", {"&unknown;", "&#0;", "\x01", "\xFF", "<b/>"}},
+      {"array", {"text", "<key>k</key>"}},
+      {"true", {"x", "<true/>"}},
+      {"dict", {"<true/>", "<key>k</key>", "<key>k</key><key>l</key><true/>", "<key>k</key><true/><true/>"}},
+      {"plist", {"", "text", "<true/><true/>", "<unknown/>", "<plist><true/></plist>", "<key>k</key>"}},
+  };
+  for (const auto& [name, texts] : kCases) {
+    for (const auto& text : texts) {
+      const auto element = "<" + name + ">" + text + "</" + name + ">";
+      EXPECT_FALSE(readPropertyList(name == "plist" ? element : document(element))) << element;
+    }
+  }
+}
+
+TEST(AnXMLPropertyList, IsReadInItsEncodingAndRefusedForAFaultOfTheDocument) {
+  const std::string latin = "<?xml version='1.0' encoding='ISO-8859-1'?>";
+  EXPECT_EQ(*readPropertyList(latin + document("<string>\xE9</string>")), Value("\u00e9"));
+  const std::string faulty[] = {latin + "<string>no root</string>", latin + document("<true/>") + "rest",
+                                "<?xml version='1.0' encoding='unknown-8'?>" + document("<true/>"),
+                                document("<array></dict>")};
+  for (const auto& text : faulty) EXPECT_FALSE(readPropertyList(text)) << text;
+  const auto fault = readPropertyList(document("<array>\n<integer>abc</integer>\n</array>"));
+  EXPECT_EQ(fault.error(), (Error{"plist", 0, "line 2: an element whose text is not of its kind"}));
+}
+
+TEST(AnXMLPropertyList, DeclaresNoEntitiesAndFetchesNone) {
+  const std::string content = document("<string>&e;</string>");
+  const std::string types[] = {
+      "<!DOCTYPE plist [<!ENTITY e 'text'>]>",
+      "<!DOCTYPE plist [<!ENTITY e SYSTEM 'file:///etc/hostname'>]>",
+      "<!DOCTYPE plist [<!ENTITY a 'aaaaaaaa'><!ENTITY b '&a;&a;&a;&a;'><!ENTITY e '&b;&b;&b;&b;'>]>",
+      "<!DOCTYPE plist [<!ENTITY % p SYSTEM 'file:///etc/hostname'> %p;]>",
+      "<!DOCTYPE plist SYSTEM 'file:///etc/hostname'>",
+      ""};
+  for (const auto& type : types)
+    EXPECT_FALSE(readPropertyList("<?xml version='1.0'?>" + type + content)) << type;
+}
+
+TEST(AnXMLPropertyList, IsWrittenAnElementALineWithoutDocumentType) {
+  const Value tree = Value::Dictionary{
+      {"a&b", Value::Array{1, 0.5, true, Date{-0.5}, Value::Array{}}},
+      {"d", Value::Bytes{1, 2, 3, 4}},
+      {"t", "x\r<\n"},
+  };
+  EXPECT_EQ(
+      *writePropertyList(tree, PropertyListEncoding::XML),
+      "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n<plist version=\"1.0\">\n<dict>\n\t<key>a&amp;b</key>\n"
+      "\t<array>\n\t\t<integer>1</integer>\n\t\t<real>0.5</real>\n\t\t<true/>\n"
+      "\t\t<date>1969-12-31T23:59:59Z</date>\n\t\t<array/>\n\t</array>\n\t<key>d</key>\n\t<data>\n"
+      "\tAQIDBA==\n\t</data>\n\t<key>t</key>\n\t<string>x&#13;&lt;\n</string>\n</dict>\n</plist>\n");
+}
+
+TEST(AnXMLPropertyList, ThatIsHostileDoesNoHarm) {
+  for (const auto* tag : {"<array>", "<dict><key>k</key>", "<unknown>"}) {
+    EXPECT_FALSE(readPropertyList("<plist>" + repeated(tag, 100'000)));
+  }
+  expectDamageIsHarmless(
+      "<?xml version='1.0' encoding='UTF-8'?><plist "
+      "version='1.0'><dict><key>k\u00e9</key><array><integer>-12</integer>"
+      "<real>1e3</real><true/><date>2024-02-29T00:00:00Z</date><data>AQIDBA==</data></array><key>s</key>"
+      "<string>&lt;\U0001F600&#13;</string></dict></plist>",
+      readPropertyList);
 }
 
 }  // namespace

@@ -45,6 +45,25 @@ inline std::string repeated(std::string_view text, std::size_t times) {
 }
 
 using TreeReader = std::function<Result<Value>(std::string_view)>;
+using TreesByText = std::vector<std::pair<std::string, Value>>;
+using FaultsByText = std::vector<std::pair<std::string, std::string>>;
+
+inline void expectTrees(const TreeReader& read, const TreesByText& cases) {
+  for (const auto& [text, tree] : cases) {
+    const auto found = read(text);
+    ASSERT_TRUE(found) << text << ": " << found.error().message;
+    EXPECT_EQ(*found, tree) << text;
+    EXPECT_EQ(found->kind(), tree.kind()) << text;
+  }
+}
+
+inline void expectFaults(const TreeReader& read, const std::string& domain, const FaultsByText& cases) {
+  for (const auto& [text, message] : cases) {
+    const auto found = read(text);
+    ASSERT_FALSE(found) << text;
+    EXPECT_EQ(found.error(), (Error{domain, 0, message})) << text;
+  }
+}
 
 /// Damages a sample in every place. What is cut short must be refused; of what is changed, whatever is still
 /// accepted must be a sound tree: one that can be written and read again.

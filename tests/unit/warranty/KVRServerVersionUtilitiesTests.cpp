@@ -6,6 +6,8 @@
 namespace kvr {
 namespace {
 
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
 using Utilities = KVRServerVersionUtilities;
 
 Value pairOf(Value low, Value high) {
@@ -14,88 +16,76 @@ Value pairOf(Value low, Value high) {
 
 std::string asset(const Value& tree) { return *writePropertyList(tree, PropertyListEncoding::XML); }
 
-class TheVersionNegotiation : public SimulatedTest {
- protected:
-  TheVersionNegotiation() { configure(simulated); }
-
-  static void configure(SimulatedPlatform& platform) {
-    platform.preferences.registerDefaults(
-        {{preference::kLowServerVersion, 2},
-         {preference::kHighServerVersion, 3},
-         {preference::kServerVersionURL, "https://assets.example/kvrV2.plist"}});
+/// A client that speaks versions 2 and 3, and the answers it comes to.
+struct Client : SimulatedPlatform {
+  Client() {
+    preferences.registerDefaults({{preference::kLowServerVersion, 2},
+                                  {preference::kHighServerVersion, 3},
+                                  {preference::kServerVersionURL, "https://assets.example/kvrV2.plist"}});
   }
-  /// What `supported` answers, run to its end.
-  static bool supported(SimulatedPlatform& world) {
+  bool supported() {
     std::optional<bool> answer;
     Utilities::serverVersionSupported(
-        world.platform, Utilities::BoolCompletion(world.log, "test", [&](bool yes) { answer = yes; }));
-    world.queues.run();
+        platform, Utilities::BoolCompletion(log, "test", [&](bool yes) { answer = yes; }));
+    queues.run();
     return answer.value();
   }
-  static bool highEnabled(SimulatedPlatform& world, std::uint64_t policy) {
+  bool highEnabled(std::uint64_t policy) {
     std::optional<bool> answer;
     Utilities::isHighServerVersionFeaturesetEnabled(
-        world.platform, policy,
-        Utilities::BoolCompletion(world.log, "test", [&](bool yes) { answer = yes; }));
-    world.queues.run();
+        platform, policy, Utilities::BoolCompletion(log, "test", [&](bool yes) { answer = yes; }));
+    queues.run();
     return answer.value();
   }
-  Value cache() const { return simulated.preferences.objectForKey(preference::kServerVersionCache); }
+  Value cache() const { return preferences.objectForKey(preference::kServerVersionCache); }
 };
 
-TEST_F(TheVersionNegotiation, SharesTheVersionsThatBothSidesSpeak) {
-  struct Case {
+TEST(TheVersionNegotiation, SharesTheVersionsThatBothSidesSpeak) {
+  const struct {
     Value server;
     bool supported;
     bool high;
-    const char* error;
-  };
-  const Case cases[] = {
-      {pairOf(2, 3), true, true, ""},
-      {pairOf(3, 4), true, true, ""},
-      {pairOf(1, 2), true, false, ""},
-      {pairOf("2", "3"), true, true, ""},
-      {pairOf("3rd", "x"), true, true, ""},
-      {pairOf(3.0, 9), true, true, ""},
-      {pairOf(1, 5), false, false, ""},
-      {pairOf(Value::Array{}, true), false, false, ""},
-      {Value::Dictionary{{"LowServerVersion", 2}}, false, false,
-       "Server version dictionary missing key 'HighServerVersion'"},
-      {Value::Dictionary{{"HighServerVersion", 3}}, false, false,
-       "Server version dictionary missing key 'LowServerVersion'"},
-      {"text", false, false, "Incorrect serverDictionary format"},
+    std::vector<std::string> errors;
+  } cases[] = {
+      {pairOf(3, 4), true, true, {}},
+      {pairOf(1, 2), true, false, {}},
+      {pairOf("2", "3"), true, true, {}},
+      {pairOf("3rd", "x"), true, true, {}},
+      {pairOf(3.0, 9), true, true, {}},
+      {pairOf(1, 5), false, false, {}},
+      {pairOf(Value::Array{}, true), false, false, {}},
+      {Value::Dictionary{{"LowServerVersion", 2}},
+       false,
+       false,
+       {"Server version dictionary missing key 'HighServerVersion'"}},
+      {"text", false, false, {"Incorrect serverDictionary format"}},
   };
   for (const auto& test : cases) {
-    SimulatedPlatform world;
-    configure(world);
-    world.preferences.setObject(test.server, preference::kServerVersionOverride);
-    EXPECT_EQ(supported(world), test.supported) << describe(test.server);
-    EXPECT_EQ(highEnabled(world, Utilities::kDefault), test.high) << describe(test.server);
-    EXPECT_EQ(Utilities::isHighServerVersionFeaturesetEnabled(world.platform), test.high);
-    EXPECT_EQ(world.preferences.objectForKey(preference::kServerVersionCache), test.server);
-    EXPECT_THAT(world.http.requests(), ::testing::IsEmpty());
-    if (*test.error != '\0') {
-      EXPECT_THAT(world.log.texts(LogLevel::Error), ::testing::Each(test.error));
-      EXPECT_FALSE(world.log.texts(LogLevel::Error).empty());
-    }
-    EXPECT_THAT(world.faults(), ::testing::IsEmpty());
+    SCOPED_TRACE(describe(test.server));
+    Client client;
+    client.preferences.setObject(test.server, preference::kServerVersionOverride);
+    EXPECT_EQ(client.supported(), test.supported);
+    EXPECT_EQ(client.log.texts(LogLevel::Error), test.errors);
+    EXPECT_EQ(client.highEnabled(Utilities::kDefault), test.high);
+    EXPECT_EQ(Utilities::isHighServerVersionFeaturesetEnabled(client.platform), test.high);
+    EXPECT_EQ(client.cache(), test.server);
+    EXPECT_THAT(client.http.requests(), IsEmpty());
+    EXPECT_THAT(client.faults(), IsEmpty());
   }
 }
 
-TEST_F(TheVersionNegotiation, TakesTheServersPairFromThePolicysSources) {
-  // Which source wins shows in the answer: only the cache {1, 2} lacks the high version, only the asset {3,
-  // 9} is stored anew.
+TEST(TheVersionNegotiation, TakesTheServersPairFromThePolicysSources) {
+  // Which source wins shows in the answer: only the cache lacks the high version, only the asset is stored
+  // anew.
   const Value cached = pairOf(1, 2);
   const Value published = pairOf(3, 9);
-  const Value client = pairOf(2, 3);
-  struct Case {
+  const struct {
     std::uint64_t policy;
     bool hasCache, hasAsset;
     bool high;
     std::size_t requests;
     Value cacheAfter;
-  };
-  const Case cases[] = {
+  } cases[] = {
       {Utilities::kDefault, true, true, false, 0, cached},
       {Utilities::kDefault, false, true, true, 1, published},
       {Utilities::kDefault, false, false, true, 1, {}},
@@ -105,98 +95,73 @@ TEST_F(TheVersionNegotiation, TakesTheServersPairFromThePolicysSources) {
       {Utilities::kCacheOnly, false, true, true, 0, {}},
       {Utilities::kRefresh, true, true, true, 1, published},
       {Utilities::kRefresh, true, false, false, 1, cached},
-      {Utilities::kRefresh, false, false, true, 1, client},
+      {Utilities::kRefresh, false, false, true, 1, pairOf(2, 3)},
   };
   for (const auto& test : cases) {
-    SimulatedPlatform world;
-    configure(world);
-    if (test.hasCache) world.preferences.setObject(cached, preference::kServerVersionCache);
-    if (test.hasAsset) world.http.respond(404, asset(published));  // the status plays no part
-    EXPECT_EQ(highEnabled(world, test.policy), test.high) << test.policy << test.hasCache << test.hasAsset;
-    EXPECT_EQ(world.http.requests().size(), test.requests) << test.policy << test.hasCache << test.hasAsset;
-    EXPECT_EQ(world.preferences.objectForKey(preference::kServerVersionCache), test.cacheAfter);
-    EXPECT_EQ(world.log.contains("Using Client version"),
+    SCOPED_TRACE(format("%d %d %d", test.policy, test.hasCache, test.hasAsset));
+    Client client;
+    if (test.hasCache) client.preferences.setObject(cached, preference::kServerVersionCache);
+    if (test.hasAsset) client.http.respond(404, asset(published));  // the status plays no part
+    EXPECT_EQ(client.highEnabled(test.policy), test.high);
+    EXPECT_EQ(client.http.requests().size(), test.requests);
+    EXPECT_EQ(client.cache(), test.cacheAfter);
+    EXPECT_EQ(client.log.contains("Using Client version"),
               !test.hasCache && (!test.hasAsset || test.requests == 0));
-    EXPECT_THAT(world.faults(), ::testing::IsEmpty());
+    EXPECT_THAT(client.faults(), IsEmpty());
   }
 }
 
-TEST_F(TheVersionNegotiation, AsksOnceMorePastTheCachesForAnAssetThatIsNoDictionary) {
-  simulated.http.respond(200, asset(Value::Array{1}));
-  simulated.http.respond(200, asset(pairOf(3, 3)));
-  EXPECT_TRUE(supported(simulated));
-  ASSERT_EQ(simulated.http.requests().size(), 2U);
-  EXPECT_FALSE(simulated.http.requests()[0].uncached);
-  EXPECT_TRUE(simulated.http.requests()[1].uncached);
-  EXPECT_EQ(cache(), pairOf(3, 3));
-  EXPECT_THAT(simulated.log.texts(LogLevel::Error),
-              ::testing::ElementsAre("Incorrect format in response detected. retrying..."));
-}
-
-TEST_F(TheVersionNegotiation, GoesOnWithTheNextSourceAfterAnyFailedFetch) {
+TEST(TheVersionNegotiation, GoesOnAfterAnyFailedFetchAndAsksOnceMoreForAnAssetThatIsNoDictionary) {
   const std::string url = "https://assets.example/kvrV2.plist";
-  struct Case {
-    std::function<void(SimulatedPlatform&)> script;
-    std::size_t requests;
+  const Value client = pairOf(2, 3);
+  const struct {
+    Value url;
+    std::vector<std::string> responses;
+    Value cacheAfter;
     std::string lastError;
-  };
-  const Case cases[] = {
-      {[](auto& world) {
-         world.http.fail(Error{"http", 7, "refused"});
-       },
-       1,
-       "Failed to fetch plist data from URL '" + url + "' with error: Error Domain=http Code=7 \"refused\""},
-      {[](auto& world) { world.http.respond(200, "<html>"); }, 1,
-       "Error serializing plist file from URL '" + url + "'"},
-      {[](auto& world) {
-         world.http.respond(200, "(1)");
-         world.http.respond(200, "(2)");
-       },
-       2,
+  } cases[] = {
+      {url, {"(1)", asset(pairOf(3, 3))}, pairOf(3, 3), "Incorrect format in response detected. retrying..."},
+      {url,
+       {"(1)", "(2)"},
+       client,
        "Incorrect format in response detected from URL '" + url +
            "'. Response: (2). Aborting without retry."},
-      {[](auto& world) { world.preferences.setObject("file:///nowhere", preference::kServerVersionURL); }, 0,
-       "Failed to fetch plist data from URL 'file:///nowhere'"},
-      {[](auto& world) { world.preferences.setObject(7, preference::kServerVersionURL); }, 0,
-       "Failed to fetch plist data from URL '7'"},
+      {url, {"<html>"}, client, "Error serializing plist file from URL '" + url + "'"},
+      {url,
+       {},
+       client,
+       "Failed to fetch plist data from URL '" + url + "' with error: Error Domain=http Code=7 \"refused\""},
+      {"file:///nowhere", {}, client, "Failed to fetch plist data from URL 'file:///nowhere'"},
+      {7, {}, client, "Failed to fetch plist data from URL '7'"},
   };
   for (const auto& test : cases) {
-    SimulatedPlatform world;
-    configure(world);
-    test.script(world);
-    EXPECT_TRUE(supported(world)) << test.lastError;
-    EXPECT_EQ(world.http.requests().size(), test.requests) << test.lastError;
+    SCOPED_TRACE(test.lastError);
+    Client world;
+    world.preferences.setObject(test.url, preference::kServerVersionURL);
+    for (const auto& response : test.responses) world.http.respond(200, response);
+    if (test.responses.empty()) world.http.fail(Error{"http", 7, "refused"});
+    EXPECT_TRUE(world.supported());
     EXPECT_THAT(world.log.texts(LogLevel::Error).back(), ::testing::StartsWith(test.lastError));
-    EXPECT_EQ(world.preferences.objectForKey(preference::kServerVersionCache), pairOf(2, 3));
-    EXPECT_THAT(world.faults(), ::testing::IsEmpty());
+    EXPECT_EQ(world.cache(), test.cacheAfter);
+    const auto& sent = world.http.requests();
+    for (std::size_t i = 0; i < sent.size(); ++i) EXPECT_EQ(sent[i].uncached, i > 0);
+    EXPECT_LE(sent.size(), 2U);
+    EXPECT_THAT(world.faults(), IsEmpty());
   }
 }
 
-TEST_F(TheVersionNegotiation, ReadsTheAssetFromAFileToo) {
-  simulated.files.put("/assets/versions.plist", asset(pairOf(3, 4)));
-  simulated.preferences.setObject("file:///assets/versions.plist", preference::kServerVersionURL);
-  EXPECT_TRUE(supported(simulated));
-  EXPECT_EQ(cache(), pairOf(3, 4));
-}
+TEST(TheVersionNegotiation, ReadsTheAssetFromAFileTooAndRemovesACacheThatIsNoDictionary) {
+  Client client;
+  client.files.put("/assets/versions.plist", asset(pairOf(3, 4)));
+  client.preferences.setObject("file:///assets/versions.plist", preference::kServerVersionURL);
+  EXPECT_TRUE(client.supported());
+  EXPECT_EQ(client.cache(), pairOf(3, 4));
 
-TEST_F(TheVersionNegotiation, RemovesACacheThatIsNoDictionary) {
-  simulated.preferences.setObject("3", preference::kServerVersionCache);
-  EXPECT_TRUE(Utilities::isHighServerVersionFeaturesetEnabled(simulated.platform));
-  EXPECT_EQ(cache(), Value());
-  EXPECT_THAT(simulated.log.texts(LogLevel::Error),
-              ::testing::ElementsAre("Incorrect format stored in server version cache. Removing it."));
-}
-
-TEST_F(TheVersionNegotiation, TellsInTheLogHowItCameToItsAnswer) {
-  simulated.http.respond(200, asset(pairOf(3, 4)));
-  EXPECT_TRUE(supported(simulated));
-  EXPECT_THAT(simulated.log.texts(),
-              ::testing::ElementsAre(
-                  " Server lookup policy:2",
-                  "Caching Server version  {HighServerVersion = 4; LowServerVersion = 3; }",
-                  "Server version  {HighServerVersion = 4; LowServerVersion = 3; }",
-                  "Server versions '{(3, 4)}'", "Client versions '{(2, 3)}'", "clientAndServerSet '{(3)}'",
-                  "Server version supported by client version - '{(3)}'"));
+  client.preferences.setObject("3", preference::kServerVersionCache);
+  EXPECT_TRUE(Utilities::isHighServerVersionFeaturesetEnabled(client.platform));
+  EXPECT_EQ(client.cache(), Value());
+  EXPECT_THAT(client.log.texts(LogLevel::Error),
+              ElementsAre("Incorrect format stored in server version cache. Removing it."));
 }
 
 }  // namespace

@@ -1,13 +1,16 @@
 #include "signing/SHA256Hash.h"
 #include "unit/SimulatedTest.h"
 #include "warranty/CacheMetadata.h"
-#include "warranty/KVRAgentDefaultWarrantyProvider.h"
+#include "warranty/KVRWarranty.h"
+#include "warranty/WarrantyKeys.h"
+
+#include <map>
+#include <set>
 
 namespace kvr {
 namespace {
 
 using ::testing::Each;
-using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 using ::testing::Not;
 
@@ -38,18 +41,10 @@ TEST_F(TheWarrantyCache, KeepsOneFileADeviceNamedByTheHash) {
   EXPECT_FALSE(cached("SN0000000002")->covered());
 }
 
-TEST_F(TheWarrantyCache, AnswersNothingForWhatIsMissingOrDamaged) {
+TEST_F(TheWarrantyCache, HasTheLegacyFileForNoDeviceOnly) {
   simulated.files.putPropertyList(kLegacyPath, Value::Dictionary{{"covered", true}});
-  EXPECT_EQ(cached("SN"), nullptr) << "the legacy file is nobody's";
+  EXPECT_EQ(cached("SN"), nullptr);
   EXPECT_NE(cached(std::nullopt), nullptr);
-
-  const auto path = std::string(kDirectory) + "/" + sha256Hash("SN") + "_Warranty.plist";
-  for (const char* bytes : {"", "<plist><dict><key>half", "bplist00garbage", "( an, array )"}) {
-    simulated.files.put(path, bytes);
-    simulated.log.clear();
-    EXPECT_EQ(cached("SN"), nullptr) << bytes;
-    EXPECT_EQ(simulated.log.texts(LogLevel::Error).size(), 1U) << bytes;
-  }
 }
 
 TEST_F(TheWarrantyCache, KeepsTheOldFileWhenTheNewTreeDoesNotFitOrCannotBeWritten) {
@@ -61,65 +56,43 @@ TEST_F(TheWarrantyCache, KeepsTheOldFileWhenTheNewTreeDoesNotFitOrCannotBeWritte
   EXPECT_TRUE(cached("SN")->covered());
 }
 
-TEST_F(TheWarrantyCache, AnswersTheProvidersQuestionsFromThePreferences) {
-  KVRAgentDefaultWarrantyProvider provider(simulated.platform, "com.example.client");
-  const CacheMetadata metadata("SN");
-  EXPECT_EQ(provider.lastUpdatedDateForSerialNumber("SN"), std::nullopt);
-  EXPECT_EQ(provider.cachedWarrantyValidityDuration(), 0);
-  EXPECT_EQ(provider.migrationVersion(), 0);
-  EXPECT_FALSE(provider.isSignedInToNimbra());
-
-  simulated.preferences.setObject(Date{5}, metadata.lastUpdatedDateKey);
-  simulated.preferences.setObject("fr_FR", metadata.localeKey);
-  simulated.preferences.setObject("2", metadata.versionKey);
-  provider.setMigrationVersion(3);
-  simulated.accounts.primary = CloudAccount{};
-  EXPECT_EQ(provider.lastUpdatedDateForSerialNumber("SN"), Date{5});
-  EXPECT_EQ(provider.cachedWarrantyLocaleForSerialNumber("SN"), "fr_FR");
-  EXPECT_EQ(provider.cachedWarrantyVersionForSerialNumber("SN"), "2");
-  EXPECT_EQ(provider.cachedWarrantyLocaleForSerialNumber("other"), std::nullopt);
-  EXPECT_EQ(provider.migrationVersion(), 3);
-  EXPECT_TRUE(provider.isSignedInToNimbra());
-}
-
 TEST_F(TheWarrantyCache, MigratesTheLegacyLayoutWithWhateverOfItIsThere) {
   const CacheMetadata metadata("SN");
-  struct Case {
-    bool file, date, locale, version;
-    bool dateMoves, localeMoves, versionMoves;
-  };
-  const Case cases[] = {
-      {true, true, true, true, true, true, true},      {true, false, false, false, false, false, false},
-      {true, true, false, true, true, false, false},   {true, false, true, false, false, true, false},
-      {true, false, false, true, false, false, false}, {false, true, true, true, false, false, false},
+  const std::string date = preference::kCachedWarrantyLastUpdatedDate;
+  const std::string locale = preference::kCachedWarrantyLocale;
+  const std::string version = preference::kCachedWarrantyVersion;
+  const std::map<std::string, std::string> keys = {
+      {date, metadata.lastUpdatedDateKey}, {locale, metadata.localeKey}, {version, metadata.versionKey}};
+  const struct {
+    bool hasFile;
+    std::set<std::string> entries, moved;
+  } cases[] = {
+      {true, {date, locale, version}, {date, locale, version}},
+      {true, {date, version}, {date}},
+      {true, {locale}, {locale}},
+      {true, {version}, {}},
+      {true, {}, {}},
+      {false, {date, locale, version}, {}},
   };
   for (const auto& test : cases) {
     SimulatedPlatform fresh;
     auto& preferences = fresh.preferences;
-    if (test.file) fresh.files.putPropertyList(kLegacyPath, Value::Dictionary{{"covered", true}});
-    if (test.date) preferences.setObject(Date{5}, preference::kCachedWarrantyLastUpdatedDate);
-    if (test.locale) preferences.setObject("en_US", preference::kCachedWarrantyLocale);
-    if (test.version) preferences.setObject("1", preference::kCachedWarrantyVersion);
-    if (!test.version) preferences.setObject("stale", metadata.versionKey);
+    if (test.hasFile) fresh.files.putPropertyList(kLegacyPath, Value::Dictionary{{"covered", true}});
+    const auto valueOf = [&](const std::string& key) { return key == date ? Value(Date{5}) : Value(key); };
+    for (const auto& key : test.entries) preferences.setObject(valueOf(key), key);
+    // A version of the time before the locale that is moved goes with that time.
+    if (test.moved.contains(locale)) preferences.setObject("stale", metadata.versionKey);
 
     const auto migrated =
         KVRWarranty::migrateLegacyCachedWarrantyIfNeededForSerialNumber(fresh.platform, "SN");
-    EXPECT_EQ(migrated != nullptr, test.file);
-    EXPECT_EQ(KVRWarranty::cachedWarrantyForSerialNumber(fresh.platform, "SN") != nullptr, test.file);
+    EXPECT_EQ(migrated != nullptr, test.hasFile);
+    EXPECT_EQ(KVRWarranty::cachedWarrantyForSerialNumber(fresh.platform, "SN") != nullptr, test.hasFile);
     EXPECT_FALSE(fresh.files.get(kLegacyPath).has_value());
-    const auto moved = [&](const char* from, const std::string& to, const Value& value, bool was,
-                           bool moves) {
-      EXPECT_EQ(preferences.objectForKey(from), was && !moves ? value : Value()) << from;
-      if (was || moves) {
-        EXPECT_EQ(preferences.objectForKey(to), moves ? value : Value()) << to;
-      }
-    };
-    moved(preference::kCachedWarrantyLastUpdatedDate, metadata.lastUpdatedDateKey, Date{5}, test.date,
-          test.dateMoves);
-    moved(preference::kCachedWarrantyLocale, metadata.localeKey, "en_US", test.locale, test.localeMoves);
-    moved(preference::kCachedWarrantyVersion, metadata.versionKey, "1", test.version, test.versionMoves);
-    if (!test.version) {
-      EXPECT_EQ(preferences.objectForKey(metadata.versionKey), test.localeMoves ? Value() : Value("stale"));
+    for (const auto& [from, to] : keys) {
+      const bool moves = test.moved.contains(from);
+      const bool stays = test.entries.contains(from) && !moves;
+      EXPECT_EQ(preferences.objectForKey(from), stays ? valueOf(from) : Value()) << from;
+      EXPECT_EQ(preferences.objectForKey(to), moves ? valueOf(from) : Value()) << to;
     }
     EXPECT_THAT(fresh.faults(), ::testing::IsEmpty());
   }

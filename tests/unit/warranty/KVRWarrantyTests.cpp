@@ -5,8 +5,6 @@
 namespace kvr {
 namespace {
 
-using ::testing::Contains;
-
 class AWarranty : public SimulatedTest {
  protected:
   AWarranty() { simulated.clock.set(Date{1'800'000'000}); }
@@ -14,11 +12,11 @@ class AWarranty : public SimulatedTest {
   std::shared_ptr<KVRWarranty> from(const Value& dictionary) {
     return KVRWarranty::initWithDictionary(simulated.platform, dictionary);
   }
-  Date inSeconds(double seconds) const { return simulated.clock.now() + seconds; }
   /// A warranty whose eligibility ends in so many seconds, with both forms of both offer texts.
   std::shared_ptr<KVRWarranty> eligibleFor(double seconds) {
     return from(Value::Dictionary{
-        {"zubOfferEligibleUntil", static_cast<std::int64_t>(inSeconds(seconds).secondsSince1970)},
+        {"zubOfferEligibleUntil",
+         static_cast<std::int64_t>((simulated.clock.now() + seconds).secondsSince1970)},
         {"zubLocalizedOfferPluralDescFormat", "%@ days left"},
         {"zubLocalizedOfferSingularDesc", "last day"},
         {"zubLocalizedOfferDetailsPluralEligibilityFormat", "within %@ days"},
@@ -37,57 +35,25 @@ TEST_F(AWarranty, IsNullOnlyWithoutADictionary) {
   ASSERT_NE(empty, nullptr);
   EXPECT_EQ(simulated.log.texts().back(), "+[KVRWarranty warrantyWithDictionary:serialNumber:] : 1");
   EXPECT_FALSE(empty->covered());
-  EXPECT_EQ(empty->zubOfferConversionDate(), std::nullopt);
-  EXPECT_EQ(empty->zubOfferDurationBeforeEndDate(), 0);
-  EXPECT_EQ(empty->coverageDetailsArray(), Value());
 }
 
 TEST_F(AWarranty, ReadsNumbersAsDatesByTheEpochRule) {
-  struct Case {
-    Value number;
-    std::optional<double> seconds;
-  };
-  const Case cases[] = {
+  const std::pair<Value, std::optional<double>> cases[] = {
       {1'700'000'000, 1'700'000'000},
       {1'700'000'000'000, 1'700'000'000},
       {10'000'000'000, 10'000'000'000},  // still seconds
       {10'000'000'001, 10'000'000},      // milliseconds, remainder dropped
-      {1'700'000'000.9, 1'700'000'000},
       {0, 0},
       {-5, 0},
-      {-5.5, 0},
       {18'446'744'073'709'551'615ULL, 18'446'744'073'709'551.0},
       {1e300, 18'446'744'073'709'551.0},
       {std::numeric_limits<double>::quiet_NaN(), 0},
       {"1700000000", std::nullopt},
-      {Value(), std::nullopt},
       {Date{5}, std::nullopt},
   };
-  for (const auto& test : cases) {
-    const auto date = from(Value::Dictionary{{"coverageEndDate", test.number}})->coverageEndDate();
-    EXPECT_EQ(date ? std::optional(date->secondsSince1970) : std::nullopt, test.seconds)
-        << describe(test.number);
-  }
-}
-
-TEST_F(AWarranty, ReadsBooleansAndDayCountsOfAnyKind) {
-  struct Case {
-    Value value;
-    bool truth;
-    double seconds;
-  };
-  const Case cases[] = {
-      {true, true, 86400},   {false, false, 0},          {1, true, 86400},    {0, false, 0},
-      {0.5, true, 43200},    {1.5, true, 129600},        {"YES", true, 0},    {" +07x", true, 7 * 86400.0},
-      {"1.5", true, 129600}, {"no", false, 0},           {"", false, 0},      {"0", false, 0},
-      {Value(), false, 0},   {Value::Array{}, false, 0}, {Date{9}, false, 0},
-  };
-  for (const auto& test : cases) {
-    const auto warranty = from(Value::Dictionary{
-        {"covered", test.value},
-        {"featureToggleParameters", Value::Dictionary{{"zubOfferDurationDaysBeforeEndDate", test.value}}}});
-    EXPECT_EQ(warranty->covered(), test.truth) << describe(test.value);
-    EXPECT_EQ(warranty->zubOfferDurationBeforeEndDate(), test.seconds) << describe(test.value);
+  for (const auto& [number, seconds] : cases) {
+    const auto date = from(Value::Dictionary{{"coverageEndDate", number}})->coverageEndDate();
+    EXPECT_EQ(date ? std::optional(date->secondsSince1970) : std::nullopt, seconds) << describe(number);
   }
 }
 
@@ -95,6 +61,7 @@ TEST_F(AWarranty, FindsEachKeyAtItsPlaceOnly) {
   const auto warranty = from(Value::Dictionary{
       {"featureToggleParameters", Value::Dictionary{{"zubOfferDisplay", true},
                                                     {"zubOfferBadgeBeforeEndDate", 5},
+                                                    {"zubOfferDurationDaysBeforeEndDate", "1.5"},
                                                     {"zubOfferToggle", Value::Array{"00101"}}}},
       {"zubOfferDisplay", false},
       {"coverage",
@@ -103,6 +70,7 @@ TEST_F(AWarranty, FindsEachKeyAtItsPlaceOnly) {
   });
   EXPECT_TRUE(warranty->zubOfferDisplay());
   EXPECT_EQ(warranty->zubOfferBadgeDurationBeforeEndDate(), 0);
+  EXPECT_EQ(warranty->zubOfferDurationBeforeEndDate(), 1.5 * 86400);
   EXPECT_EQ(warranty->zubOfferToggle(), Value(Value::Array{"00101"}));
   EXPECT_EQ(warranty->localizedCoverageDetailsTitle(), Value(7)) << "other kinds pass through";
   EXPECT_EQ(warranty->localizedBenefitsCardTitle(), Value("Card"));
@@ -115,13 +83,12 @@ TEST_F(AWarranty, FindsEachKeyAtItsPlaceOnly) {
 }
 
 TEST_F(AWarranty, TakesItsConversionDateFromTheFirstSourceThatHasOne) {
-  struct Case {
+  const Value end = 1'700'000'000;
+  const struct {
     Value override;
     Value::Dictionary dictionary;
     std::optional<Date> date;
-  };
-  const Value end = 1'700'000'000;
-  const Case cases[] = {
+  } cases[] = {
       {1'600'000'000, {{"zubOfferConversionDate", 1'650'000'000}}, Date{1'600'000'000}},
       {"1600000000", {{"zubOfferConversionDate", 1'650'000'000}}, Date{1'650'000'000}},
       {{}, {{"zubOfferConversionDate", 0}, {"coverageEndDate", end}}, std::nullopt},
@@ -139,17 +106,15 @@ TEST_F(AWarranty, TakesItsConversionDateFromTheFirstSourceThatHasOne) {
 
 TEST_F(AWarranty, CountsTheDaysLeftAndChoosesTheOfferTextByThem) {
   constexpr double kDay = 86400;
-  struct Case {
+  const struct {
     double secondsLeft;
     Value dayLength;
     std::uint32_t days;
     const char* offer;
     const char* eligibility;
-  };
-  const Case cases[] = {
+  } cases[] = {
       {2 * kDay + 1, {}, 3, "3 days left", "within 3 days"},
       {1.5 * kDay, {}, 2, "2 days left", "within 2 days"},
-      {36000, {}, 1, "last day", "today"},
       {1, {}, 1, "last day", "today"},
       {-1, {}, 0, "last day", "today"},
       {7200, 3600, 2, "2 days left", "within 2 days"},
@@ -168,25 +133,19 @@ TEST_F(AWarranty, CountsTheDaysLeftAndChoosesTheOfferTextByThem) {
 }
 
 TEST_F(AWarranty, FillsOnlyItsOwnPlaceholderInTextsFromTheService) {
-  const std::pair<const char*, const char*> cases[] = {
+  const std::pair<Value, Value> cases[] = {
       {"%1$@ jours", "3 jours"},
       {"100%% for %@", "100% for 3"},
       {"%@ of %@", "3 of %@"},
       {"%s%n%d %", "%s%n%d %"},
-      {"", ""},
+      {7, Value()},
   };
-  for (const auto& [format, text] : cases) {
-    auto warranty = eligibleFor(3 * 86400.0);
-    warranty->zubLocalizedOfferPluralDescFormat = format;
-    EXPECT_EQ(warranty->zubLocalizedOfferDesc(), Value(text));
-  }
-}
-
-TEST_F(AWarranty, ReportsAPluralFormatThatIsNoString) {
   auto warranty = eligibleFor(3 * 86400.0);
-  warranty->zubLocalizedOfferPluralDescFormat = 7;
+  for (const auto& [format, text] : cases) {
+    warranty->zubLocalizedOfferPluralDescFormat = format;
+    EXPECT_EQ(warranty->zubLocalizedOfferDesc(), text);
+  }
   warranty->zubLocalizedOfferDetailsPluralEligibilityFormat = Value();
-  EXPECT_EQ(warranty->zubLocalizedOfferDesc(), Value());
   EXPECT_EQ(warranty->zubLocalizedOfferDetailsEligibility(), Value());
   EXPECT_THAT(
       simulated.log.texts(LogLevel::Error),
@@ -204,15 +163,12 @@ TEST_F(AWarranty, IsItsDictionaryForEqualityAndCoding) {
   EXPECT_FALSE(warranty->isEqual(*from(Value::Dictionary{{"covered", true}})));
 
   const auto decoded = KVRWarranty::initWithCoder(simulated.platform, warranty->encodeWithCoder());
-  ASSERT_NE(decoded, nullptr);
   EXPECT_TRUE(decoded->isEqual(*warranty));
   EXPECT_TRUE(decoded->covered()) << "properties are read from the dictionary again";
 
-  const Value data = Value::Bytes{1};
-  EXPECT_EQ(KVRWarranty::initWithCoder(simulated.platform,
-                                       Value::Dictionary{{"DictionaryRepresentation",
-                                                          Value::Dictionary{{"x", Value::Array{data}}}}}),
-            nullptr);
+  const Value data = Value::Dictionary{{"x", Value::Bytes{1}}};
+  EXPECT_FALSE(
+      KVRWarranty::initWithCoder(simulated.platform, Value::Dictionary{{"DictionaryRepresentation", data}}));
 }
 
 }  // namespace
