@@ -16,25 +16,38 @@ namespace {
 
 constexpr double kEndingLimit = 10;  // seconds
 
-/// Termination signals end the main loop; blocked here, before any thread starts, so that the loop gets them.
-void handleSignals(kvr::EventLoop& loop) {
+/// Termination signals, blocked before any thread starts so that the loop gets them.
+void blockSignals() {
   std::signal(SIGPIPE, SIG_IGN);
   sigset_t signals;
   sigemptyset(&signals);
   sigaddset(&signals, SIGTERM);
   sigaddset(&signals, SIGINT);
   pthread_sigmask(SIG_BLOCK, &signals, nullptr);
-  const auto end = [](sd_event_source*, const signalfd_siginfo*, void* context) {
-    static_cast<kvr::EventLoop*>(context)->exit(EXIT_SUCCESS);
-    return 0;
-  };
-  for (const int signal : {SIGTERM, SIGINT}) sd_event_add_signal(loop.event(), nullptr, signal, end, &loop);
 }
 
+/// What a termination signal ends.
+struct Ending {
+  kvr::EventLoop& loop;
+  kvr::LocalPlatform& local;
+
+  void handleSignals() {
+    const auto end = [](sd_event_source*, const signalfd_siginfo*, void* context) {
+      auto& ending = *static_cast<Ending*>(context);
+      ending.local.beginEnding();
+      ending.loop.exit(EXIT_SUCCESS);
+      return 0;
+    };
+    for (const int signal : {SIGTERM, SIGINT}) sd_event_add_signal(loop.event(), nullptr, signal, end, this);
+  }
+};
+
 int run() {
+  blockSignals();
   kvr::EventLoop loop;
-  handleSignals(loop);
   kvr::LocalPlatform local(loop, [&loop] { loop.exit(EXIT_FAILURE); });
+  Ending ending{loop, local};
+  ending.handleSignals();
   int status = EXIT_SUCCESS;
   {
     const kvr::StartUp startUp(local.platform);

@@ -2,6 +2,7 @@
 
 #include "agent/AgentKeys.h"
 #include "agent/Configuration.h"
+#include "followup/KVRFollowUp.h"
 #include "followup/KVRFollowUpPost.h"
 #include "followup/KVRFollowUpRefresh.h"
 #include "scheduling/KVRConversionOutreachActivity.h"
@@ -19,9 +20,9 @@ StartUp::StartUp(Platform& platform) : delegate_(platform) {
   monitor(platform, std::make_shared<KVROutreachActivity>(platform));
   monitor(platform, std::make_shared<KVRConversionOutreachActivity>(platform));
   monitor(platform, std::make_shared<KVRFollowUpRefresh>(platform));
-  resumeFollowUpPost(platform);
   agent_ = KVRAgent::initWithCallingProcessBundleID(platform, kPreferencesBundleID);
   agent_->performMigrationIfNeeded();
+  resumeFollowUps(platform);
   localeMonitor_ = KVRLocaleMonitor::initWithAgent(platform, agent_);
   localeMonitor_->start();
   pairedDevicesMonitor_ = KVRPairedDevicesMonitor::initWithAgent(platform, agent_);
@@ -32,11 +33,17 @@ StartUp::StartUp(Platform& platform) : delegate_(platform) {
 }
 
 /// The follow-up post activity is no long-lived one: it exists only while it is scheduled. What an earlier
-/// start scheduled has to come to its run in this one, or its follow-ups would be lost.
-void StartUp::resumeFollowUpPost(Platform& platform) {
-  const auto scheduler =
+/// start scheduled has to come to its run in this one, or its follow-ups would be lost; and what is shown has
+/// to have a refresh to come, which an earlier start may have died before scheduling.
+void StartUp::resumeFollowUps(Platform& platform) {
+  const auto post =
       KVRScheduler::newSchedulerWithActivityDelegate(platform, std::make_shared<KVRFollowUpPost>(platform));
-  if (scheduler->scheduledActivityDate()) scheduler->monitorForScheduledActivity();
+  if (post->scheduledActivityDate()) post->monitorForScheduledActivity();
+  const auto refresh = KVRScheduler::newSchedulerWithActivityDelegate(
+      platform, std::make_shared<KVRFollowUpRefresh>(platform));
+  if (!refresh->scheduledActivityDate() && KVRFollowUp(platform).pendingFollowUpCount() > 0) {
+    refresh->scheduleActivityForDate(platform.clock.now());
+  }
 }
 
 void StartUp::monitor(Platform& platform, const std::shared_ptr<KVRSchedulerActivityDelegate>& activity) {

@@ -20,7 +20,7 @@ class StartUp {
   explicit StartUp(Platform& platform);
 
  private:
-  static void resumeFollowUpPost(Platform& platform);
+  static void resumeFollowUps(Platform& platform);
   void monitor(Platform& platform, const std::shared_ptr<KVRSchedulerActivityDelegate>& activity);
 
   std::vector<std::shared_ptr<KVRScheduler>> schedulers_;

@@ -97,7 +97,9 @@ constexpr ConversionOutcome conversionOutcome(std::optional<Date> dismissed,
 /// Whether a row carries a badge: the warranty wants one, the end is near enough, and has not come.
 constexpr bool showsRowBadge(bool isWanted, std::optional<Date> eligibleUntil, double durationBeforeEnd,
                              Date now) {
-  return isWanted && eligibleUntil && *eligibleUntil - durationBeforeEnd<now&& * eligibleUntil> now;
+  if (!isWanted || !eligibleUntil) return false;
+  const bool isNearEnough = *eligibleUntil - durationBeforeEnd < now;
+  return isNearEnough && now < *eligibleUntil;
 }
 
 }  // namespace kvr

@@ -16,56 +16,42 @@ constexpr double kDeferCheckInterval = 2'000'000'000;  // seconds
 
 }  // namespace
 
-/// One run's answer. A run that was deferred while it waited for its devices still does its work when they
-/// come; the answer that it then has is dropped.
-class KVRFollowUpPost::Run {
- public:
-  Run(Log& log, ActivityHandler handler) : log_(log), handler_(std::move(handler)) {}
-
-  void answer(ActivityResult result) {
-    if (answered_.exchange(true)) {
-      log_.debug("FollowUp Post activity was answered already, result %d dropped",
-                 static_cast<std::int64_t>(result));
-      return;
-    }
-    handler_(result);
-  }
-
- private:
-  Log& log_;
-  const ActivityHandler handler_;
-  std::atomic<bool> answered_{false};
-};
-
 std::string KVRFollowUpPost::identifier() const { return activity::kFollowUpPost; }
 
 void KVRFollowUpPost::performActivityForScheduler(const std::shared_ptr<KVRScheduler>& scheduler,
                                                   ActivityHandler withCompletionHandler) {
   followUpPostInProgress = true;
-  const auto run = std::make_shared<Run>(platform_.log, std::move(withCompletionHandler));
-  startDeferCheck(run, scheduler);
+  const auto answer = std::make_shared<RunAnswer>(platform_.log, std::move(withCompletionHandler));
+  startDeferCheck(answer, scheduler);
   deviceInfosQuery_(LookupPolicy::kRefresh,
                     DeviceInfosAnswer(platform_.log, "KVRFollowUpPost",
-                                      [self = shared_from_this(), run,
+                                      [self = shared_from_this(), answer,
                                        scheduler](const std::optional<KVRDeviceInfoList>& list) {
-                                        if (scheduler->isEnding()) return self->defer(*run);
-                                        self->handle(list, *run);
+                                        if (scheduler->isEnding()) return self->defer(*answer);
+                                        self->handle(list, *answer);
                                       }));
 }
 
-void KVRFollowUpPost::startDeferCheck(const std::shared_ptr<Run>& run,
+/// The check keeps nothing alive: a run whose answer is dropped on the way has come to its end.
+void KVRFollowUpPost::startDeferCheck(const std::shared_ptr<RunAnswer>& answer,
                                       const std::shared_ptr<KVRScheduler>& scheduler) {
-  followUpPostTimer = platform_.queues.newRepeatingTimer(
-      kDeferCheckInterval, platform_.queues.mainQueue(), [activity = weak_from_this(), run, scheduler] {
-        const auto self = activity.lock();
-        if (self && self->followUpPostInProgress && scheduler->shouldDefer()) self->defer(*run);
-      });
+  followUpPostTimer =
+      platform_.queues.newRepeatingTimer(kDeferCheckInterval, platform_.queues.mainQueue(),
+                                         [weakSelf = weak_from_this(), weakAnswer = std::weak_ptr(answer),
+                                          weakScheduler = std::weak_ptr(scheduler)] {
+                                           const auto self = weakSelf.lock();
+                                           const auto pending = weakAnswer.lock();
+                                           const auto running = weakScheduler.lock();
+                                           if (!self || !pending || !running) return;
+                                           if (self->followUpPostInProgress && running->shouldDefer())
+                                             self->defer(*pending);
+                                         });
 }
 
-void KVRFollowUpPost::defer(Run& run) {
+void KVRFollowUpPost::defer(RunAnswer& answer) {
   platform_.log.standard("FollowUp Post activity deferred.");
   stopDeferCheck();
-  run.answer(ActivityResult::Deferred);
+  answer.give(ActivityResult::Deferred);
 }
 
 void KVRFollowUpPost::stopDeferCheck() {
@@ -73,7 +59,7 @@ void KVRFollowUpPost::stopDeferCheck() {
   followUpPostTimer = nullptr;
 }
 
-void KVRFollowUpPost::handle(const std::optional<KVRDeviceInfoList>& devicesInfo, Run& run) {
+void KVRFollowUpPost::handle(const std::optional<KVRDeviceInfoList>& devicesInfo, RunAnswer& answer) {
   platform_.log.standard("%s -> %@", kPerform, devicesInfo);
   if (devicesInfo) {
     postAndSchedule(*devicesInfo);
@@ -82,7 +68,7 @@ void KVRFollowUpPost::handle(const std::optional<KVRDeviceInfoList>& devicesInfo
   }
   followUpPostInProgress = false;
   stopDeferCheck();
-  run.answer(devicesInfo ? ActivityResult::Finished : ActivityResult::Deferred);
+  answer.give(devicesInfo ? ActivityResult::Finished : ActivityResult::Deferred);
 }
 
 void KVRFollowUpPost::postAndSchedule(const KVRDeviceInfoList& devicesInfo) {

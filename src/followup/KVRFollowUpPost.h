@@ -3,6 +3,7 @@
 #include "followup/DeviceInfosQuery.h"
 #include "platform/AtomicProperty.h"
 #include "scheduling/KVRSchedulerActivityDelegate.h"
+#include "scheduling/RunAnswer.h"
 
 #include <atomic>
 #include <memory>
@@ -36,11 +37,11 @@ class KVRFollowUpPost : public KVRSchedulerActivityDelegate,
   std::atomic<bool> followUpPostInProgress{false};
 
  private:
-  class Run;
-  void startDeferCheck(const std::shared_ptr<Run>& run, const std::shared_ptr<KVRScheduler>& scheduler);
-  void defer(Run& run);
+  void startDeferCheck(const std::shared_ptr<RunAnswer>& answer,
+                       const std::shared_ptr<KVRScheduler>& scheduler);
+  void defer(RunAnswer& answer);
   void stopDeferCheck();
-  void handle(const std::optional<KVRDeviceInfoList>& devicesInfo, Run& run);
+  void handle(const std::optional<KVRDeviceInfoList>& devicesInfo, RunAnswer& answer);
   void postAndSchedule(const KVRDeviceInfoList& devicesInfo);
 
   Platform& platform_;

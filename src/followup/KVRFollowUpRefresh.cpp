@@ -37,7 +37,7 @@ void KVRFollowUpRefresh::refreshAndSchedule(const KVRDeviceInfoList& devicesInfo
   }
   log.standard("Followup present, schedule refresh for %@", shown);
   const auto now = platform_.clock.now();
-  const auto date = followingRefreshDate(_refreshDateWithDevicesInfo(platform_, shown).value_or(now), now);
+  const auto date = followingRefreshDate(_refreshDateWithDevicesInfo(platform_, shown), now);
   log.standard("Schedule next refresh for %@", date);
   KVRScheduler::newSchedulerWithActivityDelegate(platform_, shared_from_this())
       ->scheduleActivityForDate(date);
@@ -49,10 +49,10 @@ std::optional<Date> KVRFollowUpRefresh::nextFollowUpRefreshDateWithDevicesInfo(
                          platform.preferences.doubleForKey(preference::kOneDayInterval), isInitialCall);
 }
 
-std::optional<Date> KVRFollowUpRefresh::_refreshDateWithDevicesInfo(Platform& platform,
-                                                                    const KVRDeviceInfoList& devicesInfo) {
+Date KVRFollowUpRefresh::_refreshDateWithDevicesInfo(Platform& platform,
+                                                     const KVRDeviceInfoList& devicesInfo) {
   const auto date = nextFollowUpRefreshDateWithDevicesInfo(platform, devicesInfo, true);
-  return date ? date : nextFollowUpRefreshDateWithDevicesInfo(platform, devicesInfo, false);
+  return date ? *date : *nextFollowUpRefreshDateWithDevicesInfo(platform, devicesInfo, false);
 }
 
 }  // namespace kvr

@@ -29,8 +29,7 @@ class KVRFollowUpRefresh : public KVRSchedulerActivityDelegate,
                                                                     const KVRDeviceInfoList& devicesInfo,
                                                                     bool isInitialCall);
   /// The initial form, or where that gives nothing although follow-ups are shown, the other.
-  static std::optional<Date> _refreshDateWithDevicesInfo(Platform& platform,
-                                                         const KVRDeviceInfoList& devicesInfo);
+  static Date _refreshDateWithDevicesInfo(Platform& platform, const KVRDeviceInfoList& devicesInfo);
 
  private:
   void refreshAndSchedule(const KVRDeviceInfoList& devicesInfo);

@@ -18,6 +18,9 @@ constexpr const char* kPriority = "priority";
 constexpr const char* kRegisteredDate = "registeredDate";
 constexpr const char* kDueDate = "dueDate";
 
+/// A date that has come while its run was being deferred, in seconds since.
+constexpr double kJustPassed = 1;
+
 /// What whole seconds, and the moments between a date's being stored and registered, may put between the two.
 constexpr double kRounding = 2;
 
@@ -103,13 +106,13 @@ ActivityBlock ActivityTable::checkIn(const std::string& identifier, ActivityBloc
   return std::exchange(entry.block, std::move(block));
 }
 
-bool ActivityTable::isRegisteredFor(const std::string& identifier, Date date) const {
+bool ActivityTable::isRegisteredFor(const std::string& identifier, Date date, const Now& now) const {
   const auto found = entries_.find(identifier);
   if (found == entries_.end() || !found->second.registration) return false;
   const auto& [criteria, registered, due] = *found->second.registration;
   const Date opens = registered + seconds(criteria.delay);
   // A date that had passed when it was registered opened its window at once.
-  return opens <= std::max(date, registered) + kRounding;
+  return opens <= std::max(date, now.date) + kRounding && due <= opens + seconds(criteria.gracePeriod);
 }
 
 // Occasions.
@@ -148,13 +151,23 @@ bool ActivityTable::isInTurn(const Entry& entry) const {
          });
 }
 
+/// Whether some occasion's run is under way, or about to be.
+bool ActivityTable::isServingOccasions(const Now& now) const {
+  return std::ranges::any_of(entries_, [&now](const auto& item) {
+    const Entry& entry = item.second;
+    if (!entry.occasion || !entry.block) return false;
+    return entry.run || (now.uptime >= entry.notBefore && now.date >= entry.earliest.value_or(now.date));
+  });
+}
+
 // What is due.
 
 /// Whether nothing but its date can be in the way of a run.
 bool ActivityTable::mayRun(const Entry& entry, const Now& now) const {
   if (!entry.block || entry.run || now.uptime < entry.notBefore) return false;
-  return isInTurn(entry) ||
-         (entry.registration && (now.networkReachable || !entry.registration->criteria.requiresNetwork));
+  if (isInTurn(entry)) return true;
+  return entry.registration && (now.networkReachable || !entry.registration->criteria.requiresNetwork) &&
+         !isServingOccasions(now);
 }
 
 /// The date of an entry that may run; nothing when it need not wait for one.
@@ -215,7 +228,7 @@ ActivityTable::Entry* ActivityTable::runningEntry(const std::string& identifier)
 
 void ActivityTable::setEarliestDate(const std::string& identifier, Date date, const Now& now) {
   Entry* const entry = runningEntry(identifier);
-  if (entry == nullptr || !std::isfinite(date.secondsSince1970) || date <= now.date) return;
+  if (entry == nullptr || !std::isfinite(date.secondsSince1970) || date <= now.date - kJustPassed) return;
   entry->run->earliest = date;
 }
 

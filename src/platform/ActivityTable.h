@@ -16,8 +16,8 @@ namespace kvr {
 /// seconds after it was registered and is `gracePeriod` seconds long; the *due date* is one point in it,
 /// drawn once. A *check-in* brings the block to run; without one a registration waits. An *occasion* is a
 /// reason of the platform's own to run an activity that has checked in: the system was upgraded, or started
-/// anew. Occasions are served one after the other, in the order noticed, so that none works on what another
-/// is about to change.
+/// anew. Occasions are served one after the other, in the order noticed, and before what is registered, so
+/// that none works on what another is about to change.
 ///
 ///     table.add("outreach", {.delay = 3600, .gracePeriod = 360}, block, now, 0.5);
 ///     const auto wait = table.secondsToNext(now);           // arm a timer
@@ -65,11 +65,12 @@ class ActivityTable {
   /// replaced. A run that is under way goes on and no longer concerns the registration.
   ActivityBlock add(const std::string& identifier, const ActivityCriteria& criteria, ActivityBlock block,
                     const Now& now, double draw);
-  /// Brings a block for whatever the identifier is or will be due for; a registration that was made with a block
-  /// keeps its own. Returns the block that is not needed.
+  /// Brings a block for whatever the identifier is or will be due for; a registration that was made with a
+  /// block keeps its own. Returns the block that is not needed.
   ActivityBlock checkIn(const std::string& identifier, ActivityBlock block);
-  /// Whether the activity is registered to run from `date` on (or earlier), and within its grace period.
-  bool isRegisteredFor(const std::string& identifier, Date date) const;
+  /// Whether the activity is registered to run from `date` on (or earlier, or as of now), and within its
+  /// grace period.
+  bool isRegisteredFor(const std::string& identifier, Date date, const Now& now) const;
 
   /// An occasion when none or another version is recorded. Nothing as the version (it cannot be found out) is
   /// one only when none is recorded. The version is recorded once the run has finished.
@@ -83,7 +84,7 @@ class ActivityTable {
   /// Seconds until something will be due, the network staying as it is; nothing when nothing will.
   std::optional<double> secondsToNext(const Now& now) const;
 
-  /// The date that the run under way waits for; one that is not ahead tells nothing.
+  /// The date that the run under way waits for; one that lies in the past tells nothing.
   void setEarliestDate(const std::string& identifier, Date date, const Now& now);
   /// To be called when the network has gone: runs that need it may be deferred for this reason.
   void noticeNetworkLoss();
@@ -127,6 +128,7 @@ class ActivityTable {
   Entry* runningEntry(const std::string& identifier);
   void noticeOccasion(const std::string& identifier, std::string record, std::string fact);
   bool isInTurn(const Entry& entry) const;
+  bool isServingOccasions(const Now& now) const;
   bool mayRun(const Entry& entry, const Now& now) const;
   std::optional<Date> dateOf(const Entry& entry) const;
   bool isDue(const Entry& entry, const Now& now) const;

@@ -119,7 +119,7 @@ void FileActivityScheduler::checkIn(const Handle& handle, ActivityBlock block) {
   {
     const std::lock_guard lock(mutex_);
     load();
-    if (expected && !table_.isRegisteredFor(identifier, expected->date)) {
+    if (expected && !table_.isRegisteredFor(identifier, expected->date, now())) {
       replaced = table_.add(identifier, expected->criteria, std::move(block), now(), fraction);
       changed = true;
     } else {
@@ -200,15 +200,19 @@ void FileActivityScheduler::startDue() {
     runs = table_.takeDue(moment);
     arm(table_.secondsToNext(moment));
   }
-  for (auto& run : runs) start(std::move(run));
+  // Whatever happens from here on, each run comes to its end.
+  std::vector<std::shared_ptr<RunEnd>> ends;
+  ends.reserve(runs.size());
+  for (const auto& run : runs) ends.push_back(std::make_shared<RunEnd>(*this, run.identifier, run.number));
+  for (std::size_t index = 0; index < runs.size(); ++index) start(std::move(runs[index].block), ends[index]);
 }
 
-void FileActivityScheduler::start(ActivityTable::Run run) {
-  queues_.concurrentQueue(Priority::Default)->async([this, alive = life(), run = std::move(run)] {
-    if (alive.expired()) return;
-    const auto end = std::make_shared<RunEnd>(*this, run.identifier, run.number);
-    run.block(ActivityHandler(log_, "activity run", [end](ActivityResult result) { end->tell(result); }));
-  });
+void FileActivityScheduler::start(ActivityBlock block, const std::shared_ptr<RunEnd>& end) {
+  queues_.concurrentQueue(Priority::Default)
+      ->async([&log = log_, alive = life(), block = std::move(block), end] {
+        if (alive.expired()) return;
+        block(ActivityHandler(log, "activity run", [end](ActivityResult result) { end->tell(result); }));
+      });
 }
 
 void FileActivityScheduler::end(const std::string& identifier, std::uint64_t number, ActivityResult result) {
@@ -239,22 +243,34 @@ void FileActivityScheduler::load() {
 }
 
 void FileActivityScheduler::save() {
-  const std::lock_guard saving(saving_);
+  bool adopted = false;
+  {
+    const std::lock_guard saving(saving_);
+    adopted = write();
+  }
+  if (adopted) startDue();
+}
+
+/// With the file to itself; whether registrations have come to light that could not be read before.
+bool FileActivityScheduler::write() {
+  bool adopted = false;
   const auto fileLock = lists_.files().lock(directory_);
   Value tree;
   {
     const std::lock_guard lock(mutex_);
     if (unreadable_) {
       const auto found = lists_.read(path_, kDictionary, kSetAside, ActivityTable::complaintAbout);
-      if (!found) return;  // which has been reported
+      if (!found) return false;  // which has been reported
       table_.adopt(*found);
       unreadable_ = false;
+      adopted = true;
     }
     tree = table_.tree();
   }
   if (const auto error = lists_.write(path_, tree, PropertyListEncoding::Binary)) {
     log_.error("the activities cannot be stored: %@", *error);
   }
+  return adopted;
 }
 
 }  // namespace kvr

@@ -74,8 +74,9 @@ class FileActivityScheduler : public ActivityScheduler {
   ActivityTable::Now now() const;
   double draw();
   void load();
-  void start(ActivityTable::Run run);
+  void start(ActivityBlock block, const std::shared_ptr<RunEnd>& end);
   void save();
+  bool write();
 
   PropertyListFiles& lists_;
   const Clock& clock_;
@@ -86,7 +87,6 @@ class FileActivityScheduler : public ActivityScheduler {
   const std::string directory_;
   const std::string path_;
   const ActivityOccasions occasions_;
-  const std::shared_ptr<const bool> life_ = std::make_shared<const bool>(true);
 
   std::mutex saving_;         ///< held while the file is written; taken before `mutex_`
   mutable std::mutex mutex_;  ///< guards what follows
@@ -96,6 +96,9 @@ class FileActivityScheduler : public ActivityScheduler {
   bool registrationsLost_ = false;
   bool networkReachable_ = true;
   bool ending_ = false;
+
+  /// Ends first: what goes with the rest finds nobody to tell.
+  const std::shared_ptr<const bool> life_ = std::make_shared<const bool>(true);
 };
 
 }  // namespace kvr

@@ -26,7 +26,8 @@ void KVROutreachActivityUtilities::performOutreachActivityForConversion(
     bool conversion, const std::shared_ptr<KVRScheduler>& withScheduler,
     const ActivityHandler& andCompletion) {
   outreachInProgress = true;
-  startDeferCheck(conversion, withScheduler, andCompletion);
+  const auto answer = std::make_shared<RunAnswer>(platform_.log, andCompletion);
+  startDeferCheck(conversion, answer, withScheduler);
   std::vector<KVRDeviceRef> devices;
   for (const auto& [serialNumber, device] : KVRDevicesManager::sharedManager(platform_)->allDevices()) {
     devices.push_back(device);
@@ -44,32 +45,38 @@ void KVROutreachActivityUtilities::performOutreachActivityForConversion(
         serialNumber,
         DownloadCompletion(platform_.log, "performOutreachActivity",
                            [self, serialNumber, conversion](bool success, const KVRWarrantyRef& warranty) {
+                             // Whatever becomes of it, the run must not wait for this download any more.
+                             const std::shared_ptr<void> left(nullptr,
+                                                              [&](void*) { self->downloads_.leave(); });
                              self->handleDownload(serialNumber, success, warranty, conversion);
-                             self->downloads_.leave();
                            }));
   }
   downloads_.notify(platform_.queues.concurrentQueue(Priority::Default),
-                    [self, conversion, withScheduler, andCompletion] {
-                      if (withScheduler->isEnding()) return self->defer(conversion, andCompletion);
-                      self->finish(conversion, andCompletion);
+                    [self, conversion, withScheduler, answer] {
+                      if (withScheduler->isEnding()) return self->defer(conversion, *answer);
+                      self->finish(conversion, *answer);
                     });
 }
 
-void KVROutreachActivityUtilities::startDeferCheck(bool conversion,
-                                                   const std::shared_ptr<KVRScheduler>& scheduler,
-                                                   const ActivityHandler& completion) {
+/// The check keeps nothing alive: a run whose answer is dropped on the way has come to its end.
+void KVROutreachActivityUtilities::startDeferCheck(bool conversion, const std::shared_ptr<RunAnswer>& answer,
+                                                   const std::shared_ptr<KVRScheduler>& scheduler) {
   outReachTimer = platform_.queues.newRepeatingTimer(
       kDeferCheckInterval, platform_.queues.mainQueue(),
-      [run = weak_from_this(), conversion, scheduler, completion] {
-        const auto self = run.lock();
-        if (self && self->outreachInProgress && scheduler->shouldDefer()) self->defer(conversion, completion);
+      [weakSelf = weak_from_this(), conversion, weakAnswer = std::weak_ptr(answer),
+       weakScheduler = std::weak_ptr(scheduler)] {
+        const auto self = weakSelf.lock();
+        const auto pending = weakAnswer.lock();
+        const auto running = weakScheduler.lock();
+        if (!self || !pending || !running) return;
+        if (self->outreachInProgress && running->shouldDefer()) self->defer(conversion, *pending);
       });
 }
 
-void KVROutreachActivityUtilities::defer(bool conversion, const ActivityHandler& completion) {
+void KVROutreachActivityUtilities::defer(bool conversion, RunAnswer& answer) {
   platform_.log.standard("Warranty download activity deferred. Conversion: %d", conversion);
   stopDeferCheck();
-  answer(completion, ActivityResult::Deferred);
+  answer.give(ActivityResult::Deferred);
 }
 
 void KVROutreachActivityUtilities::stopDeferCheck() {
@@ -103,7 +110,7 @@ void KVROutreachActivityUtilities::handleDownload(const std::optional<std::strin
   earliestPostDate_ = earlierPostDate(earliestPostDate_, candidate, now);
 }
 
-void KVROutreachActivityUtilities::finish(bool conversion, const ActivityHandler& completion) {
+void KVROutreachActivityUtilities::finish(bool conversion, RunAnswer& answer) {
   std::optional<Date> postDate;
   {
     const std::lock_guard lock(mutex_);
@@ -119,16 +126,7 @@ void KVROutreachActivityUtilities::finish(bool conversion, const ActivityHandler
   }
   outreachInProgress = false;
   stopDeferCheck();
-  answer(completion, ActivityResult::Finished);
-}
-
-void KVROutreachActivityUtilities::answer(const ActivityHandler& completion, ActivityResult result) {
-  if (answered_.exchange(true)) {
-    platform_.log.debug("Outreach run was answered already, result %d dropped",
-                        static_cast<std::int64_t>(result));
-    return;
-  }
-  completion(result);
+  answer.give(ActivityResult::Finished);
 }
 
 bool KVROutreachActivityUtilities::currentDeviceShouldReceiveOutreachForWarranty(

@@ -3,6 +3,7 @@
 #include "platform/AtomicProperty.h"
 #include "platform/Platform.h"
 #include "scheduling/KVRSchedulerActivityDelegate.h"
+#include "scheduling/RunAnswer.h"
 #include "warranty/KVRAgentWarrantyProvider.h"
 
 #include <atomic>
@@ -34,18 +35,16 @@ class KVROutreachActivityUtilities : public std::enable_shared_from_this<KVROutr
   std::atomic<bool> outreachInProgress{false};
 
  private:
-  void startDeferCheck(bool conversion, const std::shared_ptr<KVRScheduler>& scheduler,
-                       const ActivityHandler& completion);
-  void defer(bool conversion, const ActivityHandler& completion);
+  void startDeferCheck(bool conversion, const std::shared_ptr<RunAnswer>& answer,
+                       const std::shared_ptr<KVRScheduler>& scheduler);
   void stopDeferCheck();
+  void defer(bool conversion, RunAnswer& answer);
   void handleDownload(const std::optional<std::string>& serialNumber, bool success,
                       const KVRWarrantyRef& warranty, bool conversion);
-  void finish(bool conversion, const ActivityHandler& completion);
-  void answer(const ActivityHandler& completion, ActivityResult result);
+  void finish(bool conversion, RunAnswer& answer);
 
   Platform& platform_;
   WorkGroup downloads_;
-  std::atomic<bool> answered_{false};
   std::mutex mutex_;  ///< guards what follows
   std::optional<Date> earliestPostDate_;
 };

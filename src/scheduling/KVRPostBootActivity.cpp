@@ -14,6 +14,7 @@ std::string KVRPostBootActivity::identifier() const { return activity::kPostBoot
 void KVRPostBootActivity::performActivityForScheduler(const std::shared_ptr<KVRScheduler>& /*scheduler*/,
                                                       ActivityHandler withCompletionHandler) {
   if (platform_.preferences.boolForKey(preference::kPostUpgradeActivityCompleted)) {
+    const auto turn = KVRScheduler::takeTurn(platform_);
     registerAgain(std::make_shared<KVROutreachActivity>(platform_));
     if (const auto date = registerAgain(std::make_shared<KVRConversionOutreachActivity>(platform_))) {
       platform_.preferences.setObject(*date, preference::kConversionOutreachScheduledDate);

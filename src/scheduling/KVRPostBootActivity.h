@@ -5,8 +5,8 @@
 
 namespace kvr {
 
-/// Runs after every boot: registers again what still has a target date, each for that same date, and nothing
-/// else.
+/// Runs after every boot: registers outreach, conversion outreach and follow-up refresh again, each that has
+/// a target date, and for that same date.
 class KVRPostBootActivity : public KVRSchedulerActivityDelegate {
  public:
   explicit KVRPostBootActivity(Platform& platform) : platform_(platform) {}

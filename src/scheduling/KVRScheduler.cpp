@@ -3,6 +3,8 @@
 #include "scheduling/SchedulingKeys.h"
 
 #include <algorithm>
+#include <exception>
+#include <utility>
 
 namespace kvr {
 namespace {
@@ -20,6 +22,31 @@ ActivityCriteria criteria(double delay, bool requiresNetwork) {
   criteria.requiresNetwork = requiresNetwork;
   return criteria;
 }
+
+/// A result on its way to the platform. The end of the process does not wait for its time, and still delivers
+/// it.
+class HandBack {
+ public:
+  HandBack(ActivityHandler handler, ActivityResult result) : handler_(std::move(handler)), result_(result) {}
+  HandBack(const HandBack&) = delete;
+  HandBack& operator=(const HandBack&) = delete;
+  ~HandBack() {
+    try {
+      give();
+    } catch (const std::exception&) {
+      isGiven_ = true;  // the platform takes the run up again at the next start
+    }
+  }
+
+  void give() {
+    if (!std::exchange(isGiven_, true)) handler_(result_);
+  }
+
+ private:
+  const ActivityHandler handler_;
+  const ActivityResult result_;
+  bool isGiven_ = false;
+};
 
 }  // namespace
 
@@ -43,6 +70,13 @@ void KVRScheduler::clearScheduledActivities(Platform& platform) {
   }
 }
 
+std::unique_lock<std::recursive_mutex> KVRScheduler::takeTurn(Platform& platform) {
+  struct Turn {
+    std::recursive_mutex mutex;
+  };
+  return std::unique_lock(platform.sharedObjects.get<Turn>([] { return new Turn; })->mutex);
+}
+
 void KVRScheduler::monitorForScheduledActivity() {
   platform_.log.standard("monitorForScheduledActivity for '%@'", identifier());
   activity_->setPreregistered(true);
@@ -64,6 +98,7 @@ void KVRScheduler::scheduleActivityForDate(std::optional<Date> date) {
 }
 
 void KVRScheduler::_scheduleActivityWithDelay(double delay, std::optional<Date> forDate) {
+  const auto turn = takeTurn(platform_);
   platform_.log.standard("scheduled '%@' with delay: %.02f (%@)", identifier(), delay, forDate);
   activity_->setPreregistered(false);
   activity_->setCriteria(criteria(delay, activityDelegate()->requiresNetwork()));
@@ -105,7 +140,8 @@ void KVRScheduler::relay(ActivityResult result, const Value& startedFor, const A
     platform_.preferences.update(
         targetDateKey_, [&](const Value& stored) { return stored == startedFor ? Value() : stored; });
   }
-  platform_.queues.after(kHandBackDelay, platform_.queues.mainQueue(), [block, result] { block(result); });
+  platform_.queues.after(kHandBackDelay, platform_.queues.mainQueue(),
+                         [handBack = std::make_shared<HandBack>(block, result)] { handBack->give(); });
 }
 
 }  // namespace kvr

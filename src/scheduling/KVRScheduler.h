@@ -5,6 +5,7 @@
 #include "scheduling/KVRSchedulerActivityDelegate.h"
 
 #include <memory>
+#include <mutex>
 #include <optional>
 #include <string>
 
@@ -31,6 +32,11 @@ class KVRScheduler : public std::enable_shared_from_this<KVRScheduler> {
   /// Removes the target date of every activity. What the platform has registered stays registered.
   static void clearScheduledActivities(Platform& platform);
 
+  /// Held while a date is stored and its activity registered, so that of two schedulings the later one has
+  /// both. Whoever decides by a stored date holds it from reading to scheduling; it may be taken again
+  /// meanwhile.
+  static std::unique_lock<std::recursive_mutex> takeTurn(Platform& platform);
+
   /// Checks in for an activity that was scheduled by an earlier start, or that the platform runs by itself.
   void monitorForScheduledActivity();
   /// `delay` in seconds; one below zero makes a target date in the past.
@@ -44,8 +50,8 @@ class KVRScheduler : public std::enable_shared_from_this<KVRScheduler> {
 
   /// Whether the platform asks the running activity to stop and defer.
   bool shouldDefer() const { return activity_->shouldDefer().has_value(); }
-  /// Whether it asks because the process is ending. What a run is told from then on, that a download failed for
-  /// one, may be the end's doing: it must not count as the run's outcome.
+  /// Whether it asks because the process is ending. What a run is told from then on, that a download failed
+  /// for one, may be the end's doing: it must not count as the run's outcome.
   bool isEnding() const { return activity_->shouldDefer() == DeferralReason::ProcessEnding; }
   const std::string& identifier() const { return activity_->identifier(); }
 

@@ -12,8 +12,6 @@
 #include "warranty/KVRServerVersionUtilities.h"
 #include "warranty/WarrantyKeys.h"
 
-#include <mutex>
-
 namespace kvr {
 namespace {
 
@@ -40,11 +38,6 @@ std::optional<std::string> contentOf(Platform& platform, const std::string& path
   if (!contents || !*contents || (*contents)->bytes.empty()) return std::nullopt;
   return (*contents)->bytes;
 }
-
-/// Held while the conversion outreach is scheduled.
-struct ConversionOutreachTurn {
-  std::mutex mutex;
-};
 
 }  // namespace
 
@@ -213,9 +206,7 @@ void KVRWarrantyDownloader::_scheduleConversionOutreachIfRequiredForWarranty(
   }
   if (!date) return;
   // Downloads of several devices come here at once; of two dates, the earlier one has to stay.
-  const auto turn =
-      platform_.sharedObjects.get<ConversionOutreachTurn>([] { return new ConversionOutreachTurn; });
-  const std::lock_guard lock(turn->mutex);
+  const auto turn = KVRScheduler::takeTurn(platform_);
   const auto scheduled = platform_.preferences.dateForKey(preference::kConversionOutreachScheduledDate);
   if (scheduled && *date >= *scheduled) return;
   if (scheduled) {

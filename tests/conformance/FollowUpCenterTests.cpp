@@ -90,32 +90,5 @@ TEST_P(AFollowUpCenter, SetsADamagedListAsideAndGoesOn) {
   EXPECT_THAT(world.log.texts(LogLevel::Error), SizeIs(2));
 }
 
-TEST_P(AFollowUpCenter, LosesNothingToClientsAtTheSameTime) {
-  constexpr int kEach = 20;
-  const auto post = [this](const std::string& prefix) {
-    const auto own = center.newClient(kClient);
-    for (int i = 0; i < kEach; ++i) EXPECT_FALSE(own->postItem(itemNamed(prefix + std::to_string(i))));
-  };
-  std::thread other(post, "b");
-  post("a");
-  other.join();
-  EXPECT_THAT(pending(), SizeIs(2 * kEach));
-}
-
-TEST(ASimulatedFollowUpCenter, SaysWhyAPostOrClearFailed) {
-  FileWorld world(false);
-  SimulatedFiles files(world.clock);
-  PropertyListFiles lists(files, world.clock, world.log);
-  FileFollowUpCenter center(lists, world.clock);
-  const auto client = center.newClient(kClient);
-  EXPECT_FALSE(client->postItem(itemNamed("a")));
-  const Error full{"files", ENOSPC, "no space"};
-  files.setWriteFault(full);
-  EXPECT_EQ(client->postItem(itemNamed("b")), full);
-  EXPECT_EQ(client->clearPendingItems({"a"}), full);
-  files.setWriteFault(std::nullopt);
-  EXPECT_THAT(*client->pendingItems(), ElementsAre(itemNamed("a")));
-}
-
 }  // namespace
 }  // namespace kvr

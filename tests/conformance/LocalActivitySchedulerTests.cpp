@@ -119,20 +119,6 @@ TEST_F(ALocalScheduler, RunsWhatBecomesDueByItsTimer) {
   EXPECT_THAT(local.finish(), ElementsAre("a"));
 }
 
-TEST_F(ALocalScheduler, KeepsWhatIsRegisteredDuringARun) {
-  const auto local = start();
-  const auto activity = local->scheduler.newActivity("a");
-  activity->schedule([&](const ActivityHandler& handler) {
-    activity->setCriteria({86400, 0});
-    activity->schedule(local->recorder("again"));
-    handler(ActivityResult::Finished);
-    local->loop.exit(0);
-  });
-  local->loop.run();
-  EXPECT_THAT(local->finish(), IsEmpty());
-  EXPECT_EQ(stored()["activities"]["a"]["delay"], Value(86400));
-}
-
 TEST_F(ALocalScheduler, WaitsForTheNetworkWithoutAskingAgain) {
   setNetwork(false);
   const auto local = start();

@@ -7,6 +7,7 @@
 #include <array>
 #include <cerrno>
 #include <cstring>
+#include <exception>
 #include <system_error>
 #include <utility>
 
@@ -18,38 +19,50 @@ constexpr std::uint32_t kOwnEnd = IN_DELETE_SELF | IN_MOVE_SELF;
 
 }  // namespace
 
-FileWatch::FileWatch(EventLoop& loop, std::filesystem::path path, std::function<void()> changed)
+FileWatch::FileWatch(EventLoop& loop, Log& log, std::filesystem::path path, std::function<void()> changed)
     : loop_(loop),
       path_(std::move(path)),
-      name_(path_.filename().string()),
       changed_(std::move(changed)),
       inotify_(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC)) {
-  if (!inotify_) throw std::system_error(errno, std::generic_category(), "inotify_init1");
-  watch();
   const auto readable = [](sd_event_source*, int, std::uint32_t, void* self) {
-    static_cast<FileWatch*>(self)->readEvents();
+    try {
+      static_cast<FileWatch*>(self)->readEvents();
+    } catch (const std::exception&) {
+      return 0;  // without memory for it, this change goes unnoticed
+    }
     return 0;
   };
-  const int result = ::sd_event_add_io(loop.event(), &source_, inotify_.get(), EPOLLIN, readable, this);
-  if (result < 0) throw std::system_error(-result, std::generic_category(), "sd_event_add_io");
+  int reason = inotify_ ? 0 : errno;
+  if (inotify_) {
+    watch();
+    if (watch_ < 0) reason = errno;
+    const int result = ::sd_event_add_io(loop.event(), &source_, inotify_.get(), EPOLLIN, readable, this);
+    if (result < 0) reason = -result;
+  }
+  if (reason != 0) {
+    log.error("changes of %@ are not noticed: %@", path_.string(), std::generic_category().message(reason));
+  }
 }
 
 FileWatch::~FileWatch() { ::sd_event_source_disable_unref(source_); }
 
 void FileWatch::watch() {
-  if (watch_ >= 0) ::inotify_rm_watch(inotify_.get(), watch_);
-  watch_ = -1;
-  isInPlace_ = true;
-  for (auto directory = path_.parent_path();; directory = directory.parent_path()) {
-    const std::uint32_t events = isInPlace_ ? kChanges : IN_CREATE | IN_MOVED_TO;
-    watch_ = ::inotify_add_watch(inotify_.get(), directory.c_str(), events | kOwnEnd | IN_ONLYDIR);
-    if (watch_ >= 0 || !directory.has_relative_path()) return;
-    isInPlace_ = false;
-  }
+  std::error_code unknown;
+  do {
+    if (watch_ >= 0) ::inotify_rm_watch(inotify_.get(), watch_);
+    awaited_ = path_;
+    while ((watch_ = ::inotify_add_watch(inotify_.get(), awaited_.parent_path().c_str(),
+                                         kChanges | kOwnEnd | IN_ONLYDIR)) < 0 &&
+           awaited_.parent_path().has_relative_path()) {
+      awaited_ = awaited_.parent_path();
+    }
+    // A directory that has come before its own was watched would never be noticed.
+  } while (watch_ >= 0 && awaited_ != path_ && std::filesystem::is_directory(awaited_, unknown));
 }
 
 void FileWatch::readEvents() {
   alignas(inotify_event) std::array<char, 16384> buffer{};
+  const std::string awaited = awaited_.filename().string();
   bool concerns = false;
   bool isWatchLost = false;
   for (;;) {
@@ -61,13 +74,13 @@ void FileWatch::readEvents() {
       const char* const name = buffer.data() + at + sizeof event;
       // An older watch's last words concern nobody; a lost event (which names none) may be any.
       if (event.wd == watch_ || event.wd == -1) {
-        if (event.len == 0 || name_ == name) concerns = true;
-        if (!isInPlace_ || (event.mask & (kOwnEnd | IN_IGNORED)) != 0) isWatchLost = true;
+        if (event.len == 0 || awaited == name) concerns = true;
+        if ((event.mask & (kOwnEnd | IN_IGNORED)) != 0) isWatchLost = true;
       }
       at += sizeof event + event.len;
     }
   }
-  if (isWatchLost) watch();
+  if (isWatchLost || (concerns && awaited_ != path_)) watch();
   if (concerns || isWatchLost) loop_.post(changed_);
 }
 

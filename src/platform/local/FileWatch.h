@@ -1,5 +1,6 @@
 #pragma once
 
+#include "platform/Log.h"
 #include "platform/local/Descriptor.h"
 #include "platform/local/EventLoop.h"
 
@@ -16,9 +17,9 @@ namespace kvr {
 /// on the loop's thread.
 class FileWatch {
  public:
-  /// `changed` is posted to the loop; it may be called without a change. Throws std::system_error when the
-  /// kernel refuses.
-  FileWatch(EventLoop& loop, std::filesystem::path path, std::function<void()> changed);
+  /// `changed` is posted to the loop; it may be called without a change. Where the kernel refuses, which is
+  /// one error line, nothing is noticed.
+  FileWatch(EventLoop& loop, Log& log, std::filesystem::path path, std::function<void()> changed);
   ~FileWatch();
   FileWatch(const FileWatch&) = delete;
   FileWatch& operator=(const FileWatch&) = delete;
@@ -29,12 +30,11 @@ class FileWatch {
 
   EventLoop& loop_;
   const std::filesystem::path path_;
-  const std::string name_;
   const std::function<void()> changed_;
   Descriptor inotify_;
   sd_event_source* source_ = nullptr;
   int watch_ = -1;
-  bool isInPlace_ = false;  ///< whether it is the file's own directory that is watched
+  std::filesystem::path awaited_;  ///< the file, or the missing directory that leads to it
 };
 
 }  // namespace kvr

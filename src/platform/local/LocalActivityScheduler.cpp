@@ -45,7 +45,7 @@ LocalActivityScheduler::LocalActivityScheduler(EventLoop& loop, const DeviceRoot
       host_(std::move(host)),
       timer_(wallClockTimer()),
       network_(
-          loop, root, [this](bool reachable) { setNetworkReachable(reachable); }, host_.networkState) {
+          loop, log, root, [this](bool reachable) { setNetworkReachable(reachable); }, host_.networkState) {
   const auto ended = [](sd_event_source*, int, std::uint32_t, void* self) {
     static_cast<LocalActivityScheduler*>(self)->timerEnded();
     return 0;
@@ -74,7 +74,12 @@ void LocalActivityScheduler::arm(std::optional<double> wait) {
     time.it_value.tv_sec = static_cast<time_t>(end);
     time.it_value.tv_nsec = static_cast<long>((end - std::floor(end)) * 1e9);
   }
-  ::timerfd_settime(timer_.get(), TFD_TIMER_ABSTIME | TFD_TIMER_CANCEL_ON_SET, &time, nullptr);
+  constexpr int kFlags = TFD_TIMER_ABSTIME | TFD_TIMER_CANCEL_ON_SET;
+  if (::timerfd_settime(timer_.get(), kFlags, &time, nullptr) < 0 && errno == ECANCELED) {
+    // The clock was set since the wait was worked out: look again at once.
+    time.it_value = {0, 1};
+    ::timerfd_settime(timer_.get(), kFlags, &time, nullptr);
+  }
 }
 
 void LocalActivityScheduler::timerEnded() noexcept {

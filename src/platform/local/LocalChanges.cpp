@@ -14,7 +14,7 @@ bool containsAll(const std::set<std::string>& whole, const std::set<std::string>
 
 }  // namespace
 
-LocalChanges::LocalChanges(EventLoop& loop, const DeviceRoot& root, const LocalUserLocale& locale,
+LocalChanges::LocalChanges(EventLoop& loop, Log& log, const DeviceRoot& root, const LocalUserLocale& locale,
                            const LocalPairedDeviceRegistry& pairedDevices, LocalNotifications& notifications,
                            const std::vector<std::string>& hostLocale)
     : locale_(locale),
@@ -24,7 +24,8 @@ LocalChanges::LocalChanges(EventLoop& loop, const DeviceRoot& root, const LocalU
       language_(languageNow()),
       watches_(watchesNow()) {
   const auto watch = [&](const std::string& path, void (LocalChanges::*notice)()) {
-    fileWatches_.push_back(std::make_unique<FileWatch>(loop, path, [this, notice] { (this->*notice)(); }));
+    fileWatches_.push_back(
+        std::make_unique<FileWatch>(loop, log, path, [this, notice] { (this->*notice)(); }));
   };
   watch(root.pathOf("Locale.plist"), &LocalChanges::noticeLanguage);
   for (const auto& path : hostLocale_) watch(path, &LocalChanges::noticeLanguage);

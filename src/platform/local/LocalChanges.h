@@ -21,7 +21,7 @@ class LocalChanges {
   /// Where hosts keep their locale.
   static std::vector<std::string> hostLocaleFiles() { return {"/etc/locale.conf", "/etc/default/locale"}; }
 
-  LocalChanges(EventLoop& loop, const DeviceRoot& root, const LocalUserLocale& locale,
+  LocalChanges(EventLoop& loop, Log& log, const DeviceRoot& root, const LocalUserLocale& locale,
                const LocalPairedDeviceRegistry& pairedDevices, LocalNotifications& notifications,
                const std::vector<std::string>& hostLocale = hostLocaleFiles());
 

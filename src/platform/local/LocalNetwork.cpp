@@ -27,12 +27,12 @@ bool isHostReachable(const std::string& path) {
 
 }  // namespace
 
-LocalNetwork::LocalNetwork(EventLoop& loop, const DeviceRoot& root, std::function<void(bool)> changed,
-                           std::string hostState)
+LocalNetwork::LocalNetwork(EventLoop& loop, Log& log, const DeviceRoot& root,
+                           std::function<void(bool)> changed, std::string hostState)
     : root_(root),
       hostState_(std::move(hostState)),
-      ownWatch_(loop, root.pathOf(kFile), [this, changed] { changed(isReachable()); }),
-      hostWatch_(loop, hostState_, [this, changed] { changed(isReachable()); }) {}
+      ownWatch_(loop, log, root.pathOf(kFile), [this, changed] { changed(isReachable()); }),
+      hostWatch_(loop, log, hostState_, [this, changed] { changed(isReachable()); }) {}
 
 bool LocalNetwork::isReachable() const {
   const auto reachable = root_.dictionary(kFile)["reachable"];

@@ -15,9 +15,8 @@ class LocalNetwork {
   /// Where systemd-networkd publishes the state of all links together.
   static constexpr const char* kHostState = "/run/systemd/netif/state";
 
-  /// `changed` is called on the loop's thread, with the answer, when it may have changed. Throws
-  /// std::system_error when the kernel refuses.
-  LocalNetwork(EventLoop& loop, const DeviceRoot& root, std::function<void(bool reachable)> changed,
+  /// `changed` is called on the loop's thread, with the answer, when it may have changed.
+  LocalNetwork(EventLoop& loop, Log& log, const DeviceRoot& root, std::function<void(bool reachable)> changed,
                std::string hostState = kHostState);
 
   /// The answer now. Any thread.

@@ -7,13 +7,17 @@ LocalPlatform::LocalPlatform(EventLoop& mainLoop, std::function<void()> busLost)
       services(queues, *log, entitlements, std::move(busLost)),
       activities(mainLoop, root, clock, queues, random, deviceProperties, *log, kMainBundleIdentifier,
                  {"com.tarsil.kvragent.upgrade", "com.tarsil.kvragent.boot"}, {}),
-      changes(mainLoop, root, locale, pairedDevices, notifications),
+      changes(mainLoop, *log, root, locale, pairedDevices, notifications),
       cleanExit(mainLoop, queues, activities, http, services, *log, kMainBundleIdentifier) {}
 
-bool LocalPlatform::end(double limit) {
+void LocalPlatform::beginEnding() {
   log->beginEnding();
   activities.beginEnding();
   notifications.beginEnding();
+}
+
+bool LocalPlatform::end(double limit) {
+  beginEnding();
   services.beginEnding();
   http.beginEnding();
   queues.beginEnding();

@@ -42,6 +42,9 @@ struct LocalPlatform {
   /// `busLost` is called on the bus thread, see `LocalServiceListeners`.
   LocalPlatform(EventLoop& mainLoop, std::function<void()> busLost);
 
+  /// From here on nothing new is begun of the agent's own accord. To be called before the loop is left, which
+  /// lets go of what was delayed.
+  void beginEnding();
   /// Fails what waits for remote answers, lets running work finish and send its replies. False when some work
   /// did not finish within `limit` seconds; nothing must be destroyed then.
   bool end(double limit);

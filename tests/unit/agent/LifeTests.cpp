@@ -2,6 +2,7 @@
 #include "followup/FollowUpKeys.h"
 #include "platform/JSON.h"
 #include "platform/simulated/SimulatedPlatform.h"
+#include "scheduling/KVROutreachActivity.h"
 #include "scheduling/SchedulingKeys.h"
 
 #include <gmock/gmock.h>
@@ -43,11 +44,12 @@ class Life {
                           {"featureToggleParameters", Value::Dictionary{{"zubOfferDisplay", true}}}};
   }
 
-  void start() {
+  /// `pause`: for so many days the device is off before.
+  void start(double pause = 0) {
     auto next = std::make_unique<SimulatedPlatform>(++seed_);
     if (platform_) {
       next->files.takeOver(platform_->files);
-      next->clock.set(platform_->clock.now());
+      next->clock.set(platform_->clock.now() + pause * kDay);
       end();
     } else {
       next->clock.set(kBirth);
@@ -153,6 +155,21 @@ TEST(TheFirstDay, EndsTheSameWhereverTheAgentIsKilled) {
     EXPECT_EQ(life.outcome(), expected) << "seed " << seed;
     EXPECT_THAT(life.platform().log.texts(LogLevel::Error), IsEmpty()) << "seed " << seed;
   }
+}
+
+TEST(ABoot, RunsWhatIsOverdueOnce) {
+  Life life(1);
+  life.start();
+  ASSERT_FALSE(life.liveUntil(0.1));
+  KVRScheduler::newSchedulerWithActivityDelegate(
+      life.platform().platform, std::make_shared<KVROutreachActivity>(life.platform().platform))
+      ->scheduleActivityForDate(kBirth + 0.15 * kDay);
+  life.systemVersion = "17.10";  // and another boot
+  life.start(0.1);
+  ASSERT_FALSE(life.liveUntil(0.21));
+  const auto& log = life.platform().log;
+  EXPECT_EQ(log.count("'com.tarsil.kvragent.outreach' not complete, rescheduling"), 1U);
+  EXPECT_EQ(log.count("target reached for 'com.tarsil.kvragent.outreach', trigger activity"), 1U);
 }
 
 /// A month with offers that come and go, another language, two upgrades.

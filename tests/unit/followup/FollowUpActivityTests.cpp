@@ -128,7 +128,7 @@ TEST_F(AFollowUpActivity, DropsTheAnswerOfAPostRunThatWasDeferredMeanwhile) {
   EXPECT_EQ(post->followUpPostTimer(), nullptr);
   held[0](KVRDeviceInfoList{info("A", due(5), inDays(-9))});
   EXPECT_THAT(pendingSerials(), ::testing::ElementsAre("A")) << "the work is done all the same";
-  EXPECT_EQ(world.log.count("FollowUp Post activity was answered already, result 1 dropped"), 1U);
+  EXPECT_EQ(world.log.count("activity run was answered already, result 1 dropped"), 1U);
   EXPECT_TRUE(world.preferences.dateForKey("com.tarsil.kvragent.followuppost.TargetDate").has_value());
 }
 

@@ -63,7 +63,7 @@ TEST_F(AnActivityTable, RunsAnActivityOnceAtThePointDrawnInItsWindow) {
     EXPECT_THAT(next(), ElementsAre("a"));
     EXPECT_TRUE(end("a", kFinished).changesTree);
     EXPECT_EQ(table.secondsToNext(now), std::nullopt);
-    EXPECT_FALSE(table.isRegisteredFor("a", now.date));
+    EXPECT_FALSE(table.isRegisteredFor("a", now.date, now));
   }
 }
 
@@ -123,7 +123,7 @@ TEST_F(AnActivityTable, RunsAgainAtTheDateADeferredRunWaitsFor) {
   now.date = now.date + 315'360'000;
   EXPECT_THAT(started(), ElementsAre("a"));
   // A date that is not ahead, or is none, says nothing.
-  table.setEarliestDate("a", now.date, now);
+  table.setEarliestDate("a", now.date - 10, now);
   table.setEarliestDate("a", Date{std::numeric_limits<double>::quiet_NaN()}, now);
   end("a", kDeferred);
   EXPECT_THAT(table.secondsToNext(now), Optional(10.0));
@@ -145,7 +145,7 @@ TEST_F(AnActivityTable, KeepsARegistrationThatWasMadeDuringTheRun) {
     pass(20);
     EXPECT_THAT(started(), IsEmpty()) << "never twice at once";
     end("a", result);
-    EXPECT_TRUE(table.isRegisteredFor("a", now.date));
+    EXPECT_TRUE(table.isRegisteredFor("a", now.date, now));
     EXPECT_THAT(started(), ElementsAre("a"));
     const auto old = numbers["a"];
     end("a", kFinished);
@@ -169,7 +169,7 @@ TEST_F(AnActivityTable, TakesUpItsTreeAgainAndKeepsWhatNobodyChecksInFor) {
   EXPECT_EQ(next.secondsToNext(now), std::nullopt);
   next.checkIn("a", kBlock);
   EXPECT_THAT(next.secondsToNext(now), Optional(3780.0));
-  EXPECT_TRUE(next.isRegisteredFor("b", now.date + 60));
+  EXPECT_TRUE(next.isRegisteredFor("b", now.date + 60, now));
 }
 
 TEST_F(AnActivityTable, ComplainsOfATreeThatIsNotItsOwn) {

@@ -143,5 +143,18 @@ TEST_F(AScheduler, ClearsEveryTargetDateAndNothingElse) {
   EXPECT_THAT(newLines(), ElementsAre("Clearing a.TargetDate", "Clearing b.TargetDate"));
 }
 
+TEST_F(AScheduler, ComesBackToARunWhoseWorkFailsOrDropsItsAnswer) {
+  int runs = 0;
+  activity->work = [&](const ActivityHandler&) {
+    if (++runs == 2) throw std::runtime_error("no answer");
+  };
+  scheduler->scheduleActivityForDate(start);
+  simulated.queues.advance(35);
+  EXPECT_EQ(runs, 3) << "at once, after 10 s and after 20 s more";
+  EXPECT_EQ(simulated.activities.runsUnderWay(), 0U);
+  EXPECT_EQ(simulated.queues.takeFaults().size(), 1U);
+  EXPECT_FALSE(simulated.log.takeFaults().empty());
+}
+
 }  // namespace
 }  // namespace kvr

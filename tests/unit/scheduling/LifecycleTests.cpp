@@ -9,7 +9,6 @@
 #include "scheduling/KVRPostBootActivity.h"
 #include "scheduling/KVRPostUpgradeActivity.h"
 #include "scheduling/SchedulingKeys.h"
-#include "scheduling/VersionOrder.h"
 #include "unit/followup/OfferWorld.h"
 
 namespace kvr {
@@ -90,14 +89,6 @@ TEST_F(TheAgentsLife, SchedulesThePostAtTheEarliestDateOfAnOutreach) {
       EXPECT_EQ(world.log.count("Warranty failed to download"),
                 (phone.isNull() ? 1U : 0U) + (watch.isNull() ? 1U : 0U));
     }
-  }
-  for (const char* line :
-       {"serialNumber: W success: 1 -- Conversion: 1", "Warranty downloaded successfully",
-        "Coverage check shows device should display Zub offer, check on-device state",
-        "Configuration does not support current device. Complete activity without scheduling followup",
-        "Warranty shows device is ineligible, complete activity without scheduling followup",
-        "carrierID: (null)", "carrierID: 00101"}) {
-    EXPECT_EQ(world.log.count(line), std::string_view(line).starts_with("Warranty down") ? 2U : 1U) << line;
   }
   EXPECT_THAT(world.log.texts(LogLevel::Error),
               Contains("No mobileCountryCode for networkInfo: {1 = (null)/(null); 2 = 001/01; }, carrier: "
@@ -190,22 +181,6 @@ TEST_F(TheAgentsLife, MovesTheConversionOutreachToEarlierDatesOnly) {
   }
 }
 
-TEST_F(TheAgentsLife, GoesFromTheFirstStartToAPostedFollowUpAndItsRefresh) {
-  warranties["LOCAL"] = shownInDays(-1, 2.5);
-  const StartUp startUp(world.platform);
-  world.queues.advance(60);
-  ASSERT_THAT(pendingSerials(), ElementsAre("LOCAL"));
-  EXPECT_EQ(pending()[0].targetBundleIdentifier, kFollowUpSettingsBundleIdentifier);
-  EXPECT_EQ(pending()[0].displayStyle, 18U);
-  EXPECT_EQ(pending()[0].informativeFooterText, Value("3 days left"));
-  EXPECT_NEAR(*target(activity::kFollowUpRefresh) - inDays(0.5), -60, 1);
-  for (const char* done : {activity::kPostUpgrade, activity::kOutreach, activity::kFollowUpPost}) {
-    EXPECT_EQ(target(done), std::nullopt) << done;
-  }
-  world.queues.advance(0.6 * kDay);
-  EXPECT_EQ(pending()[0].informativeFooterText, Value("2 days left"));
-}
-
 TEST_F(TheAgentsLife, LosesNoDismissalThatComesDuringAPostRun) {
   pair("W", 100);
   warranties = {{"LOCAL", shownInDays(-1, 9)}, {"W", shownInDays(-1, 9)}};
@@ -222,48 +197,13 @@ TEST_F(TheAgentsLife, LosesNoDismissalThatComesDuringAPostRun) {
   world.queues.run();
   ASSERT_FALSE(waiting.empty());
   const auto agent = KVRAgent::initWithCallingProcessBundleID(world.platform, "client");
-  bool replied = false;
-  for (const char* serialNumber : {"W", ""}) {
-    agent->dismissFollowUpForSerialNumber(serialNumber,
-                                          BoolReply(world.log, "test", [&](bool yes) { replied = yes; }));
-    EXPECT_TRUE(std::exchange(replied, false));
-  }
+  agent->dismissFollowUpForSerialNumber("W", BoolReply(world.log, "test", [](bool) {}));
   world.http.handler = plain;
   for (const auto& [request, answer] : waiting) plain(request, false, answer);
   world.queues.advance(60);
   EXPECT_THAT(pendingSerials(), ElementsAre("LOCAL"));
   EXPECT_THAT(hashes(preference::kFollowUpDismissedHashes), ElementsAre(sha256Hash("W")));
   EXPECT_EQ(hashes(preference::kFollowUpPostedHashes).size(), 2U);
-}
-
-TEST_F(TheAgentsLife, NeverRunsAFollowUpActivityTwiceWithinAMinuteWithoutANewCause) {
-  pair("W0", 100);
-  pair("W1", 100);
-  warranties = {{"LOCAL", shownInDays(-1, 10.3)},  // shown until it ends: its last day gives no date
-                {"W0", shownInDays(5, 20.7)},
-                {"W1", shownInDays(8, 3)}};  // ends unposted
-  const StartUp startUp(world.platform);
-  std::map<std::string, double> last;
-  std::map<std::string, int> runs;
-  for (int second = 0; second < 30 * 86400; second += 20) {
-    world.queues.advance(20);
-    for (const auto& line : world.log.texts()) {
-      if (line.find(": Schedule refresh for: ") != line.npos) last.erase(activity::kFollowUpRefresh);
-      for (const char* identifier :
-           {activity::kFollowUpPost, activity::kFollowUpRefresh, activity::kOutreach}) {
-        if (line != format("target reached for '%@', trigger activity", identifier)) continue;
-        EXPECT_TRUE(!last.contains(identifier) || second - last[identifier] >= 60) << identifier << second;
-        last[identifier] = second;
-        ++runs[identifier];
-      }
-    }
-    world.log.clear();
-  }
-  EXPECT_THAT(pendingSerials(), IsEmpty());
-  EXPECT_GE(runs[activity::kFollowUpPost], 25) << "daily once an offer has ended unposted";
-  EXPECT_LE(runs[activity::kFollowUpPost], 35);
-  EXPECT_GE(runs[activity::kFollowUpRefresh], 15);
-  EXPECT_LE(runs[activity::kFollowUpRefresh], 70);
 }
 
 }  // namespace

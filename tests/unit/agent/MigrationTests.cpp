@@ -1,0 +1,71 @@
+#include "agent/KVRAgent.h"
+#include "unit/followup/OfferWorld.h"
+#include "warranty/CacheMetadata.h"
+
+namespace kvr {
+namespace {
+
+constexpr const char* kLegacyFile = "/home/user/Library/Application Support/com.tarsil.Kavrel/Warranty.plist";
+
+class Migration : public AnOfferTest {
+ protected:
+  void pend(const std::string& uniqueIdentifier) {
+    FollowUpItem item;
+    item.uniqueIdentifier = uniqueIdentifier;
+    item.displayStyle = 2;
+    EXPECT_FALSE(world.followUps.newClient(kFollowUpClientIdentifier)->postItem(item));
+  }
+  std::vector<std::string> pendingIdentifiers() {
+    std::vector<std::string> identifiers;
+    for (const auto& item : pending()) identifiers.push_back(*item.uniqueIdentifier);
+    return identifiers;
+  }
+  void migrate() {
+    KVRAgent::initWithCallingProcessBundleID(world.platform, "client")->performMigrationIfNeeded();
+  }
+};
+
+TEST_F(Migration, BringsWhatThereIsOfTheOldLayoutToTheNewOneOnce) {
+  const std::string legacy = kFollowUpClientIdentifier;
+  const std::string own = legacy + "." + sha256Hash("LOCAL");
+  const CacheMetadata metadata("LOCAL");
+  auto& preferences = world.preferences;
+  for (int bits = 0; bits < 64; ++bits) {
+    const bool hasFile = bits & 1, hasItem = bits & 2, hasDate = bits & 4, hasSerial = bits & 8;
+    const int level = bits / 16;
+    SCOPED_TRACE(bits);
+    for (const auto& key : preferences.allKeys()) preferences.removeObject(key);
+    world.files.erase("/home/user/Library/FollowUps/com.tarsil.Kavrel.plist");
+    for (const auto& path : world.files.list("/home/user/Library/Application Support"))
+      world.files.erase(path);
+    world.deviceProperties.answers["SerialNumber"] = "LOCAL";
+    if (!hasSerial) world.deviceProperties.answers.erase("SerialNumber");
+    if (hasFile) world.files.putPropertyList(kLegacyFile, offer(10));
+    if (hasItem) pend(legacy);
+    if (hasDate) {
+      preferences.setObject(inDays(-1), "CachedWarrantyLastUpdatedDate");
+      preferences.setObject("en_US", "CachedWarrantyLocale");
+      preferences.setObject("1", "CachedWarrantyVersion");
+    }
+    if (level > 0) preferences.setObject(level, preference::kMigrationVersion);
+    migrate();
+
+    const bool runs = level < 2;
+    const bool moves = runs && hasFile && hasSerial;
+    EXPECT_EQ(preferences.integerForKey(preference::kMigrationVersion), runs ? 2 : level);
+    EXPECT_EQ(world.files.get(kLegacyFile).has_value(), hasFile && !moves);
+    EXPECT_EQ(KVRWarranty::cachedWarrantyForSerialNumber(world.platform, "LOCAL") != nullptr, moves);
+    EXPECT_EQ(world.files.list("/home/user/Library/Application Support").size(), hasFile ? 1U : 0U);
+    EXPECT_EQ(preferences.dateForKey(metadata.lastUpdatedDateKey).has_value(), moves && hasDate);
+    EXPECT_EQ(preferences.stringForKey(metadata.localeKey).has_value(), moves && hasDate);
+    EXPECT_EQ(preferences.stringForKey("CachedWarrantyVersion").has_value(), hasDate && !moves);
+    const std::vector<std::string> expected = !hasItem ? std::vector<std::string>{}
+                                              : !runs  ? std::vector{legacy}
+                                              : moves  ? std::vector{own}
+                                                       : std::vector<std::string>{};
+    EXPECT_EQ(pendingIdentifiers(), expected);
+  }
+}
+
+}  // namespace
+}  // namespace kvr

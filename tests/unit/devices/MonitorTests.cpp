@@ -1,0 +1,93 @@
+#include "agent/KVRAgent.h"
+#include "devices/KVRLocaleMonitor.h"
+#include "devices/KVRPairedDevicesMonitor.h"
+#include "followup/KVRFollowUp.h"
+#include "platform/JSON.h"
+#include "scheduling/SchedulingKeys.h"
+#include "unit/followup/OfferWorld.h"
+
+namespace kvr {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+
+class Monitors : public AnOfferTest {
+ protected:
+  Monitors() {
+    world.featureFlags.enabled.insert({"Kavrel", "Bravik_3_0"});
+    world.coverage = [this](const HTTPRequest&) { return HTTPResponse{200, *writeJSON(coverage), {}}; };
+  }
+  ~Monitors() override { world.notifications.end(); }
+
+  std::optional<Date> postDate() {
+    return world.preferences.dateForKey(std::string(activity::kFollowUpPost) + preference::kTargetDateSuffix);
+  }
+  void pair(const std::string& serialNumber) {
+    world.pairedDevices.devices.push_back({"W", {}, serialNumber, inDays(-30), true, false});
+  }
+
+  Value coverage = shownInDays(2, 20);
+  const std::shared_ptr<KVRAgent> agent = KVRAgent::initWithCallingProcessBundleID(world.platform, "client");
+};
+
+TEST_F(Monitors, LookUpAllDevicesAndScheduleThePostWhenAWatchIsPairedOrUnpaired) {
+  const auto monitor = KVRPairedDevicesMonitor::initWithAgent(world.platform, agent);
+  monitor->start();
+  EXPECT_NE(monitor->pairNotifyToken, monitor->unpairNotifyToken);
+  pair("W");
+  world.notifications.post(PairedDeviceRegistry::kDeviceDidPair);
+  world.queues.run();
+  EXPECT_EQ(postDate(), inDays(2));
+  EXPECT_EQ(world.http.requests().size(), 4U) << "a version and a warranty for each of two devices";
+  EXPECT_TRUE(world.log.contains(format(
+      "Watch paired after phone's refreshActivity has already finished. Schedule followUp post for: %@",
+      inDays(2))));
+
+  FollowUpItem shown;
+  shown.uniqueIdentifier = KVRFollowUp::uniqueIdentfierForSerialNumber("GONE");
+  shown.userInfo = {{kFollowUpSerialNumberKey, "GONE"}};
+  EXPECT_FALSE(world.followUps.newClient(kFollowUpClientIdentifier)->postItem(shown));
+  world.notifications.post(PairedDeviceRegistry::kDeviceDidUnpair);
+  world.queues.run();
+  EXPECT_THAT(pending(), IsEmpty()) << "of a watch that is tracked no more";
+}
+
+TEST_F(Monitors, ServeAThousandNotificationsOneByOne) {
+  const auto monitor = KVRPairedDevicesMonitor::initWithAgent(world.platform, agent);
+  monitor->start();
+  for (int i = 0; i < 1000; ++i) world.notifications.post(PairedDeviceRegistry::kDeviceDidPair);
+  world.queues.advance(60);
+  EXPECT_EQ(world.log.count("Devices followups to be posted, if required, after paired device change"),
+            1000U);
+  EXPECT_EQ(postDate(), world.clock.now() - 60 + 2 * kDay);
+}
+
+TEST_F(Monitors, CheckFiveSecondsAfterEveryChangeOfLanguageAndEndThen) {
+  const auto monitor = KVRLocaleMonitor::initWithAgent(world.platform, agent);
+  monitor->start();
+  const auto start = world.clock.now();
+  const auto change = [&] {
+    world.notifications.post(UserLocale::kLanguageChanged);
+    world.queues.advance(1);
+  };
+  change();
+  change();
+  world.queues.advance(10);
+  EXPECT_THAT(world.cleanExit.requests, ElementsAre(start + 5, start + 6));
+  EXPECT_THAT(world.http.requests(), IsEmpty());
+
+  FollowUpItem shown;
+  shown.uniqueIdentifier = "shown";
+  shown.userInfo = {{kFollowUpSerialNumberKey, "LOCAL"}};
+  EXPECT_FALSE(world.followUps.newClient(kFollowUpClientIdentifier)->postItem(shown));
+  change();
+  world.queues.advance(10);
+  EXPECT_EQ(world.http.requests().size(), 2U);
+  EXPECT_EQ(pending()[0].title, Value("Zub"));
+  EXPECT_TRUE(world.log.contains("Device infos refreshed after locale change"));
+  EXPECT_EQ(world.cleanExit.requests.size(), 3U);
+}
+
+}  // namespace
+}  // namespace kvr
