@@ -185,15 +185,14 @@ void KVRAgent::getAllDeviceInfosUsingPolicy(std::uint64_t policy, bool updateFol
   const auto self = shared_from_this();
   for (const auto& entry : deviceProvider()->allDevices()) {
     group_.enter();
+    // Goes with the reply: a look-up that is dropped is waited for no longer.
+    const std::shared_ptr<void> entered(nullptr, [self](void*) { self->group_.leave(); });
     getWarrantyUsingPolicy(
         policy, entry.first,
         WarrantyReply(platform_.log, "getAllDeviceInfosUsingPolicy",
-                      [self, results, device = entry.second](const KVRWarrantyRef& warranty) {
-                        {
-                          const std::lock_guard lock(results->mutex);
-                          results->list.push_back(KVRDeviceInfo::deviceInfoWithDevice(device, warranty));
-                        }
-                        self->group_.leave();
+                      [results, entered, device = entry.second](const KVRWarrantyRef& warranty) {
+                        const std::lock_guard lock(results->mutex);
+                        results->list.push_back(KVRDeviceInfo::deviceInfoWithDevice(device, warranty));
                       }));
   }
   group_.notify(policyLookupQueue_, [self, results, updateFollowUps, withReply] {

@@ -48,13 +48,13 @@ class Activity {
   virtual void setPreregistered(bool preregistered) = 0;
   /// Set before `schedule`, for an activity that is not preregistered.
   virtual void setCriteria(const ActivityCriteria& criteria) = 0;
-  /// Installs the run block. Preregistered: for what the platform knows without a block. Not preregistered: registers
-  /// the activity anew with its criteria, counted from now; an earlier registration of the identifier, one
-  /// whose run is under way included, is replaced, and the end of that run leaves the new registration alone.
-  /// The platform holds the block until the activity has finished or is registered anew.
+  /// Installs the run block. Preregistered: for what the platform knows without a block. Not preregistered:
+  /// registers the activity anew with its criteria, counted from now; an earlier registration of the
+  /// identifier, one whose run is under way included, is replaced, and the end of that run leaves the new
+  /// registration alone. The platform holds the block until the activity has finished or is registered anew.
   virtual void schedule(ActivityBlock block) = 0;
-  /// Set before `schedule`, for a preregistered activity: what its client holds it to be registered for. Should
-  /// the platform have lost that registration, or never got it, the activity is registered so.
+  /// Set before `schedule`, for a preregistered activity: what its client holds it to be registered for.
+  /// Should the platform have lost that registration, or never got it, the activity is registered so.
   virtual void setExpectation(const ActivityExpectation& expectation) = 0;
   /// Tells the platform, during a run that is about to be deferred, the date before which running again is of
   /// no use.

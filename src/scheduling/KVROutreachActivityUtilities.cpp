@@ -41,15 +41,14 @@ void KVROutreachActivityUtilities::performOutreachActivityForConversion(
   for (const auto& device : devices) {
     const auto serialNumber = device->serialNumber();
     downloads_.enter();
+    // Goes with the completion: whatever becomes of it, the run does not wait for this download any more.
+    const std::shared_ptr<void> entered(nullptr, [self](void*) { self->downloads_.leave(); });
     downloader->downloadWarrantyForSerialNumber(
-        serialNumber,
-        DownloadCompletion(platform_.log, "performOutreachActivity",
-                           [self, serialNumber, conversion](bool success, const KVRWarrantyRef& warranty) {
-                             // Whatever becomes of it, the run must not wait for this download any more.
-                             const std::shared_ptr<void> left(nullptr,
-                                                              [&](void*) { self->downloads_.leave(); });
-                             self->handleDownload(serialNumber, success, warranty, conversion);
-                           }));
+        serialNumber, DownloadCompletion(platform_.log, "performOutreachActivity",
+                                         [self, entered, serialNumber, conversion](
+                                             bool success, const KVRWarrantyRef& warranty) {
+                                           self->handleDownload(serialNumber, success, warranty, conversion);
+                                         }));
   }
   downloads_.notify(platform_.queues.concurrentQueue(Priority::Default),
                     [self, conversion, withScheduler, answer] {

@@ -47,7 +47,8 @@ class ANewDevice : public ::testing::Test {
 };
 
 TEST_F(ANewDevice, GetsItsFollowUpsWhereverTheAgentIsKilledOnTheWay) {
-  for (const auto* line : {"launched", "launched", "perform upgrade activity"}) {
+  for (const auto* line :
+       {"launched", "launched", "monitorForScheduledActivity for 'com.tarsil.kvragent.followuprefresh'"}) {
     world.startAgent();
     world.agent().waitForErrorOutput(line);
     world.agent().kill();

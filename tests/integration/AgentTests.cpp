@@ -281,8 +281,8 @@ TEST_F(TheAgent, ReportsBadInputAndGoesOn) {
   });
   EXPECT_FALSE(std::filesystem::exists(file));
   EXPECT_EQ(label(World::info(client, World::kFirstWatch, World::Default)), Value("Warranty"));
-  world.directory.write("device/Locale.plist", "garbage {");
   expectComplaint("Locale.plist is damaged and counts as missing", [&] {
+    world.directory.write("device/Locale.plist", "garbage {");
     EXPECT_EQ(label(World::info(client, World::kFirstWatch, World::Default)), Value("Warranty"));
   });
 }
@@ -309,6 +309,29 @@ TEST_F(TheAgent, SurvivesClientsThatLeaveInTheMiddleOfACall) {
   EXPECT_THAT(World::allInfos(client, World::Default), SizeIs(3));
   EXPECT_EQ(world.agent().terminate(), 0);
   EXPECT_THAT(world.agent().errorOutput(), Not(HasSubstr("without an answer")));
+}
+
+TEST_F(TheAgent, LeavesCleanlyAfterAChangeOfLanguageAndComesBackWhenItIsCalled) {
+  world.letTheBusStartIt();
+  const auto client = world.newClient();
+  client.call("DefaultDevice");
+  world.setLocale("fr_FR");
+  world.waitForName(false);
+  world.bus.daemon().waitForErrorOutput("agent: status 0");
+  const auto before = world.bus.daemon().errorOutput().size();
+  EXPECT_EQ(label(World::info(client, World::kPhone, World::Default)), Value("Garantie"));
+  world.setLocale("en_US");
+  world.waitForName(false);
+  world.pair({World::kFirstWatch});  // which brings it back without a call
+  world.bus.daemon().waitForErrorOutput("Devices followups to be posted, if required", before);
+}
+
+TEST_F(TheAgent, FollowsTheFileOfPairedWatches) {
+  world.pair({});
+  world.startAgent();
+  world.pair({World::kFirstWatch});
+  world.agent().waitForErrorOutput("Devices followups to be posted, if required, after paired device change");
+  EXPECT_THAT(world.coverageRequests(), SizeIs(2));
 }
 
 }  // namespace

@@ -22,12 +22,14 @@ class LocalCleanExit : public CleanExit {
  public:
   /// `name` is the agent's on the bus. All must outlive this; on the loop's thread.
   LocalCleanExit(EventLoop& loop, LocalWorkQueues& queues, const LocalActivityScheduler& activities,
-                 const LocalHTTP& http, LocalServiceListeners& services, Log& log, std::string name)
+                 const LocalHTTP& http, LocalServiceListeners& services, const Clock& clock, Log& log,
+                 std::string name)
       : loop_(loop),
         queues_(queues),
         activities_(activities),
         http_(http),
         services_(services),
+        clock_(clock),
         log_(log),
         name_(std::move(name)) {}
 
@@ -35,6 +37,7 @@ class LocalCleanExit : public CleanExit {
 
  private:
   bool wouldBeStartedAgain();
+  bool leaveWaker();
   bool isIdle() const;
   void begin();
   void look(double patience);
@@ -44,6 +47,7 @@ class LocalCleanExit : public CleanExit {
   const LocalActivityScheduler& activities_;
   const LocalHTTP& http_;
   LocalServiceListeners& services_;
+  const Clock& clock_;
   Log& log_;
   const std::string name_;
   bool requested_ = false;

@@ -73,33 +73,39 @@ AgentWorld::AgentWorld(Attestation attestation) {
 
 void AgentWorld::becomeNewDevice() const { std::filesystem::remove(home() / kActivities); }
 
+ChildProcess::Environment AgentWorld::environment() const {
+  return {{"HOME", home().string()}, {"KVR_DEVICE_ROOT", (directory / "device").string()},
+          {"KVR_LOG_PRIVATE", "1"},  {"DBUS_SESSION_BUS_ADDRESS", bus.address()},
+          {"LC_ALL", "C"},           {"JOURNAL_STREAM", ""}};
+}
+
 void AgentWorld::startAgent() {
   for (const auto* path : {"Library", "Library/Preferences", "Library/Activities"}) {
     std::filesystem::permissions(home() / path, std::filesystem::perms::owner_all);
   }
+  agent_ = std::make_unique<ChildProcess>(std::vector<std::string>{KVR_PROGRAMS "/kvragent"}, environment());
+  waitForName(true);
+}
+
+void AgentWorld::letTheBusStartIt() {
+  std::string script = "#!/bin/sh\n";
+  for (const auto& [name, value] : environment()) script += "export " + name + "='" + value + "'\n";
+  script += KVR_PROGRAMS "/kvragent\necho \"agent: status $?\" >&2\n";
+  bus.addService(RawBusClient::kName, "/bin/sh " + directory.write("start-agent", script).string());
+}
+
+void AgentWorld::waitForName(bool isOwned) const {
   const RawBusClient watcher = newClient();
-  bool isOwned = false;
-  const auto handler = [](sd_bus_message*, void* userdata, sd_bus_error*) {
-    *static_cast<bool*>(userdata) = true;
-    return 0;
-  };
+  const auto handler = [](sd_bus_message*, void*, sd_bus_error*) { return 0; };
   sd_bus_match_signal(watcher.bus(), nullptr, "org.freedesktop.DBus", nullptr, "org.freedesktop.DBus",
-                      "NameOwnerChanged", handler, &isOwned);
-  agent_ = std::make_unique<ChildProcess>(std::vector<std::string>{KVR_PROGRAMS "/kvragent"},
-                                          ChildProcess::Environment{
-                                              {"HOME", home().string()},
-                                              {"KVR_DEVICE_ROOT", (directory / "device").string()},
-                                              {"KVR_LOG_PRIVATE", "1"},
-                                              {"DBUS_SESSION_BUS_ADDRESS", bus.address()},
-                                              {"LC_ALL", "C"},
-                                              {"JOURNAL_STREAM", ""},
-                                          });
-  // The watcher sees its own arrival too; it is the agent's name that counts.
-  while (!isOwned || sd_bus_get_name_creds(watcher.bus(), RawBusClient::kName, 0, nullptr) < 0) {
+                      "NameOwnerChanged", handler, nullptr);
+  // Every arrival and departure wakes the watcher up, its own included; it is the agent's name that counts.
+  while ((sd_bus_get_name_creds(watcher.bus(), RawBusClient::kName, 0, nullptr) >= 0) != isOwned) {
     const int processed = sd_bus_process(watcher.bus(), nullptr);
     if (processed < 0) throw std::runtime_error("the bus is gone");
     if (processed == 0 && sd_bus_wait(watcher.bus(), kLimitMicroseconds) == 0) {
-      throw std::runtime_error("the agent never took its name: " + agent_->errorOutput());
+      throw std::runtime_error("nothing happened to the agent's name: " +
+                               (agent_ ? agent_->errorOutput() : ""));
     }
   }
 }

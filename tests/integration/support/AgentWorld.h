@@ -15,8 +15,8 @@ namespace kvr::testing {
 /// A phone with two watches, its coverage service and its agent: the real programs on a bus of their own. The
 /// test is the client.
 ///
-/// The agent is started by `startAgent`, so that a test may change the device before. It finds a device that it
-/// has set up earlier, and so does nothing of its own accord.
+/// The agent is started by `startAgent`, so that a test may change the device before. It finds a device that
+/// it has set up earlier, and so does nothing of its own accord.
 class AgentWorld {
  public:
   static constexpr const char* kPhone = "SNPHONE00001";
@@ -33,6 +33,11 @@ class AgentWorld {
   void becomeNewDevice() const;
   /// Starts the agent, after killing one that runs, and returns once it has its name on the bus.
   void startAgent();
+  /// Instead: has the bus start it at the first call. It prints to the bus's error output, and its exit
+  /// status in the end.
+  void letTheBusStartIt();
+  /// Waits until somebody on the bus has the agent's name, or nobody has.
+  void waitForName(bool isOwned) const;
   ChildProcess& agent() { return *agent_; }
   RawBusClient newClient() const { return RawBusClient(bus.address()); }
 
@@ -67,6 +72,7 @@ class AgentWorld {
   TemporaryDirectory directory;
 
  private:
+  ChildProcess::Environment environment() const;
   std::unique_ptr<ChildProcess> service_;
   std::string serviceURL_;
   std::unique_ptr<ChildProcess> agent_;

@@ -10,6 +10,8 @@ std::string configuration(const TemporaryDirectory& directory) {
   <type>session</type>
   <listen>unix:dir=)" +
          directory.path().string() + R"(</listen>
+  <servicedir>)" +
+         (directory.path() / "services").string() + R"(</servicedir>
   <auth>EXTERNAL</auth>
   <policy context="default">
     <allow send_destination="*" eavesdrop="true"/>
@@ -25,6 +27,11 @@ std::string configuration(const TemporaryDirectory& directory) {
 }
 
 }  // namespace
+
+void PrivateBus::addService(const std::string& name, const std::string& command) const {
+  directory_.write("services/" + name + ".service",
+                   "[D-BUS Service]\nName=" + name + "\nExec=" + command + "\n");
+}
 
 PrivateBus::PrivateBus()
     : daemon_({"dbus-daemon",

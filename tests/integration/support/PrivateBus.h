@@ -13,6 +13,10 @@ class PrivateBus {
  public:
   PrivateBus();
 
+  /// Has the bus start a program when somebody calls the name.
+  void addService(const std::string& name, const std::string& command) const;
+  /// The bus itself; what the programs it starts print as errors is printed there.
+  ChildProcess& daemon() { return daemon_; }
   const std::string& address() const { return address_; }
   pid_t pid() const { return daemon_.pid(); }
   /// Ends the bus the hard way; every connection is lost.
