@@ -1,5 +1,7 @@
 #include "integration/support/AgentWorld.h"
 #include "platform/JSON.h"
+#include "platform/PropertyList.h"
+#include "signing/SHA256Hash.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -8,6 +10,7 @@
 #include <algorithm>
 #include <fstream>
 #include <iterator>
+#include <map>
 #include <set>
 #include <thread>
 
@@ -332,6 +335,49 @@ TEST_F(TheAgent, FollowsTheFileOfPairedWatches) {
   world.pair({World::kFirstWatch});
   world.agent().waitForErrorOutput("Devices followups to be posted, if required, after paired device change");
   EXPECT_THAT(world.coverageRequests(), SizeIs(2));
+}
+
+TEST_F(TheAgent, KnowsTheSupportApplicationInTheUsersLanguage) {
+  world.writeDeviceFile(
+      "Applications.plist",
+      Value::Dictionary{{"com.tarsil.support", Value::Dictionary{{"localizedName", "Support"}}}});
+  world.writeDeviceFile("Store.plist", Value::Dictionary{{"purchaseDelay", 3600}});
+  world.writeDeviceFile("Resources/KavrelUI/nl/Localizable.plist",
+                        Value::Dictionary{{"INSTALLED", "Aanwezig"}});
+  world.startAgent();
+  const auto waiting = world.newClient();
+  // For the store, which holds up nobody else.
+  std::uint64_t cookie = 0;
+  sd_bus_send(waiting.bus(), waiting.newCall("AppSupportAvailability", "s", {"not there"}).get(), &cookie);
+  sd_bus_flush(waiting.bus());
+  const auto client = world.newClient();
+  for (const auto& [locale, text] : std::map<std::string, std::string>{{"en_GB", "Installed"},
+                                                                       {"de_AT", "Installiert"},
+                                                                       {"fr", "Installée"},
+                                                                       {"ja_JP", "インストール済み"},
+                                                                       {"nl_NL", "Aanwezig"},
+                                                                       {"pt_BR", "Installed"}}) {
+    world.setLocale(locale);
+    const auto answer =
+        client.value("a{sv}", client.call("AppSupportAvailability", "s", {"com.tarsil.support"}));
+    EXPECT_EQ(answer["AppAvailablityText"], Value(text)) << locale;
+    EXPECT_EQ(answer["AppVendorName"], Value(""));
+  }
+}
+
+TEST_F(TheAgent, MigratesWhatAnEarlierVersionLeft) {
+  const std::string caches = "home/Library/Application Support/com.tarsil.Kavrel/";
+  world.directory.write(caches + "Warranty.plist",
+                        *writePropertyList(*readJSON(R"({"covered":true,"coverageLocalizedLabel":"Old"})"),
+                                           PropertyListEncoding::XML));
+  world.directory.write("home/Library/FollowUps/com.tarsil.Kavrel.plist",
+                        "{ items = ( { uniqueIdentifier = \"com.tarsil.Kavrel\"; displayStyle = 2; } ); }");
+  world.startAgent();
+  EXPECT_TRUE(std::filesystem::exists(world.cacheFileOf(World::kPhone)));
+  EXPECT_FALSE(std::filesystem::exists(world.directory / (caches + "Warranty.plist")));
+  EXPECT_EQ(world.file("Library/FollowUps/com.tarsil.Kavrel.plist")["items"].array()[0]["uniqueIdentifier"],
+            Value("com.tarsil.Kavrel." + sha256Hash(World::kPhone)));
+  EXPECT_EQ(world.preferences()["KVRMigrationVersion"], Value(2));
 }
 
 }  // namespace
