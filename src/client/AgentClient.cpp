@@ -13,6 +13,7 @@ constexpr const char* kPath = "/com/tarsil/kvragent";
 constexpr const char* kInterface = "com.tarsil.kvragent.KVRAgentProtocol";
 
 /// Downloads with all their retries take hours at worst; an agent that ends is noticed at once.
+constexpr std::uint64_t kSecond = 1'000'000;                      // microseconds
 constexpr std::uint64_t kLongestCall = 24ULL * 3600 * 1'000'000;  // microseconds
 
 constexpr const char* kUnreachable[] = {
@@ -74,11 +75,27 @@ Result<Value> AgentClient::call(const char* member, const std::vector<Argument>&
     const auto error = appendBusValue(made, argument.type, argument.value);
     if (error) return failure(OtherFailure, error->message);
   }
-  BusError error;
   sd_bus_message* answer = nullptr;
-  r = sd_bus_call(bus_.get(), made, kLongestCall, error.get(), &answer);
+  sd_bus_slot* pending = nullptr;
+  const auto keep = [](sd_bus_message* given, void* kept, sd_bus_error*) {
+    *static_cast<sd_bus_message**>(kept) = sd_bus_message_ref(given);
+    return 0;
+  };
+  r = sd_bus_call_async(bus_.get(), &pending, made, keep, static_cast<void*>(&answer), kLongestCall);
+  const BusSlotRef slot(pending);
+  for (int seconds = 0; r >= 0 && answer == nullptr;) {
+    r = sd_bus_process(bus_.get(), nullptr);
+    if (r != 0) continue;
+    r = sd_bus_wait(bus_.get(), kSecond);
+    if (r == 0 && waiting_) waiting_(++seconds);
+  }
   const BusMessageRef reply(answer);
-  if (r < 0) return failureOf(r, error);
+  if (answer == nullptr) return failureOf(r, BusError());
+  if (const sd_bus_error* error = sd_bus_message_get_error(answer)) {
+    BusError copy;
+    sd_bus_error_copy(copy.get(), error);
+    return failureOf(-sd_bus_message_get_errno(answer), copy);
+  }
   Result<Value> value = readBusValue(answer, replyType);
   if (!value) return failure(OtherFailure, "the agent's answer cannot be read: " + value.error().message);
   return value;
@@ -110,6 +127,44 @@ Result<bool> AgentClient::dismissFollowUp(const std::string& serialNumber) const
   const Result<Value> reply = call("DismissFollowUpForSerialNumber", {{"s", serialNumber}}, "b");
   if (!reply) return reply.error();
   return reply->boolean();
+}
+
+Result<bool> AgentClient::scheduleOutreach(double delay) const {
+  const Result<Value> reply = call("ScheduleOutreachAfter", {{"d", delay}}, "b");
+  if (!reply) return reply.error();
+  return reply->boolean();
+}
+
+Result<bool> AgentClient::accountAdded() const {
+  const Result<Value> reply = call("TarsilAccountAdded", {}, "b");
+  if (!reply) return reply.error();
+  return reply->boolean();
+}
+
+Result<Value> AgentClient::supportApplication(const std::string& bundleIdentifier) const {
+  return call("AppSupportAvailability", {{"s", bundleIdentifier}}, "a{sv}");
+}
+
+Result<std::optional<std::string>> AgentClient::webURLOverride() const {
+  const Result<Value> reply = call("ReadWebURLOverride", {}, "s");
+  if (!reply) return reply.error();
+  return reply->string().empty() ? std::nullopt : std::optional(reply->string());
+}
+
+std::optional<Error> AgentClient::tell(const char* member) const {
+  sd_bus_message* made = nullptr;
+  int r = sd_bus_message_new_method_call(bus_.get(), &made, kName, kPath, kInterface, member);
+  const BusMessageRef message(made);
+  if (r >= 0) r = sd_bus_send(bus_.get(), made, nullptr);
+  if (r >= 0) r = sd_bus_flush(bus_.get());
+  return r < 0 ? std::optional(failureOf(r, BusError())) : std::nullopt;
+}
+
+std::optional<Error> AgentClient::post(const std::string& notification) const {
+  int r = sd_bus_emit_signal(bus_.get(), "/com/tarsil/NotificationCenter", "com.tarsil.NotificationCenter",
+                             "Posted", "s", notification.c_str());
+  if (r >= 0) r = sd_bus_flush(bus_.get());
+  return r < 0 ? std::optional(failureOf(r, BusError())) : std::nullopt;
 }
 
 }  // namespace kvr::client

@@ -4,6 +4,8 @@
 #include "platform/Error.h"
 #include "platform/local/bus/BusHandles.h"
 
+#include <functional>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -49,7 +51,22 @@ class AgentClient {
   Result<DeviceInfo> deviceInfo(const std::string& serialNumber, Policy policy) const;
   Result<std::vector<DeviceInfo>> allDeviceInfos(Policy policy, bool updateFollowUps) const;
   Result<bool> dismissFollowUp(const std::string& serialNumber) const;
+  /// `delay` in seconds.
+  Result<bool> scheduleOutreach(double delay) const;
+  /// Answered only when the agent has looked into it, which may be an hour later.
+  Result<bool> accountAdded() const;
+  /// How an application stands on this device; the keys are the agent's.
+  Result<Value> supportApplication(const std::string& bundleIdentifier) const;
+  /// Nothing when no override is set.
+  Result<std::optional<std::string>> webURLOverride() const;
 
+  /// What is to be done about once a second while an answer is waited for, with the seconds so far.
+  void setWaiting(std::function<void(int seconds)> waiting) { waiting_ = std::move(waiting); }
+
+  /// Calls a member without arguments, and does not wait for its reply.
+  std::optional<Error> tell(const char* member) const;
+  /// Posts a notification to everyone on the bus.
+  std::optional<Error> post(const std::string& notification) const;
   /// Any operation, by its member's name and the type of what it replies.
   Result<Value> call(const char* member, const std::vector<Argument>& arguments, const char* replyType) const;
 
@@ -57,6 +74,7 @@ class AgentClient {
   explicit AgentClient(BusRef bus) : bus_(std::move(bus)) {}
 
   BusRef bus_;
+  std::function<void(int)> waiting_;
 };
 
 }  // namespace kvr::client

@@ -3,11 +3,14 @@
 #include "client/AgentClient.h"
 #include "platform/PropertyList.h"
 
+#include <openssl/sha.h>
 #include <pwd.h>
 #include <unistd.h>
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
+#include <cstdio>
 #include <cstdlib>
 #include <fstream>
 #include <iterator>
@@ -21,7 +24,21 @@ constexpr const char* kFollowUps = "Library/FollowUps/com.tarsil.Kavrel.plist";
 constexpr const char* kActivities = "Library/Activities/com.tarsil.kvragent.plist";
 constexpr const char* kPreferences = "Library/Preferences/com.tarsil.kvragent.plist";
 constexpr std::string_view kTargetDate = ".TargetDate";
+constexpr std::string_view kDownloadedDate = "_CachedWarrantyLastUpdatedDate";
 constexpr std::int64_t kBadge = 1;  // of the display style
+
+/// Under which the agent keeps what it knows of a device.
+std::string hashOf(const std::string& serialNumber) {
+  std::array<unsigned char, SHA256_DIGEST_LENGTH> digest{};
+  SHA256(reinterpret_cast<const unsigned char*>(serialNumber.data()), serialNumber.size(), digest.data());
+  std::string hash;
+  for (const auto byte : digest) {
+    std::array<char, 3> digits{};
+    std::snprintf(digits.data(), digits.size(), "%02x", byte);
+    hash += digits.data();
+  }
+  return hash;
+}
 
 }  // namespace
 
@@ -94,6 +111,12 @@ Result<std::vector<Activity>> LocalState::activities() const {
   };
   std::ranges::stable_sort(sorted, {}, dateOf);
   return sorted;
+}
+
+Result<std::optional<Date>> LocalState::downloadedDate(const std::string& serialNumber) const {
+  const auto preferences = dictionaryIn(kPreferences);
+  if (!preferences) return preferences.error();
+  return (*preferences)[hashOf(serialNumber) + std::string(kDownloadedDate)].dateIfAny();
 }
 
 }  // namespace kvr::client

@@ -42,6 +42,9 @@ class LocalState {
   /// In the order in which they come: those with an earlier date first.
   Result<std::vector<Activity>> activities() const;
 
+  /// When the device's warranty was downloaded last.
+  Result<std::optional<Date>> downloadedDate(const std::string& serialNumber) const;
+
   /// HOME, or as the system has it.
   static std::string homeDirectoryOfUser();
 

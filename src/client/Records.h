@@ -24,6 +24,20 @@ struct Device {
   static Device from(const Value& record);
 };
 
+/// What a warranty's dictionary says to its owner.
+struct Coverage {
+  bool isCovered = false;
+  std::optional<std::string> label;
+  std::optional<std::string> description;
+  std::optional<Date> end;
+  bool isOfferShown = false;  ///< whether an offer's follow-up may be shown
+  std::optional<std::string> offerLabel;
+  std::optional<Date> offerFrom;  ///< from when the follow-up is due
+  std::optional<Date> offerEnd;
+
+  static Coverage from(const Value& warranty);
+};
+
 struct DeviceInfo {
   Device device;
   Value warranty;  ///< the warranty's dictionary, null when none is known

@@ -14,7 +14,6 @@ namespace {
 
 constexpr std::string_view kVersion = "1";
 constexpr std::size_t kShownSerialCharacters = 4;
-constexpr double kFirstMillisecondEpoch = 1e10;
 constexpr double kLastCalendarSecond = 1e15;
 
 /// Control characters, line separators, and what reorders text.
@@ -61,12 +60,6 @@ const char* nameOfType(std::uint64_t type) {
   return type == Device::Watch ? "Watch" : type == Device::Other ? "Other" : "Default";
 }
 
-std::optional<Date> epochDate(const Value& epoch) {
-  if (!epoch.isNumber()) return std::nullopt;
-  const double number = epoch.asDouble();
-  return Date{number > kFirstMillisecondEpoch ? number / 1000 : number};
-}
-
 std::string shown(const std::optional<Date>& date) {
   return date ? isoDate(*date).value_or("unknown") : "unknown";
 }
@@ -76,19 +69,36 @@ void appendWarranty(std::vector<std::pair<std::string, std::string>>& lines, con
     lines.emplace_back("Warranty", "none known");
     return;
   }
-  const auto appendText = [&](const char* name, const char* key) {
-    if (warranty[key].isString()) lines.emplace_back(name, warranty[key].string());
+  const auto coverage = Coverage::from(warranty);
+  const auto append = [&lines](const char* name, const std::optional<std::string>& text) {
+    if (text) lines.emplace_back(name, *text);
   };
-  const auto appendDate = [&](const char* name, const char* key) {
-    if (const auto date = epochDate(warranty[key])) lines.emplace_back(name, shown(date));
+  const auto dateText = [](const std::optional<Date>& date) {
+    return date ? std::optional(shown(date)) : std::nullopt;
   };
-  lines.emplace_back("Covered", warranty["covered"].asBool() ? "yes" : "no");
-  appendText("Coverage", "coverageLocalizedLabel");
-  appendText("Description", "coverageLocalizedDesc");
-  appendDate("Coverage ends", "coverageEndDate");
+  lines.emplace_back("Covered", coverage.isCovered ? "yes" : "no");
+  append("Coverage", coverage.label);
+  append("Description", coverage.description);
+  append("Coverage ends", dateText(coverage.end));
   if (!warranty["zubOfferEligible"].asBool()) return;
-  appendText("Offer", "zubLocalizedOfferLabel");
-  appendDate("Offer ends", "zubOfferEligibleUntil");
+  append("Offer", coverage.offerLabel);
+  append("Offer ends", dateText(coverage.offerEnd));
+}
+
+/// Whole days from one date to another, rounded up; "0" for one that has passed.
+std::string daysBetween(Date from, Date until) {
+  const double days = std::ceil((until - from) / 86400);
+  return std::abs(days) < kLastCalendarSecond ? std::to_string(std::max(0LL, static_cast<long long>(days)))
+                                              : "";
+}
+
+std::string ageText(double seconds) {
+  if (!(seconds >= 0) || seconds > kLastCalendarSecond) return "";
+  const auto whole = static_cast<long long>(seconds);
+  if (whole < 60) return "just now";
+  if (whole < 3600) return std::to_string(whole / 60) + " min ago";
+  if (whole < 2 * 86400) return std::to_string(whole / 3600) + " h ago";
+  return std::to_string(whole / 86400) + " days ago";
 }
 
 std::string aligned(const std::vector<std::pair<std::string, std::string>>& lines) {
@@ -215,10 +225,59 @@ Value Report::treeOf(const Device& device) const {
   return plain(tree);
 }
 
+std::string Report::text(const Value& dictionary) {
+  Lines lines;
+  if (dictionary.isDictionary()) {
+    for (const auto& [key, value] : dictionary.dictionary()) lines.emplace_back(key, describe(value));
+  }
+  return aligned(lines);
+}
+
+Result<std::string> Report::json(std::string_view name, const Value& tree) {
+  const Result<std::string> content = writeJSON(plain(tree));
+  if (!content) return content.error();
+  return document(name, *content);
+}
+
 Result<std::string> Report::json(const Device& device) const {
   const Result<std::string> content = writeJSON(treeOf(device));
   if (!content) return content.error();
   return document("device", *content);
+}
+
+Value Report::treeOf(const DeviceStatus& status) const {
+  const auto& [device, coverage, hasFollowUp, downloaded, now] = status;
+  Value::Dictionary tree{
+      {"device", treeOf(device)}, {"hasFollowUp", hasFollowUp}, {"isKnown", coverage.has_value()}};
+  if (downloaded) tree.emplace("downloadedDate", *downloaded);
+  if (coverage) {
+    tree.emplace("isCovered", coverage->isCovered);
+    if (coverage->end) tree.emplace("coverageEndDate", *coverage->end);
+    if (coverage->isOfferShown && coverage->offerEnd) tree.emplace("offerEndDate", *coverage->offerEnd);
+  }
+  return plain(tree);
+}
+
+std::string Report::text(const std::vector<DeviceStatus>& statuses, const Style& style) const {
+  Table table({"Device", "Serial", "Coverage", "Until", "Days left", "Offer until", "Follow-up", "Asked"});
+  for (const auto& status : statuses) {
+    const auto& coverage = status.coverage;
+    const bool isCovered = coverage && coverage->isCovered;
+    const auto until = coverage ? coverage->end : std::nullopt;
+    const bool isOffered =
+        coverage && coverage->isOfferShown && coverage->offerEnd && *coverage->offerEnd > status.now;
+    table.add({printable(status.device.name.value_or("unnamed")),
+               printable(status.device.serialNumber ? serial(*status.device.serialNumber) : "unknown"),
+               style.paint(isCovered ? Style::Good : Style::Bad,
+                           !coverage   ? "unknown"
+                           : isCovered ? printable(coverage->label.value_or("covered"))
+                                       : "not covered"),
+               until ? style.day(*until) : "", until ? daysBetween(status.now, *until) : "",
+               isOffered ? style.day(*coverage->offerEnd) : "",
+               status.hasFollowUp ? style.paint(Style::Notice, "shown") : "",
+               status.downloaded ? ageText(status.now - *status.downloaded) : ""});
+  }
+  return table.text();
 }
 
 Value Report::treeOf(const FollowUp& followUp) const {
@@ -241,6 +300,10 @@ Value Report::treeOf(const Activity& activity) {
 
 Result<std::string> Report::json(const std::vector<Device>& devices) const {
   return listed("devices", devices, [this](const Device& device) { return treeOf(device); });
+}
+
+Result<std::string> Report::json(const std::vector<DeviceStatus>& statuses) const {
+  return listed("statuses", statuses, [this](const DeviceStatus& status) { return treeOf(status); });
 }
 
 Result<std::string> Report::json(const std::vector<FollowUp>& followUps) const {

@@ -74,6 +74,8 @@ TEST_F(Kvrctl, AsksWhatItIsTold) {
   setAnswer("GetDeviceInfoForSerialNumber", info(Value::Dictionary{{"covered", true}}));
   setAnswer("GetDefaultDeviceInfoUsingPolicy", info(Value()));
   setAnswer("GetAllDeviceInfosUsingPolicy", Value::Array{info(Value()), info(Value::Dictionary{})});
+  for (const auto* member : {"DismissFollowUpForSerialNumber", "ScheduleOutreachAfter"}) setAnswer(member, true);
+  setAnswer("TarsilAccountAdded", false);
   setAnswer("DefaultDevice", Value::Dictionary{{"name", 7}, {"deviceType", "x"}});
   const struct {
     std::vector<std::string> arguments;
@@ -82,6 +84,13 @@ TEST_F(Kvrctl, AsksWhatItIsTold) {
   } cases[] = {
       {{"device"}, "DefaultDevice()", 0},
       {{"paired"}, "PairedDevices()", 0},
+      {{}, "GetAllDeviceInfosUsingPolicy(1, 0)", 0},
+      {{"refresh"}, "GetAllDeviceInfosUsingPolicy(2, 0)", 0},
+      {{"dismiss", "S1"}, "DismissFollowUpForSerialNumber(S1)", 0},
+      {{"schedule-outreach", "--after", "60"}, "ScheduleOutreachAfter(60)", 0},
+      {{"account-added"}, "TarsilAccountAdded()", 2},
+      {{"support-app", "b"}, "AppSupportAvailability(b)", 0},
+      {{"web-url"}, "ReadWebURLOverride()", 2},
       {{"info"}, "GetDefaultDeviceInfoUsingPolicy(0)", 2},
       {{"info", "S1", "--policy", "refresh"}, "GetDeviceInfoForSerialNumber(S1, 2)", 0},
       {{"info", "--all", "--policy", "cache"}, "GetAllDeviceInfosUsingPolicy(1, 0)", 0},
@@ -103,7 +112,7 @@ TEST_F(Kvrctl, TellsWhyItGotNoAnswer) {
   EXPECT_EQ(refused.output, "");
   EXPECT_THAT(refused.errors, AllOf(HasSubstr(std::string(kEntitlement)), HasSubstr("Entitlements.plist")));
   const std::vector<std::string> misuses[] = {
-      {}, {"devices"}, {"info", "S", "--all"}, {"info", "--policy", "7"}, {"info", ""}, {"info", "\xFF"}};
+      {"devices"}, {"info", "S", "--all"}, {"info", "--policy", "7"}, {"info", ""}, {"info", "\xFF"}};
   for (const auto& misuse : misuses) EXPECT_EQ(run(misuse).status, 1);
   bus.kill();
   EXPECT_EQ(run({"device"}).status, 3);

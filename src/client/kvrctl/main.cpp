@@ -3,13 +3,24 @@
 #include "client/AgentClient.h"
 #include "client/LocalState.h"
 #include "client/Report.h"
+#include "client/Timeline.h"
+#include "client/kvrctl/Doctor.h"
+#include "client/kvrctl/Monitor.h"
 
 #include <CLI/CLI.hpp>
+#include <sys/ioctl.h>
+#include <unistd.h>
 
 #include <algorithm>
+#include <array>
+#include <cerrno>
+#include <chrono>
+#include <clocale>
 #include <cstdio>
 #include <exception>
 #include <filesystem>
+#include <fstream>
+#include <map>
 #include <string>
 
 namespace {
@@ -21,6 +32,10 @@ enum Status { kFine = 0, kFailed = 1, kNothingKnown = 2, kUnreachable = 3, kRefu
 
 struct Options {
   std::string serialNumber;
+  std::string text;
+  std::string file;
+  double seconds = 0;
+  bool noWait = false;
   Policy policy = Policy::Default;
   bool all = false;
   bool json = false;
@@ -59,11 +74,15 @@ int print(const Result<std::string>& text, int status) {
   return text ? print(*text, status) : fail(text.error());
 }
 
+Report reportFor(const Options& options) {
+  return Report(options.showSerial ? Report::Serials::Whole : Report::Serials::Shortened);
+}
+
 /// Writes an answer's text, or its JSON; `none` in the place of a text without anything.
 template <class Answer>
 int show(const Result<Answer>& answer, const Options& options, const std::string& none) {
   if (!answer) return fail(answer.error());
-  const Report report(options.showSerial ? Report::Serials::Whole : Report::Serials::Shortened);
+  const Report report = reportFor(options);
   if (options.json) return print(report.json(*answer), kFine);
   const std::string text = report.text(*answer);
   return print(text.empty() ? none + "\n" : text, kFine);
@@ -73,8 +92,7 @@ int showDevice(const AgentClient& agent, const Options& options) {
   const Result<Device> device = agent.defaultDevice();
   if (!device) return fail(device.error());
   if (!options.json) return show(Result(std::vector{*device}), options, {});
-  return print(Report(options.showSerial ? Report::Serials::Whole : Report::Serials::Shortened).json(*device),
-               kFine);
+  return print(reportFor(options).json(*device), kFine);
 }
 
 int showPaired(const AgentClient& agent, const Options& options) {
@@ -100,15 +118,152 @@ int showInfo(const AgentClient& agent, const Options& options) {
 }
 
 int dismiss(const AgentClient& agent, const Options& options) {
-  const Result<bool> answer = agent.dismissFollowUp(options.serialNumber);
+  const Result<bool> answer = agent.dismissFollowUp(options.text);
   return answer ? kFine : fail(answer.error());
+}
+
+int scheduleOutreach(const AgentClient& agent, const Options& options) {
+  const Result<bool> answer = agent.scheduleOutreach(options.seconds);
+  return answer ? kFine : fail(answer.error());
+}
+
+int reportAccountAdded(const AgentClient& agent, const Options& options) {
+  if (options.noWait) {
+    const auto error = agent.tell("TarsilAccountAdded");
+    return error ? fail(*error) : kFine;
+  }
+  if (::isatty(STDERR_FILENO) == 1)
+    say("the agent may take an hour to answer; --no-wait does not wait for it");
+  const Result<bool> answer = agent.accountAdded();
+  if (!answer) return fail(answer.error());
+  return print(*answer ? "The agent has looked into it\n" : "The agent has not been set up yet\n",
+               *answer ? kFine : kNothingKnown);
+}
+
+int showSupportApplication(const AgentClient& agent, const Options& options) {
+  const Result<Value> answer = agent.supportApplication(options.text);
+  if (!answer) return fail(answer.error());
+  const auto report = reportFor(options);
+  return options.json ? print(report.json("supportApplication", *answer), kFine)
+                      : print(report.text(*answer), kFine);
+}
+
+int showWebURL(const AgentClient& agent, const Options& options) {
+  const Result<std::optional<std::string>> answer = agent.webURLOverride();
+  if (!answer) return fail(answer.error());
+  const int status = *answer ? kFine : kNothingKnown;
+  if (options.json) return print(reportFor(options).json("webURL", Value(*answer)), status);
+  return print(*answer ? printable(**answer) + "\n" : "No override\n", status);
+}
+
+Date now() {
+  using Seconds = std::chrono::duration<double>;
+  return {std::chrono::duration_cast<Seconds>(std::chrono::system_clock::now().time_since_epoch()).count()};
+}
+
+/// Each device with what is known of it, here and at the agent.
+Result<std::vector<DeviceStatus>> statusesFrom(const AgentClient& agent, Policy policy) {
+  const auto infos = agent.allDeviceInfos(policy, false);
+  if (!infos) return infos.error();
+  const LocalState state;
+  const auto followUps = state.followUps();
+  std::vector<DeviceStatus> statuses;
+  for (const auto& [device, warranty] : *infos) {
+    DeviceStatus status{device, std::nullopt, false, std::nullopt, now()};
+    if (!warranty.isNull()) status.coverage = Coverage::from(warranty);
+    if (followUps && device.serialNumber) {
+      status.hasFollowUp = std::ranges::any_of(*followUps, [&device](const FollowUp& followUp) {
+        return followUp.serialNumber == device.serialNumber;
+      });
+    }
+    if (device.serialNumber) {
+      const auto downloaded = state.downloadedDate(*device.serialNumber);
+      if (downloaded) status.downloaded = *downloaded;
+    }
+    statuses.push_back(std::move(status));
+  }
+  std::ranges::sort(statuses, {}, [](const DeviceStatus& status) {
+    return std::pair(status.device.deviceType, status.device.name.value_or(""));
+  });
+  return statuses;
+}
+
+int showStatuses(const AgentClient& agent, const Options& options, Policy policy) {
+  const auto statuses = statusesFrom(agent, policy);
+  if (!statuses) return fail(statuses.error());
+  const bool isKnown =
+      std::ranges::any_of(*statuses, [](const auto& status) { return status.coverage.has_value(); });
+  const auto report = reportFor(options);
+  const int status = isKnown ? kFine : kNothingKnown;
+  return options.json ? print(report.json(*statuses), status)
+                      : print(report.text(*statuses, Style::ofOutput()), status);
+}
+
+int showStatus(const AgentClient& agent, const Options& options) {
+  return showStatuses(agent, options, Policy::CacheOnly);
+}
+
+int refresh(const AgentClient& agent, const Options& options) {
+  return showStatuses(agent, options, Policy::Refresh);
+}
+
+int showTimeline(const AgentClient& agent, const Options& options) {
+  const auto statuses = statusesFrom(agent, Policy::CacheOnly);
+  if (!statuses) return fail(statuses.error());
+  const LocalState state;
+  const auto followUps = state.followUps();
+  const auto activities = state.activities();
+  if (!followUps || !activities) return fail(followUps ? activities.error() : followUps.error());
+  const Timeline timeline(*statuses, *followUps, *activities, now());
+  if (options.file.empty()) {
+    winsize size{};
+    const bool isKnown = ::ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) == 0 && size.ws_col > 0;
+    return print(timeline.text(Style::ofOutput(), isKnown ? size.ws_col - 12U : 88U), kFine);
+  }
+  std::ofstream file(options.file, std::ios::trunc);
+  if (file << timeline.svg() << std::flush) return kFine;
+  say(options.file + " cannot be written: " + std::generic_category().message(errno));
+  return kFailed;
+}
+
+int notify(const AgentClient& agent, const Options& options) {
+  const auto error = agent.post(options.text);
+  return error ? fail(*error) : kFine;
+}
+
+int showVerdicts(const Options& options) {
+  const auto verdicts = examine();
+  const Style style = Style::ofOutput();
+  Value::Array trees;
+  Table table({"", "", "", ""});
+  int status = kFine;
+  for (const auto& [subject, state, finding, cure] : verdicts) {
+    constexpr std::array<const char*, 3> kMarks{"fine", "look", "broken"};
+    constexpr std::array<Style::Paint, 3> kPaints{Style::Good, Style::Notice, Style::Bad};
+    if (state == Verdict::Broken) status = kFailed;
+    trees.emplace_back(Value::Dictionary{
+        {"subject", subject}, {"verdict", kMarks[state]}, {"finding", finding}, {"cure", cure}});
+    table.add({style.paint(kPaints[state], kMarks[state]), printable(subject), printable(finding),
+               cure.empty() ? "" : "→ " + printable(cure)});
+  }
+  if (options.json) return print(reportFor(options).json("verdicts", trees), status);
+  const std::string text = table.text();
+  return print(text.substr(text.find('\n') + 1), status);
 }
 
 using AgentCommand = int (*)(const AgentClient&, const Options&);
 
 int withAgent(AgentCommand command, const Options& options) {
-  const Result<AgentClient> agent = AgentClient::connect();
-  return agent ? command(*agent, options) : fail(agent.error());
+  Result<AgentClient> connected = AgentClient::connect();
+  if (!connected) return fail(connected.error());
+  AgentClient agent = *std::move(connected);
+  const bool isWatched = ::isatty(STDERR_FILENO) == 1;
+  if (isWatched) {
+    agent.setWaiting([](int seconds) { std::fprintf(stderr, "\rwaiting for the agent, %d s ", seconds); });
+  }
+  const int status = command(agent, options);
+  if (isWatched) std::fprintf(stderr, "\r\033[K");
+  return status;
 }
 
 CLI::App* addCommand(CLI::App& app, const char* name, const char* description, Options& options) {
@@ -122,27 +277,54 @@ int run(int argumentCount, char** arguments) {
   Options options;
   std::string policy = "default";
   CLI::App app("Asks the agent about devices and their warranties.", "kvrctl");
-  app.require_subcommand(1);
+  app.require_subcommand(0, 1);
   app.footer(
-      "Exit status: 0 fine, 2 no warranty known, 3 the agent cannot be reached, 4 it refuses this program, "
+      "Exit status: 0 fine, 2 nothing known, 3 the agent cannot be reached, 4 it refuses this program, "
       "1 anything else.");
-  CLI::App* const device = addCommand(app, "device", "This device", options);
-  const CLI::App* const paired = addCommand(app, "paired", "The paired devices", options);
-  const CLI::App* const followUps = addCommand(app, "follow-ups", "The offers that are shown", options);
-  const CLI::App* const activities =
-      addCommand(app, "activities", "The background activities to come", options);
-  CLI::App* const dismissal = app.add_subcommand("dismiss", "Takes a device's offer away");
-  dismissal->add_option("SERIAL", options.serialNumber, "The device's serial number")->required();
-  CLI::App* const info = addCommand(app, "info", "A device and its warranty", options);
+  std::map<const CLI::App*, AgentCommand> commands;
+  const auto add = [&](const char* name, const char* description, AgentCommand command) {
+    CLI::App* const added = addCommand(app, name, description, options);
+    commands.emplace(added, command);
+    return added;
+  };
+  const auto isText = [](const std::string& text) {
+    return text.empty() ? std::string("it is empty") : std::string();
+  };
+  add("status", "Every device at a glance, from what is known already (the default)", showStatus);
+  add("device", "This device", showDevice);
+  add("paired", "The paired devices", showPaired);
+  CLI::App* const info = add("info", "A device and its warranty", showInfo);
   CLI::Option* const serial =
-      info->add_option("SERIAL", options.serialNumber, "Another device's serial number")
-          ->check([](const std::string& text) {
-            return text.empty() ? std::string("a serial number is not empty") : std::string();
-          });
+      info->add_option("SERIAL", options.serialNumber, "Another device's serial number")->check(isText);
   info->add_option("--policy", policy, "Where the warranty comes from")
       ->check(CLI::IsMember({"default", "cache", "refresh"}))
       ->capture_default_str();
   info->add_flag("--all", options.all, "This device and every paired one")->excludes(serial);
+  add("refresh", "Downloads every device's warranty anew", refresh);
+  add("dismiss", "Takes a device's offer away", dismiss)
+      ->add_option("SERIAL", options.text, "The device's serial number")
+      ->required()
+      ->check(isText);
+  add("schedule-outreach", "Has the agent ask about every device by itself", scheduleOutreach)
+      ->add_option("--after", options.seconds, "So many seconds from now");
+  add("account-added", "Tells the agent that a cloud account was added", reportAccountAdded)
+      ->add_flag("--no-wait", options.noWait, "Does not wait for the answer, which may take an hour");
+  add("support-app", "How an application stands on this device", showSupportApplication)
+      ->add_option("BUNDLE", options.text, "Its bundle identifier")
+      ->required()
+      ->check(isText);
+  add("web-url", "The override of the web flow's address", showWebURL);
+  add("timeline", "Coverage, offers and activities on one axis of dates", showTimeline)
+      ->add_option("--svg", options.file, "Draws a picture into this file instead");
+  add("notify", "Posts a notification to everyone on the bus", notify)
+      ->add_option("NAME", options.text, "Its name")
+      ->required()
+      ->check(isText);
+  const CLI::App* const followUps = addCommand(app, "follow-ups", "The offers that are shown", options);
+  const CLI::App* const activities =
+      addCommand(app, "activities", "The background activities to come", options);
+  const CLI::App* const watching = addCommand(app, "monitor", "What changes, as it happens", options);
+  const CLI::App* const doctor = addCommand(app, "doctor", "What is wrong, and what helps", options);
   try {
     app.parse(argumentCount, arguments);
   } catch (const CLI::ParseError& error) {
@@ -152,13 +334,18 @@ int run(int argumentCount, char** arguments) {
   if (policy == "refresh") options.policy = Policy::Refresh;
   if (followUps->parsed()) return show(LocalState().followUps(), options, "No follow-ups");
   if (activities->parsed()) return show(LocalState().activities(), options, "No activities");
-  if (dismissal->parsed()) return withAgent(dismiss, options);
-  return withAgent(device->parsed() ? showDevice : paired->parsed() ? showPaired : showInfo, options);
+  if (watching->parsed()) return monitor(reportFor(options));
+  if (doctor->parsed()) return showVerdicts(options);
+  for (const auto& [command, operation] : commands) {
+    if (command->parsed()) return withAgent(operation, options);
+  }
+  return withAgent(showStatus, options);
 }
 
 }  // namespace
 
 int main(int argumentCount, char** arguments) {
+  std::setlocale(LC_TIME, "");
   try {
     return run(argumentCount, arguments);
   } catch (const std::exception& error) {

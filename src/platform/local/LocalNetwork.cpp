@@ -28,7 +28,7 @@ bool isHostReachable(const std::string& path) {
 }  // namespace
 
 LocalNetwork::LocalNetwork(EventLoop& loop, Log& log, const DeviceRoot& root,
-                           std::function<void(bool)> changed, std::string hostState)
+                           const std::function<void(bool)>& changed, std::string hostState)
     : root_(root),
       hostState_(std::move(hostState)),
       ownWatch_(loop, log, root.pathOf(kFile), [this, changed] { changed(isReachable()); }),

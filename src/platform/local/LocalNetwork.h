@@ -16,8 +16,8 @@ class LocalNetwork {
   static constexpr const char* kHostState = "/run/systemd/netif/state";
 
   /// `changed` is called on the loop's thread, with the answer, when it may have changed.
-  LocalNetwork(EventLoop& loop, Log& log, const DeviceRoot& root, std::function<void(bool reachable)> changed,
-               std::string hostState = kHostState);
+  LocalNetwork(EventLoop& loop, Log& log, const DeviceRoot& root,
+               const std::function<void(bool reachable)>& changed, std::string hostState = kHostState);
 
   /// The answer now. Any thread.
   bool isReachable() const;

@@ -27,9 +27,10 @@ std::string LocalStringTables::localizedString(const std::string& bundle, const 
   const std::array<std::string, 3> languages{identifier, identifier.substr(0, identifier.find_first_of("_-")),
                                              "en"};
   for (const auto& language : languages) {
-    const auto file = bundle + "/" + language + "/" + table + ".plist";
-    for (const auto& path : {root_.pathOf("Resources/" + file), installed_ + "/" + file}) {
-      const auto texts = root_.lists().read(path, PropertyListFiles::Expected::Dictionary,
+    const auto file = std::filesystem::path(bundle) / language / (table + ".plist");
+    for (const auto& path : {std::filesystem::path(root_.pathOf("Resources")) / file,
+                             std::filesystem::path(installed_) / file}) {
+      const auto texts = root_.lists().read(path.string(), PropertyListFiles::Expected::Dictionary,
                                             PropertyListFiles::WhenDamaged::Leave);
       if (!texts) continue;
       if (const auto text = (*texts)[key].stringIfAny()) return *text;

@@ -1,0 +1,69 @@
+#include "client/Terminal.h"
+
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <cmath>
+#include <cstdlib>
+#include <ctime>
+
+namespace kvr::client {
+namespace {
+
+constexpr double kLastCalendarSecond = 1e15;
+constexpr std::array<const char*, 4> kColours{"\033[32m", "\033[31m", "\033[33m", "\033[2m"};
+constexpr const char* kPlain = "\033[0m";
+constexpr std::size_t kGap = 2;  // columns between two
+
+}  // namespace
+
+Style Style::ofOutput() {
+  const char* const refused = std::getenv("NO_COLOR");
+  return Style(::isatty(STDOUT_FILENO) == 1 && (refused == nullptr || *refused == '\0'));
+}
+
+std::string Style::paint(Paint paint, const std::string& text) const {
+  return isColoured_ && !text.empty() ? std::string(kColours[paint]) + text + kPlain : text;
+}
+
+std::string Style::day(Date date) {
+  if (!(std::abs(date.secondsSince1970) < kLastCalendarSecond)) return "unknown";
+  const auto time = static_cast<std::time_t>(std::floor(date.secondsSince1970));
+  std::tm local{};
+  std::array<char, 64> text{};
+  if (::localtime_r(&time, &local) == nullptr) return "unknown";
+  return {text.data(), std::strftime(text.data(), text.size(), "%x", &local)};
+}
+
+std::size_t columnsOf(std::string_view text) {
+  std::size_t columns = 0;
+  bool isInColour = false;
+  for (const char c : text) {
+    if (c == '\033') isInColour = true;
+    // What continues a character in UTF-8 takes no column of its own.
+    if (!isInColour && (static_cast<unsigned char>(c) & 0xC0U) != 0x80U) ++columns;
+    if (c == 'm') isInColour = false;
+  }
+  return columns;
+}
+
+std::string Table::text() const {
+  std::vector<std::size_t> widths(rows_.front().size(), 0);
+  for (const auto& row : rows_) {
+    for (std::size_t column = 0; column < row.size(); ++column) {
+      widths[column] = std::max(widths[column], columnsOf(row[column]));
+    }
+  }
+  std::string text;
+  for (const auto& row : rows_) {
+    std::string line;
+    for (std::size_t column = 0; column < row.size(); ++column) {
+      line += row[column] + std::string(widths[column] - columnsOf(row[column]) + kGap, ' ');
+    }
+    text += line.substr(0, line.find_last_not_of(' ') + 1) + "\n";
+  }
+  return text;
+}
+
+}  // namespace kvr::client
