@@ -2,6 +2,7 @@
 
 #include "agent/AgentKeys.h"
 #include "agent/Configuration.h"
+#include "followup/FollowUpKeys.h"
 #include "followup/KVRFollowUp.h"
 #include "followup/KVRFollowUpPost.h"
 #include "followup/KVRFollowUpRefresh.h"
@@ -41,7 +42,8 @@ void StartUp::resumeFollowUps(Platform& platform) {
   if (post->scheduledActivityDate()) post->monitorForScheduledActivity();
   const auto refresh = KVRScheduler::newSchedulerWithActivityDelegate(
       platform, std::make_shared<KVRFollowUpRefresh>(platform));
-  if (!refresh->scheduledActivityDate() && KVRFollowUp(platform).pendingFollowUpCount() > 0) {
+  const bool hasPosted = !platform.preferences.objectForKey(preference::kFollowUpPostedHashes).isNull();
+  if (hasPosted && !refresh->scheduledActivityDate() && KVRFollowUp(platform).pendingFollowUpCount() > 0) {
     refresh->scheduleActivityForDate(platform.clock.now());
   }
 }
