@@ -168,17 +168,13 @@ Result<std::vector<DeviceStatus>> statusesFrom(const AgentClient& agent, Policy 
   const LocalState state;
   const auto followUps = state.followUps();
   std::vector<DeviceStatus> statuses;
-  for (const auto& [device, warranty] : *infos) {
-    DeviceStatus status{device, std::nullopt, false, std::nullopt, now()};
-    if (!warranty.isNull()) status.coverage = Coverage::from(warranty);
-    if (followUps && device.serialNumber) {
-      status.hasFollowUp = std::ranges::any_of(*followUps, [&device](const FollowUp& followUp) {
-        return followUp.serialNumber == device.serialNumber;
-      });
-    }
-    if (device.serialNumber) {
-      const auto downloaded = state.downloadedDate(*device.serialNumber);
-      if (downloaded) status.downloaded = *downloaded;
+  for (const auto& info : *infos) {
+    DeviceStatus status{info.device, std::nullopt, false, std::nullopt, now()};
+    if (!info.warranty.isNull()) status.coverage = Coverage::from(info.warranty);
+    if (const auto& serialNumber = info.device.serialNumber) {
+      status.hasFollowUp = followUps && std::ranges::find(*followUps, serialNumber,
+                                                          &FollowUp::serialNumber) != followUps->end();
+      if (const auto downloaded = state.downloadedDate(*serialNumber)) status.downloaded = *downloaded;
     }
     statuses.push_back(std::move(status));
   }
