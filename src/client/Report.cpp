@@ -14,6 +14,7 @@ namespace {
 
 constexpr std::string_view kVersion = "1";
 constexpr std::size_t kShownSerialCharacters = 4;
+constexpr long long kDaySeconds = 86400;
 constexpr double kLastCalendarSecond = 1e15;
 
 /// Control characters, line separators, and what reorders text.
@@ -97,8 +98,8 @@ std::string ageText(double seconds) {
   const auto whole = static_cast<long long>(seconds);
   if (whole < 60) return "just now";
   if (whole < 3600) return std::to_string(whole / 60) + " min ago";
-  if (whole < 2 * 86400) return std::to_string(whole / 3600) + " h ago";
-  return std::to_string(whole / 86400) + " days ago";
+  if (whole < 2 * kDaySeconds) return std::to_string(whole / 3600) + " h ago";
+  return std::to_string(whole / kDaySeconds) + " days ago";
 }
 
 std::string aligned(const std::vector<std::pair<std::string, std::string>>& lines) {

@@ -74,7 +74,8 @@ TEST_F(Kvrctl, AsksWhatItIsTold) {
   setAnswer("GetDeviceInfoForSerialNumber", info(Value::Dictionary{{"covered", true}}));
   setAnswer("GetDefaultDeviceInfoUsingPolicy", info(Value()));
   setAnswer("GetAllDeviceInfosUsingPolicy", Value::Array{info(Value()), info(Value::Dictionary{})});
-  for (const auto* member : {"DismissFollowUpForSerialNumber", "ScheduleOutreachAfter"}) setAnswer(member, true);
+  for (const auto* member : {"DismissFollowUpForSerialNumber", "ScheduleOutreachAfter"})
+    setAnswer(member, true);
   setAnswer("TarsilAccountAdded", false);
   setAnswer("DefaultDevice", Value::Dictionary{{"name", 7}, {"deviceType", "x"}});
   const struct {

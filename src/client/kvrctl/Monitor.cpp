@@ -39,16 +39,19 @@ class Differences {
   void update(Lines lines) {
     for (const auto& [name, line] : lines) {
       const auto before = lines_.find(name);
-      if (before == lines_.end()) say(what_ + " " + name + ": " + line);
-      if (before != lines_.end() && before->second != line) say(what_ + " " + name + " changed: " + line);
+      if (before == lines_.end()) say(named(name).append(": ").append(line));
+      if (before != lines_.end() && before->second != line)
+        say(named(name).append(" changed: ").append(line));
     }
     for (const auto& [name, line] : lines_) {
-      if (!lines.contains(name)) say(what_ + " " + name + " is gone");
+      if (!lines.contains(name)) say(named(name).append(" is gone"));
     }
     lines_ = std::move(lines);
   }
 
  private:
+  std::string named(const std::string& name) const { return what_ + " " + name; }
+
   const std::string what_;
   Lines lines_;
 };
