@@ -34,13 +34,23 @@ struct Ending {
   void handleSignals() {
     const auto end = [](sd_event_source*, const signalfd_siginfo*, void* context) {
       auto& ending = *static_cast<Ending*>(context);
-      ending.local.beginEnding();
-      ending.loop.exit(EXIT_SUCCESS);
+      ending.loop.post([&ending] {
+        ending.local.cleanExit.abandon();
+        ending.local.beginEnding();
+        ending.loop.exit(EXIT_SUCCESS);
+      });
       return 0;
     };
     for (const int signal : {SIGTERM, SIGINT}) sd_event_add_signal(loop.event(), nullptr, signal, end, this);
   }
 };
+
+/// Nothing may be destroyed while work that uses it does not come to its end.
+void finish(kvr::LocalPlatform& local) {
+  if (local.end(kEndingLimit)) return;
+  local.log->error("Work did not finish within %d seconds of the end", static_cast<int>(kEndingLimit));
+  std::_Exit(EXIT_FAILURE);
+}
 
 int run() {
   blockSignals();
@@ -48,16 +58,16 @@ int run() {
   kvr::LocalPlatform local(loop, [&loop] { loop.exit(EXIT_FAILURE); });
   Ending ending{loop, local};
   ending.handleSignals();
-  int status = EXIT_SUCCESS;
-  {
+  int status = EXIT_FAILURE;
+  try {
     const kvr::StartUp startUp(local.platform);
     sd_notify(0, "READY=1");
     status = loop.run();
     sd_notify(0, "STOPPING=1");
-    if (!local.end(kEndingLimit)) {
-      local.log->error("Work did not finish within %d seconds of the end", static_cast<int>(kEndingLimit));
-      std::_Exit(EXIT_FAILURE);
-    }
+    finish(local);
+  } catch (const std::exception& error) {
+    local.log->error("The agent cannot go on: %@", std::string(error.what()));
+    finish(local);
   }
   return status;
 }

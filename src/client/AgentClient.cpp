@@ -12,9 +12,7 @@ constexpr const char* kName = "com.tarsil.kvragent";
 constexpr const char* kPath = "/com/tarsil/kvragent";
 constexpr const char* kInterface = "com.tarsil.kvragent.KVRAgentProtocol";
 
-/// Downloads with all their retries take hours at worst; an agent that ends is noticed at once.
-constexpr std::uint64_t kSecond = 1'000'000;                      // microseconds
-constexpr std::uint64_t kLongestCall = 24ULL * 3600 * 1'000'000;  // microseconds
+constexpr std::uint64_t kSecond = 1'000'000;  // microseconds
 
 constexpr const char* kUnreachable[] = {
     SD_BUS_ERROR_SERVICE_UNKNOWN, SD_BUS_ERROR_NAME_HAS_NO_OWNER, SD_BUS_ERROR_NO_REPLY,
@@ -81,7 +79,8 @@ Result<Value> AgentClient::call(const char* member, const std::vector<Argument>&
     *static_cast<sd_bus_message**>(kept) = sd_bus_message_ref(given);
     return 0;
   };
-  r = sd_bus_call_async(bus_.get(), &pending, made, keep, static_cast<void*>(&answer), kLongestCall);
+  r = sd_bus_call_async(bus_.get(), &pending, made, keep, static_cast<void*>(&answer),
+                        static_cast<std::uint64_t>(patience_) * kSecond);
   const BusSlotRef slot(pending);
   for (int seconds = 0; r >= 0 && answer == nullptr;) {
     r = sd_bus_process(bus_.get(), nullptr);

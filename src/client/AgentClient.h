@@ -33,8 +33,8 @@ enum Failure : std::int64_t {
 ///     Result<AgentClient> agent = AgentClient::connect();
 ///     if (agent) { auto info = agent->defaultDeviceInfo(Policy::Default); … }
 ///
-/// A call waits for its answer, which may take as long as a download does. Errors are in domain
-/// `kErrorDomain`.
+/// A call waits for its answer, which may take as long as a download with all its retries does. Errors are in
+/// domain `kErrorDomain`.
 class AgentClient {
  public:
   struct Argument {
@@ -60,6 +60,8 @@ class AgentClient {
   /// Nothing when no override is set.
   Result<std::optional<std::string>> webURLOverride() const;
 
+  /// How long an answer is waited for, in seconds; a day at first.
+  void setPatience(int seconds) { patience_ = seconds; }
   /// What is to be done about once a second while an answer is waited for, with the seconds so far.
   void setWaiting(std::function<void(int seconds)> waiting) { waiting_ = std::move(waiting); }
 
@@ -75,6 +77,7 @@ class AgentClient {
 
   BusRef bus_;
   std::function<void(int)> waiting_;
+  int patience_ = 24 * 3600;
 };
 
 }  // namespace kvr::client

@@ -229,7 +229,8 @@ Value Report::treeOf(const Device& device) const {
 std::string Report::text(const Value& dictionary) {
   Lines lines;
   if (dictionary.isDictionary()) {
-    for (const auto& [key, value] : dictionary.dictionary()) lines.emplace_back(key, describe(value));
+    for (const auto& [key, value] : dictionary.dictionary())
+      lines.emplace_back(printable(key), describe(value));
   }
   return aligned(lines);
 }

@@ -87,7 +87,7 @@ Timeline::Timeline(const std::vector<DeviceStatus>& devices, const std::vector<F
   for (const auto& activity : activities) {
     const auto date = activity.dueDate ? activity.dueDate : activity.targetDate;
     if (!date) continue;
-    rows_.push_back({activity.identifier.substr(activity.identifier.rfind('.') + 1), {}, {*date}});
+    rows_.push_back({printable(activity.identifier.substr(activity.identifier.rfind('.') + 1)), {}, {*date}});
     until_ = std::max(until_, std::min(*date, now_ + kFuture));
   }
   until_ = until_ + 0.05 * (until_ - from_);

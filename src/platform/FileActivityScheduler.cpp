@@ -175,11 +175,6 @@ void FileActivityScheduler::beginEnding() {
   arm(std::nullopt);
 }
 
-std::optional<double> FileActivityScheduler::secondsToNext() const {
-  const std::lock_guard lock(mutex_);
-  return table_.secondsToNext(now());
-}
-
 std::size_t FileActivityScheduler::runsUnderWay() const {
   const std::lock_guard lock(mutex_);
   return table_.runsUnderWay();

@@ -38,9 +38,6 @@ class FileActivityScheduler : public ActivityScheduler {
 
   /// From here on no run is started, and those under way are asked to defer. Any thread.
   void beginEnding();
-  /// Seconds until something will be due, the network staying as it is; nothing when nothing will. Any
-  /// thread.
-  std::optional<double> secondsToNext() const;
   /// Runs handed to the queue whose end has not been told. Any thread.
   std::size_t runsUnderWay() const;
 

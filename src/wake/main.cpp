@@ -1,6 +1,10 @@
 // kvragent-wake: stands in for an agent that has ended cleanly on a bus without a service manager, until
-// there is something to do for it. Argument: the date of the next activity in seconds since 1970, or "never".
-// Closes its standard output once it is watching.
+// there is something to do for it.
+//
+// Started by the agent before it gives its name up. Writes one byte to its standard output once it is
+// watching; its standard input ends with the agent, and from then on it acts: it has the bus start the next
+// agent when a notification has been posted, which it then posts again, or when an activity is due. It leaves
+// when there is an agent.
 
 #include "platform/local/BusConnection.h"
 #include "platform/local/LocalChanges.h"
@@ -10,12 +14,15 @@
 #include "platform/local/LocalWorkQueues.h"
 #include "platform/local/bus/BusHandles.h"
 
+#include <sys/epoll.h>
+#include <systemd/sd-event.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
+#include <set>
 #include <string_view>
 
 namespace kvr {
@@ -24,22 +31,26 @@ namespace {
 constexpr const char* kName = "com.tarsil.kvragent";
 constexpr const char* kBus = "org.freedesktop.DBus";
 constexpr const char* kBusPath = "/org/freedesktop/DBus";
-constexpr double kNever = 1e15;         // seconds
 constexpr double kLongestWait = 86400;  // seconds; between two looks at a clock that may have been set
+constexpr double kRetry = 60;           // seconds; after a start that failed
 
-/// Has the agent started when a date has come or a notification is posted, and leaves as soon as there is
-/// one.
 class Waker {
  public:
-  explicit Waker(Date due) : due_(due) {}
-
   int run() {
     for (const auto* name : {UserLocale::kLanguageChanged, PairedDeviceRegistry::kDeviceDidPair,
                              PairedDeviceRegistry::kDeviceDidUnpair}) {
-      notifications_.registerFor(name, [this, name] { wake(name); });
+      notifications_.registerFor(name, [this, name] {
+        heard_.insert(name);
+        look();
+      });
     }
     bus_.thread()->post([this] { watchForAgent(); });
-    waitForDate();
+    const auto agentEnded = [](sd_event_source* source, int, std::uint32_t, void* self) {
+      sd_event_source_set_enabled(source, SD_EVENT_OFF);
+      static_cast<Waker*>(self)->loop_.post([self] { static_cast<Waker*>(self)->beginActing(); });
+      return 0;
+    };
+    sd_event_add_io(loop_.event(), nullptr, STDIN_FILENO, EPOLLIN | EPOLLHUP, agentEnded, this);
     const int status = loop_.run();
     notifications_.beginEnding();
     queues_.beginEnding();
@@ -48,49 +59,82 @@ class Waker {
   }
 
  private:
-  void waitForDate() {
-    const double wait = due_ - clock_.now();
-    if (wait <= 0) return wake(nullptr);
-    loop_.after(std::min(wait, kLongestWait), [this] { waitForDate(); });
+  /// On the bus thread: whether the agent has a successor, and that this is being watched.
+  void watchForAgent() {
+    sd_bus* const bus = bus_.bus();
+    sd_bus_slot* slot = nullptr;
+    const auto changed = [](sd_bus_message* message, void* context, sd_bus_error*) {
+      return guardedBusCallback([&] {
+        const char* name = nullptr;
+        const char* before = nullptr;
+        const char* now = nullptr;
+        if (sd_bus_message_read(message, "sss", &name, &before, &now) >= 0 &&
+            std::string_view(name) == kName && *now != '\0') {
+          static_cast<Waker*>(context)->loop_.exit(EXIT_SUCCESS);
+        }
+        return 0;
+      });
+    };
+    if (bus == nullptr ||
+        sd_bus_match_signal(bus, &slot, kBus, kBusPath, kBus, "NameOwnerChanged", changed, this) < 0) {
+      return loop_.exit(EXIT_FAILURE);
+    }
+    ownerWatch_.reset(slot);
+    if (::write(STDOUT_FILENO, "+", 1) != 1) loop_.exit(EXIT_FAILURE);
   }
 
-  /// The notification is posted once more, to the agent that could not hear it.
-  void wake(const char* notification) {
-    if (std::exchange(isWaking_, true)) return;
-    bus_.thread()->post([this, notification] {
+  void beginActing() {
+    isActing_ = true;
+    look();
+  }
+
+  /// When the next activity is due, by what the agent has left on disk.
+  std::optional<Date> dueDate() {
+    const auto tree =
+        lists_.read(files_.homeDirectory() + "/Library/Activities/" + kName + ".plist",
+                    PropertyListFiles::Expected::Dictionary, PropertyListFiles::WhenDamaged::Leave);
+    std::optional<Date> due;
+    if (!tree || !(*tree)["activities"].isDictionary()) return due;
+    for (const auto& [identifier, activity] : (*tree)["activities"].dictionary()) {
+      const auto date = activity["dueDate"].dateIfAny();
+      if (date && (!due || *date < *due)) due = date;
+    }
+    return due;
+  }
+
+  void look() {
+    if (!isActing_ || isStarting_) return;
+    const auto due = dueDate();
+    const double wait = due ? *due - clock_.now() : kLongestWait;
+    if (!heard_.empty() || wait <= 0) return start();
+    loop_.after(std::min(wait, kLongestWait), [this] { look(); });
+  }
+
+  /// Nothing is missed meanwhile: what is heard goes to the next agent as well.
+  void start() {
+    isStarting_ = true;
+    bus_.thread()->post([this] {
       sd_bus* const bus = bus_.bus();
-      if (bus == nullptr) return;
-      sd_bus_call_method(bus, kBus, kBusPath, kBus, "StartServiceByName", nullptr, nullptr, "su", kName, 0U);
-      if (notification != nullptr) notifications_.post(notification);
-      bus_.thread()->post([this] { loop_.exit(EXIT_SUCCESS); });
+      const bool isStarted =
+          bus != nullptr && sd_bus_call_method(bus, kBus, kBusPath, kBus, "StartServiceByName", nullptr,
+                                               nullptr, "su", kName, 0U) >= 0;
+      loop_.post([this, isStarted] { finishStart(isStarted); });
     });
   }
 
-  /// On the bus thread.
-  void watchForAgent() {
-    sd_bus* const bus = bus_.bus();
-    if (bus == nullptr) return;
-    sd_bus_slot* slot = nullptr;
-    const auto owned = [](sd_bus_message* message, void* self, sd_bus_error*) {
-      const char* name = nullptr;
-      const char* before = nullptr;
-      const char* now = nullptr;
-      if (sd_bus_message_read(message, "sss", &name, &before, &now) >= 0 && std::string_view(name) == kName &&
-          *now != '\0') {
-        static_cast<Waker*>(self)->loop_.exit(EXIT_SUCCESS);
-      }
-      return 0;
-    };
-    if (sd_bus_match_signal(bus, &slot, kBus, kBusPath, kBus, "NameOwnerChanged", owned, this) >= 0) {
-      sd_bus_slot_set_floating(slot, 1);
-      sd_bus_slot_unref(slot);
+  void finishStart(bool isStarted) {
+    isStarting_ = false;
+    if (!isStarted) {
+      loop_.after(kRetry, [this] { look(); });
+      return;
     }
-    // From here on nothing is missed, which lets the agent go.
-    ::close(STDOUT_FILENO);
+    for (const auto& name : heard_) notifications_.post(name);
+    bus_.thread()->post([this] { loop_.exit(EXIT_SUCCESS); });
   }
 
-  const Date due_;
-  bool isWaking_ = false;
+  bool isActing_ = false;    ///< since the agent has ended
+  bool isStarting_ = false;  ///< the next one
+  std::set<std::string> heard_;
   EventLoop loop_;
   const std::unique_ptr<LocalLog> log_ = LocalLog::fromEnvironment();
   LocalClock clock_;
@@ -100,6 +144,7 @@ class Waker {
   LocalUserLocale locale_{root_, *log_};
   LocalPairedDeviceRegistry pairedDevices_{root_};
   LocalWorkQueues queues_{loop_, *log_};
+  BusSlotRef ownerWatch_;  ///< the bus thread's
   BusConnection bus_{*log_, [this](const Error&) { loop_.exit(EXIT_SUCCESS); }};
   LocalNotifications notifications_{bus_, queues_, *log_};
   LocalChanges changes_{loop_, *log_, root_, locale_, pairedDevices_, notifications_};
@@ -108,11 +153,10 @@ class Waker {
 }  // namespace
 }  // namespace kvr
 
-int main(int argumentCount, char** arguments) {
+int main() {
   std::signal(SIGPIPE, SIG_IGN);
-  const double due = argumentCount > 1 ? std::strtod(arguments[1], nullptr) : 0;
   try {
-    return kvr::Waker(kvr::Date{due > 0 ? due : kvr::kNever}).run();
+    return kvr::Waker().run();
   } catch (const std::exception& error) {
     std::fprintf(stderr, "kvragent-wake: %s\n", error.what());
     return EXIT_FAILURE;

@@ -20,6 +20,7 @@
 #include <iterator>
 #include <memory>
 #include <system_error>
+#include <utility>
 
 namespace kvr::client {
 namespace {
@@ -27,6 +28,7 @@ namespace {
 namespace fs = std::filesystem;
 
 constexpr const char* kDefaultRoot = "/var/lib/kvragent/device";
+constexpr int kAnswerLimit = 5;                // seconds
 constexpr int kConnectLimit = 3000;            // milliseconds
 constexpr std::time_t kYear2024 = 1704067200;  // no agent ran before
 constexpr std::time_t kYear2100 = 4102444800;
@@ -39,12 +41,14 @@ fs::path deviceRoot() {
 }
 
 Verdict agentVerdict() {
-  const auto agent = AgentClient::connect();
-  if (!agent) {
-    return {"session bus", Verdict::Broken, agent.error().message,
+  auto connected = AgentClient::connect();
+  if (!connected) {
+    return {"session bus", Verdict::Broken, connected.error().message,
             "log in to a session, or set DBUS_SESSION_BUS_ADDRESS"};
   }
-  const auto device = agent->defaultDevice();
+  AgentClient agent = *std::move(connected);
+  agent.setPatience(kAnswerLimit);
+  const auto device = agent.defaultDevice();
   if (device) return {"agent", Verdict::Fine, "answers, and serves this program", ""};
   if (device.error().code == Refused) {
     std::error_code unknown;

@@ -61,7 +61,7 @@ Differences::Lines followUpLines(const LocalState& state, const Report& report) 
   const auto followUps = state.followUps();
   if (!followUps) return lines;
   for (const auto& followUp : *followUps) {
-    lines[report.serial(followUp.serialNumber.value_or("of no device"))] =
+    lines[followUp.serialNumber ? report.serial(*followUp.serialNumber) : "of no device"] =
         followUp.title.value_or("untitled") + ", " + followUp.text.value_or("") +
         (followUp.hasBadge ? ", badge" : "");
   }
@@ -80,9 +80,11 @@ Differences::Lines activityLines(const LocalState& state) {
 }
 
 int handlePosted(sd_bus_message* message, void*, sd_bus_error*) {
-  const char* name = nullptr;
-  if (sd_bus_message_read(message, "s", &name) >= 0) say(std::string("notification ") + name);
-  return 0;
+  return guardedBusCallback([&] {
+    const char* name = nullptr;
+    if (sd_bus_message_read(message, "s", &name) >= 0) say(std::string("notification ") + name);
+    return 0;
+  });
 }
 
 int handleOwner(sd_bus_message* message, void*, sd_bus_error*) {
@@ -120,6 +122,7 @@ int monitor(const Report& report) {
     return 3;
   }
   const BusRef bus(opened);
+  sd_bus_set_exit_on_disconnect(opened, 1);
   sd_bus_attach_event(opened, loop.event(), 0);
   sd_bus_match_signal(opened, nullptr, nullptr, "/com/tarsil/NotificationCenter",
                       "com.tarsil.NotificationCenter", "Posted", handlePosted, nullptr);

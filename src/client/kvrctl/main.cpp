@@ -283,6 +283,12 @@ int run(int argumentCount, char** arguments) {
     commands.emplace(added, command);
     return added;
   };
+  // One whose answer is no document.
+  const auto addPlain = [&](const char* name, const char* description, AgentCommand command) {
+    CLI::App* const added = app.add_subcommand(name, description);
+    commands.emplace(added, command);
+    return added;
+  };
   const auto isText = [](const std::string& text) {
     return text.empty() ? std::string("it is empty") : std::string();
   };
@@ -297,22 +303,22 @@ int run(int argumentCount, char** arguments) {
       ->capture_default_str();
   info->add_flag("--all", options.all, "This device and every paired one")->excludes(serial);
   add("refresh", "Downloads every device's warranty anew", refresh);
-  add("dismiss", "Takes a device's offer away", dismiss)
+  addPlain("dismiss", "Takes a device's offer away", dismiss)
       ->add_option("SERIAL", options.text, "The device's serial number")
       ->required()
       ->check(isText);
-  add("schedule-outreach", "Has the agent ask about every device by itself", scheduleOutreach)
+  addPlain("schedule-outreach", "Has the agent ask about every device by itself", scheduleOutreach)
       ->add_option("--after", options.seconds, "So many seconds from now");
-  add("account-added", "Tells the agent that a cloud account was added", reportAccountAdded)
+  addPlain("account-added", "Tells the agent that a cloud account was added", reportAccountAdded)
       ->add_flag("--no-wait", options.noWait, "Does not wait for the answer, which may take an hour");
   add("support-app", "How an application stands on this device", showSupportApplication)
       ->add_option("BUNDLE", options.text, "Its bundle identifier")
       ->required()
       ->check(isText);
   add("web-url", "The override of the web flow's address", showWebURL);
-  add("timeline", "Coverage, offers and activities on one axis of dates", showTimeline)
+  addPlain("timeline", "Coverage, offers and activities on one axis of dates", showTimeline)
       ->add_option("--svg", options.file, "Draws a picture into this file instead");
-  add("notify", "Posts a notification to everyone on the bus", notify)
+  addPlain("notify", "Posts a notification to everyone on the bus", notify)
       ->add_option("NAME", options.text, "Its name")
       ->required()
       ->check(isText);

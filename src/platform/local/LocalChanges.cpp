@@ -8,6 +8,8 @@
 namespace kvr {
 namespace {
 
+constexpr double kSettling = 0.1;  // seconds
+
 bool containsAll(const std::set<std::string>& whole, const std::set<std::string>& part) {
   return std::ranges::includes(whole, part);
 }
@@ -21,15 +23,15 @@ LocalChanges::LocalChanges(EventLoop& loop, Log& log, const DeviceRoot& root, co
       pairedDevices_(pairedDevices),
       notifications_(notifications),
       hostLocale_(hostLocale),
+      loop_(loop),
       language_(languageNow()),
       watches_(watchesNow()) {
-  const auto watch = [&](const std::string& path, void (LocalChanges::*notice)()) {
-    fileWatches_.push_back(
-        std::make_unique<FileWatch>(loop, log, path, [this, notice] { (this->*notice)(); }));
-  };
-  watch(root.pathOf("Locale.plist"), &LocalChanges::noticeLanguage);
-  for (const auto& path : hostLocale_) watch(path, &LocalChanges::noticeLanguage);
-  watch(root.pathOf("PairedDevices.plist"), &LocalChanges::noticeWatches);
+  std::vector<std::string> paths = hostLocale_;
+  paths.push_back(root.pathOf("Locale.plist"));
+  paths.push_back(root.pathOf("PairedDevices.plist"));
+  for (const auto& path : paths) {
+    fileWatches_.push_back(std::make_unique<FileWatch>(loop, log, path, [this] { noticeSoon(); }));
+  }
 }
 
 std::string LocalChanges::languageNow() const {
@@ -51,14 +53,17 @@ std::set<std::string> LocalChanges::watchesNow() const {
   return watches;
 }
 
-void LocalChanges::noticeLanguage() {
-  if (std::exchange(language_, languageNow()) != language_) notifications_.post(UserLocale::kLanguageChanged);
+void LocalChanges::noticeSoon() {
+  if (std::exchange(isNoticing_, true)) return;
+  loop_.after(kSettling, [this] { notice(); });
 }
 
-void LocalChanges::noticeWatches() {
-  const auto before = std::exchange(watches_, watchesNow());
-  if (!containsAll(before, watches_)) notifications_.post(PairedDeviceRegistry::kDeviceDidPair);
-  if (!containsAll(watches_, before)) notifications_.post(PairedDeviceRegistry::kDeviceDidUnpair);
+void LocalChanges::notice() {
+  isNoticing_ = false;
+  const auto watches = std::exchange(watches_, watchesNow());
+  if (!containsAll(watches, watches_)) notifications_.post(PairedDeviceRegistry::kDeviceDidPair);
+  if (!containsAll(watches_, watches)) notifications_.post(PairedDeviceRegistry::kDeviceDidUnpair);
+  if (std::exchange(language_, languageNow()) != language_) notifications_.post(UserLocale::kLanguageChanged);
 }
 
 }  // namespace kvr

@@ -29,13 +29,15 @@ class LocalChanges {
   /// What the language in use depends on.
   std::string languageNow() const;
   std::set<std::string> watchesNow() const;
-  void noticeLanguage();
-  void noticeWatches();
+  void noticeSoon();
+  void notice();
 
   const LocalUserLocale& locale_;
   const LocalPairedDeviceRegistry& pairedDevices_;
   LocalNotifications& notifications_;
   const std::vector<std::string> hostLocale_;
+  EventLoop& loop_;
+  bool isNoticing_ = false;  ///< soon
   std::string language_;
   std::set<std::string> watches_;
   std::vector<std::unique_ptr<FileWatch>> fileWatches_;

@@ -1,10 +1,9 @@
 #include "platform/local/LocalCleanExit.h"
 
-#include "platform/local/Descriptor.h"
-
 #include <fcntl.h>
 #include <poll.h>
 #include <spawn.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -47,40 +46,56 @@ bool LocalCleanExit::wouldBeStartedAgain() {
   return services_.isActivatable(name_) && ::access(wakerPath().c_str(), X_OK) == 0;
 }
 
-/// Leaves a process behind that has the bus start the next agent for what no client asks for, and is watching
-/// when this returns.
+/// Leaves a process behind that has the bus start the next agent for what no client asks for. It is watching
+/// when this returns, and acts once this process has ended.
 bool LocalCleanExit::leaveWaker() {
-  const auto fail = [this](int reason) {
-    log_.error("no clean exit, %@ cannot be left behind: %@", wakerPath(),
-               std::generic_category().message(reason));
-    return false;
-  };
-  std::array<int, 2> ends{};
-  if (::pipe2(ends.data(), O_CLOEXEC) < 0) return fail(errno);
-  const Descriptor readEnd(ends[0]);
-  Descriptor writeEnd(ends[1]);
+  std::array<int, 2> input{};
+  std::array<int, 2> output{};
+  if (::pipe2(input.data(), O_CLOEXEC) < 0) return reportNoWaker(errno);
+  const Descriptor childInput(input[0]);
+  wakerInput_ = Descriptor(input[1]);
+  if (::pipe2(output.data(), O_CLOEXEC) < 0) return reportNoWaker(errno);
+  const Descriptor ownOutput(output[0]);
+  Descriptor childOutput(output[1]);
 
   std::string path = wakerPath();
-  const auto next = activities_.secondsToNext();
-  std::string date = next ? std::to_string((clock_.now() + *next).secondsSince1970) : "never";
-  const std::array<char*, 3> arguments{path.data(), date.data(), nullptr};
+  const std::array<char*, 2> arguments{path.data(), nullptr};
   posix_spawn_file_actions_t actions;
   ::posix_spawn_file_actions_init(&actions);
-  ::posix_spawn_file_actions_adddup2(&actions, writeEnd.get(), STDOUT_FILENO);
+  ::posix_spawn_file_actions_adddup2(&actions, childInput.get(), STDIN_FILENO);
+  ::posix_spawn_file_actions_adddup2(&actions, childOutput.get(), STDOUT_FILENO);
   posix_spawnattr_t attributes;
   ::posix_spawnattr_init(&attributes);
   sigset_t none;
   sigemptyset(&none);
   ::posix_spawnattr_setsigmask(&attributes, &none);
   ::posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSID);
-  pid_t process = 0;
-  const int result = ::posix_spawn(&process, path.c_str(), &actions, &attributes, arguments.data(), environ);
+  const int result = ::posix_spawn(&waker_, path.c_str(), &actions, &attributes, arguments.data(), environ);
   ::posix_spawnattr_destroy(&attributes);
   ::posix_spawn_file_actions_destroy(&actions);
-  if (result != 0) return fail(result);
-  writeEnd = Descriptor();
-  pollfd closed{readEnd.get(), POLLIN, 0};
-  return ::poll(&closed, 1, kWakerLimit) == 1 || fail(ETIMEDOUT);
+  if (result != 0) {
+    waker_ = 0;
+    return reportNoWaker(result);
+  }
+  childOutput = Descriptor();
+  pollfd ready{ownOutput.get(), POLLIN, 0};
+  char byte = 0;
+  if (::poll(&ready, 1, kWakerLimit) == 1 && ::read(ownOutput.get(), &byte, 1) == 1) return true;
+  abandon();
+  return reportNoWaker(ETIMEDOUT);
+}
+
+bool LocalCleanExit::reportNoWaker(int reason) {
+  log_.error("no clean exit, %@ cannot be left behind: %@", wakerPath(),
+             std::generic_category().message(reason));
+  return false;
+}
+
+void LocalCleanExit::abandon() {
+  if (waker_ == 0) return;
+  ::kill(waker_, SIGKILL);
+  ::waitpid(waker_, nullptr, 0);
+  waker_ = 0;
 }
 
 void LocalCleanExit::begin() {
@@ -98,14 +113,23 @@ bool LocalCleanExit::isIdle() const {
          queues_.outstanding() == 0 && loop_.delayed() == 0;
 }
 
+/// One step a look, so that in between the loop takes in what has come meanwhile.
 void LocalCleanExit::look(double patience) {
-  if (isIdle() && !nameGivenUp_) {
-    if (!isManagedService() && !leaveWaker()) return;
-    nameGivenUp_ = true;
-    services_.beginEnding();
+  double next = std::min(2 * patience, kLongestPatience);
+  if (isIdle()) {
+    next = kFirstPatience;
+    if (nameGivenUp_) return loop_.exit(EXIT_SUCCESS);
+    if (isManagedService() || waker_ != 0) {
+      // What is scheduled from here on is the next agent's.
+      nameGivenUp_ = true;
+      activities_.beginEnding();
+      services_.beginEnding();
+    } else if (!leaveWaker()) {
+      requested_ = false;
+      return;
+    }
   }
-  if (isIdle() && nameGivenUp_) return loop_.exit(EXIT_SUCCESS);
-  loop_.after(patience, [this, next = std::min(2 * patience, kLongestPatience)] { look(next); });
+  loop_.after(patience, [this, next] { look(next); });
 }
 
 }  // namespace kvr

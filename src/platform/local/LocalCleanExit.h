@@ -2,11 +2,14 @@
 
 #include "platform/CleanExit.h"
 #include "platform/Log.h"
+#include "platform/local/Descriptor.h"
 #include "platform/local/EventLoop.h"
 #include "platform/local/LocalActivityScheduler.h"
 #include "platform/local/LocalHTTP.h"
 #include "platform/local/LocalServiceListeners.h"
 #include "platform/local/LocalWorkQueues.h"
+
+#include <sys/types.h>
 
 #include <string>
 
@@ -21,37 +24,39 @@ namespace kvr {
 class LocalCleanExit : public CleanExit {
  public:
   /// `name` is the agent's on the bus. All must outlive this; on the loop's thread.
-  LocalCleanExit(EventLoop& loop, LocalWorkQueues& queues, const LocalActivityScheduler& activities,
-                 const LocalHTTP& http, LocalServiceListeners& services, const Clock& clock, Log& log,
-                 std::string name)
+  LocalCleanExit(EventLoop& loop, LocalWorkQueues& queues, LocalActivityScheduler& activities,
+                 const LocalHTTP& http, LocalServiceListeners& services, Log& log, std::string name)
       : loop_(loop),
         queues_(queues),
         activities_(activities),
         http_(http),
         services_(services),
-        clock_(clock),
         log_(log),
         name_(std::move(name)) {}
 
   void requestWhenIdle() override;
+  /// Takes back what was left behind for the next agent: this one was told to end. On the loop's thread.
+  void abandon();
 
  private:
   bool wouldBeStartedAgain();
   bool leaveWaker();
+  bool reportNoWaker(int reason);
   bool isIdle() const;
   void begin();
   void look(double patience);
 
   EventLoop& loop_;
   LocalWorkQueues& queues_;
-  const LocalActivityScheduler& activities_;
+  LocalActivityScheduler& activities_;
   const LocalHTTP& http_;
   LocalServiceListeners& services_;
-  const Clock& clock_;
   Log& log_;
   const std::string name_;
   bool requested_ = false;
   bool nameGivenUp_ = false;
+  pid_t waker_ = 0;
+  Descriptor wakerInput_;  ///< ends with this process
 };
 
 }  // namespace kvr

@@ -17,9 +17,8 @@ namespace kvr {
 /// Notifications as signals on the session bus, which anyone on it may send:
 /// `com.tarsil.NotificationCenter.Posted` from `/com/tarsil/NotificationCenter`, with the name.
 ///
-/// The bus is asked for them from the first registration on. Handlers that wait for the main queue are
-/// limited: what comes beyond is dropped, with an error line, so that whoever floods the bus fills nothing
-/// here.
+/// The bus is asked for them from the first registration on. So many handlers may wait for the main queue;
+/// what comes beyond is dropped, with an error line.
 class LocalNotifications : public Notifications {
  public:
   static constexpr std::size_t kMostWaiting = 4096;

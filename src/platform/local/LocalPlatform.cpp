@@ -8,7 +8,7 @@ LocalPlatform::LocalPlatform(EventLoop& mainLoop, std::function<void()> busLost)
       activities(mainLoop, root, clock, queues, random, deviceProperties, *log, kMainBundleIdentifier,
                  {"com.tarsil.kvragent.upgrade", "com.tarsil.kvragent.boot"}, {}),
       changes(mainLoop, *log, root, locale, pairedDevices, notifications),
-      cleanExit(mainLoop, queues, activities, http, services, clock, *log, kMainBundleIdentifier) {}
+      cleanExit(mainLoop, queues, activities, http, services, *log, kMainBundleIdentifier) {}
 
 void LocalPlatform::beginEnding() {
   log->beginEnding();

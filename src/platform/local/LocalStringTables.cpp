@@ -24,8 +24,8 @@ std::string LocalStringTables::localizedString(const std::string& bundle, const 
                                                const std::string& defaultValue) const {
   // Letters, digits and a few marks between them: the identifier names a directory and leads nowhere else.
   const auto identifier = locale_.preferredIdentifier();
-  const std::array<std::string, 3> languages{identifier, identifier.substr(0, identifier.find_first_of("_-")),
-                                             "en"};
+  const std::array<std::string, 3> languages{identifier,
+                                             identifier.substr(0, identifier.find_first_of("_-@;=")), "en"};
   for (const auto& language : languages) {
     const auto file = std::filesystem::path(bundle) / language / (table + ".plist");
     for (const auto& path : {std::filesystem::path(root_.pathOf("Resources")) / file,
