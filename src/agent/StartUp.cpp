@@ -34,8 +34,8 @@ StartUp::StartUp(Platform& platform) : delegate_(platform) {
 }
 
 /// The follow-up post activity is no long-lived one: it exists only while it is scheduled. What an earlier
-/// start scheduled has to come to its run in this one, or its follow-ups would be lost; and what is shown has
-/// to have a refresh to come, which an earlier start may have died before scheduling.
+/// start scheduled has to come to its run in this one, or its follow-ups would be lost; and what was posted
+/// and is shown has to have a refresh to come, which an earlier start may have died before scheduling.
 void StartUp::resumeFollowUps(Platform& platform) {
   const auto post =
       KVRScheduler::newSchedulerWithActivityDelegate(platform, std::make_shared<KVRFollowUpPost>(platform));

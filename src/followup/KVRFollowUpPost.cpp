@@ -27,8 +27,9 @@ void KVRFollowUpPost::performActivityForScheduler(const std::shared_ptr<KVRSched
                     DeviceInfosAnswer(platform_.log, "KVRFollowUpPost",
                                       [self = shared_from_this(), answer,
                                        scheduler](const std::optional<KVRDeviceInfoList>& list) {
-                                        if (scheduler->isEnding()) return self->defer(*answer);
-                                        self->handle(list, *answer);
+                                        if (!scheduler->isEnding()) return self->handle(list, *answer);
+                                        self->followUpPostInProgress = false;
+                                        self->defer(*answer);
                                       }));
 }
 

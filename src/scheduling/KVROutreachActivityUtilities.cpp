@@ -52,8 +52,9 @@ void KVROutreachActivityUtilities::performOutreachActivityForConversion(
   }
   downloads_.notify(platform_.queues.concurrentQueue(Priority::Default),
                     [self, conversion, withScheduler, answer] {
-                      if (withScheduler->isEnding()) return self->defer(conversion, *answer);
-                      self->finish(conversion, *answer);
+                      if (!withScheduler->isEnding()) return self->finish(conversion, *answer);
+                      self->outreachInProgress = false;
+                      self->defer(conversion, *answer);
                     });
 }
 

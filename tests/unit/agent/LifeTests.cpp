@@ -196,6 +196,7 @@ std::vector<std::string> hastyRuns(const std::vector<std::string>& log, const st
                                    const std::string& cause) {
   std::vector<std::string> hasty;
   long long last = 0;
+  int runs = 0;
   for (const auto& line : log) {
     if (line.find(cause) != std::string::npos) last = 0;
     if (!line.starts_with("Velt activity block occured '" + activity + "'")) continue;
@@ -207,7 +208,9 @@ std::vector<std::string> hastyRuns(const std::vector<std::string>& log, const st
     const auto now = secondsSince1970(time);
     if (now - last < 60) hasty.push_back(line);
     last = now;
+    ++runs;
   }
+  EXPECT_GT(runs, 3) << activity;
   return hasty;
 }
 
