@@ -12,7 +12,6 @@ namespace kvr {
 namespace {
 
 constexpr const char* kPerform = "-[KVRFollowUpPost performActivityForScheduler:withCompletionHandler:]";
-constexpr double kDeferCheckInterval = 2'000'000'000;  // seconds
 
 }  // namespace
 
@@ -22,7 +21,10 @@ void KVRFollowUpPost::performActivityForScheduler(const std::shared_ptr<KVRSched
                                                   ActivityHandler withCompletionHandler) {
   followUpPostInProgress = true;
   const auto answer = std::make_shared<RunAnswer>(platform_.log, std::move(withCompletionHandler));
-  startDeferCheck(answer, scheduler);
+  followUpPostTimer = newDeferCheck<KVRFollowUpPost>(platform_.queues, weak_from_this(), answer, scheduler,
+                                                     [](KVRFollowUpPost& self, RunAnswer& pending) {
+                                                       if (self.followUpPostInProgress) self.defer(pending);
+                                                     });
   deviceInfosQuery_(LookupPolicy::kRefresh,
                     DeviceInfosAnswer(platform_.log, "KVRFollowUpPost",
                                       [self = shared_from_this(), answer,
@@ -31,22 +33,6 @@ void KVRFollowUpPost::performActivityForScheduler(const std::shared_ptr<KVRSched
                                         self->followUpPostInProgress = false;
                                         self->defer(*answer);
                                       }));
-}
-
-/// The check keeps nothing alive: a run whose answer is dropped on the way has come to its end.
-void KVRFollowUpPost::startDeferCheck(const std::shared_ptr<RunAnswer>& answer,
-                                      const std::shared_ptr<KVRScheduler>& scheduler) {
-  followUpPostTimer =
-      platform_.queues.newRepeatingTimer(kDeferCheckInterval, platform_.queues.mainQueue(),
-                                         [weakSelf = weak_from_this(), weakAnswer = std::weak_ptr(answer),
-                                          weakScheduler = std::weak_ptr(scheduler)] {
-                                           const auto self = weakSelf.lock();
-                                           const auto pending = weakAnswer.lock();
-                                           const auto running = weakScheduler.lock();
-                                           if (!self || !pending || !running) return;
-                                           if (self->followUpPostInProgress && running->shouldDefer())
-                                             self->defer(*pending);
-                                         });
 }
 
 void KVRFollowUpPost::defer(RunAnswer& answer) {

@@ -37,8 +37,6 @@ class KVRFollowUpPost : public KVRSchedulerActivityDelegate,
   std::atomic<bool> followUpPostInProgress{false};
 
  private:
-  void startDeferCheck(const std::shared_ptr<RunAnswer>& answer,
-                       const std::shared_ptr<KVRScheduler>& scheduler);
   void defer(RunAnswer& answer);
   void stopDeferCheck();
   void handle(const std::optional<KVRDeviceInfoList>& devicesInfo, RunAnswer& answer);

@@ -10,8 +10,6 @@
 namespace kvr {
 namespace {
 
-constexpr double kDeferCheckInterval = 2'000'000'000;  // seconds
-
 std::string describeSubscriptions(const std::map<std::string, Carrier>& subscriptions) {
   std::string text = "{";
   for (const auto& [subscription, carrier] : subscriptions) {
@@ -27,7 +25,11 @@ void KVROutreachActivityUtilities::performOutreachActivityForConversion(
     const ActivityHandler& andCompletion) {
   outreachInProgress = true;
   const auto answer = std::make_shared<RunAnswer>(platform_.log, andCompletion);
-  startDeferCheck(conversion, answer, withScheduler);
+  outReachTimer = newDeferCheck<KVROutreachActivityUtilities>(
+      platform_.queues, weak_from_this(), answer, withScheduler,
+      [conversion](KVROutreachActivityUtilities& self, RunAnswer& pending) {
+        if (self.outreachInProgress) self.defer(conversion, pending);
+      });
   std::vector<KVRDeviceRef> devices;
   for (const auto& [serialNumber, device] : KVRDevicesManager::sharedManager(platform_)->allDevices()) {
     devices.push_back(device);
@@ -56,21 +58,6 @@ void KVROutreachActivityUtilities::performOutreachActivityForConversion(
                       self->outreachInProgress = false;
                       self->defer(conversion, *answer);
                     });
-}
-
-/// The check keeps nothing alive: a run whose answer is dropped on the way has come to its end.
-void KVROutreachActivityUtilities::startDeferCheck(bool conversion, const std::shared_ptr<RunAnswer>& answer,
-                                                   const std::shared_ptr<KVRScheduler>& scheduler) {
-  outReachTimer = platform_.queues.newRepeatingTimer(
-      kDeferCheckInterval, platform_.queues.mainQueue(),
-      [weakSelf = weak_from_this(), conversion, weakAnswer = std::weak_ptr(answer),
-       weakScheduler = std::weak_ptr(scheduler)] {
-        const auto self = weakSelf.lock();
-        const auto pending = weakAnswer.lock();
-        const auto running = weakScheduler.lock();
-        if (!self || !pending || !running) return;
-        if (self->outreachInProgress && running->shouldDefer()) self->defer(conversion, *pending);
-      });
 }
 
 void KVROutreachActivityUtilities::defer(bool conversion, RunAnswer& answer) {

@@ -35,8 +35,6 @@ class KVROutreachActivityUtilities : public std::enable_shared_from_this<KVROutr
   std::atomic<bool> outreachInProgress{false};
 
  private:
-  void startDeferCheck(bool conversion, const std::shared_ptr<RunAnswer>& answer,
-                       const std::shared_ptr<KVRScheduler>& scheduler);
   void stopDeferCheck();
   void defer(bool conversion, RunAnswer& answer);
   void handleDownload(const std::optional<std::string>& serialNumber, bool success,

@@ -2,9 +2,13 @@
 
 #include "platform/ActivityScheduler.h"
 #include "platform/Log.h"
+#include "platform/WorkQueues.h"
+#include "scheduling/KVRScheduler.h"
 
 #include <atomic>
 #include <cstdint>
+#include <functional>
+#include <memory>
 #include <utility>
 
 namespace kvr {
@@ -28,5 +32,23 @@ class RunAnswer {
   const ActivityHandler handler_;
   std::atomic<bool> isGiven_{false};
 };
+
+/// Looks, very rarely, whether the platform wants the run deferred; `defer` is then called on the main queue.
+/// Keeps nothing alive: a run whose answer is dropped on the way has come to its end.
+template <class Owner>
+std::shared_ptr<Timer> newDeferCheck(WorkQueues& queues, std::weak_ptr<Owner> owner,
+                                     std::weak_ptr<RunAnswer> answer, std::weak_ptr<KVRScheduler> scheduler,
+                                     std::function<void(Owner&, RunAnswer&)> defer) {
+  constexpr double kInterval = 2'000'000'000;  // seconds
+  return queues.newRepeatingTimer(kInterval, queues.mainQueue(),
+                                  [owner = std::move(owner), answer = std::move(answer),
+                                   scheduler = std::move(scheduler), defer = std::move(defer)] {
+                                    const auto self = owner.lock();
+                                    const auto pending = answer.lock();
+                                    const auto running = scheduler.lock();
+                                    if (self && pending && running && running->shouldDefer())
+                                      defer(*self, *pending);
+                                  });
+}
 
 }  // namespace kvr
