@@ -1,6 +1,7 @@
 #include "client/AgentClient.h"
 
 #include "platform/local/bus/BusCodec.h"
+#include "platform/local/bus/BusHandles.h"
 
 #include <cerrno>
 #include <utility>
@@ -60,7 +61,18 @@ Result<AgentClient> AgentClient::connect() {
   const int r = sd_bus_open_user_with_description(&bus, "kvragent client");
   if (r < 0)
     return failure(NoBus, "the session bus cannot be reached: " + std::generic_category().message(-r));
-  return AgentClient(BusRef(bus));
+  return AgentClient(bus);
+}
+
+void AgentClient::Close::operator()(sd_bus* bus) const { sd_bus_close_unref(bus); }
+
+bool AgentClient::isAgentRunning() const {
+  sd_bus_message* answer = nullptr;
+  int isOwned = 0;
+  const int r = sd_bus_call_method(bus_.get(), "org.freedesktop.DBus", "/org/freedesktop/DBus",
+                                   "org.freedesktop.DBus", "NameHasOwner", nullptr, &answer, "s", kName);
+  const BusMessageRef reply(answer);
+  return r >= 0 && sd_bus_message_read(answer, "b", &isOwned) >= 0 && isOwned != 0;
 }
 
 Result<Value> AgentClient::call(const char* member, const std::vector<Argument>& arguments,

@@ -2,13 +2,15 @@
 
 #include "client/Records.h"
 #include "platform/Error.h"
-#include "platform/local/bus/BusHandles.h"
 
 #include <functional>
+#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
+
+struct sd_bus;
 
 namespace kvr::client {
 
@@ -33,8 +35,11 @@ enum Failure : std::int64_t {
 ///     Result<AgentClient> agent = AgentClient::connect();
 ///     if (agent) { auto info = agent->defaultDeviceInfo(Policy::Default); … }
 ///
-/// A call waits for its answer, which may take as long as a download with all its retries does. Errors are in
-/// domain `kErrorDomain`.
+/// A call waits for its answer, which may take as long as a download with all its retries does. An agent that
+/// is not running is started by the bus. Errors are in domain `kErrorDomain`; no exception but that of memory
+/// running out leaves an operation.
+///
+/// Of the records, a warranty's dictionary has the service's own keys; `Coverage::from` reads the usual ones.
 class AgentClient {
  public:
   struct Argument {
@@ -65,6 +70,8 @@ class AgentClient {
   /// What is to be done about once a second while an answer is waited for, with the seconds so far.
   void setWaiting(std::function<void(int seconds)> waiting) { waiting_ = std::move(waiting); }
 
+  /// Whether an agent is running now; asking starts none.
+  bool isAgentRunning() const;
   /// Calls a member without arguments, and does not wait for its reply.
   std::optional<Error> tell(const char* member) const;
   /// Posts a notification to everyone on the bus.
@@ -73,9 +80,12 @@ class AgentClient {
   Result<Value> call(const char* member, const std::vector<Argument>& arguments, const char* replyType) const;
 
  private:
-  explicit AgentClient(BusRef bus) : bus_(std::move(bus)) {}
+  struct Close {
+    void operator()(sd_bus* bus) const;
+  };
+  explicit AgentClient(sd_bus* bus) : bus_(bus) {}
 
-  BusRef bus_;
+  std::unique_ptr<sd_bus, Close> bus_;
   std::function<void(int)> waiting_;
   int patience_ = 24 * 3600;
 };

@@ -14,7 +14,6 @@
 #include <cstdlib>
 #include <fstream>
 #include <iterator>
-#include <map>
 #include <system_error>
 
 namespace kvr::client {
@@ -25,6 +24,7 @@ constexpr const char* kActivities = "Library/Activities/com.tarsil.kvragent.plis
 constexpr const char* kPreferences = "Library/Preferences/com.tarsil.kvragent.plist";
 constexpr std::string_view kTargetDate = ".TargetDate";
 constexpr std::string_view kDownloadedDate = "_CachedWarrantyLastUpdatedDate";
+constexpr std::string_view kDismissedDate = ".dismissed";
 constexpr std::int64_t kBadge = 1;  // of the display style
 
 /// Under which the agent keeps what it knows of a device.
@@ -95,6 +95,12 @@ Result<std::vector<Activity>> LocalState::activities() const {
       activities[identifier].requiresNetwork = entry["requiresNetwork"].asBool();
     }
   }
+  if (const Value& runs = (*registered)["lastRuns"]; runs.isDictionary()) {
+    for (const auto& [identifier, run] : runs.dictionary()) {
+      activities[identifier].lastResult = run["result"].stringIfAny();
+      activities[identifier].lastEnd = run["endedDate"].dateIfAny();
+    }
+  }
   if (preferences->isDictionary()) {
     for (const auto& [key, value] : preferences->dictionary()) {
       if (!key.ends_with(kTargetDate)) continue;
@@ -106,10 +112,8 @@ Result<std::vector<Activity>> LocalState::activities() const {
     activity.identifier = identifier;
     sorted.push_back(std::move(activity));
   }
-  const auto dateOf = [](const Activity& activity) {
-    return std::max(activity.targetDate.value_or(Date{}), activity.dueDate.value_or(Date{}));
-  };
-  std::ranges::stable_sort(sorted, {}, dateOf);
+  std::ranges::stable_sort(
+      sorted, {}, [](const Activity& activity) { return std::pair(!activity.isToCome(), activity.date()); });
   return sorted;
 }
 
@@ -117,6 +121,23 @@ Result<std::optional<Date>> LocalState::downloadedDate(const std::string& serial
   const auto preferences = dictionaryIn(kPreferences);
   if (!preferences) return preferences.error();
   return (*preferences)[hashOf(serialNumber) + std::string(kDownloadedDate)].dateIfAny();
+}
+
+Result<std::map<std::string, Date>> LocalState::downloads() const {
+  const auto preferences = dictionaryIn(kPreferences);
+  if (!preferences) return preferences.error();
+  std::map<std::string, Date> dates;
+  if (!preferences->isDictionary()) return dates;
+  for (const auto& [key, value] : preferences->dictionary()) {
+    if (!key.ends_with(kDownloadedDate) || !value.isDate()) continue;
+    dates.emplace(key.substr(0, key.size() - kDownloadedDate.size()), value.date());
+  }
+  return dates;
+}
+
+bool LocalState::isDismissed(const std::string& serialNumber) const {
+  const auto preferences = dictionaryIn(kPreferences);
+  return preferences && preferences->contains(hashOf(serialNumber) + std::string(kDismissedDate));
 }
 
 }  // namespace kvr::client

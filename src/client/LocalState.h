@@ -4,6 +4,8 @@
 #include "platform/Error.h"
 #include "platform/Value.h"
 
+#include <algorithm>
+#include <map>
 #include <optional>
 #include <string>
 #include <vector>
@@ -22,12 +24,19 @@ struct FollowUp {
   static FollowUp from(const Value& entry);
 };
 
-/// A background activity that is to come.
+/// A background activity.
 struct Activity {
   std::string identifier;
   std::optional<Date> targetDate;  ///< before which it does nothing
   std::optional<Date> dueDate;     ///< when the platform runs it
   bool requiresNetwork = false;
+  std::optional<std::string> lastResult;  ///< "finished" or "deferred"
+  std::optional<Date> lastEnd;            ///< when its last run ended
+
+  /// Whether it is to come; else it has only run.
+  bool isToCome() const { return targetDate || dueDate; }
+  /// Before which nothing can be expected of it.
+  Date date() const { return std::max(targetDate.value_or(Date{}), dueDate.value_or(Date{})); }
 };
 
 /// What the agent's files below the home directory say. Looking changes nothing, and needs no agent.
@@ -39,11 +48,15 @@ class LocalState {
   explicit LocalState(std::string homeDirectory = homeDirectoryOfUser());
 
   Result<std::vector<FollowUp>> followUps() const;
-  /// In the order in which they come: those with an earlier date first.
+  /// In the order in which they come, those with an earlier date first; then those that have only run.
   Result<std::vector<Activity>> activities() const;
 
   /// When the device's warranty was downloaded last.
   Result<std::optional<Date>> downloadedDate(const std::string& serialNumber) const;
+  /// When each device's was, by the hash under which the agent keeps what it knows of the device.
+  Result<std::map<std::string, Date>> downloads() const;
+  /// Whether the owner has dismissed a follow-up of the device; an unreadable file says no.
+  bool isDismissed(const std::string& serialNumber) const;
 
   /// HOME, or as the system has it.
   static std::string homeDirectoryOfUser();

@@ -10,6 +10,7 @@ namespace {
 constexpr const char* kActivities = "activities";
 constexpr const char* kBootIdentifier = "bootIdentifier";
 constexpr const char* kOSVersion = "OSVersion";
+constexpr const char* kLastRuns = "lastRuns";
 
 constexpr const char* kDelay = "delay";
 constexpr const char* kGracePeriod = "gracePeriod";
@@ -17,6 +18,9 @@ constexpr const char* kRequiresNetwork = "requiresNetwork";
 constexpr const char* kPriority = "priority";
 constexpr const char* kRegisteredDate = "registeredDate";
 constexpr const char* kDueDate = "dueDate";
+
+constexpr const char* kResult = "result";
+constexpr const char* kEndedDate = "endedDate";
 
 /// A date that has come while its run was being deferred, in seconds since.
 constexpr double kJustPassed = 1;
@@ -255,6 +259,7 @@ ActivityTable::Ending ActivityTable::end(const std::string& identifier, std::uin
   const UnderWay run = *std::exchange(entry->run, std::nullopt);
   const bool isReplaced = entry->registrationNumber != run.registrationNumber;
   Ending ending;
+  ending.changesTree = recordRun(identifier, result, now);
   if (result != ActivityResult::Finished) {
     if (!isReplaced) defer(*entry, run, now);
     return ending;
@@ -269,6 +274,17 @@ ActivityTable::Ending ActivityTable::end(const std::string& identifier, std::uin
   ending.released = std::move(entry->block);
   entries_.erase(identifier);
   return ending;
+}
+
+/// Whether the result is news. The date alone is not: it is stored with the next change, so that an activity
+/// which is deferred again and again does not have the file written each time.
+bool ActivityTable::recordRun(const std::string& identifier, ActivityResult result, const Now& now) {
+  const char* const name = result == ActivityResult::Finished ? "finished" : "deferred";
+  const Value before = std::exchange(records_[kLastRuns], Value());
+  Value::Dictionary runs = before.isDictionary() ? before.dictionary() : Value::Dictionary();
+  runs.insert_or_assign(identifier, Value::Dictionary{{kResult, name}, {kEndedDate, now.date}});
+  records_[kLastRuns] = std::move(runs);
+  return before[identifier][kResult] != Value(name);
 }
 
 void ActivityTable::defer(Entry& entry, const UnderWay& run, const Now& now) {

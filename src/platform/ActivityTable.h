@@ -52,7 +52,8 @@ class ActivityTable {
   /// Between the starts of two runs that are one registration's, in seconds.
   static constexpr double kShortestCycle = 0.5;
 
-  // What is persisted: registrations, and the boot and system version whose occasions were served.
+  // What is persisted: registrations, the boot and system version whose occasions were served, and how each
+  // activity's last run ended.
 
   /// Why a tree is not one that `tree` gave, if it is not.
   static std::optional<Error> complaintAbout(const Value& tree);
@@ -133,6 +134,7 @@ class ActivityTable {
   std::optional<Date> dateOf(const Entry& entry) const;
   bool isDue(const Entry& entry, const Now& now) const;
   static bool isInWindow(const Entry& entry, const Now& now);
+  bool recordRun(const std::string& identifier, ActivityResult result, const Now& now);
   void defer(Entry& entry, const UnderWay& run, const Now& now);
 
   std::map<std::string, Entry, std::less<>> entries_;

@@ -26,16 +26,30 @@ class Kvrctl : public BusFixture {
       return [this](const std::string& member, const Value::Array& arguments, const ServiceReply& reply) {
         const std::lock_guard lock(mutex_);
         asked_ = member + describe(Value(arguments));
-        reply(answers_[member]);
+        if (member == heldMember_) {
+          held_.push_back(reply);
+          isHeld_.set_value();
+        } else {
+          reply(answers_[member]);
+        }
       };
     };
   }
 
-  Outcome run(std::vector<std::string> arguments) {
+  ChildProcess start(std::vector<std::string> arguments) {
     arguments.insert(arguments.begin(), kProgram);
-    ChildProcess program(std::move(arguments), {{"DBUS_SESSION_BUS_ADDRESS", bus.address()}});
+    return ChildProcess(std::move(arguments), {{"DBUS_SESSION_BUS_ADDRESS", bus.address()},
+                                               {"HOME", home_.path()},
+                                               {"LC_ALL", "C"},
+                                               {"TZ", "UTC"}});
+  }
+  static Outcome outcomeOf(ChildProcess& program) {
     const int status = program.wait();
     return {status, program.output(), program.errorOutput()};
+  }
+  Outcome run(std::vector<std::string> arguments) {
+    auto program = start(std::move(arguments));
+    return outcomeOf(program);
   }
 
   std::shared_ptr<void> serveAgent() { return serve(agentServiceInterface()); }
@@ -43,6 +57,12 @@ class Kvrctl : public BusFixture {
   void setAnswer(const std::string& member, const Value& value) {
     const std::lock_guard lock(mutex_);
     answers_[member] = value;
+  }
+  /// A member's calls get no reply; tells when one has come.
+  std::future<void> hold(const std::string& member) {
+    const std::lock_guard lock(mutex_);
+    heldMember_ = member;
+    return isHeld_.get_future();
   }
   /// The last call and its arguments.
   std::string asked() const {
@@ -56,6 +76,10 @@ class Kvrctl : public BusFixture {
   mutable std::mutex mutex_;
   std::map<std::string, Value> answers_;
   std::string asked_;
+  std::string heldMember_;
+  std::promise<void> isHeld_;
+  std::vector<ServiceReply> held_;
+  const TemporaryDirectory home_;
 };
 
 Value device(const std::string& name) {
@@ -78,6 +102,7 @@ TEST_F(Kvrctl, AsksWhatItIsTold) {
     setAnswer(member, true);
   setAnswer("TarsilAccountAdded", false);
   setAnswer("DefaultDevice", Value::Dictionary{{"name", 7}, {"deviceType", "x"}});
+  setAnswer("PairedDevices", Value::Array{device("a watch")});
   const struct {
     std::vector<std::string> arguments;
     const char* asked;
@@ -87,7 +112,7 @@ TEST_F(Kvrctl, AsksWhatItIsTold) {
       {{"paired"}, "PairedDevices()", 0},
       {{}, "GetAllDeviceInfosUsingPolicy(1, 0)", 0},
       {{"refresh"}, "GetAllDeviceInfosUsingPolicy(2, 0)", 0},
-      {{"dismiss", "S1"}, "DismissFollowUpForSerialNumber(S1)", 0},
+      {{"dismiss", "…1234"}, "DismissFollowUpForSerialNumber(C02XY1234)", 0},
       {{"schedule-outreach", "--after", "60"}, "ScheduleOutreachAfter(60)", 0},
       {{"account-added"}, "TarsilAccountAdded()", 2},
       {{"support-app", "b"}, "AppSupportAvailability(b)", 0},
@@ -104,19 +129,69 @@ TEST_F(Kvrctl, AsksWhatItIsTold) {
   }
 }
 
-TEST_F(Kvrctl, TellsWhyItGotNoAnswer) {
-  EXPECT_EQ(run({"device"}).status, 3);
-  const auto serving = serveAgent();
+/// One line on standard error, nothing on standard output, and the status.
+MATCHER_P2(IsFailure, status, line, "") {
+  return arg.status == status && arg.output.empty() && arg.errors.find('\n') + 1 == arg.errors.size() &&
+         ::testing::Value(arg.errors, line);
+}
+
+TEST_F(Kvrctl, TellsWhyItGotNoAnswerAndWhatHelps) {
+  EXPECT_THAT(run({"device"}), IsFailure(3, HasSubstr("systemctl --user start kvragent")));
+  auto serving = serveAgent();
   entitle(true, "/proc/self/exe");
-  const Outcome refused = run({"device"});
-  EXPECT_EQ(refused.status, 4);
-  EXPECT_EQ(refused.output, "");
-  EXPECT_THAT(refused.errors, AllOf(HasSubstr(std::string(kEntitlement)), HasSubstr("Entitlements.plist")));
-  const std::vector<std::string> misuses[] = {
-      {"devices"}, {"info", "S", "--all"}, {"info", "--policy", "7"}, {"info", ""}, {"info", "\xFF"}};
-  for (const auto& misuse : misuses) EXPECT_EQ(run(misuse).status, 1);
+  EXPECT_THAT(run({"device"}), IsFailure(4, AllOf(HasSubstr(kEntitlement), HasSubstr("Entitlements.plist"),
+                                                  HasSubstr(kProgram))));
+  entitle(true, kProgram);
+  EXPECT_THAT(run({"dismiss", "S1"}), IsFailure(2, HasSubstr("kvrctl paired")));
+  for (const auto& misuse : std::vector<std::vector<std::string>>{
+           {"devices"}, {"info", "S", "--all"}, {"info", "--policy", "7"}, {"info", ""}, {"info", "\xFF"}}) {
+    EXPECT_EQ(run(misuse).status, 1);
+  }
+  const auto unanswered = hold("DefaultDevice");
+  auto waiting = start({"device"});
+  unanswered.wait();
+  serving.reset();
+  EXPECT_THAT(outcomeOf(waiting), IsFailure(3, HasSubstr("cannot be reached")));
   bus.kill();
-  EXPECT_EQ(run({"device"}).status, 3);
+  EXPECT_THAT(run({"device"}), IsFailure(3, HasSubstr("DBUS_SESSION_BUS_ADDRESS")));
+}
+
+TEST_F(Kvrctl, WritesOneDocumentWithAVersionWhateverItIsAsked) {
+  const auto serving = serveAgent();
+  setAnswer("DefaultDevice", device("a phone"));
+  setAnswer("DismissFollowUpForSerialNumber", true);
+  for (const std::vector<std::string>& command :
+       std::vector<std::vector<std::string>>{{},
+                                             {"device"},
+                                             {"paired"},
+                                             {"info"},
+                                             {"refresh"},
+                                             {"dismiss", "…1234"},
+                                             {"schedule-outreach"},
+                                             {"account-added"},
+                                             {"account-added", "--no-wait"},
+                                             {"support-app", "b"},
+                                             {"web-url"},
+                                             {"timeline"},
+                                             {"notify", "n"},
+                                             {"follow-ups"},
+                                             {"activities"},
+                                             {"doctor"}}) {
+    auto arguments = command;
+    arguments.emplace_back("--json");
+    const Outcome outcome = run(arguments);
+    const auto document = readJSON(outcome.output);
+    ASSERT_TRUE(document) << outcome.output << outcome.errors;
+    EXPECT_EQ((*document)["version"], Value(1)) << outcome.output;
+    EXPECT_EQ(outcome.errors, "");
+  }
+  auto monitor = start({"monitor", "--json"});
+  monitor.waitForOutput("watching");
+  run({"notify", "com.example.news"});
+  const auto told = readJSON(monitor.waitForOutput("com.example.news"));
+  ASSERT_TRUE(told);
+  EXPECT_EQ((*told)["event"]["event"], Value("posted"));
+  EXPECT_EQ(monitor.terminate(), 0);
 }
 
 TEST_F(Kvrctl, PrintsTextThatCannotCommandATerminal) {
@@ -129,7 +204,7 @@ TEST_F(Kvrctl, PrintsTextThatCannotCommandATerminal) {
   EXPECT_THAT(text.output,
               HasSubstr("Coverage:      \\u001b]0;owned\\u0007 \\u009b2J\\u000d\\u000aCovered: no\\u202e\n"));
   EXPECT_THAT(text.output,
-              AllOf(HasSubstr("…1234"), Not(HasSubstr("C02XY1234")), HasSubstr("1970-01-02T00:00:00Z")));
+              AllOf(HasSubstr("…1234"), Not(HasSubstr("C02XY1234")), HasSubstr("01/02/70 00:00:00")));
   EXPECT_THAT(run({"info", "--show-serial"}).output, HasSubstr("C02XY1234"));
   EXPECT_THAT(run({"info", "--json"}).output, AllOf(Not(HasSubstr("\u009B")), HasSubstr("\\u009b")));
 }

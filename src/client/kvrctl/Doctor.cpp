@@ -2,8 +2,10 @@
 
 #include "client/AgentClient.h"
 #include "client/LocalState.h"
+#include "client/kvrctl/Output.h"
 #include "platform/PropertyList.h"
 #include "platform/URL.h"
+#include "platform/local/DeviceRoot.h"
 
 #include <fcntl.h>
 #include <netdb.h>
@@ -13,7 +15,6 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <cstdlib>
 #include <ctime>
 #include <filesystem>
 #include <fstream>
@@ -27,7 +28,6 @@ namespace {
 
 namespace fs = std::filesystem;
 
-constexpr const char* kDefaultRoot = "/var/lib/kvragent/device";
 constexpr int kAnswerLimit = 5;                // seconds
 constexpr int kConnectLimit = 3000;            // milliseconds
 constexpr std::time_t kYear2024 = 1704067200;  // no agent ran before
@@ -35,28 +35,20 @@ constexpr std::time_t kYear2100 = 4102444800;
 
 std::string reasonOf(int error) { return std::generic_category().message(error); }
 
-fs::path deviceRoot() {
-  const char* const root = std::getenv("KVR_DEVICE_ROOT");
-  return root != nullptr && *root != '\0' ? root : kDefaultRoot;
-}
+fs::path deviceRoot() { return DeviceRoot::directoryFromEnvironment(); }
 
 Verdict agentVerdict() {
   auto connected = AgentClient::connect();
   if (!connected) {
-    return {"session bus", Verdict::Broken, connected.error().message,
-            "log in to a session, or set DBUS_SESSION_BUS_ADDRESS"};
+    return {"session bus", Verdict::Broken, connected.error().message, cureFor(connected.error())};
   }
   AgentClient agent = *std::move(connected);
   agent.setPatience(kAnswerLimit);
   const auto device = agent.defaultDevice();
   if (device) return {"agent", Verdict::Fine, "answers, and serves this program", ""};
-  if (device.error().code == Refused) {
-    std::error_code unknown;
-    return {"entitlement", Verdict::Broken, device.error().message,
-            "grant it to " + fs::read_symlink("/proc/self/exe", unknown).string() + " in " +
-                (deviceRoot() / "Entitlements.plist").string()};
-  }
-  return {"agent", Verdict::Broken, device.error().message, "start it: systemctl --user start kvragent"};
+  const bool isRefused = device.error().code == Refused;
+  return {isRefused ? "entitlement" : "agent", Verdict::Broken, device.error().message,
+          cureFor(device.error())};
 }
 
 /// Whether nobody but root and this user can write a file that the agent has to trust.

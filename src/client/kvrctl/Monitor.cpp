@@ -1,5 +1,9 @@
 #include "client/kvrctl/Monitor.h"
 
+#include "client/AgentClient.h"
+#include "client/LocalState.h"
+#include "client/kvrctl/Output.h"
+#include "client/kvrctl/Terminal.h"
 #include "platform/local/EventLoop.h"
 #include "platform/local/FileWatch.h"
 #include "platform/local/LocalLog.h"
@@ -7,11 +11,11 @@
 
 #include <systemd/sd-event.h>
 
-#include <array>
+#include <chrono>
 #include <csignal>
-#include <cstdio>
 #include <cstdlib>
-#include <ctime>
+#include <functional>
+#include <initializer_list>
 #include <map>
 
 namespace kvr::client {
@@ -19,40 +23,59 @@ namespace {
 
 constexpr const char* kAgent = "com.tarsil.kvragent";
 
-void say(const std::string& what) {
-  const std::time_t now = std::time(nullptr);
-  std::tm local{};
-  std::array<char, 32> text{};
-  ::localtime_r(&now, &local);
-  std::strftime(text.data(), text.size(), "%H:%M:%S", &local);
-  std::printf("%s  %s\n", text.data(), printable(what).c_str());
-  std::fflush(stdout);
-}
+/// Where what happens is told, a line each: text, or a JSON document.
+class Teller {
+ public:
+  explicit Teller(bool inJSON) : inJSON_(inJSON) {}
 
-/// Says what has come to, gone from or changed in a list of lines, each under a name.
+  /// `subject` is what it happened to, `event` what happened, `detail` how it is now, if it is at all.
+  void tell(const std::string& subject, const std::string& name, const std::string& event,
+            const std::string& detail = {}) const {
+    using Seconds = std::chrono::duration<double>;
+    const Date now{
+        std::chrono::duration_cast<Seconds>(std::chrono::system_clock::now().time_since_epoch()).count()};
+    if (inJSON_) {
+      Value::Dictionary tree{{"date", now}, {"subject", subject}, {"event", event}};
+      if (!name.empty()) tree.emplace("name", name);
+      if (!detail.empty()) tree.emplace("detail", detail);
+      print(Report::json("event", tree), kFine);
+      return;
+    }
+    std::string line = subject;
+    for (const auto* word : {&name, &event}) line += word->empty() ? "" : " " + *word;
+    if (!detail.empty()) line += ": " + detail;
+    print(Style::moment(now) + "  " + printable(line) + "\n", kFine);
+  }
+
+ private:
+  const bool inJSON_;
+};
+
+/// Tells what has come to, gone from or changed in a list of lines, each under a name.
 class Differences {
  public:
   using Lines = std::map<std::string, std::string>;
 
-  Differences(std::string what, Lines lines) : what_(std::move(what)), lines_(std::move(lines)) {}
+  Differences(const Teller& teller, std::string subject, std::function<Lines()> look)
+      : teller_(teller), subject_(std::move(subject)), look_(std::move(look)), lines_(look_()) {}
 
-  void update(Lines lines) {
+  void update() {
+    Lines lines = look_();
     for (const auto& [name, line] : lines) {
       const auto before = lines_.find(name);
-      if (before == lines_.end()) say(named(name).append(": ").append(line));
-      if (before != lines_.end() && before->second != line)
-        say(named(name).append(" changed: ").append(line));
+      if (before == lines_.end()) teller_.tell(subject_, name, "added", line);
+      if (before != lines_.end() && before->second != line) teller_.tell(subject_, name, "changed", line);
     }
     for (const auto& [name, line] : lines_) {
-      if (!lines.contains(name)) say(named(name).append(" is gone"));
+      if (!lines.contains(name)) teller_.tell(subject_, name, "gone");
     }
     lines_ = std::move(lines);
   }
 
  private:
-  std::string named(const std::string& name) const { return what_ + " " + name; }
-
-  const std::string what_;
+  const Teller& teller_;
+  const std::string subject_;
+  const std::function<Lines()> look_;
   Lines lines_;
 };
 
@@ -72,41 +95,52 @@ Differences::Lines activityLines(const LocalState& state) {
   Differences::Lines lines;
   const auto activities = state.activities();
   if (!activities) return lines;
+  const auto dateText = [](const std::optional<Date>& date) { return date ? Style::moment(*date) : "none"; };
   for (const auto& activity : *activities) {
-    lines[activity.identifier] =
-        "not before " + describe(activity.targetDate) + ", due " + describe(activity.dueDate);
+    std::string& line = lines[activity.identifier];
+    if (activity.isToCome()) {
+      line = "not before " + dateText(activity.targetDate) + ", due " + dateText(activity.dueDate);
+    }
+    if (activity.lastResult) {
+      line += (line.empty() ? "" : "; ") + *activity.lastResult + " " + dateText(activity.lastEnd);
+    }
   }
   return lines;
 }
 
-int handlePosted(sd_bus_message* message, void*, sd_bus_error*) {
+Differences::Lines downloadLines(const LocalState& state) {
+  Differences::Lines lines;
+  const auto downloads = state.downloads();
+  if (!downloads) return lines;
+  for (const auto& [device, date] : *downloads) lines[device.substr(0, 8) + "…"] = Style::moment(date);
+  return lines;
+}
+
+int handlePosted(sd_bus_message* message, void* teller, sd_bus_error*) {
   return guardedBusCallback([&] {
     const char* name = nullptr;
-    if (sd_bus_message_read(message, "s", &name) >= 0) say(std::string("notification ") + name);
+    if (sd_bus_message_read(message, "s", &name) >= 0) {
+      static_cast<const Teller*>(teller)->tell("notification", name, "posted");
+    }
     return 0;
   });
 }
 
-int handleOwner(sd_bus_message* message, void*, sd_bus_error*) {
-  const char* name = nullptr;
-  const char* before = nullptr;
-  const char* now = nullptr;
-  if (sd_bus_message_read(message, "sss", &name, &before, &now) >= 0 && std::string_view(name) == kAgent) {
-    say(*now != '\0' ? "the agent has started" : "the agent has ended");
-  }
-  return 0;
+int handleOwner(sd_bus_message* message, void* teller, sd_bus_error*) {
+  return guardedBusCallback([&] {
+    const char* name = nullptr;
+    const char* before = nullptr;
+    const char* now = nullptr;
+    if (sd_bus_message_read(message, "sss", &name, &before, &now) >= 0) {
+      static_cast<const Teller*>(teller)->tell("agent", "", *now != '\0' ? "started" : "ended");
+    }
+    return 0;
+  });
 }
 
-}  // namespace
-
-int monitor(const Report& report) {
-  sigset_t signals;
-  sigemptyset(&signals);
-  sigaddset(&signals, SIGINT);
-  sigaddset(&signals, SIGTERM);
-  ::pthread_sigmask(SIG_BLOCK, &signals, nullptr);
-  EventLoop loop;
-  for (const int signal : {SIGINT, SIGTERM}) {
+/// Has the loop end with a signal. The signals must be blocked in every thread.
+void endWith(EventLoop& loop, std::initializer_list<int> signals) {
+  for (const int signal : signals) {
     sd_event_add_signal(
         loop.event(), nullptr, signal,
         [](sd_event_source*, const signalfd_siginfo*, void* it) {
@@ -115,33 +149,52 @@ int monitor(const Report& report) {
         },
         &loop);
   }
+}
+
+}  // namespace
+
+Status monitor(const Report& report, bool inJSON) {
+  sigset_t signals;
+  sigemptyset(&signals);
+  sigaddset(&signals, SIGINT);
+  sigaddset(&signals, SIGTERM);
+  ::pthread_sigmask(SIG_BLOCK, &signals, nullptr);
+  EventLoop loop;
+  endWith(loop, {SIGINT, SIGTERM});
   sd_bus* opened = nullptr;
   if (const int r = sd_bus_open_user(&opened); r < 0) {
-    std::fprintf(stderr, "kvrctl: the session bus cannot be reached: %s\n",
-                 std::generic_category().message(-r).c_str());
-    return 3;
+    return fail({std::string(kErrorDomain), NoBus,
+                 "the session bus cannot be reached: " + std::generic_category().message(-r)});
   }
   const BusRef bus(opened);
+  Teller teller(inJSON);
   sd_bus_set_exit_on_disconnect(opened, 1);
   sd_bus_attach_event(opened, loop.event(), 0);
   sd_bus_match_signal(opened, nullptr, nullptr, "/com/tarsil/NotificationCenter",
-                      "com.tarsil.NotificationCenter", "Posted", handlePosted, nullptr);
-  sd_bus_match_signal(opened, nullptr, "org.freedesktop.DBus", nullptr, "org.freedesktop.DBus",
-                      "NameOwnerChanged", handleOwner, nullptr);
+                      "com.tarsil.NotificationCenter", "Posted", handlePosted, &teller);
+  const std::string owner =
+      std::string("type='signal',sender='org.freedesktop.DBus',member='NameOwnerChanged',arg0='") + kAgent +
+      "'";
+  sd_bus_add_match(opened, nullptr, owner.c_str(), handleOwner, &teller);
 
   const auto log = LocalLog::fromEnvironment();
   const LocalState state;
   const std::string library = LocalState::homeDirectoryOfUser() + "/Library/";
-  Differences followUps("follow-up", followUpLines(state, report));
-  Differences activities("activity", activityLines(state));
+  Differences followUps(teller, "follow-up", [&] { return followUpLines(state, report); });
+  Differences activities(teller, "activity", [&] { return activityLines(state); });
+  Differences downloads(teller, "download", [&] { return downloadLines(state); });
   const FileWatch followUpWatch(loop, *log, library + "FollowUps/com.tarsil.Kavrel.plist",
-                                [&] { followUps.update(followUpLines(state, report)); });
+                                [&] { followUps.update(); });
   const FileWatch activityWatch(loop, *log, library + "Activities/com.tarsil.kvragent.plist",
-                                [&] { activities.update(activityLines(state)); });
-  say("watching");
+                                [&] { activities.update(); });
+  const FileWatch preferenceWatch(loop, *log, library + "Preferences/com.tarsil.kvragent.plist", [&] {
+    activities.update();
+    downloads.update();
+  });
+  teller.tell("monitor", "", "watching");
   const int status = loop.run();
   sd_bus_detach_event(opened);
-  return status;
+  return status == EXIT_SUCCESS ? kFine : kUnreachable;
 }
 
 }  // namespace kvr::client

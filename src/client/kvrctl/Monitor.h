@@ -1,12 +1,13 @@
 #pragma once
 
-#include "client/Report.h"
+#include "client/kvrctl/Output.h"
+#include "client/kvrctl/Report.h"
 
 namespace kvr::client {
 
-/// Prints what changes as it happens, a line each: notifications on the bus, agents that come and go,
-/// follow-ups, activities. Sleeps in between. Ends when the bus does, or with SIGINT or SIGTERM; returns an
-/// exit status.
-int monitor(const Report& report);
+/// Tells what changes as it happens, a line each: notifications on the bus, agents that come and go,
+/// follow-ups, activities, downloads. In JSON each line is a document. Sleeps in between. Ends with SIGINT or
+/// SIGTERM, or when the bus does.
+Status monitor(const Report& report, bool inJSON);
 
 }  // namespace kvr::client

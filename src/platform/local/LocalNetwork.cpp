@@ -34,9 +34,11 @@ LocalNetwork::LocalNetwork(EventLoop& loop, Log& log, const DeviceRoot& root,
       ownWatch_(loop, log, root.pathOf(kFile), [this, changed] { changed(isReachable()); }),
       hostWatch_(loop, log, hostState_, [this, changed] { changed(isReachable()); }) {}
 
-bool LocalNetwork::isReachable() const {
-  const auto reachable = root_.dictionary(kFile)["reachable"];
-  return reachable.isBool() ? reachable.boolean() : isHostReachable(hostState_);
+bool LocalNetwork::isReachable() const { return isReachable(root_.dictionary(kFile), hostState_); }
+
+bool LocalNetwork::isReachable(const Value& described, const std::string& hostState) {
+  const Value& reachable = described["reachable"];
+  return reachable.isBool() ? reachable.boolean() : isHostReachable(hostState);
 }
 
 }  // namespace kvr

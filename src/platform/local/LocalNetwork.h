@@ -21,6 +21,8 @@ class LocalNetwork {
 
   /// The answer now. Any thread.
   bool isReachable() const;
+  /// The answer by what "Network.plist" holds, or null, and by the host's state. Any thread.
+  static bool isReachable(const Value& described, const std::string& hostState = kHostState);
 
  private:
   const DeviceRoot& root_;

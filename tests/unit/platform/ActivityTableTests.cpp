@@ -99,7 +99,9 @@ TEST_F(AnActivityTable, BacksOffFromTenSecondsToAnHour) {
   table.add("a", {}, kBlock, now, 0);
   EXPECT_THAT(started(), ElementsAre("a"));
   for (const double wait : {10, 20, 40, 80, 160, 320, 640, 1280, 2560, 3600, 3600}) {
-    EXPECT_FALSE(end("a", kDeferred).changesTree);
+    // That it is deferred is news once.
+    EXPECT_EQ(end("a", kDeferred).changesTree, wait == 10);
+    EXPECT_EQ(table.tree()["lastRuns"]["a"]["endedDate"], Value(now.date));
     EXPECT_THAT(table.secondsToNext(now), Optional(wait));
     now.date = now.date + 315'360'000;  // a moved clock shortens no wait
     EXPECT_THAT(table.secondsToNext(now), Optional(wait));

@@ -2,7 +2,7 @@
 
 #include "client/LocalState.h"
 #include "client/Records.h"
-#include "client/Terminal.h"
+#include "client/kvrctl/Terminal.h"
 #include "platform/Error.h"
 
 #include <string>
@@ -16,9 +16,23 @@ struct DeviceStatus {
   Device device;
   std::optional<Coverage> coverage;  ///< nothing when none is known
   bool hasFollowUp = false;          ///< whether its offer is being shown
+  bool isDismissed = false;          ///< whether the owner has dismissed it before
   std::optional<Date> downloaded;    ///< when the service was asked last
   Date now;                          ///< what the rest is compared with
 };
+
+/// What an activity's run depends on, besides its dates.
+struct Circumstances {
+  Date now;
+  bool isAgentRunning = false;
+  bool isNetworkReachable = true;
+};
+
+/// What an activity that is to come waits for, in words; empty when it is not to come.
+std::string waitsFor(const Activity& activity, const Circumstances& circumstances);
+
+/// A device's type in a word.
+const char* nameOf(std::uint64_t deviceType);
 
 /// What a person, or a program, is shown of the agent's answers.
 ///
@@ -33,14 +47,16 @@ class Report {
   /// A serial number as it is shown.
   std::string serial(const std::string& whole) const;
 
-  // For people: lines of a name and a value, records set apart by an empty line.
+  // For people, with dates in the user's form and zone: lines of a name and a value, records set apart by an
+  // empty line; or a table. Empty when there are none.
   std::string text(const std::vector<Device>& devices) const;
   std::string text(const std::vector<DeviceInfo>& infos) const;
   std::string text(const std::vector<FollowUp>& followUps) const;
-  std::string text(const std::vector<Activity>& activities) const;
 
   /// Any dictionary, a line an entry.
   static std::string text(const Value& dictionary);
+  /// A table of one line an activity.
+  static std::string text(const std::vector<Activity>& activities, const Circumstances& circumstances);
   /// A table of one line a device.
   std::string text(const std::vector<DeviceStatus>& statuses, const Style& style) const;
 
@@ -53,7 +69,8 @@ class Report {
   static Result<std::string> json(std::string_view name, const Value& tree);
   Result<std::string> json(const std::vector<DeviceStatus>& statuses) const;
   Result<std::string> json(const std::vector<FollowUp>& followUps) const;
-  Result<std::string> json(const std::vector<Activity>& activities) const;
+  static Result<std::string> json(const std::vector<Activity>& activities,
+                                  const Circumstances& circumstances);
 
  private:
   using Lines = std::vector<std::pair<std::string, std::string>>;
@@ -62,12 +79,8 @@ class Report {
   Value treeOf(const Device& device) const;
   Value treeOf(const DeviceStatus& status) const;
   Value treeOf(const FollowUp& followUp) const;
-  static Value treeOf(const Activity& activity);
 
   const Serials serials_;
 };
-
-/// The text with control characters, and others that change how their surroundings look, as escapes.
-std::string printable(std::string_view text);
 
 }  // namespace kvr::client

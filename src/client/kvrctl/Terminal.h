@@ -22,10 +22,15 @@ class Style {
   std::string paint(Paint paint, const std::string& text) const;
   /// A date's day as the user's locale writes it (`std::setlocale` must have been called).
   static std::string day(Date date);
+  /// Its day and time of day, likewise.
+  static std::string moment(Date date);
 
  private:
   bool isColoured_;
 };
+
+/// The text with control characters, and others that change how their surroundings look, as escapes.
+std::string printable(std::string_view text);
 
 /// Columns as wide as what stands in them. Text may be coloured.
 class Table {

@@ -1,22 +1,57 @@
-#include "client/Terminal.h"
+#include "client/kvrctl/Terminal.h"
+
+#include "platform/UTF8.h"
 
 #include <unistd.h>
 
 #include <algorithm>
 #include <array>
 #include <cmath>
+#include <cstdio>
 #include <cstdlib>
 #include <ctime>
 
 namespace kvr::client {
 namespace {
 
-constexpr double kLastCalendarSecond = 1e15;
 constexpr std::array<const char*, 4> kColours{"\033[32m", "\033[31m", "\033[33m", "\033[2m"};
 constexpr const char* kPlain = "\033[0m";
 constexpr std::size_t kGap = 2;  // columns between two
 
+std::string formatted(Date date, const char* format) {
+  const auto time = static_cast<std::time_t>(std::floor(date.secondsSince1970));
+  std::tm local{};
+  std::array<char, 64> text{};
+  if (!isInCalendar(date) || ::localtime_r(&time, &local) == nullptr) return "unknown";
+  return printable({text.data(), std::strftime(text.data(), text.size(), format, &local)});
+}
+
+/// Control characters, line separators, and what reorders text.
+bool isUnprintable(char32_t point) {
+  return point < 0x20 || (point >= 0x7F && point <= 0x9F) || (point >= 0x2028 && point <= 0x202E) ||
+         (point >= 0x2066 && point <= 0x2069) || point == 0x200E || point == 0x200F || point == 0x061C;
+}
+
 }  // namespace
+
+std::string printable(std::string_view text) {
+  std::string result;
+  for (std::size_t at = 0; at < text.size();) {
+    const std::size_t begin = at;
+    char32_t point = nextCodePoint(text, at);
+    if (point == kNoCodePoint) {
+      point = 0xFFFD;
+      ++at;
+    } else if (!isUnprintable(point)) {
+      result += text.substr(begin, at - begin);
+      continue;
+    }
+    char escape[16];
+    std::snprintf(escape, sizeof escape, "\\u%04x", static_cast<unsigned>(point));
+    result += escape;
+  }
+  return result;
+}
 
 Style Style::ofOutput() {
   const char* const refused = std::getenv("NO_COLOR");
@@ -27,14 +62,8 @@ std::string Style::paint(Paint paint, const std::string& text) const {
   return isColoured_ && !text.empty() ? std::string(kColours[paint]) + text + kPlain : text;
 }
 
-std::string Style::day(Date date) {
-  if (!(std::abs(date.secondsSince1970) < kLastCalendarSecond)) return "unknown";
-  const auto time = static_cast<std::time_t>(std::floor(date.secondsSince1970));
-  std::tm local{};
-  std::array<char, 64> text{};
-  if (::localtime_r(&time, &local) == nullptr) return "unknown";
-  return {text.data(), std::strftime(text.data(), text.size(), "%x", &local)};
-}
+std::string Style::day(Date date) { return formatted(date, "%x"); }
+std::string Style::moment(Date date) { return formatted(date, "%x %X"); }
 
 std::size_t columnsOf(std::string_view text) {
   std::size_t columns = 0;

@@ -1,4 +1,4 @@
-#include "client/Timeline.h"
+#include "client/kvrctl/Timeline.h"
 
 #include <algorithm>
 #include <array>
@@ -65,40 +65,74 @@ std::string filled(const char* format, Values... values) {
   return {text.data(), static_cast<std::size_t>(std::clamp(length, 0, static_cast<int>(text.size()) - 1))};
 }
 
+/// When the texts of what is shown change next.
+std::optional<Date> nextChange(const std::vector<Activity>& activities) {
+  for (const auto& activity : activities) {
+    if (activity.identifier.ends_with(".followuprefresh") && activity.isToCome()) return activity.date();
+  }
+  return std::nullopt;
+}
+
 }  // namespace
 
 Timeline::Timeline(const std::vector<DeviceStatus>& devices, const std::vector<FollowUp>& followUps,
                    const std::vector<Activity>& activities, Date now)
     : now_(now), from_(now - kPast), until_(now + kLeastFuture) {
-  for (const auto& [device, coverage, hasFollowUp, downloaded, ignored] : devices) {
-    const std::string name = printable(device.name.value_or("unnamed"));
-    if (coverage && coverage->isCovered) {
-      add({name, {}, {}}, CoverageSpan, device.activationDate.value_or(from_), coverage->end);
-    } else {
-      rows_.push_back({name, {}, {}});
-    }
-    if (coverage && coverage->isOfferShown)
-      add({"  offer", {}, {}}, OfferSpan, coverage->offerFrom, coverage->offerEnd);
-    for (const auto& followUp : followUps) {
-      if (!followUp.serialNumber || followUp.serialNumber != device.serialNumber) continue;
-      add({"  follow-up, shown", {}, {}}, FollowUpSpan, now, followUp.expirationDate);
-    }
-  }
+  for (const auto& status : devices) addDevice(status, followUps, nextChange(activities));
   for (const auto& activity : activities) {
     const auto date = activity.dueDate ? activity.dueDate : activity.targetDate;
     if (!date) continue;
     rows_.push_back({printable(activity.identifier.substr(activity.identifier.rfind('.') + 1)), {}, {*date}});
-    until_ = std::max(until_, std::min(*date, now_ + kFuture));
+    reach(*date);
   }
   until_ = until_ + 0.05 * (until_ - from_);
 }
 
-void Timeline::add(Row row, Kind kind, std::optional<Date> from, std::optional<Date> until) {
+void Timeline::addDevice(const DeviceStatus& status, const std::vector<FollowUp>& followUps,
+                         std::optional<Date> change) {
+  const auto& [device, coverage, hasFollowUp, isDismissed, downloaded, ignored] = status;
+  const std::string name = printable(device.name.value_or("unnamed"));
+  if (coverage && coverage->isCovered) {
+    add(name, CoverageSpan, device.activationDate.value_or(from_), coverage->end);
+  } else {
+    rows_.push_back({name, {}, {}});
+  }
+  if (!coverage || !coverage->isOfferShown) return;
+  add("  offer", OfferSpan, coverage->offerFrom, coverage->offerEnd);
+  if (!hasFollowUp && !isDismissed && coverage->offerFrom && coverage->offerEnd > now_) {
+    add("  follow-up, to come", FollowUpSpan, std::max(*coverage->offerFrom, now_), coverage->offerEnd);
+  }
+  for (const auto& followUp : followUps) {
+    if (!followUp.serialNumber || followUp.serialNumber != device.serialNumber) continue;
+    add("  follow-up, shown", FollowUpSpan, now_, followUp.expirationDate);
+    if (change) rows_.back().marks.push_back(*change);
+  }
+}
+
+void Timeline::add(const std::string& label, Kind kind, std::optional<Date> from, std::optional<Date> until) {
+  Row row{label, {}, {}};
   if (from && until && *from < *until) {
     row.spans.push_back({kind, *from, *until});
-    until_ = std::max(until_, std::min(*until, now_ + kFuture));
+    reach(*until);
   }
   rows_.push_back(std::move(row));
+}
+
+void Timeline::reach(Date date) { until_ = std::max(until_, std::min(date, now_ + kFuture)); }
+
+Value Timeline::tree() const {
+  Value::Array rows;
+  for (const auto& row : rows_) {
+    Value::Array spans;
+    for (const auto& [kind, from, until] : row.spans) {
+      spans.emplace_back(Value::Dictionary{{"kind", kNames[kind]}, {"from", from}, {"until", until}});
+    }
+    Value::Array marks(row.marks.begin(), row.marks.end());
+    const std::string label = row.label.substr(std::min(row.label.find_first_not_of(' '), row.label.size()));
+    rows.emplace_back(
+        Value::Dictionary{{"label", label}, {"spans", std::move(spans)}, {"marks", std::move(marks)}});
+  }
+  return Value::Dictionary{{"now", now_}, {"from", from_}, {"until", until_}, {"rows", std::move(rows)}};
 }
 
 double Timeline::place(Date date) const {
@@ -130,7 +164,7 @@ std::string Timeline::text(const Style& style, std::size_t columns) const {
     text += fitted(row.label, labels) + "  ";
     for (const auto& cell : cells) text += cell;
     if (!row.spans.empty()) text += " " + Style::day(row.spans.back().until);
-    if (!row.marks.empty()) text += " " + Style::day(row.marks.back());
+    if (row.spans.empty() && !row.marks.empty()) text += " " + Style::day(row.marks.back());
     text += "\n";
   }
   text += "\n";

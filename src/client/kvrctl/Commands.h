@@ -1,0 +1,49 @@
+#pragma once
+
+#include "client/AgentClient.h"
+#include "client/kvrctl/Output.h"
+#include "client/kvrctl/Report.h"
+
+#include <string>
+
+namespace kvr::client {
+
+/// What the command line says.
+struct Options {
+  std::string text;  ///< a command's one argument: a serial number, a bundle identifier, a name
+  std::string file;  ///< to draw into
+  double seconds = 0;
+  bool noWait = false;
+  Policy policy = Policy::Default;
+  bool all = false;
+  bool json = false;
+  bool showSerial = false;
+
+  Report report() const { return Report(showSerial ? Report::Serials::Whole : Report::Serials::Shortened); }
+};
+
+// The commands. Each writes its answer to standard output, or says on standard error why there is none.
+// A serial number may be given as it is shown, "…1234", if only one device of this phone ends so.
+
+using AgentCommand = Status (*)(const AgentClient&, const Options&);
+
+Status showStatus(const AgentClient& agent, const Options& options);
+Status showDevice(const AgentClient& agent, const Options& options);
+Status showPaired(const AgentClient& agent, const Options& options);
+Status showInfo(const AgentClient& agent, const Options& options);
+Status refresh(const AgentClient& agent, const Options& options);
+Status dismiss(const AgentClient& agent, const Options& options);
+Status scheduleOutreach(const AgentClient& agent, const Options& options);
+Status reportAccountAdded(const AgentClient& agent, const Options& options);
+Status showSupportApplication(const AgentClient& agent, const Options& options);
+Status showWebURL(const AgentClient& agent, const Options& options);
+Status showTimeline(const AgentClient& agent, const Options& options);
+Status postNotification(const AgentClient& agent, const Options& options);
+
+// These need no agent.
+
+Status showFollowUps(const Options& options);
+Status showActivities(const Options& options);
+Status showVerdicts(const Options& options);
+
+}  // namespace kvr::client
