@@ -16,7 +16,11 @@ struct Error {
   friend bool operator==(const Error&, const Error&) = default;
 };
 
-std::string describe(const Error& error);
+/// The form that stands in log lines.
+inline std::string describe(const Error& error) {
+  return "Error Domain=" + error.domain + " Code=" + std::to_string(error.code) + " \"" + error.message +
+         "\"";
+}
 
 /// A value, or the error that took its place.
 template <class T>

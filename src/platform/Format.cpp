@@ -5,11 +5,6 @@
 
 namespace kvr {
 
-std::string describe(const Error& error) {
-  return "Error Domain=" + error.domain + " Code=" + std::to_string(error.code) + " \"" + error.message +
-         "\"";
-}
-
 namespace format_detail {
 
 void appendInteger(std::string& out, long long number) {

@@ -1,8 +1,12 @@
 #include "agent/KVRAgentProtocol.h"
 #include "integration/support/BusFixture.h"
 #include "platform/JSON.h"
+#include "platform/local/BusIntrospection.h"
 
 #include <gmock/gmock.h>
+
+#include <fstream>
+#include <iterator>
 
 namespace kvr::testing {
 namespace {
@@ -230,6 +234,26 @@ TEST_F(Kvrctl, WritesOneJSONDocumentOfEverythingTheAgentKnows) {
                 {"version", 1},
                 {"deviceInfos", Value::Array{Value::Dictionary{{"device", told}, {"warranty", known}},
                                              Value::Dictionary{{"device", told}, {"warranty", Value()}}}}}));
+}
+
+/// What the file declares, without its comments and line breaks.
+std::string declarationsIn(std::string text) {
+  text.erase(0, text.find("<interface name=\"com.tarsil"));
+  for (auto at = text.find("<!--"); at != std::string::npos; at = text.find("<!--")) {
+    text.erase(at, text.find("-->", at) + 3 - at);
+  }
+  std::string line;
+  for (const char c : text) {
+    const bool isBlank = c == ' ' || c == '\n';
+    if (!isBlank || !line.ends_with(' ')) line += isBlank ? ' ' : c;
+  }
+  return line;
+}
+
+TEST(TheInstalledInterface, IsTheOneThatTheAgentServes) {
+  std::ifstream file(KVR_INTERFACE_FILE);
+  const std::string text{std::istreambuf_iterator<char>(file), {}};
+  EXPECT_EQ(declarationsIn(text), declarationsIn(introspectionDocument(agentServiceInterface())));
 }
 
 }  // namespace

@@ -9,9 +9,12 @@ namespace kvr::client {
 namespace {
 
 constexpr double kDay = 86400;              // seconds
-constexpr double kPast = 60 * kDay;         // of the axis, before now
-constexpr double kFuture = 3 * 365 * kDay;  // at most, after now
+// Of the axis, before and after now. Coverage is long, what the agent does is near: an axis for the one would
+// leave no room for the other, so coverage may run out of it.
+constexpr double kPast = 60 * kDay;
 constexpr double kLeastFuture = 60 * kDay;
+constexpr double kFutureForCoverage = 180 * kDay;
+constexpr double kFuture = 365 * kDay;
 
 constexpr std::array<const char*, 3> kNames{"coverage", "offer", "follow-up"};
 
@@ -113,7 +116,7 @@ void Timeline::add(const std::string& label, Kind kind, std::optional<Date> from
   Row row{label, {}, {}};
   if (from && until && *from < *until) {
     row.spans.push_back({kind, *from, *until});
-    reach(*until);
+    reach(kind == CoverageSpan ? std::min(*until, now_ + kFutureForCoverage) : *until);
   }
   rows_.push_back(std::move(row));
 }
@@ -159,6 +162,7 @@ std::string Timeline::text(const Style& style, std::size_t columns) const {
       for (std::size_t at = columnOf(span.from); at <= columnOf(span.until); ++at) {
         cells[at] = style.paint(kPaints[span.kind], kBlocks[span.kind]);
       }
+      if (span.until > until_) cells.back() = style.paint(kPaints[span.kind], "▶");
     }
     for (const auto& mark : row.marks) cells[columnOf(mark)] = style.paint(Style::Notice, "◆");
     text += fitted(row.label, labels) + "  ";
@@ -214,6 +218,10 @@ std::string Timeline::svg() const {
       const double left = x(span.from);
       svg += filled("<rect class=\"%s\" x=\"%.1f\" y=\"%d\" width=\"%.1f\" height=\"%d\" rx=\"4\"/>",
                     kNames[span.kind], left, y, std::max(x(span.until) - left, 3.0), kBarHeight);
+      if (span.until > until_) {
+        svg += filled("<path class=\"%s\" d=\"M%d %d l12 11 l-12 11 z\"/>", kNames[span.kind],
+                      kWidth - kRight - 4, y - 3);
+      }
     }
     for (const auto& mark : row.marks) {
       svg += filled("<path class=\"mark\" d=\"M%.1f %d l7 8 l-7 8 l-7 -8 z\"/>", x(mark), y);
