@@ -14,6 +14,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <array>
 #include <cerrno>
 #include <ctime>
 #include <filesystem>
@@ -137,11 +138,20 @@ std::string connectFailure(const std::string& host, const std::string& port) {
   return reason;
 }
 
-Verdict endpointVerdict(const std::string& key, const Value& preferences) {
-  const auto text = preferences[key].stringIfAny();
-  if (!text) return {key, Verdict::Fine, "the agent's own", ""};
-  const auto url = URL::parse(*text);
-  if (!url) return {key, Verdict::Broken, *text + " is no URL", "correct it in the agent's preferences"};
+/// An address that the agent's preferences may name, and where the agent asks when they do not.
+struct Endpoint {
+  const char* key;
+  const char* usual;
+};
+constexpr std::array<Endpoint, 3> kEndpoints{{{"WarrantyURL", "https://coverage.tarsil.example"},
+                                              {"WearablesWarrantyURL", "https://coverage.tarsil.example"},
+                                              {"ServerVersionURL", "https://assets.tarsil.example"}}};
+
+Verdict endpointVerdict(const Endpoint& endpoint, const Value& preferences) {
+  const std::string key = endpoint.key;
+  const std::string text = preferences[key].stringIfAny().value_or(endpoint.usual);
+  const auto url = URL::parse(text);
+  if (!url) return {key, Verdict::Broken, text + " is no URL", "correct it in the agent's preferences"};
   if (url->isFile()) {
     std::error_code unknown;
     if (fs::is_regular_file(url->filePath(), unknown))
@@ -151,7 +161,7 @@ Verdict endpointVerdict(const std::string& key, const Value& preferences) {
   const auto failure = connectFailure(url->host(), portOf(*url));
   if (failure.empty()) return {key, Verdict::Fine, url->host() + " can be reached", ""};
   return {key, Verdict::Broken, url->host() + " cannot be reached: " + failure,
-          "see to the network, or to the address"};
+          "see to the network, or to " + key + " in the agent's preferences"};
 }
 
 }  // namespace
@@ -173,8 +183,8 @@ std::vector<Verdict> examine() {
   verdicts.push_back(clockVerdict());
   std::ifstream file(preferences, std::ios::binary);
   const auto tree = readPropertyList(std::string{std::istreambuf_iterator<char>(file), {}});
-  for (const auto* key : {"WarrantyURL", "WearablesWarrantyURL", "ServerVersionURL"}) {
-    verdicts.push_back(endpointVerdict(key, tree ? *tree : Value()));
+  for (const auto& endpoint : kEndpoints) {
+    verdicts.push_back(endpointVerdict(endpoint, tree ? *tree : Value()));
   }
   return verdicts;
 }

@@ -8,7 +8,7 @@
 namespace kvr::client {
 namespace {
 
-constexpr double kDay = 86400;              // seconds
+constexpr double kDay = 86400;  // seconds
 // Of the axis, before and after now. Coverage is long, what the agent does is near: an axis for the one would
 // leave no room for the other, so coverage may run out of it.
 constexpr double kPast = 60 * kDay;
