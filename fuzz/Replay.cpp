@@ -13,8 +13,9 @@ namespace {
 namespace fs = std::filesystem;
 
 std::vector<fs::path> filesBelow(const fs::path& path) {
-  if (!fs::is_directory(path)) return {path};
+  if (fs::is_regular_file(path)) return {path};
   std::vector<fs::path> files;
+  if (!fs::exists(path)) return files;
   for (const auto& entry : fs::recursive_directory_iterator(path)) {
     if (entry.is_regular_file()) files.push_back(entry.path());
   }

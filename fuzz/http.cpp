@@ -15,7 +15,7 @@
 
 #include <algorithm>
 #include <array>
-#include <atomic>
+#include <cerrno>
 
 namespace kvr::fuzz {
 namespace {
@@ -35,6 +35,16 @@ HTTPHeaders headersIn(std::string_view text) {
     require(headers.value(name) == value, "a header is what it was set to");
   }
   return headers;
+}
+
+/// Waits for one of them; libFuzzer's timer does not end it.
+template <std::size_t count>
+bool waitFor(std::array<pollfd, count>& sources, int milliseconds) {
+  int ready = 0;
+  do {
+    ready = ::poll(sources.data(), sources.size(), milliseconds);
+  } while (ready < 0 && errno == EINTR);
+  return ready > 0;
 }
 
 /// A server on this machine that answers one request with any bytes.
@@ -70,8 +80,8 @@ class Server {
     }
     ::shutdown(connection.get(), SHUT_WR);
     // The client has read all it wants to once it closes, or sees that it is closed.
-    pollfd closed{connection.get(), POLLIN, 0};
-    ::poll(&closed, 1, answer.empty() ? 0 : 1000);
+    std::array closed{pollfd{connection.get(), POLLIN, 0}};
+    if (!answer.empty()) waitFor(closed, 1000);
     return request;
   }
 
@@ -105,7 +115,7 @@ void Client::exchange(const HTTPHeaders& headers, std::string_view answer) {
   });
   std::array<pollfd, 2> sources{pollfd{replied.get(), POLLIN, 0}, pollfd{server.descriptor(), POLLIN, 0}};
   while (sources[0].revents == 0) {
-    require(::poll(sources.data(), sources.size(), 20'000) > 0, "an exchange comes to its end");
+    require(waitFor(sources, 20'000), "an exchange comes to its end");
     if (sources[1].revents == 0) continue;
     const auto received = server.serve(answer);
     const auto end = received.find("\r\n\r\n");
