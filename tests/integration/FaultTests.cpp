@@ -11,9 +11,11 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <cstring>
 #include <fstream>
 #include <functional>
 #include <iterator>
+#include <limits>
 #include <map>
 
 #if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
@@ -31,6 +33,8 @@ namespace fs = std::filesystem;
 using World = AgentWorld;
 
 constexpr double kDay = 86400;
+/// Error lines that a fault may lead to: no lock, no file, and what came of that for the one who asked.
+constexpr std::size_t kMostComplaints = 4;
 
 /// What a file holds, without what is another one each time.
 Value steady(const Value& tree) {
@@ -52,7 +56,8 @@ Value contentOf(const fs::path& path) {
 /// it is a change.
 struct Store {
   std::string folder;
-  int changes;  ///< of files
+  unsigned changes;      ///< of files
+  unsigned directories;  ///< made in it
   std::function<void(AgentWorld&, int round)> prepare;
   std::function<void(const RawBusClient&, int round)> change;
 };
@@ -73,11 +78,11 @@ std::vector<Store> allStores() {
   const auto schedule = [](const RawBusClient& client, int round) {
     client.call("ScheduleOutreachAfter", "d", {kDay + round});
   };
-  return {{"Preferences", 1, nothing, schedule},
-          {"FollowUps", 1, nothing, dismiss},
-          {"Activities", 1, nothing, schedule},
-          {"Application Support", 1, setLabel, refresh(World::kFirstWatch)},
-          {"Keys", 4, nothing, refresh(World::kPhone)}};
+  return {{"Preferences", 1, 0, nothing, schedule},
+          {"FollowUps", 1, 0, nothing, dismiss},
+          {"Activities", 1, 0, nothing, schedule},
+          {"Application Support", 1, 0, setLabel, refresh(World::kFirstWatch)},
+          {"Keys", 4, 1, nothing, refresh(World::kPhone)}};
 }
 
 class TheAgentsStores : public ::testing::Test {
@@ -115,17 +120,26 @@ class TheAgentsStores : public ::testing::Test {
   }
 
   fs::path library() const { return world.home() / "Library"; }
-  /// Brings the stores back to what they were at the beginning.
+  /// Brings a store back to what it was at the beginning, each file at one moment.
   void restore(const Store& store, int round) {
+    const auto saved = world.directory / "saved" / store.folder;
+    if (!fs::exists(saved)) fs::remove_all(library() / store.folder);
+    for (const auto& [file, content] : stateIn(saved)) {
+      fs::copy_file(saved / file, world.directory / "restored", fs::copy_options::overwrite_existing);
+      fs::rename(world.directory / "restored", library() / store.folder / file);
+    }
+    store.prepare(world, round);
+  }
+  /// Brings all of them back, behind an agent that is no more.
+  void restoreAll() const {
     fs::remove_all(library());
     fs::copy(world.directory / "saved", library(), fs::copy_options::recursive);
-    store.prepare(world, round);
   }
   /// Has the calls of a store from `first` to `last` fail, or none if `first` is 0.
   void arm(const std::string& folder, unsigned first = 0, unsigned last = 0, int error = 0) const {
     injection->first = 0;
     injection->path[0] = '\0';
-    const std::string path = library() / folder;
+    const std::string path = folder.empty() ? library() : library() / folder;
     ASSERT_LT(path.size(), Injection::kLongestPath);
     std::ranges::copy(path.c_str() + 1, path.c_str() + path.size() + 1, injection->path + 1);
     injection->path[0] = '/';
@@ -144,9 +158,9 @@ class TheAgentsStores : public ::testing::Test {
     world.newClient().call("GetAllDeviceInfosUsingPolicy", "tb", {World::CacheOnly, false});
   }
 
-  State stateOf(const Store& store) const {
+  State stateOf(const Store& store) const { return stateIn(library() / store.folder); }
+  static State stateIn(const fs::path& folder) {
     State state;
-    const auto folder = library() / store.folder;
     if (!fs::exists(folder)) return state;
     for (const auto& entry : fs::recursive_directory_iterator(folder)) {
       if (entry.is_regular_file() && !isTemporary(entry.path())) {
@@ -178,7 +192,11 @@ class TheAgentsStores : public ::testing::Test {
     }
   }
 
-  std::size_t errorLines() const {
+  /// The agent's error lines so far. What it printed may arrive after what it replied, but not out of order.
+  std::size_t errorLines() {
+    const auto mark = "MARK" + std::to_string(++marks);
+    world.newClient().call("GetDeviceInfoForSerialNumber", "st", {mark, World::CacheOnly});
+    world.agent().waitForErrorOutput(mark);
     const auto log = world.agent().errorOutput();
     std::size_t lines = 0;
     for (auto at = log.find(" error com."); at != std::string::npos; at = log.find(" error com.", at + 1))
@@ -187,13 +205,15 @@ class TheAgentsStores : public ::testing::Test {
   }
 
   mutable AgentWorld world;
+  unsigned marks = 0;
   Injection* injection = nullptr;
 };
 
 TEST_F(TheAgentsStores, AreTheOldOrTheNewOnesWhereverItIsKilled) {
   unsigned points = 0;
   for (const auto& store : allStores()) {
-    restore(store, 0);
+    restoreAll();
+    store.prepare(world, 0);
     const State before = stateOf(store);
     startAgent();
     arm(store.folder);
@@ -201,17 +221,19 @@ TEST_F(TheAgentsStores, AreTheOldOrTheNewOnesWhereverItIsKilled) {
     const unsigned calls = injection->calls;
     const State after = stateOf(store);
     ASSERT_NE(after, before) << store.folder;
-    EXPECT_EQ(injection->replacements, static_cast<unsigned>(store.changes)) << store.folder;
-    EXPECT_EQ(injection->fileSyncs, injection->replacements) << store.folder;
+    EXPECT_EQ(injection->replacements, store.changes) << store.folder;
+    EXPECT_EQ(injection->fileSyncs, store.changes) << store.folder;
+    EXPECT_EQ(injection->directorySyncs, store.changes + store.directories) << store.folder;
     world.agent().kill();
 
     for (unsigned call = 1; call <= calls; ++call, ++points) {
       SCOPED_TRACE(store.folder + ", call " + std::to_string(call) + " of " + std::to_string(calls));
-      restore(store, 0);
+      restoreAll();
       startAgent();
       arm(store.folder, call, call, Injection::kKill);
       store.change(world.newClient(), 0);
-      if (injection->calls < call) break;  // a file that has become old enough is not read again
+      // A file that has become old enough is not read again, which makes fewer calls.
+      if (injection->calls < call) world.agent().kill();
       ASSERT_EQ(world.agent().wait(), -SIGKILL);
       expectOldOrNew(stateOf(store), before, after);
 
@@ -226,8 +248,66 @@ TEST_F(TheAgentsStores, AreTheOldOrTheNewOnesWhereverItIsKilled) {
       if (HasFailure()) return;
     }
   }
+  EXPECT_GT(points, 8 * allStores().size());
   RecordProperty("points", static_cast<int>(points));
-  std::printf("%u points\n", points);
+}
+
+TEST_F(TheAgentsStores, AreTheOldOrTheNewOnesWhateverCallFailsAndNormalWithoutARestart) {
+  startAgent();
+  const auto client = world.newClient();
+  int round = 0;
+  unsigned calls = 0;
+  /// Makes a change while some calls fail, and again when none does; whether as many calls were made.
+  const auto change = [&](const Store& store, unsigned first, unsigned last, int error) {
+    SCOPED_TRACE(store.folder + ", call " + std::to_string(first) + ": " + std::strerror(error));
+    restore(store, ++round);
+    const State before = stateOf(store);
+    const auto lines = errorLines();
+    arm(store.folder, first, last, error);
+    store.change(client, round);
+    calls = injection->calls;
+    arm("nothing");
+    const State found = stateOf(store);
+    EXPECT_LE(errorLines(), lines + kMostComplaints)
+        << world.agent().errorOutput().substr(world.agent().errorOutput().size() - 9000);
+    const auto linesThen = errorLines();
+    store.change(client, round);
+    expectOldOrNew(found, before, stateOf(store));
+    EXPECT_EQ(errorLines(), linesThen);
+    EXPECT_EQ(temporaries(store), 0);
+    EXPECT_NE(stateOf(store), before);
+  };
+  unsigned points = 0;
+  for (const auto& store : allStores()) {
+    for (const int error : {ENOSPC, EIO, EROFS, EMFILE}) {
+      unsigned call = 0;
+      do {
+        ++call;
+        if (error == EIO) change(store, call, std::numeric_limits<unsigned>::max(), error);
+        change(store, call, call, error);
+      } while (calls >= call && !HasFailure());
+      points += call - 1;
+      if (HasFailure()) return;
+    }
+  }
+  EXPECT_EQ(world.agent().terminate(), 0);
+  EXPECT_GT(points, 4 * 8 * allStores().size());
+  RecordProperty("points", static_cast<int>(points));
+}
+
+TEST_F(TheAgentsStores, AreNotWrittenWhenNothingChanges) {
+  startAgent();
+  const auto client = world.newClient();
+  client.call("DismissFollowUpForSerialNumber", "s", {World::kPhone});
+  arm("FollowUps");
+  client.call("DismissFollowUpForSerialNumber", "s", {World::kPhone});
+  EXPECT_GT(injection->calls, 0U);
+  EXPECT_EQ(injection->fileSyncs + injection->directorySyncs + injection->replacements, 0U);
+  arm("");
+  World::info(client, World::kFirstWatch, World::Default);
+  errorLines();
+  EXPECT_GT(injection->calls, 0U);
+  EXPECT_EQ(injection->fileSyncs + injection->directorySyncs + injection->replacements, 0U);
 }
 
 }  // namespace

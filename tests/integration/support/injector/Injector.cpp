@@ -120,12 +120,13 @@ ssize_t write(int descriptor, const void* bytes, size_t size) {
   return ::syscall(SYS_write, descriptor, bytes, size);
 }
 
+/// Counts only: no power fails in a test, and the disk would take most of its time.
 int fsync(int descriptor) {
   const auto kind = kindOf(descriptor);
-  if (kind != Opened::Elsewhere && fails()) return -1;
-  if (kind == Opened::File) ++page()->fileSyncs;
-  if (kind == Opened::Directory) ++page()->directorySyncs;
-  return static_cast<int>(::syscall(SYS_fsync, descriptor));
+  if (kind == Opened::Elsewhere) return 0;
+  if (fails()) return -1;
+  ++(kind == Opened::File ? page()->fileSyncs : page()->directorySyncs);
+  return 0;
 }
 
 /// A descriptor is closed whatever the call says.
