@@ -8,19 +8,10 @@
 #include "platform/simulated/SimulatedLog.h"
 
 #include <cstdio>
-#include <cstdlib>
 #include <filesystem>
 #include <fstream>
 #include <iterator>
 #include <new>
-
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-#define KVR_IS_SANITIZED 1
-#elif defined(__has_feature)
-#if __has_feature(address_sanitizer) || __has_feature(thread_sanitizer)
-#define KVR_IS_SANITIZED 1
-#endif
-#endif
 
 namespace {
 
@@ -33,20 +24,6 @@ bool fails() { return ++allocations == failing; }
 
 }  // namespace
 
-#ifdef KVR_IS_SANITIZED
-// The sanitizer has the C allocator to itself.
-void* operator new(std::size_t size) {
-  void* const memory = fails() ? nullptr : std::malloc(size);
-  if (memory == nullptr) throw std::bad_alloc();
-  ++held;
-  return memory;
-}
-void operator delete(void* memory) noexcept {
-  if (memory != nullptr) --held;
-  std::free(memory);
-}
-void operator delete(void* memory, std::size_t) noexcept { operator delete(memory); }
-#else
 extern "C" {
 void* __libc_malloc(std::size_t size);
 void* __libc_realloc(void* memory, std::size_t size);
@@ -66,12 +43,10 @@ void free(void* memory) noexcept {
   if (memory != nullptr) --held;
   __libc_free(memory);
 }
-}
-#endif
+
+}  // extern "C"
 
 namespace kvr::fuzz {
-
-void run(std::string_view) {}
 
 namespace {
 

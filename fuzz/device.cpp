@@ -1,5 +1,6 @@
 // The files that describe the device: the input stands in the place of each, and everything is asked.
 #include "Fuzz.h"
+#include "integration/support/TemporaryDirectory.h"
 #include "platform/local/LocalAccountSession.h"
 #include "platform/local/LocalAccountStore.h"
 #include "platform/local/LocalApplicationRegistry.h"
@@ -18,43 +19,23 @@
 
 #include <atomic>
 #include <cstdlib>
-#include <filesystem>
-#include <fstream>
 
 namespace kvr::fuzz {
 namespace {
 
-namespace fs = std::filesystem;
-
 /// Whom a file belongs to is a question to the real one, so there are real ones, empty; what they hold is
 /// simulated.
-class RealDirectory {
- public:
-  RealDirectory() {
-    std::string pattern = (fs::temp_directory_path() / "kvr-fuzz-XXXXXX").string();
-    require(::mkdtemp(pattern.data()) != nullptr, "a directory can be made");
-    path_ = fs::canonical(pattern);
-    for (const auto* trusted : {"Accounts.plist", "Entitlements.plist"}) std::ofstream(path_ / trusted);
-  }
-  RealDirectory(const RealDirectory&) = delete;
-  RealDirectory& operator=(const RealDirectory&) = delete;
-  ~RealDirectory() {
-    std::error_code ignored;
-    fs::remove_all(path_, ignored);
-  }
-  std::string path() const { return path_.string(); }
-
- private:
-  fs::path path_;
-};
-
 struct Device {
-  RealDirectory directory;
+  Device() {
+    for (const auto* trusted : {"Accounts.plist", "Entitlements.plist"}) directory.write(trusted, "");
+  }
+
+  testing::TemporaryDirectory directory;
   SimulatedClock clock;
   SimulatedLog log;
   SimulatedFiles files{clock};
   PropertyListFiles lists{files, clock, log};
-  DeviceRoot root{lists, log, directory.path()};
+  DeviceRoot root{lists, log, directory.path().string()};
   LocalUserLocale locale{root, log};
   LocalDeviceProperties properties{root, "/nowhere"};
   LocalFeatureFlags flags{root};

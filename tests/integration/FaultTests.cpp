@@ -18,14 +18,6 @@
 #include <limits>
 #include <map>
 
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-#define KVR_IS_SANITIZED 1
-#elif defined(__has_feature)
-#if __has_feature(address_sanitizer) || __has_feature(thread_sanitizer)
-#define KVR_IS_SANITIZED 1
-#endif
-#endif
-
 namespace kvr::testing {
 namespace {
 
@@ -91,9 +83,7 @@ class TheAgentsStores : public ::testing::Test {
   using State = Value::Dictionary;
 
   void SetUp() override {
-#ifdef KVR_IS_SANITIZED
-    GTEST_SKIP() << "the sanitizer's runtime stands before the injector's calls";
-#endif
+    if (*KVR_SANITIZERS != '\0') GTEST_SKIP() << "a sanitizer's runtime stands before the injector's calls";
     const auto file = world.directory.write("injection", std::string(sizeof(Injection), '\0'));
     const int descriptor = ::open(file.c_str(), O_RDWR | O_CLOEXEC);
     void* const page = ::mmap(nullptr, sizeof(Injection), PROT_READ | PROT_WRITE, MAP_SHARED, descriptor, 0);
@@ -268,8 +258,7 @@ TEST_F(TheAgentsStores, AreTheOldOrTheNewOnesWhateverCallFailsAndNormalWithoutAR
     calls = injection->calls;
     arm("nothing");
     const State found = stateOf(store);
-    EXPECT_LE(errorLines(), lines + kMostComplaints)
-        << world.agent().errorOutput().substr(world.agent().errorOutput().size() - 9000);
+    EXPECT_LE(errorLines(), lines + kMostComplaints);
     const auto linesThen = errorLines();
     store.change(client, round);
     expectOldOrNew(found, before, stateOf(store));
