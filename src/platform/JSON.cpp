@@ -10,6 +10,7 @@
 #include <cmath>
 #include <exception>
 #include <limits>
+#include <new>
 
 namespace kvr {
 namespace {
@@ -200,6 +201,8 @@ Result<Value> readJSON(std::string_view bytes) {
     Events events;
     nlohmann::json::sax_parse(bytes.begin(), bytes.end(), &events);
     return events.result();
+  } catch (const std::bad_alloc&) {
+    throw;
   } catch (const std::exception& exception) {
     return jsonError(exception.what());
   }

@@ -16,7 +16,8 @@ inline constexpr std::size_t kMaximumDepth = 512;
 /// Reads a property list in any encoding: XML, binary, or the old ASCII form.
 ///
 /// Takes any bytes: what is no property list, is nested deeper than `kMaximumDepth`, or unfolds to more than
-/// a bounded number of values is an error in domain "plist". Thread-safe, no state.
+/// a bounded number of values is an error in domain "plist". Short memory says nothing about the bytes: it is
+/// std::bad_alloc, never an error. Thread-safe, no state.
 Result<Value> readPropertyList(std::string_view bytes);
 
 /// Writes a tree. XML holds no null, no character that XML forbids and no date outside the calendar, and

@@ -12,6 +12,7 @@
 #include <exception>
 #include <limits>
 #include <memory>
+#include <new>
 
 namespace kvr {
 namespace {
@@ -145,10 +146,11 @@ class Reader {
   Element leaf_ = Element::None;
   std::string text_;  ///< of the open leaf, so far; copied from, so that it need not grow anew for each
   const char* problem_ = nullptr;
+  bool isOutOfMemory_ = false;
 };
 
 Result<Value> Reader::read(std::string_view bytes) {
-  if (!parser_) return plistError("out of memory");
+  if (!parser_) throw std::bad_alloc();
   installHandlers();
   constexpr std::size_t kMostAtOnce = std::size_t{1} << 30U;  // Expat takes an int
   bool ok = true;
@@ -157,6 +159,7 @@ Result<Value> Reader::read(std::string_view bytes) {
     bytes.remove_prefix(part.size());
     ok = XML_Parse(parser_.get(), part.data(), static_cast<int>(part.size()), bytes.empty()) == XML_STATUS_OK;
   } while (ok && !bytes.empty());
+  if (isOutOfMemory_ || XML_GetErrorCode(parser_.get()) == XML_ERROR_NO_MEMORY) throw std::bad_alloc();
   if (ok && builder_.isComplete()) return builder_.take();
   const char* problem = problem_ != nullptr ? problem_
                         : ok                ? "the document holds no value"
@@ -172,6 +175,7 @@ void Reader::call(void* self, A... arguments) noexcept {
   try {
     (reader.*operation)(arguments...);
   } catch (const std::exception&) {
+    reader.isOutOfMemory_ = true;
     reader.fail("out of memory");
   }
 }

@@ -147,7 +147,8 @@ Verdict verify(const Certificate& certificate, const Certificate& authority, Dat
   }
   auto* const parameters = X509_STORE_CTX_get0_param(context.get());
   X509_VERIFY_PARAM_set_time(parameters, secondsOf(now));
-  X509_VERIFY_PARAM_set_flags(parameters, X509_V_FLAG_X509_STRICT);
+  // The authority's own signature as well: it tells whether its certificate is as it was made.
+  X509_VERIFY_PARAM_set_flags(parameters, X509_V_FLAG_X509_STRICT | X509_V_FLAG_CHECK_SS_SIGNATURE);
   const bool verified = X509_verify_cert(context.get()) == 1;
   ERR_clear_error();
   if (verified) return Verdict::Good;

@@ -236,7 +236,10 @@ std::optional<Error> LocalFiles::replace(const std::string& path, const std::str
   if (!writeAll(descriptor->get(), bytes) || ::fsync(descriptor->get()) != 0 ||
       ::rename(temporary.c_str(), path.c_str()) != 0) {
     const auto error = failure(path);
-    ::unlink(temporary.c_str());
+    if (::unlink(temporary.c_str()) != 0) {
+      const std::lock_guard own(mutex_);
+      swept_.erase(directoryOf(path));  // for the next one to sweep
+    }
     return error;
   }
   return syncDirectory(directoryOf(path));

@@ -74,9 +74,12 @@ AgentWorld::AgentWorld(Attestation attestation) {
 void AgentWorld::becomeNewDevice() const { std::filesystem::remove(home() / kActivities); }
 
 ChildProcess::Environment AgentWorld::environment() const {
-  return {{"HOME", home().string()}, {"KVR_DEVICE_ROOT", (directory / "device").string()},
-          {"KVR_LOG_PRIVATE", "1"},  {"DBUS_SESSION_BUS_ADDRESS", bus.address()},
-          {"LC_ALL", "C"},           {"JOURNAL_STREAM", ""}};
+  ChildProcess::Environment environment{
+      {"HOME", home().string()}, {"KVR_DEVICE_ROOT", (directory / "device").string()},
+      {"KVR_LOG_PRIVATE", "1"},  {"DBUS_SESSION_BUS_ADDRESS", bus.address()},
+      {"LC_ALL", "C"},           {"JOURNAL_STREAM", ""}};
+  environment.insert(moreEnvironment.begin(), moreEnvironment.end());
+  return environment;
 }
 
 void AgentWorld::startAgent() {

@@ -70,6 +70,7 @@ class AgentWorld {
 
   PrivateBus bus;
   TemporaryDirectory directory;
+  ChildProcess::Environment moreEnvironment;  ///< of the agent, besides what makes its world
 
  private:
   ChildProcess::Environment environment() const;

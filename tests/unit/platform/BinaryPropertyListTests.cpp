@@ -184,13 +184,14 @@ TEST(ABinaryPropertyList, IsWrittenSoThatItCanBeReadHoweverMuchIsShared) {
   EXPECT_TRUE(*read == tree);
 }
 
-TEST(ABinaryPropertyList, ThatIsDamagedDoesNoHarm) {
+TEST(ABinaryPropertyList, IsRefusedWhereverItIsCut) {
   const Value tree = Value::Dictionary{
       {"a", Value::Array{1, -1, 0.5, true, Value(), Date{0}, Value::Bytes{1, 2}, ~0ULL,
                          Value::Array{"\u00e9\U0001F600"}}},
       {"b", Value::Dictionary{{"a string with a long length", 65536}}},
   };
-  expectDamageIsHarmless(*writePropertyList(tree, PropertyListEncoding::Binary), readBinaryPropertyList);
+  expectRefusedWhereverItIsCut(*writePropertyList(tree, PropertyListEncoding::Binary),
+                               readBinaryPropertyList);
 }
 
 }  // namespace

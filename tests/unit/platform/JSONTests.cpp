@@ -51,8 +51,8 @@ TEST(AJSONText, MayBeNestedToTheLimitAndNoFurther) {
   }
 }
 
-TEST(AJSONText, ThatIsDamagedDoesNoHarm) {
-  expectDamageIsHarmless(
+TEST(AJSONText, IsRefusedWhereverItIsCut) {
+  expectRefusedWhereverItIsCut(
       R"({"a": [1, -2.5e-3, 18446744073709551615, "\u00e9\n\ud83d\ude00é😀"], "b": {"": null}})", readJSON);
 }
 

@@ -65,24 +65,10 @@ inline void expectFaults(const TreeReader& read, const std::string& domain, cons
   }
 }
 
-/// Damages a sample in every place. What is cut short must be refused; of what is changed, whatever is still
-/// accepted must be a sound tree: one that can be written and read again.
-inline void expectDamageIsHarmless(const std::string& sample, const TreeReader& read) {
+inline void expectRefusedWhereverItIsCut(const std::string& sample, const TreeReader& read) {
   ASSERT_TRUE(read(sample));
   for (std::size_t size = 0; size < sample.size(); ++size) {
     EXPECT_FALSE(read(std::string_view(sample).substr(0, size))) << "cut at " << size;
-  }
-  for (std::size_t at = 0; at < sample.size(); ++at) {
-    for (const unsigned change : {0x01U, 0x02U, 0x04U, 0x08U, 0x10U, 0x20U, 0x40U, 0x80U, 0xFFU}) {
-      std::string damaged = sample;
-      damaged[at] = static_cast<char>(static_cast<unsigned char>(damaged[at]) ^ change);
-      const auto tree = read(damaged);
-      if (!tree) continue;
-      const auto written = writePropertyList(*tree, PropertyListEncoding::Binary);
-      ASSERT_TRUE(written) << "byte " << at << " changed by " << change << ": " << written.error().message;
-      const auto again = readPropertyList(*written);
-      EXPECT_TRUE(again && *again == *tree) << "byte " << at << " changed by " << change;
-    }
   }
 }
 

@@ -1,0 +1,120 @@
+// The files that describe the device: the input stands in the place of each, and everything is asked.
+#include "Fuzz.h"
+#include "integration/support/TemporaryDirectory.h"
+#include "platform/local/LocalAccountSession.h"
+#include "platform/local/LocalAccountStore.h"
+#include "platform/local/LocalApplicationRegistry.h"
+#include "platform/local/LocalCarrierInfo.h"
+#include "platform/local/LocalDeviceAttestation.h"
+#include "platform/local/LocalDeviceProperties.h"
+#include "platform/local/LocalEntitlements.h"
+#include "platform/local/LocalFeatureFlags.h"
+#include "platform/local/LocalPairedDeviceRegistry.h"
+#include "platform/local/LocalStore.h"
+#include "platform/local/LocalStringTables.h"
+#include "platform/local/LocalUserLocale.h"
+#include "platform/simulated/SimulatedClock.h"
+#include "platform/simulated/SimulatedFiles.h"
+#include "platform/simulated/SimulatedLog.h"
+
+#include <atomic>
+#include <cstdlib>
+
+namespace kvr::fuzz {
+namespace {
+
+/// Whom a file belongs to is a question to the real one, so there are real ones, empty; what they hold is
+/// simulated.
+struct Device {
+  Device() {
+    for (const auto* trusted : {"Accounts.plist", "Entitlements.plist"}) directory.write(trusted, "");
+  }
+
+  testing::TemporaryDirectory directory;
+  SimulatedClock clock;
+  SimulatedLog log;
+  SimulatedFiles files{clock};
+  PropertyListFiles lists{files, clock, log};
+  DeviceRoot root{lists, log, directory.path().string()};
+  LocalUserLocale locale{root, log};
+  LocalDeviceProperties properties{root, "/nowhere"};
+  LocalFeatureFlags flags{root};
+  LocalPairedDeviceRegistry paired{root};
+  LocalEntitlements entitlements{root};
+  LocalAccountSession session{root};
+  LocalApplicationRegistry applications{root};
+  LocalCarrierInfo carriers{root};
+  LocalDeviceAttestation attestation{root, properties, files, clock, log};
+  LocalStringTables tables{root, locale, "/nowhere"};
+
+  void ask();
+  void askAccounts();
+};
+
+void Device::ask() {
+  for (const auto question :
+       {DeviceProperties::kSerialNumber, DeviceProperties::kProductType, DeviceProperties::kProductVersion}) {
+    static_cast<void>(properties.answer(question));
+  }
+  static_cast<void>(properties.isInternalInstall());
+  static_cast<void>(flags.isEnabled("Kavrel", "Bravik_3_0"));
+  static_cast<void>(paired.allDevicesPassing([](const PairedDeviceEntry&) { return true; }));
+  static_cast<void>(carriers.subscriptions());
+  static_cast<void>(applications.installedApplication("com.tarsil.supportapp"));
+  static_cast<void>(attestation.isSupported());
+  static_cast<void>(entitlements.valueFor({1, 2}, "com.tarsil.private.kvragent"));
+  const auto language = locale.preferredIdentifier();
+  require(!language.empty() && language.find('/') == std::string::npos, "a locale can be part of a path");
+  static_cast<void>(tables.localizedString("KavrelUI", "Localizable", "KEY", "default"));
+}
+
+void Device::askAccounts() {
+  std::atomic<int> replies = 0;
+  int questions = 2;
+  {
+    LocalStore store(root, log);
+    store.purchaseHistory(1, {"com.tarsil.supportapp"}, [&replies](const auto&) { ++replies; });
+    store.lookUp({"com.tarsil.supportapp"}, "com.tarsil.Preferences",
+                 [&replies](const auto&, const auto&) { ++replies; });
+    LocalAccountStore accounts(root, log);
+    HTTPRequest request;
+    session.addClientInfoHeader(request);
+    session.addDeviceIdentifierHeader(request);
+    static_cast<void>(session.authenticationHeadersFor(request));
+    if (const auto account = accounts.primaryAccount()) {
+      static_cast<void>(accounts.storeAccountFor(*account));
+      if (const auto authentication = accounts.authenticationAccountFor(*account)) {
+        static_cast<void>(accounts.tokenFor(*authentication, "com.tarsil.vornic.supportapp.auth"));
+        ++questions;
+        accounts.renewCredentialsFor(*authentication, {}, [&replies](auto, const auto&) { ++replies; });
+      }
+    }
+  }
+  require(replies == questions, "every question has one answer");
+}
+
+}  // namespace
+
+void run(std::string_view input) {
+  static Device device;
+  const std::vector<std::string> dictionaries = {
+      "Accounts.plist",         "Applications.plist", "Attestation.plist",
+      "DeviceProperties.plist", "Entitlements.plist", "FeatureFlags.plist",
+      "Locale.plist",           "Store.plist",        "Resources/KavrelUI/en/Localizable.plist"};
+  const std::vector<std::string> arrays = {"Carriers.plist", "PairedDevices.plist"};
+  for (const auto* names : {&dictionaries, &arrays}) {
+    for (const auto& name : *names) device.files.put(device.root.pathOf(name), std::string(input));
+  }
+  const auto tree = readPropertyList(input);
+  const std::size_t damaged = (tree && tree->isDictionary() ? 0 : dictionaries.size()) +
+                              (tree && tree->isArray() ? 0 : arrays.size());
+  device.log.clear();
+  ::setenv("LC_ALL", "en_US", 1);
+  device.ask();
+  device.askAccounts();
+  require(device.log.texts(LogLevel::Error).size() == damaged, "one line a damaged file");
+  device.ask();
+  require(device.log.texts(LogLevel::Error).size() == damaged, "which is not repeated");
+}
+
+}  // namespace kvr::fuzz
