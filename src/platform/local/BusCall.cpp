@@ -53,6 +53,7 @@ Result<BusCall> readBusCall(sd_bus_message* message, const ServiceInterface& int
     if (value->isString() && value->string().size() > kLongestText) {
       return invalidArguments(*method, std::string(argument.name) + " is too long");
     }
+    if (value->isString()) call.bytes += value->string().size();
     call.arguments.push_back(*std::move(value));
   }
   call.index = static_cast<std::size_t>(method - interface.methods.begin());

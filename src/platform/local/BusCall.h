@@ -15,6 +15,7 @@ struct BusCall {
   BusMessageRef message;
   std::size_t index = 0;  ///< of the method in its interface
   Value::Array arguments;
+  std::size_t bytes = 0;  ///< of the texts among the arguments
 };
 
 /// Takes a call apart. An error's domain is the bus error's name to answer with. All that is kept of the
