@@ -177,28 +177,6 @@ TEST_F(TheAgent, SendsTheRequestWithWhateverAttestationHeadersCouldBeMade) {
   }
 }
 
-TEST_F(TheAgent, RefusesWhoeverIsNotEntitledAndAdmitsByTheValueOnly) {
-  world.startAgent();
-  const std::pair<Value, bool> cases[] = {
-      {Value(), false}, {"true", false}, {0, false}, {false, false}, {true, true}, {1, true},
-  };
-  for (const auto& [value, admitted] : cases) {
-    world.entitle(value);
-    const auto client = world.newClient();
-    const auto reply = client.call("DefaultDevice");
-    EXPECT_EQ(reply.message != nullptr, admitted) << describe(value);
-    world.entitle(!admitted);
-    EXPECT_EQ(client.call("DefaultDevice").message != nullptr, admitted) << "decided once for a connection";
-    if (admitted) continue;
-    EXPECT_EQ(reply.error, "org.freedesktop.DBus.Error.AccessDenied");
-    EXPECT_THAT(reply.errorText, HasSubstr("com.tarsil.private.kvragent"));
-  }
-  std::filesystem::permissions(world.directory / "device/Entitlements.plist", std::filesystem::perms(0666));
-  world.entitle(true);
-  EXPECT_EQ(world.newClient().call("DefaultDevice").error, "org.freedesktop.DBus.Error.AccessDenied")
-      << "a file that anyone may write grants nothing";
-}
-
 TEST_F(TheAgent, AnswersOneRecordADeviceForFiftyWatchesWhenEverySecondDownloadFails) {
   std::vector<std::string> watches;
   for (int i = 0; i < 50; ++i) watches.push_back("SNMANY" + std::to_string(1000 + i));
@@ -295,23 +273,6 @@ TEST_F(TheAgent, EndsWithAnErrorWhenItLosesTheBusAndCleanlyWhenAsked) {
   world.bus.kill();
   EXPECT_GT(world.agent().wait(), 0) << "a status, not a signal";
   EXPECT_THAT(world.agent().errorOutput(), HasSubstr("error com.tarsil.Kavrel:core "));
-}
-
-TEST_F(TheAgent, SurvivesClientsThatLeaveInTheMiddleOfACall) {
-  world.misbehave(R"([{"late":0.3}])");
-  world.startAgent();
-  for (int i = 0; i < 20; ++i) {
-    auto client = world.newClient();
-    const auto call = client.newCall("GetAllDeviceInfosUsingPolicy", "tb", {World::Refresh, true});
-    ASSERT_GE(sd_bus_send(client.bus(), call.get(), nullptr), 0);
-    ASSERT_GE(sd_bus_flush(client.bus()), 0);
-    client.leave();
-  }
-  world.misbehave("[]");
-  const auto client = world.newClient();
-  EXPECT_THAT(World::allInfos(client, World::Default), SizeIs(3));
-  EXPECT_EQ(world.agent().terminate(), 0);
-  EXPECT_THAT(world.agent().errorOutput(), Not(HasSubstr("without an answer")));
 }
 
 TEST_F(TheAgent, LeavesCleanlyAfterAChangeOfLanguageAndComesBackWhenItIsCalled) {

@@ -1,5 +1,4 @@
 #include "integration/support/BusFixture.h"
-#include "platform/local/PeerIdentity.h"
 #include "platform/local/bus/BusCodec.h"
 #include "unit/platform/Trees.h"
 
@@ -299,17 +298,6 @@ TEST_F(AValueOnTheBus, ReadsAsNullWhereItsKindIsUnknown) {
                                                                               {"struct", Value()},
                                                                               {"variant", Value()},
                                                                               {"last", "x"}}));
-}
-
-TEST(APeer, IsHeldToItsVeryProcess) {
-  ChildProcess child({"cat", "/dev/tty"}, {});
-  child.wait();
-  EXPECT_FALSE(PeerIdentity::of(child.pid()));
-
-  const Result<PeerIdentity> self = PeerIdentity::of(::getpid());
-  ASSERT_TRUE(self);
-  EXPECT_EQ(self->executable(), FileIdentity::of("/proc/self/exe"));
-  EXPECT_TRUE(self->isAlive());
 }
 
 }  // namespace

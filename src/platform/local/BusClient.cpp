@@ -226,11 +226,13 @@ void BusClient::serve(BusCall call) {
   const auto reply = std::make_shared<CallReply>(context_->thread, weak_from_this(), number);
   const ServiceReply completion(context_->log, context_->interface.methods[index].member,
                                 [reply](Value value) { reply->give(std::move(value)); });
-  Value::Array arguments = std::exchange(call.arguments, {});
-  open_.emplace(number, std::move(call));
-  queue_->async([object = object_, index, arguments = std::move(arguments), completion] {
-    object->invoke(index, arguments, completion);
+  // What still waits behind another call when the client leaves is not done any more.
+  queue_->async([object = object_, index, arguments = std::weak_ptr(call.arguments), completion] {
+    const auto held = arguments.lock();
+    if (!held) return completion({});
+    object->invoke(index, *held, completion);
   });
+  open_.emplace(number, std::move(call));
 }
 
 void BusClient::answer(std::uint64_t number, const std::optional<Value>& value) {

@@ -113,7 +113,7 @@ class BusClient : public ServiceConnection, public std::enable_shared_from_this<
   State state_ = State::Identifying;
   std::string refusal_;
   std::deque<BusCall> waiting_;
-  std::map<std::uint64_t, BusCall> open_;  ///< by number; their arguments are gone
+  std::map<std::uint64_t, BusCall> open_;  ///< by number
   std::size_t bytes_ = 0;                  ///< of both
   std::uint64_t lastCall_ = 0;
   BusSlotRef watch_;
