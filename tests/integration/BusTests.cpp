@@ -90,16 +90,9 @@ TEST_F(AService, AnswersWithAnErrorWhatItCannotServe) {
   const auto serving = serve();
   const RawBusClient client = newClient();
   const std::string failed = "org.freedesktop.DBus.Error.Failed";
-  const std::string invalid = "org.freedesktop.DBus.Error.InvalidArgs";
   for (const char* fault : {"dropped", "throw", "kind", "text", "large"}) {
     EXPECT_EQ(client.call("EchoText", "s", {fault}).error, failed) << fault;
   }
-  EXPECT_EQ(served, 5);
-  EXPECT_EQ(client.call("EchoText", "s", {std::string((1U << 20U) + 1, 'x')}).error, invalid);
-  EXPECT_EQ(client.call("EchoText", "t", {1}).error, invalid);
-  EXPECT_EQ(client.call("EchoText", "ss", {"a", "b"}).error, invalid);
-  EXPECT_EQ(client.call("EchoText").error, invalid);
-  EXPECT_EQ(client.call("EchoNothing").error, "org.freedesktop.DBus.Error.UnknownMethod");
   EXPECT_EQ(served, 5);
   EXPECT_EQ(decisions.size(), 1U);
 }

@@ -2,8 +2,6 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <poll.h>
-#include <sys/socket.h>
 
 #include <algorithm>
 #include <chrono>
@@ -13,7 +11,6 @@
 namespace kvr::testing {
 namespace {
 
-using ::testing::AnyOf;
 using ::testing::HasSubstr;
 using World = AgentWorld;
 
@@ -40,7 +37,7 @@ class TheAgentAmongHostilePeers : public ::testing::Test {
   /// Once the peers have left. A sanitizer keeps what was let go of, and so much of the rest in proportion.
   void expectNothingIsLeft(const std::string& when) {
     expectPoliteService(when);
-    EXPECT_LE(descriptors(), descriptors_ + 8) << when;
+    EXPECT_LE(descriptors(), descriptors_ + 32) << when;  // some connections to the service are kept
 #if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__)
     EXPECT_LE(memory(), memory_ + (64 << 10)) << when << ", in KiB";
 #endif
