@@ -153,7 +153,7 @@ bool Connection::send(std::string_view bytes) const {
 
 void Connection::reset() const {
   const sockaddr nowhere{AF_UNSPEC, {}};
-  connect(socket_.get(), &nowhere, sizeof nowhere);
+  static_cast<void>(connect(socket_.get(), &nowhere, sizeof nowhere));
 }
 
 ssize_t Connection::write(const char* bytes, std::size_t size) {

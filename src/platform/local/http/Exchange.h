@@ -217,8 +217,7 @@ inline std::size_t Exchange::takeBody(char* bytes, std::size_t, std::size_t size
 inline std::size_t Exchange::giveBody(char* bytes, std::size_t one, std::size_t size,
                                       void* exchange) noexcept {
   auto& self = *static_cast<Exchange*>(exchange);
-  const std::size_t count = std::min(one * size, self.request_.body.size() - self.sent_);
-  std::memcpy(bytes, self.request_.body.data() + self.sent_, count);
+  const std::size_t count = self.request_.body.copy(bytes, one * size, self.sent_);
   self.sent_ += count;
   return count;
 }
