@@ -140,6 +140,8 @@ TEST_F(TheAgentAmongHostilePeers, AnswersWithAnErrorWhateverIsNoCallOfItsInterfa
       {path, own, text1, text(10U << 20U), kInvalid},
       {path, own, text1, bytes(30U << 20U), kInvalid},
       {path, own, text1, entries(200'000), kInvalid},
+      {path, own, text1, [](sd_bus_message* call) { sd_bus_message_append(call, "h", 0); },
+       "org.freedesktop.DBus.Error.NotSupported"},
       {path, own, text1, nested('v', 32), kInvalid},
       {path, own, text1, nested('v', 62), kInvalid},
       {path, own, text1, nested('v', 64), kInvalid},
