@@ -1,5 +1,4 @@
 #include "integration/support/BusFixture.h"
-#include "platform/local/PeerIdentity.h"
 #include "platform/local/bus/BusCodec.h"
 #include "unit/platform/Trees.h"
 
@@ -91,16 +90,9 @@ TEST_F(AService, AnswersWithAnErrorWhatItCannotServe) {
   const auto serving = serve();
   const RawBusClient client = newClient();
   const std::string failed = "org.freedesktop.DBus.Error.Failed";
-  const std::string invalid = "org.freedesktop.DBus.Error.InvalidArgs";
   for (const char* fault : {"dropped", "throw", "kind", "text", "large"}) {
     EXPECT_EQ(client.call("EchoText", "s", {fault}).error, failed) << fault;
   }
-  EXPECT_EQ(served, 5);
-  EXPECT_EQ(client.call("EchoText", "s", {std::string((1U << 20U) + 1, 'x')}).error, invalid);
-  EXPECT_EQ(client.call("EchoText", "t", {1}).error, invalid);
-  EXPECT_EQ(client.call("EchoText", "ss", {"a", "b"}).error, invalid);
-  EXPECT_EQ(client.call("EchoText").error, invalid);
-  EXPECT_EQ(client.call("EchoNothing").error, "org.freedesktop.DBus.Error.UnknownMethod");
   EXPECT_EQ(served, 5);
   EXPECT_EQ(decisions.size(), 1U);
 }
@@ -299,17 +291,6 @@ TEST_F(AValueOnTheBus, ReadsAsNullWhereItsKindIsUnknown) {
                                                                               {"struct", Value()},
                                                                               {"variant", Value()},
                                                                               {"last", "x"}}));
-}
-
-TEST(APeer, IsHeldToItsVeryProcess) {
-  ChildProcess child({"cat", "/dev/tty"}, {});
-  child.wait();
-  EXPECT_FALSE(PeerIdentity::of(child.pid()));
-
-  const Result<PeerIdentity> self = PeerIdentity::of(::getpid());
-  ASSERT_TRUE(self);
-  EXPECT_EQ(self->executable(), FileIdentity::of("/proc/self/exe"));
-  EXPECT_TRUE(self->isAlive());
 }
 
 }  // namespace

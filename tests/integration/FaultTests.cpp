@@ -83,7 +83,7 @@ class TheAgentsStores : public ::testing::Test {
   using State = Value::Dictionary;
 
   void SetUp() override {
-    if (*KVR_SANITIZERS != '\0') GTEST_SKIP() << "a sanitizer's runtime stands before the injector's calls";
+    if (KVR_SANITIZED) GTEST_SKIP() << "a sanitizer's runtime stands before the injector's calls";
     const auto file = world.directory.write("injection", std::string(sizeof(Injection), '\0'));
     const int descriptor = ::open(file.c_str(), O_RDWR | O_CLOEXEC);
     void* const page = ::mmap(nullptr, sizeof(Injection), PROT_READ | PROT_WRITE, MAP_SHARED, descriptor, 0);

@@ -316,6 +316,10 @@ TEST_F(OverHTTP, AResponseWithoutEndIsGivenUp) {
     EXPECT_EQ(codeOf(got) == kTimedOut, limit < 60);
     EXPECT_NE(codeOf(got), 0);
   }
+  const ScriptedServer mute(keepSilent);
+  HTTPRequest handshake = get("https://" + mute.host() + "/");
+  handshake.timeout = 0.05;
+  EXPECT_EQ(codeOf(exchange(handshake)), kTimedOut);
 }
 
 TEST_F(OverHTTP, WhatMustNotBeSentFailsWithoutAConnection) {

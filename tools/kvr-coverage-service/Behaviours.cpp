@@ -16,6 +16,13 @@ std::optional<Behaviour::Body> bodyNamed(const std::string& name) {
   return std::nullopt;
 }
 
+std::optional<Behaviour::End> endNamed(const std::string& name) {
+  if (name == "close") return Behaviour::End::Close;
+  if (name == "reset") return Behaviour::End::Reset;
+  if (name == "hold") return Behaviour::End::Hold;
+  return std::nullopt;
+}
+
 }  // namespace
 
 const char* const Behaviours::kHelp =
@@ -27,6 +34,10 @@ RULE, all optional:
   "body": KIND          "garbage", "truncated" or "oversize"
   "late": SECONDS       answer only then
   "never": true         hold the request until the client goes
+  "raw": TEXT           send this in place of an answer, status line and all
+  "repeat": TEXT        after "raw", send this until the client goes
+  "pace": SECONDS       wait so long before each "repeat"
+  "end": KIND           after "raw" without "repeat": "close" (the default), "reset" or "hold" the connection
   "serialNumber": TEXT  only requests about this device
   "every": N            only each Nth request that would fit, beginning with the Nth
   "times": N            only this often
@@ -79,6 +90,16 @@ std::optional<std::string> Behaviours::takeMember(Rule& rule, const std::string&
   } else if (name == "never") {
     if (!value.isBool()) return "is not a bool";
     rule.behaviour.never = value.boolean();
+  } else if (name == "raw" || name == "repeat") {
+    if (!text) return "is not a string";
+    (name == "raw" ? rule.behaviour.raw.emplace() : rule.behaviour.repeat) = *text;
+  } else if (name == "pace") {
+    if (!value.isNumber() || !(value.asDouble() >= 0)) return "is not a number of seconds";
+    rule.behaviour.pace = value.asDouble();
+  } else if (name == "end") {
+    const auto end = text ? endNamed(*text) : std::nullopt;
+    if (!end) return "is not an end";
+    rule.behaviour.end = *end;
   } else if (name == "serialNumber") {
     if (!text) return "is not a string";
     rule.serialNumber = text;

@@ -16,12 +16,17 @@ namespace kvr::coverage_service {
 /// How an answer is to differ from the plain one.
 struct Behaviour {
   enum class Body { Plain, Garbage, Truncated, Oversize };
+  enum class End { Close, Reset, Hold };
 
   std::optional<int> status;
   std::optional<std::string> redirect;  ///< the location
   Body body = Body::Plain;
   double late = 0;  ///< seconds
   bool never = false;
+  std::optional<std::string> raw;  ///< what is sent in place of an answer
+  std::string repeat;              ///< and then again and again
+  double pace = 0;                 ///< seconds between two of these
+  End end = End::Close;
 };
 
 /// The rules by which answers misbehave, per endpoint, set while the service runs. Thread-safe.

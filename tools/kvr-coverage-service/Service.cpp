@@ -30,6 +30,17 @@ double secondsSince1970() {
   return std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
 }
 
+/// Sends what is no answer, or none that a client should take.
+void sendRaw(Connection& connection, const Behaviour& behaviour) {
+  bool isOpen = connection.send(*behaviour.raw);
+  while (isOpen && !behaviour.repeat.empty()) {
+    isOpen = (behaviour.pace <= 0 || connection.wait(behaviour.pace)) && connection.send(behaviour.repeat);
+  }
+  if (isOpen && behaviour.end == Behaviour::End::Hold) connection.wait(-1);
+  if (behaviour.end == Behaviour::End::Reset) connection.reset();
+  connection.abandon();
+}
+
 void write(httplib::Response& response, std::string body, const char* type, Behaviour::Body kind) {
   switch (kind) {
     case Behaviour::Body::Plain:
@@ -88,11 +99,12 @@ void Service::handle(const httplib::Request& request, httplib::Response& respons
     answer = asset(received, behaviour);
   }
   const int status = behaviour.status.value_or(answer.status);
-  records_.add(received, behaviour.never ? 0 : status, answer.reason);
+  records_.add(received, behaviour.never || behaviour.raw ? 0 : status, answer.reason);
 
   if (behaviour.never) connection.wait(-1);
   if (behaviour.never || (behaviour.late > 0 && !connection.wait(behaviour.late)))
     return connection.abandon();
+  if (behaviour.raw) return sendRaw(connection, behaviour);
   response.status = status;
   if (behaviour.redirect) response.set_header("Location", *behaviour.redirect);
   write(response, std::move(answer.body), answer.type, behaviour.body);

@@ -142,8 +142,22 @@ ssize_t Connection::read(char* bytes, std::size_t size) {
   return static_cast<ssize_t>(count);
 }
 
+bool Connection::send(std::string_view bytes) const {
+  while (!bytes.empty()) {
+    const auto count = ::send(socket_.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
+    if (count <= 0) return false;
+    bytes.remove_prefix(static_cast<std::size_t>(count));
+  }
+  return true;
+}
+
+void Connection::reset() const {
+  const sockaddr nowhere{AF_UNSPEC, {}};
+  static_cast<void>(connect(socket_.get(), &nowhere, sizeof nowhere));
+}
+
 ssize_t Connection::write(const char* bytes, std::size_t size) {
-  return isAbandoned_ ? -1 : send(socket_.get(), bytes, size, MSG_NOSIGNAL);
+  return isAbandoned_ ? -1 : ::send(socket_.get(), bytes, size, MSG_NOSIGNAL);
 }
 
 void Connection::get_remote_ip_and_port(std::string& ip, int& port) const {

@@ -6,6 +6,7 @@
 #include <httplib.h>
 
 #include <string>
+#include <string_view>
 #include <vector>
 
 namespace kvr::coverage_service {
@@ -24,6 +25,10 @@ class Connection : public httplib::Stream {
   /// Waits; without a limit when `seconds` is negative. False when meanwhile the client went or the server
   /// stopped.
   bool wait(double seconds) const;
+  /// Writes all of it; false when the client has gone.
+  bool send(std::string_view bytes) const;
+  /// Breaks the connection off as a host does that knows nothing of it.
+  void reset() const;
   /// Nothing more is written: the client sees the connection end.
   void abandon() { isAbandoned_ = true; }
 

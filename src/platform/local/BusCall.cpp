@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <memory>
 #include <new>
 #include <utility>
 
@@ -47,14 +48,17 @@ Result<BusCall> readBusCall(sd_bus_message* message, const ServiceInterface& int
     return invalidArguments(*method, "the arguments are not of type \"" + signature + "\"");
   }
   BusCall call;
+  Value::Array arguments;
   for (const ServiceArgument& argument : method->in) {
     Result<Value> value = readBusValue(message, argument.type);
     if (!value) return invalidArguments(*method, value.error().message);
     if (value->isString() && value->string().size() > kLongestText) {
       return invalidArguments(*method, std::string(argument.name) + " is too long");
     }
-    call.arguments.push_back(*std::move(value));
+    if (value->isString()) call.bytes += value->string().size();
+    arguments.push_back(*std::move(value));
   }
+  call.arguments = std::make_shared<const Value::Array>(std::move(arguments));
   call.index = static_cast<std::size_t>(method - interface.methods.begin());
   call.message.reset(sd_bus_message_ref(message));
   return call;

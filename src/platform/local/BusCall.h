@@ -3,6 +3,8 @@
 #include "platform/ServiceListener.h"
 #include "platform/local/bus/BusHandles.h"
 
+#include <memory>
+
 namespace kvr {
 
 // Names of errors that a call is answered with.
@@ -14,7 +16,8 @@ inline constexpr const char* kBusErrorTooMany = SD_BUS_ERROR_LIMITS_EXCEEDED;
 struct BusCall {
   BusMessageRef message;
   std::size_t index = 0;  ///< of the method in its interface
-  Value::Array arguments;
+  std::shared_ptr<const Value::Array> arguments;
+  std::size_t bytes = 0;  ///< of the texts among the arguments
 };
 
 /// Takes a call apart. An error's domain is the bus error's name to answer with. All that is kept of the

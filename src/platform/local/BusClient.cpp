@@ -10,11 +10,9 @@
 namespace kvr {
 namespace {
 
-constexpr const char* kBus = "org.freedesktop.DBus";
-constexpr const char* kBusPath = "/org/freedesktop/DBus";
-
-/// Calls of one client that wait or are being served; more are turned away.
-constexpr std::size_t kMaximumCalls = 1024;
+/// Calls of one client that wait or are being served, and the bytes of their arguments; more are turned away.
+constexpr FairLimit kCalls{1024, 8192, 16};
+constexpr FairLimit kBytes{std::size_t{4} << 20, std::size_t{32} << 20, std::size_t{16} << 10};
 
 /// The way back of one call. It may be given on any thread, and if it is let go without, the caller is told.
 class CallReply {
@@ -74,15 +72,16 @@ std::optional<Error> BusClient::begin(sd_bus* bus) {
 
 int BusClient::ask(sd_bus* bus, const char* member, sd_bus_message_handler_t handler) {
   sd_bus_slot* slot = nullptr;
-  const int r =
-      sd_bus_call_method_async(bus, &slot, kBus, kBusPath, kBus, member, handler, this, "s", name_.c_str());
+  const int r = sd_bus_call_method_async(bus, &slot, kBusName, kBusPath, kBusName, member, handler, this, "s",
+                                         name_.c_str());
   question_.reset(slot);
   return r;
 }
 
 int BusClient::handleWatched(sd_bus_message* message, void* userdata, sd_bus_error*) {
   return onClient(userdata, [message](BusClient& self) {
-    if (!sd_bus_message_is_method_error(message, nullptr) || self.state_ == State::Gone) return;
+    if (!isFromBus(message) || !sd_bus_message_is_method_error(message, nullptr)) return;
+    if (self.state_ == State::Gone) return;
     // It could never be let go again.
     self.refuse("it cannot be watched");
     self.context_->forget(self.name_);
@@ -100,11 +99,24 @@ int BusClient::handleOwnerChanged(sd_bus_message* message, void* userdata, sd_bu
 }
 
 int BusClient::handleCredentials(sd_bus_message* message, void* userdata, sd_bus_error*) {
-  return onClient(userdata, [message](BusClient& self) { self.identified(message); });
+  return onClient(userdata, [message](BusClient& self) {
+    if (self.isBusAnswer(message, "GetConnectionCredentials", handleCredentials)) self.identified(message);
+  });
 }
 
 int BusClient::handleStillThere(sd_bus_message* message, void* userdata, sd_bus_error*) {
-  return onClient(userdata, [message](BusClient& self) { self.confirmed(message); });
+  return onClient(userdata, [message](BusClient& self) {
+    if (self.isBusAnswer(message, "GetNameOwner", handleStillThere)) self.confirmed(message);
+  });
+}
+
+/// Whether the answer is the bus's; if somebody else has given it, the bus is asked once more.
+bool BusClient::isBusAnswer(sd_bus_message* reply, const char* member, sd_bus_message_handler_t handler) {
+  if (isFromBus(reply)) return true;
+  if (state_ == State::Identifying && ask(sd_bus_message_get_bus(reply), member, handler) < 0) {
+    refuse("the bus cannot be asked about it");
+  }
+  return false;
 }
 
 void BusClient::identified(sd_bus_message* reply) {
@@ -114,46 +126,41 @@ void BusClient::identified(sd_bus_message* reply) {
   const Value user = credentials ? (*credentials)["UnixUserID"] : Value();
   const Value process = credentials ? (*credentials)["ProcessID"] : Value();
   if (user.kind() != Value::Kind::Int || process.kind() != Value::Kind::Int) {
-    return refuse("the bus does not tell its user and process");
+    distrust_ = "the bus does not tell its user and process";
+  } else if (user.integer() != static_cast<std::int64_t>(::geteuid())) {
+    distrust_ = "it belongs to another user";
+  } else {
+    process_ = static_cast<std::int32_t>(process.integer());
   }
-  if (user.integer() != static_cast<std::int64_t>(::geteuid())) return refuse("it belongs to another user");
-  process_ = static_cast<std::int32_t>(process.integer());
   isDeciding_ = true;
   context_->listenerQueue->async([self = shared_from_this()] { self->decide(); });
 }
 
 void BusClient::decide() {
-  bool accepted = false;
-  bool isAlive = false;
-  std::optional<Error> trouble;
-  if (const Result<PeerIdentity> peer = PeerIdentity::of(process_)) {
+  const Result<PeerIdentity> peer =
+      distrust_.empty() ? PeerIdentity::of(process_) : Result<PeerIdentity>(Error{"process", 0, distrust_});
+  if (peer) {
     executable_ = peer->executable();
-    accepted = context_->delegate->accepts(*this);
-    isAlive = peer->isAlive();
-  } else {
-    trouble = peer.error();
+  } else if (distrust_.empty()) {
+    distrust_ = describe(peer.error());
   }
+  // A peer that is not known for certain holds nothing; the delegate is asked all the same, to tell what of.
+  bool accepted = context_->delegate->accepts(*this);
+  if (accepted && distrust_.empty() && !peer->isAlive()) distrust_ = "its process has ended";
+  accepted = accepted && distrust_.empty();
   if (accepted) {
     queue_ = context_->queues.newSerialQueue("com.tarsil.kvragent.connection" + name_);
   } else {
     object_.reset();
   }
-  context_->thread->post(
-      [self = shared_from_this(), accepted, trouble, isAlive] { self->decided(accepted, trouble, isAlive); });
+  context_->thread->post([self = shared_from_this(), accepted] { self->decided(accepted); });
 }
 
-void BusClient::decided(bool accepted, const std::optional<Error>& trouble, bool isAlive) {
+void BusClient::decided(bool accepted) {
   isDeciding_ = false;
   if (state_ == State::Gone) return release();
-  if (trouble) return refuse(describe(*trouble));
-  if (!accepted) {
-    state_ = State::Refused;  // the delegate has said why
-    refusal_ = missingEntitlement_.empty() ? "the connection is refused"
-                                           : "missing entitlement '" + missingEntitlement_ + "'";
-    return serveWaiting();
-  }
+  if (!accepted) return refuse(distrust_);
   if (!isExported_ || !object_) return refuse("nothing is exported to it");
-  if (!isAlive) return refuse("its process has ended");
   const int r = ask(sd_bus_slot_get_bus(watch_.get()), "GetNameOwner", handleStillThere);
   if (r < 0) refuse(describe(busError(r, "the bus cannot be asked whether it is still there")));
 }
@@ -165,22 +172,29 @@ void BusClient::confirmed(sd_bus_message* reply) {
   serveWaiting();
 }
 
-void BusClient::refuse(std::string why) {
-  context_->log.error("Refusing connection %@: %@", name_, why);
+/// Why is for the log; an empty text when the delegate has said it. The peer learns what it lacks.
+void BusClient::refuse(const std::string& why) {
+  if (!why.empty()) context_->log.error("Refusing connection %@: %@", name_, why);
   state_ = State::Refused;
-  refusal_ = std::move(why);
+  refusal_ = missingEntitlement_.empty() ? "the connection is refused"
+                                         : "missing entitlement '" + missingEntitlement_ + "'";
   serveWaiting();
   release();
 }
 
 void BusClient::receive(sd_bus_message* message) {
   if (state_ == State::Refused) return failBusCall(message, kBusErrorRefused, refusal_);
-  if (waiting_.size() + open_.size() >= kMaximumCalls) {
+  if (waiting_.size() + open_.size() >= kCalls.when(*context_->openCalls)) {
     return failBusCall(message, kBusErrorTooMany, "too many calls of this connection are unanswered");
   }
   Result<BusCall> call = readBusCall(message, context_->interface);
   if (!call) return failBusCall(message, call.error().domain.c_str(), call.error().message);
+  if (call->bytes > 0 && bytes_ + call->bytes > kBytes.when(*context_->openBytes)) {
+    return failBusCall(message, kBusErrorTooMany, "the unanswered calls of this connection are too large");
+  }
   ++*context_->openCalls;
+  bytes_ += call->bytes;
+  *context_->openBytes += call->bytes;
   waiting_.push_back(*std::move(call));
   serveWaiting();
 }
@@ -193,10 +207,17 @@ void BusClient::serveWaiting() {
     if (state_ == State::Admitted) {
       serve(std::move(call));
     } else {
-      --*context_->openCalls;
+      settle(call);
       failBusCall(call.message.get(), kBusErrorRefused, refusal_);
     }
   }
+}
+
+/// The call is not open any more.
+void BusClient::settle(const BusCall& call) {
+  --*context_->openCalls;
+  bytes_ -= call.bytes;
+  *context_->openBytes -= call.bytes;
 }
 
 void BusClient::serve(BusCall call) {
@@ -205,11 +226,13 @@ void BusClient::serve(BusCall call) {
   const auto reply = std::make_shared<CallReply>(context_->thread, weak_from_this(), number);
   const ServiceReply completion(context_->log, context_->interface.methods[index].member,
                                 [reply](Value value) { reply->give(std::move(value)); });
-  Value::Array arguments = std::exchange(call.arguments, {});
-  open_.emplace(number, std::move(call));
-  queue_->async([object = object_, index, arguments = std::move(arguments), completion] {
-    object->invoke(index, arguments, completion);
+  // What still waits behind another call when the client leaves is not done any more.
+  queue_->async([object = object_, index, arguments = std::weak_ptr(call.arguments), completion] {
+    const auto held = arguments.lock();
+    if (!held) return completion({});
+    object->invoke(index, *held, completion);
   });
+  open_.emplace(number, std::move(call));
 }
 
 void BusClient::answer(std::uint64_t number, const std::optional<Value>& value) {
@@ -217,9 +240,14 @@ void BusClient::answer(std::uint64_t number, const std::optional<Value>& value) 
   if (found == open_.end()) return;
   const BusCall call = std::move(found->second);
   open_.erase(found);
-  --*context_->openCalls;
+  settle(call);
   const ServiceMethod& method = context_->interface.methods[call.index];
   if (!value) return failBusCall(call.message.get(), kBusErrorFailed, "the call went without an answer");
+  if (sd_bus_message_get_expect_reply(call.message.get()) > 0 &&
+      !context_->unread->maySend(sd_bus_message_get_bus(call.message.get()), name_, *value)) {
+    return failBusCall(call.message.get(), kBusErrorTooMany,
+                       "too many replies to this connection are unread");
+  }
   if (const auto error = replyToBusCall(call.message.get(), method.out.type, *value)) {
     context_->log.error("%s: %@ cannot be answered: %@", method.member, name_, *error);
   }
@@ -229,6 +257,8 @@ void BusClient::close() {
   if (state_ == State::Gone) return;
   state_ = State::Gone;
   *context_->openCalls -= waiting_.size() + open_.size();
+  *context_->openBytes -= std::exchange(bytes_, 0);
+  context_->unread->forget(name_);
   waiting_.clear();
   open_.clear();
   watch_.reset();
@@ -244,7 +274,7 @@ void BusClient::release() {
 
 Value BusClient::valueForEntitlement(std::string_view entitlement) const {
   missingEntitlement_ = entitlement;
-  return context_->entitlements.valueFor(executable_, entitlement);
+  return executable_ ? context_->entitlements.valueFor(*executable_, entitlement) : Value();
 }
 
 void BusClient::setExportedInterface(const ServiceInterface& interface) {

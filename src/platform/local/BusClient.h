@@ -6,6 +6,7 @@
 #include "platform/local/BusCall.h"
 #include "platform/local/BusConnection.h"
 #include "platform/local/LocalEntitlements.h"
+#include "platform/local/UnreadReplies.h"
 #include "platform/local/bus/BusHandles.h"
 
 #include <atomic>
@@ -42,7 +43,8 @@ class DelegateGate {
 /// Its first call starts its admission, and until that is decided its calls wait:
 ///
 ///   1. its going is watched, and the bus is asked for its user and process;
-///   2. on the listener's queue, the process is held, its program is looked up and the delegate is asked;
+///   2. on the listener's queue, the process is held, its program is looked up and the delegate is asked; a
+///   peer of another user, or one of whom that cannot be told, holds no entitlement;
 ///   3. if the process still lives then, and the bus, asked once more, still knows the connection, it is
 ///   admitted.
 ///
@@ -63,6 +65,9 @@ class BusClient : public ServiceConnection, public std::enable_shared_from_this<
     std::shared_ptr<std::atomic<std::size_t>> openCalls;
     /// Lets go of a client that has left the bus. On the bus thread.
     std::function<void(const std::string& uniqueName)> forget;
+    /// The bytes of the open calls' arguments. On the bus thread, as is what follows.
+    std::shared_ptr<std::size_t> openBytes = std::make_shared<std::size_t>(0);
+    std::shared_ptr<UnreadReplies> unread = nullptr;
   };
 
   BusClient(std::shared_ptr<const Context> context, std::string uniqueName);
@@ -94,11 +99,13 @@ class BusClient : public ServiceConnection, public std::enable_shared_from_this<
 
   void identified(sd_bus_message* reply);
   void decide();
-  void decided(bool accepted, const std::optional<Error>& trouble, bool isAlive);
+  void decided(bool accepted);
   void confirmed(sd_bus_message* reply);
-  void refuse(std::string why);
+  void refuse(const std::string& why);
+  bool isBusAnswer(sd_bus_message* reply, const char* member, sd_bus_message_handler_t handler);
   void serveWaiting();
   void serve(BusCall call);
+  void settle(const BusCall& call);
   void release();
 
   const std::shared_ptr<const Context> context_;
@@ -106,7 +113,8 @@ class BusClient : public ServiceConnection, public std::enable_shared_from_this<
   State state_ = State::Identifying;
   std::string refusal_;
   std::deque<BusCall> waiting_;
-  std::map<std::uint64_t, BusCall> open_;  ///< by number; their arguments are gone
+  std::map<std::uint64_t, BusCall> open_;  ///< by number
+  std::size_t bytes_ = 0;                  ///< of both
   std::uint64_t lastCall_ = 0;
   BusSlotRef watch_;
   BusSlotRef question_;
@@ -115,7 +123,8 @@ class BusClient : public ServiceConnection, public std::enable_shared_from_this<
 
   // While `isDeciding_`, the listener queue's; else the bus thread's.
   std::int32_t process_ = 0;
-  FileIdentity executable_;
+  std::optional<FileIdentity> executable_;
+  std::string distrust_;  ///< why the peer is not known for certain
   mutable std::string missingEntitlement_;
   bool isExported_ = false;
   std::shared_ptr<ServiceObject> object_;

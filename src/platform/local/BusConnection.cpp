@@ -4,8 +4,11 @@
 
 #include <pthread.h>
 
+#include <cctype>
 #include <chrono>
 #include <cstdint>
+#include <cstdlib>
+#include <cstring>
 #include <future>
 #include <utility>
 
@@ -14,6 +17,26 @@ namespace {
 
 /// How long an ending process waits for a bus that takes nothing.
 constexpr std::chrono::seconds kSendLimit{2};
+
+/// Where the session says its bus is, or else where a session has it.
+std::string sessionBusAddress() {
+  if (const char* const stated = ::secure_getenv("DBUS_SESSION_BUS_ADDRESS")) return stated;
+  const char* const directory = ::secure_getenv("XDG_RUNTIME_DIR");
+  if (directory == nullptr) return {};
+  std::string address = "unix:path=";
+  for (const char* at = directory; *at != '\0'; ++at) {
+    const bool isPlain =
+        std::isalnum(static_cast<unsigned char>(*at)) != 0 || std::strchr("-_/.\\", *at) != nullptr;
+    if (isPlain) {
+      address += *at;
+    } else {
+      constexpr const char* kDigits = "0123456789abcdef";
+      const auto byte = static_cast<unsigned char>(*at);
+      address.append({'%', kDigits[byte >> 4U], kDigits[byte & 15U]});
+    }
+  }
+  return address += "/bus";
+}
 
 }  // namespace
 
@@ -65,10 +88,16 @@ sd_bus* BusConnection::bus() {
 
 int BusConnection::connect() {
   sd_bus* opened = nullptr;
-  int r = sd_bus_open_user_with_description(&opened, "kvragent");
+  int r = sd_bus_new(&opened);
   if (r < 0) return r;
   bus_.reset(opened);
-  r = sd_bus_set_exit_on_disconnect(opened, 0);
+  r = sd_bus_set_description(opened, "kvragent");
+  if (r >= 0) r = sd_bus_set_address(opened, sessionBusAddress().c_str());
+  if (r >= 0) r = sd_bus_set_bus_client(opened, 1);
+  // No call has use for a descriptor, and so nobody can use up this process's.
+  if (r >= 0) r = sd_bus_negotiate_fds(opened, 0);
+  if (r >= 0) r = sd_bus_set_exit_on_disconnect(opened, 0);
+  if (r >= 0) r = sd_bus_start(opened);
   if (r < 0) return r;
   sd_bus_slot* slot = nullptr;
   r = sd_bus_match_signal(opened, &slot, "org.freedesktop.DBus.Local", nullptr, "org.freedesktop.DBus.Local",

@@ -9,7 +9,8 @@
 namespace kvr {
 namespace {
 
-constexpr const char* kBus = "org.freedesktop.DBus";
+/// Connections that have called and not left; more are turned away.
+constexpr std::size_t kMostClients = 4096;
 
 // What the bus answers to a request for a name.
 constexpr std::uint32_t kIsOwner = 1;
@@ -25,6 +26,7 @@ std::string pathFor(const std::string& name) {
 
 BusService::BusService(Settings settings, BusClient::Context context)
     : settings_(std::move(settings)), path_(pathFor(settings_.name)) {
+  context.unread = std::make_shared<UnreadReplies>(settings_.log);
   context.forget = [this](const std::string& uniqueName) { forget(uniqueName); };
   context_ = std::make_shared<const BusClient::Context>(std::move(context));
 }
@@ -43,15 +45,20 @@ int BusService::offer(sd_bus* bus) {
   r = sd_bus_add_filter(bus, &slot, handleAny, this);
   if (r < 0) return r;
   filter_.reset(slot);
-  r = sd_bus_request_name_async(bus, &slot, settings_.name.c_str(), 0, handleNameRequested, this);
-  if (r < 0) return r;
+  return requestName(bus);
+}
+
+int BusService::requestName(sd_bus* bus) {
+  sd_bus_slot* slot = nullptr;
+  const int r = sd_bus_request_name_async(bus, &slot, settings_.name.c_str(), 0, handleNameRequested, this);
   nameRequest_.reset(slot);
-  return 0;
+  return r;
 }
 
 int BusService::handleNameRequested(sd_bus_message* message, void* userdata, sd_bus_error*) {
   return guardedBusCallback([&] {
     const auto self = static_cast<BusService*>(userdata)->shared_from_this();
+    if (!isFromBus(message)) return self->requestName(sd_bus_message_get_bus(message));
     std::uint32_t answer = 0;
     const sd_bus_error* const error = sd_bus_message_get_error(message);
     if (error) {
@@ -65,13 +72,17 @@ int BusService::handleNameRequested(sd_bus_message* message, void* userdata, sd_
 }
 
 int BusService::handleAny(sd_bus_message* message, void* userdata, sd_bus_error*) {
-  if (!sd_bus_message_is_signal(message, kBus, "NameLost")) return 0;
+  if (sd_bus_message_is_method_call(message, nullptr, nullptr)) {
+    return guardedBusCallback(
+        [&] { return static_cast<BusService*>(userdata)->context_->unread->admit(message) ? 0 : 1; });
+  }
+  if (!sd_bus_message_is_signal(message, kBusName, "NameLost")) return 0;
   return guardedBusCallback([&] {
     const auto self = static_cast<BusService*>(userdata)->shared_from_this();
     const char* const sender = sd_bus_message_get_sender(message);
     const char* name = nullptr;
     const bool isTrue =
-        sender && std::string_view(sender) == kBus && sd_bus_message_read(message, "s", &name) >= 0;
+        sender && std::string_view(sender) == kBusName && sd_bus_message_read(message, "s", &name) >= 0;
     if (isTrue && name == self->settings_.name && !self->isGivingUp_) self->fail("somebody has taken it");
     return 0;
   });
@@ -87,7 +98,11 @@ int BusService::handleCall(sd_bus_message* message, void* userdata, sd_bus_error
 /// Whether the call was for the service; what is not, the bus library answers.
 bool BusService::take(sd_bus_message* message) {
   if (sd_bus_message_is_method_call(message, "org.freedesktop.DBus.Introspectable", "Introspect")) {
-    replyToBusCall(message, "s", introspectionDocument(context_->interface));
+    const Value document = introspectionDocument(context_->interface);
+    const char* const sender = sd_bus_message_get_sender(message);
+    if (sender && context_->unread->maySend(sd_bus_message_get_bus(message), sender, document)) {
+      replyToBusCall(message, "s", document);
+    }
     return true;
   }
   const char* const interface = sd_bus_message_get_interface(message);
@@ -101,6 +116,9 @@ void BusService::receive(sd_bus_message* call) {
   if (hasEnded_ || !sender) return failBusCall(call, kBusErrorFailed, "the service is ending");
   auto found = clients_.find(std::string_view(sender));
   if (found == clients_.end()) {
+    if (clients_.size() >= kMostClients) {
+      return failBusCall(call, kBusErrorTooMany, "too many connections");
+    }
     const auto client = std::make_shared<BusClient>(context_, sender);
     if (const auto error = client->begin(sd_bus_message_get_bus(call))) {
       client->close();
@@ -154,6 +172,7 @@ void BusService::close() {
   filter_.reset();
   object_.reset();
   for (const auto& [name, client] : std::exchange(clients_, {})) client->close();
+  context_->unread->close();
   done_ = nullptr;
 }
 

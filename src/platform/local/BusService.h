@@ -38,6 +38,7 @@ class BusService : public std::enable_shared_from_this<BusService> {
   static int handleNameReleased(sd_bus_message* message, void* userdata, sd_bus_error* error);
 
   int offer(sd_bus* bus);
+  int requestName(sd_bus* bus);
   bool take(sd_bus_message* message);
   void receive(sd_bus_message* call);
   void forget(const std::string& uniqueName);

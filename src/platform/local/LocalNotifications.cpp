@@ -1,5 +1,6 @@
 #include "platform/local/LocalNotifications.h"
 
+#include <chrono>
 #include <string_view>
 #include <utility>
 
@@ -10,6 +11,8 @@ constexpr const char* kPath = "/com/tarsil/NotificationCenter";
 constexpr const char* kInterface = "com.tarsil.NotificationCenter";
 constexpr const char* kMember = "Posted";
 
+using Clock = std::chrono::steady_clock;
+
 }  // namespace
 
 /// What the bus thread and the main queue use as well.
@@ -17,6 +20,8 @@ struct LocalNotifications::State : std::enable_shared_from_this<State> {
   struct Registration {
     std::string name;
     std::shared_ptr<const std::function<void()>> handler;
+    bool isDue = false;       ///< its handler is to be called
+    Clock::time_point rests;  ///< until then it is not called
   };
   using Registrations = std::map<Token, Registration>;
 
@@ -24,23 +29,22 @@ struct LocalNotifications::State : std::enable_shared_from_this<State> {
 
   /// On the bus thread.
   void deliver(std::string_view name) {
-    std::vector<Token> tokens;
-    bool isFull = false;
+    std::vector<std::pair<Token, double>> due;
     {
       const std::lock_guard lock(mutex);
-      for (const auto& [token, registration] : registrations) {
-        if (registration.name != name) continue;
-        if (waiting == kMostWaiting) {
-          isFull = !std::exchange(dropping, true);
-          break;
-        }
-        ++waiting;
-        tokens.push_back(token);
+      const auto now = Clock::now();
+      for (auto& [token, registration] : registrations) {
+        if (registration.name != name || std::exchange(registration.isDue, true)) continue;
+        due.emplace_back(token, std::chrono::duration<double>(registration.rests - now).count());
       }
     }
-    if (isFull) log.error("Too many notifications wait to be handled: '%@' is dropped", std::string(name));
-    for (const auto token : tokens) {
-      queues.mainQueue()->async([self = shared_from_this(), token] { self->handle(token); });
+    for (const auto& [token, delay] : due) {
+      Work work = [self = shared_from_this(), key = token] { self->handle(key); };
+      if (delay > 0) {
+        queues.after(delay, queues.mainQueue(), std::move(work));
+      } else {
+        queues.mainQueue()->async(std::move(work));
+      }
     }
   }
 
@@ -48,9 +52,12 @@ struct LocalNotifications::State : std::enable_shared_from_this<State> {
     std::shared_ptr<const std::function<void()>> handler;
     {
       const std::lock_guard lock(mutex);
-      if (--waiting == 0) dropping = false;
       if (const auto found = registrations.find(token); found != registrations.end()) {
-        handler = found->second.handler;
+        Registration& registration = found->second;
+        handler = registration.handler;
+        registration.isDue = false;
+        registration.rests = Clock::now() + std::chrono::duration_cast<Clock::duration>(
+                                                std::chrono::duration<double>(kInterval));
       }
     }
     if (handler) (*handler)();
@@ -58,12 +65,10 @@ struct LocalNotifications::State : std::enable_shared_from_this<State> {
 
   WorkQueues& queues;
   Log& log;
-  BusSlotRef slot;   ///< the bus thread's
-  std::mutex mutex;  ///< guards what follows
+  std::map<std::string, BusSlotRef> slots;  ///< by name; the bus thread's
+  std::mutex mutex;                         ///< guards what follows
   Registrations registrations;
   Token last = 0;
-  std::size_t waiting = 0;
-  bool dropping = false;  ///< since the main queue last caught up
 };
 
 LocalNotifications::LocalNotifications(BusConnection& bus, WorkQueues& queues, Log& log)
@@ -71,7 +76,7 @@ LocalNotifications::LocalNotifications(BusConnection& bus, WorkQueues& queues, L
 
 LocalNotifications::~LocalNotifications() {
   beginEnding();
-  bus_.thread()->post([state = state_] { state->slot.reset(); });
+  bus_.thread()->post([state = state_] { state->slots.clear(); });
 }
 
 LocalNotifications::Token LocalNotifications::registerFor(const std::string& name,
@@ -81,16 +86,20 @@ LocalNotifications::Token LocalNotifications::registerFor(const std::string& nam
     const std::lock_guard lock(state_->mutex);
     token = ++state_->last;
     state_->registrations.emplace(
-        token, State::Registration{name, std::make_shared<const std::function<void()>>(std::move(handler))});
+        token, State::Registration{
+                   name, std::make_shared<const std::function<void()>>(std::move(handler)), false, {}});
   }
-  bus_.thread()->post([state = state_, &bus = bus_] {
-    sd_bus* const connection = state->slot ? nullptr : bus.bus();
+  bus_.thread()->post([state = state_, &bus = bus_, name] {
+    sd_bus* const connection = state->slots.contains(name) ? nullptr : bus.bus();
     if (connection == nullptr) return;
+    std::string rule = "type='signal',path='";
+    rule.append(kPath).append("',interface='").append(kInterface).append("',member='").append(kMember);
+    rule.append("',arg0='").append(name).append("'");
     sd_bus_slot* slot = nullptr;
-    const int r = sd_bus_match_signal_async(connection, &slot, nullptr, kPath, kInterface, kMember,
-                                            handlePosted, nullptr, state.get());
+    const int r =
+        sd_bus_add_match_async(connection, &slot, rule.c_str(), handlePosted, handleWatched, state.get());
     if (r >= 0) {
-      state->slot.reset(slot);
+      state->slots[name].reset(slot);
     } else {
       state->log.error("Notifications cannot be received: %@", busError(r, "the bus refuses"));
     }
@@ -117,6 +126,17 @@ void LocalNotifications::beginEnding() {
   State::Registrations released;
   const std::lock_guard lock(state_->mutex);
   released.swap(state_->registrations);
+}
+
+int LocalNotifications::handleWatched(sd_bus_message* message, void* userdata, sd_bus_error*) {
+  return guardedBusCallback([&] {
+    const sd_bus_error* const error = sd_bus_message_get_error(message);
+    if (error && isFromBus(message)) {
+      static_cast<State*>(userdata)->log.error("Notifications cannot be received: %@",
+                                               std::string(error->message ? error->message : error->name));
+    }
+    return 0;
+  });
 }
 
 int LocalNotifications::handlePosted(sd_bus_message* message, void* userdata, sd_bus_error*) {

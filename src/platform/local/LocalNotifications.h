@@ -5,7 +5,6 @@
 #include "platform/WorkQueues.h"
 #include "platform/local/BusConnection.h"
 
-#include <cstddef>
 #include <map>
 #include <memory>
 #include <mutex>
@@ -17,11 +16,12 @@ namespace kvr {
 /// Notifications as signals on the session bus, which anyone on it may send:
 /// `com.tarsil.NotificationCenter.Posted` from `/com/tarsil/NotificationCenter`, with the name.
 ///
-/// The bus is asked for them from the first registration on. So many handlers may wait for the main queue;
-/// what comes beyond is dropped, with an error line.
+/// The bus is asked for those that somebody has registered for. A handler is called at once, but not again
+/// within half a second of the last time: what comes meanwhile is one call then. So the last notification is
+/// always followed by a call, and a flood costs two a second.
 class LocalNotifications : public Notifications {
  public:
-  static constexpr std::size_t kMostWaiting = 4096;
+  static constexpr double kInterval = 0.5;  ///< seconds
 
   /// The bus must outlive this.
   LocalNotifications(BusConnection& bus, WorkQueues& queues, Log& log);
@@ -38,6 +38,7 @@ class LocalNotifications : public Notifications {
 
  private:
   struct State;
+  static int handleWatched(sd_bus_message* message, void* userdata, sd_bus_error* error);
   static int handlePosted(sd_bus_message* message, void* userdata, sd_bus_error* error);
 
   BusConnection& bus_;

@@ -97,7 +97,7 @@ bool LocalServiceListeners::isActivatable(const std::string& name) {
     if (bus != nullptr &&
         sd_bus_call_method(bus, "org.freedesktop.DBus", "/org/freedesktop/DBus", "org.freedesktop.DBus",
                            "ListActivatableNames", nullptr, &made, "") >= 0 &&
-        sd_bus_message_read_strv(made, &names) >= 0) {
+        isFromBus(made) && sd_bus_message_read_strv(made, &names) >= 0) {
       for (char** each = names; each != nullptr && *each != nullptr; ++each) {
         found = found || name == *each;
         std::free(*each);

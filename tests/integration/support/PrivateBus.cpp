@@ -17,6 +17,7 @@ std::string configuration(const TemporaryDirectory& directory) {
     <allow send_destination="*" eavesdrop="true"/>
     <allow eavesdrop="true"/>
     <allow own="*"/>
+    <allow user="*"/>
   </policy>
   <limit name="max_connections_per_user">100000</limit>
   <limit name="max_completed_connections">100000</limit>

@@ -7,6 +7,7 @@
 #include <cerrno>
 #include <memory>
 #include <string>
+#include <string_view>
 #include <system_error>
 
 namespace kvr {
@@ -23,6 +24,17 @@ using BusRef = std::unique_ptr<sd_bus, BusRelease>;
 using BusMessageRef = std::unique_ptr<sd_bus_message, BusRelease>;
 /// A match, filter, object or pending call; letting it go cancels it.
 using BusSlotRef = std::unique_ptr<sd_bus_slot, BusRelease>;
+
+inline constexpr const char* kBusName = "org.freedesktop.DBus";
+inline constexpr const char* kBusPath = "/org/freedesktop/DBus";
+
+/// Whether a reply is the bus's own, or this process's about a bus that is gone. Many buses hand on replies
+/// that nobody asked for, and replies are told apart by a number that is easily guessed: whoever asks the bus
+/// must not take another peer's word for it.
+inline bool isFromBus(sd_bus_message* reply) {
+  const char* const sender = sd_bus_message_get_sender(reply);
+  return sender == nullptr || std::string_view(sender) == kBusName;
+}
 
 /// An error of one call.
 class BusError {

@@ -91,6 +91,8 @@ class Exchange {
  private:
   // What libcurl calls.
   static std::size_t takeBody(char* bytes, std::size_t one, std::size_t size, void* exchange) noexcept;
+  static std::size_t giveBody(char* bytes, std::size_t one, std::size_t size, void* exchange) noexcept;
+  static int refuseToSeek(void*, curl_off_t, int) noexcept { return CURL_SEEKFUNC_FAIL; }
   static std::size_t takeHeader(char* bytes, std::size_t one, std::size_t size, void* exchange) noexcept;
   static curl_socket_t openSocket(void* exchange, curlsocktype purpose, curl_sockaddr* address) noexcept;
 
@@ -116,6 +118,7 @@ class Exchange {
   URL url_;
   int redirects_ = 0;
   std::string body_;
+  std::size_t sent_ = 0;  ///< of the request's body
   std::size_t headerBytes_ = 0;
   std::optional<Error> refusal_;  ///< why we broke the hop off
   bool isBodyTooLarge_ = false;
@@ -128,6 +131,7 @@ inline void Exchange::prepare() {
   curl_easy_reset(handle_.get());
   url_ = URL::parse(request_.url).value();
   body_.clear();
+  sent_ = 0;
   headerBytes_ = 0;
   errorText_.front() = '\0';
 
@@ -165,7 +169,11 @@ inline void Exchange::setMessage() {
   } else if (method == "POST" || !request_.body.empty()) {
     set(CURLOPT_POST, 1L);
     set(CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(request_.body.size()));
-    set(CURLOPT_POSTFIELDS, request_.body.data());
+    // A body that cannot be wound back: on a connection that was kept alive and breaks, libcurl would send
+    // the request once more of its own accord, and the service may have had it already.
+    set(CURLOPT_READFUNCTION, giveBody);
+    set(CURLOPT_READDATA, static_cast<void*>(this));
+    set(CURLOPT_SEEKFUNCTION, refuseToSeek);
   }
   if (method != "HEAD" && method != "POST" && method != "GET") set(CURLOPT_CUSTOMREQUEST, method.c_str());
   if (method == "GET" && !request_.body.empty()) set(CURLOPT_CUSTOMREQUEST, "GET");
@@ -204,6 +212,14 @@ inline std::size_t Exchange::takeBody(char* bytes, std::size_t, std::size_t size
   } catch (...) {
     return 0;
   }
+}
+
+inline std::size_t Exchange::giveBody(char* bytes, std::size_t one, std::size_t size,
+                                      void* exchange) noexcept {
+  auto& self = *static_cast<Exchange*>(exchange);
+  const std::size_t count = self.request_.body.copy(bytes, one * size, self.sent_);
+  self.sent_ += count;
+  return count;
 }
 
 inline std::size_t Exchange::takeHeader(char*, std::size_t, std::size_t size, void* exchange) noexcept {

@@ -1,0 +1,265 @@
+#include "integration/support/AgentWorld.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <chrono>
+#include <fstream>
+#include <functional>
+
+namespace kvr::testing {
+namespace {
+
+using ::testing::HasSubstr;
+using World = AgentWorld;
+
+constexpr const char* kLimits = "org.freedesktop.DBus.Error.LimitsExceeded";
+constexpr const char* kInvalid = "org.freedesktop.DBus.Error.InvalidArgs";
+constexpr const char* kUnknown = "org.freedesktop.DBus.Error.UnknownMethod";
+constexpr const char* kNoObject = "org.freedesktop.DBus.Error.UnknownObject";
+
+/// The agent, beside whose hostile peers a polite one is always served, and whose memory and descriptors stay
+/// where they were.
+class TheAgentAmongHostilePeers : public ::testing::Test {
+ protected:
+  void begin() {
+    world.startAgent();
+    polite = std::make_unique<RawBusClient>(world.newClient());
+    expectPoliteService("at the beginning");
+    descriptors_ = descriptors();
+    memory_ = memory();
+  }
+  void expectPoliteService(const std::string& when) const {
+    EXPECT_EQ(polite->value("a{sv}", polite->call("DefaultDevice"))["serialNumber"], Value(World::kPhone))
+        << when;
+  }
+  /// Once the peers have left. A sanitizer keeps what was let go of.
+  void expectNothingIsLeft(const std::string& when) {
+    expectPoliteService(when);
+    EXPECT_LE(descriptors(), descriptors_ + 32) << when;  // some connections to the service are kept
+    if (!KVR_SANITIZED) {
+      EXPECT_LE(memory(), memory_ + (64 << 10)) << when << ", in KiB";
+    }
+  }
+  std::size_t memory() {
+    std::ifstream status("/proc/" + std::to_string(world.agent().pid()) + "/status");
+    for (std::string word; status >> word;) {
+      if (word == "VmRSS:") return status >> word ? std::stoul(word) : 0;
+    }
+    return 0;
+  }
+  std::ptrdiff_t descriptors() {
+    const std::filesystem::directory_iterator all("/proc/" + std::to_string(world.agent().pid()) + "/fd");
+    return std::distance(all, std::filesystem::directory_iterator());
+  }
+
+  /// Sends without waiting for an answer, and without reading any.
+  static void send(const RawBusClient& client, const BusMessageRef& message) {
+    std::uint64_t number = 0;  // without one, no answer would be expected
+    ASSERT_GE(sd_bus_send(client.bus(), message.get(), &number), 0);
+  }
+  /// Reads what has come and what comes until `count` calls have been answered: by error, "" for none.
+  static std::map<std::string, int> answers(const RawBusClient& client, int count) {
+    std::map<std::string, int> found;
+    while (count > 0) {
+      sd_bus_message* message = nullptr;
+      const int r = sd_bus_process(client.bus(), &message);
+      const BusMessageRef held(message);
+      if (r < 0 || (r == 0 && sd_bus_wait(client.bus(), 60'000'000) <= 0)) break;
+      if (!message) continue;
+      const bool isError = sd_bus_message_is_method_error(message, nullptr) > 0;
+      if (!isError && sd_bus_message_is_signal(message, nullptr, nullptr)) continue;
+      ++found[isError ? sd_bus_message_get_error(message)->name : ""];
+      --count;
+    }
+    return found;
+  }
+
+  World world;
+  std::unique_ptr<RawBusClient> polite;
+
+ private:
+  std::ptrdiff_t descriptors_ = 0;
+  std::size_t memory_ = 0;
+};
+
+TEST_F(TheAgentAmongHostilePeers, AnswersWithAnErrorWhateverIsNoCallOfItsInterface) {
+  begin();
+  const auto nested = [](char type, int depth) {
+    return [type, depth](sd_bus_message* call) {
+      for (int i = depth; i > 0; --i) {
+        const std::string inner =
+            type == 'v' ? (i > 1 ? "v" : "s") : std::string(static_cast<std::size_t>(i) - 1, 'a') + "s";
+        sd_bus_message_open_container(call, type, inner.c_str());
+      }
+      sd_bus_message_append(call, "s", "x");
+      for (int i = 0; i < depth; ++i) sd_bus_message_close_container(call);
+    };
+  };
+  const auto text = [](std::size_t size) {
+    return [size](sd_bus_message* call) { sd_bus_message_append(call, "s", std::string(size, 'x').c_str()); };
+  };
+  const auto bytes = [](std::size_t size) {
+    return [size](sd_bus_message* call) {
+      const std::string data(size, 'x');
+      sd_bus_message_append_array(call, 'y', data.data(), data.size());
+    };
+  };
+  const auto entries = [](int count) {
+    return [count](sd_bus_message* call) {
+      sd_bus_message_open_container(call, 'a', "{sv}");
+      for (int i = 0; i < count; ++i) sd_bus_message_append(call, "{sv}", std::to_string(i).c_str(), "i", i);
+      sd_bus_message_close_container(call);
+    };
+  };
+  const auto nothing = [](sd_bus_message*) {};
+  struct Call {
+    const char* path;
+    const char* interface;
+    const char* member;
+    std::function<void(sd_bus_message*)> fill;
+    const char* error;
+  };
+  const char* const path = RawBusClient::kPath;
+  const char* const own = RawBusClient::kInterface;
+  const char* const text1 = "DismissFollowUpForSerialNumber";
+  const std::string longName(255, 'M');
+  const Call calls[] = {
+      {path, own, "Nothing", nothing, kUnknown},
+      {path, own, "defaultDevice", nothing, kUnknown},
+      {path, own, longName.c_str(), nothing, kUnknown},
+      {path, "com.example.Other", "DefaultDevice", nothing, kUnknown},
+      {path, "org.freedesktop.DBus.Properties", "GetAll", text(8),
+       "org.freedesktop.DBus.Error.UnknownInterface"},
+      {"/", own, "DefaultDevice", nothing, kNoObject},
+      {"/com/tarsil/kvragent/x", own, "DefaultDevice", nothing, kNoObject},
+      {path, own, "DefaultDevice", text(1), kInvalid},
+      {path, own, text1, nothing, kInvalid},
+      {path, own, text1, text((1U << 20U) + 1), kInvalid},
+      {path, own, text1, text(10U << 20U), kInvalid},
+      {path, own, text1, bytes(30U << 20U), kInvalid},
+      {path, own, text1, entries(200'000), kInvalid},
+      {path, own, text1, [](sd_bus_message* call) { sd_bus_message_append(call, "h", 0); },
+       "org.freedesktop.DBus.Error.NotSupported"},
+      {path, own, text1, nested('v', 32), kInvalid},
+      {path, own, text1, nested('v', 62), kInvalid},
+      {path, own, text1, nested('v', 64), kInvalid},
+      {path, own, text1, nested('a', 32), kInvalid},
+  };
+  const RawBusClient client = world.newClient();
+  for (const auto& call : calls) {
+    sd_bus_message* made = nullptr;
+    ASSERT_GE(sd_bus_message_new_method_call(client.bus(), &made, RawBusClient::kName, call.path,
+                                             call.interface, call.member),
+              0);
+    const BusMessageRef message(made);
+    call.fill(made);
+    EXPECT_EQ(client.call(message).error, call.error)
+        << call.path << " " << call.interface << "." << call.member << " "
+        << sd_bus_message_get_signature(made, 1);
+  }
+  expectNothingIsLeft("after calls that are none");
+}
+
+TEST_F(TheAgentAmongHostilePeers, BoundsWhatOneConnectionLeavesWaiting) {
+  world.writeDeviceFile("Store.plist", Value::Dictionary{{"purchaseDelay", 3600}});
+  begin();
+  struct Flood {
+    std::size_t textSize;
+    int calls;
+    int served;
+  };
+  // Each of these waits for the store, some seconds long.
+  const Flood floods[] = {{16, 1500, 1024}, {1U << 20U, 12, 4}};
+  for (const auto& flood : floods) {
+    RawBusClient client = world.newClient();
+    for (int i = 0; i < flood.calls; ++i)
+      send(client, client.newCall("AppSupportAvailability", "s", {std::string(flood.textSize, 'x')}));
+    const auto found = answers(client, flood.calls - flood.served);
+    EXPECT_EQ(found, (std::map<std::string, int>{{kLimits, flood.calls - flood.served}})) << flood.textSize;
+    expectPoliteService("beside a flood of calls");
+    client.leave();
+  }
+  expectNothingIsLeft("after the floods");
+}
+
+TEST_F(TheAgentAmongHostilePeers, TurnsAwayWhoeverDoesNotReadAndServesThemOnceTheyHave) {
+  begin();
+  RawBusClient client = world.newClient();
+  constexpr int kCalls = 3000;
+  const auto from = world.agent().errorOutput().size();
+  for (int i = 0; i < kCalls; ++i) {
+    sd_bus_message* call = nullptr;
+    sd_bus_message_new_method_call(client.bus(), &call, RawBusClient::kName, RawBusClient::kPath,
+                                   "org.freedesktop.DBus.Introspectable", "Introspect");
+    send(client, BusMessageRef(call));
+  }
+  ASSERT_GE(sd_bus_flush(client.bus()), 0);
+  world.agent().waitForErrorOutput("does not read what it is answered", from);
+  expectPoliteService("beside one who does not read");
+  const auto found = answers(client, kCalls);
+  EXPECT_GT(found.at(kLimits), 0);
+  EXPECT_GT(found.at(""), 1000);
+  std::string error = kLimits;
+  for (int tries = 0; error == kLimits && tries < 100; ++tries) error = client.call("DefaultDevice").error;
+  EXPECT_EQ(error, "");
+  client.leave();
+  expectNothingIsLeft("after one who did not read");
+}
+
+TEST_F(TheAgentAmongHostilePeers, ServesAThousandConnectionsAtOnceAndLetsGoOfThoseThatLeave) {
+  world.misbehave(R"([{"late":0.3}])");
+  begin();
+  std::vector<RawBusClient> clients;
+  for (int i = 0; i < 1000; ++i) clients.push_back(world.newClient());
+  for (const auto& client : clients) {
+    send(client, client.newCall("DefaultDevice"));
+    ASSERT_GE(sd_bus_flush(client.bus()), 0);
+  }
+  for (const auto& client : clients) EXPECT_EQ(answers(client, 1), (std::map<std::string, int>{{"", 1}}));
+  clients.erase(clients.begin() + 50, clients.end());
+  for (auto& client : clients) {
+    send(client, client.newCall("GetAllDeviceInfosUsingPolicy", "tb", {World::Refresh, true}));
+    ASSERT_GE(sd_bus_flush(client.bus()), 0);
+    client.leave();
+  }
+  world.misbehave("[]");
+  EXPECT_EQ(World::allInfos(*polite, World::Default).size(), 3U);
+  expectNothingIsLeft("after a thousand");
+  EXPECT_EQ(world.agent().terminate(), 0);
+  EXPECT_THAT(world.agent().errorOutput(), ::testing::Not(HasSubstr("without an answer")));
+}
+
+TEST_F(TheAgentAmongHostilePeers, HandlesTheLastOfAFloodOfNotifications) {
+  world.pair({});
+  begin();
+  const RawBusClient client = world.newClient();
+  const auto start = std::chrono::steady_clock::now();
+  const auto post = [&client](const char* name) {
+    sd_bus_emit_signal(client.bus(), "/com/tarsil/NotificationCenter", "com.tarsil.NotificationCenter",
+                       "Posted", "s", name);
+  };
+  const std::string unheard(1U << 20U, 'x');
+  for (int i = 0; i < 20'000; ++i) {
+    post("com.tarsil.pairedregistry.device-did-pair");
+    post("com.tarsil.language.changed");
+    if (i % 500 == 0) post(unheard.c_str());
+  }
+  ASSERT_GE(sd_bus_flush(client.bus()), 0);
+  expectPoliteService("beside a flood of notifications");
+  world.pair({World::kFirstWatch});
+  post("com.tarsil.pairedregistry.device-did-pair");
+  ASSERT_GE(sd_bus_flush(client.bus()), 0);
+  world.agent().waitForErrorOutput(std::string(World::kFirstWatch) + " : warranty download attempt");
+  const auto seconds = std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
+  const std::string log = world.agent().errorOutput();
+  const std::string handled = "-[KVRPairedDevicesMonitor _pairedOrActiveDevicesDidChange:]";
+  double count = 0;
+  for (auto at = log.find(handled); at != std::string::npos; at = log.find(handled, at + 1)) ++count;
+  EXPECT_LE(count, 2 + seconds * 2) << "two calls a second";
+  expectNothingIsLeft("after a flood of notifications");
+}
+
+}  // namespace
+}  // namespace kvr::testing
