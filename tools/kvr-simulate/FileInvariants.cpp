@@ -56,7 +56,9 @@ void Invariants::fileChanged(const std::string& path, bool isDone) {
   if (bytes && path.ends_with(".plist") && !damageIsPlanted_ && !readPropertyList(*bytes)) {
     report("files are whole", path);
   }
-  if (isDone && !filesFailed_ && !filesFail_) {
+  // What an earlier process left is cleared away before the first file of a directory is replaced.
+  const bool isReplaced = isDone && bytes && path.find(".damaged-") == std::string::npos;
+  if (isReplaced && !filesFailed_) {
     for (const auto& neighbour : platform_->files.list(path.substr(0, path.rfind('/')))) {
       if (isTemporary(neighbour)) report("no temporary file stays", neighbour);
     }
@@ -205,7 +207,11 @@ void Invariants::checkNewPost(const Offer& offer, const std::string& hash, const
 void Invariants::posted(const FollowUpItem& item, bool wasPending, bool isDone) {
   if (!isWatching() || !isDone) return;
   ++figures.posts;
-  lastPosted_[*item.uniqueIdentifier] = world_.now;
+  if (runs_.contains(activity::kFollowUpRefresh)) {
+    refreshed_[*item.uniqueIdentifier] = world_.now;
+  } else {
+    refreshed_.erase(*item.uniqueIdentifier);
+  }
   if (!wasPending) toBeListed_.insert(sha256Hash(item.userInfo.at(kFollowUpSerialNumberKey).string()));
 }
 

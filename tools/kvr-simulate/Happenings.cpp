@@ -154,7 +154,7 @@ void Life::suspend(Dice& dice) {
   process_->simulated.queues.suspend(seconds);
   world_.now += seconds;
   clients_.excuse(seconds);
-  invariants_.excuseRuns();
+  invariants_.suspended(seconds);
   disturb();
 }
 

@@ -158,6 +158,11 @@ void Invariants::clockMoved() {
   excuseRuns();
 }
 
+void Invariants::suspended(double seconds) {
+  lastRequest_ += seconds;
+  excuseRuns();
+}
+
 // Quiet.
 
 void Invariants::checkCalm() {
@@ -198,20 +203,20 @@ void Invariants::checkOverdue(const Value& stored, const Value& registrations) {
 
 void Invariants::checkShown(const Value& stored) {
   const auto pending = pendingItems();
-  const bool isRefreshDue =
-      stored.contains(std::string(activity::kFollowUpRefresh) + preference::kTargetDateSuffix);
-  if (isRefreshDue) datesAreDamaged_ = false;
-  if (!pending.empty() && !stored[preference::kFollowUpPostedHashes].isNull() && !isRefreshDue &&
+  const auto refresh =
+      stored[std::string(activity::kFollowUpRefresh) + preference::kTargetDateSuffix].dateIfAny();
+  if (refresh) datesAreDamaged_ = false;
+  if (!pending.empty() && !stored[preference::kFollowUpPostedHashes].isNull() && !refresh &&
       !datesAreDamaged_ && !runs_.contains(activity::kFollowUpRefresh) &&
       !runs_.contains(activity::kFollowUpPost)) {
     report("what is shown is kept up to date", "no refresh is to come");
   }
-  // A single follow-up of an earlier version begins no chain of refreshes.
-  if (shortestDay < 86400 || !isRefreshDue) return;
+  // A single follow-up of an earlier version begins no chain of refreshes; and one may be late, by its grace.
+  if (shortestDay < 86400 || !refresh || *refresh <= platform_->clock.now()) return;
   for (const auto& item : pending) {
-    const auto posted = lastPosted_.find(*item.uniqueIdentifier);
+    const auto posted = refreshed_.find(*item.uniqueIdentifier);
     auto* const offer = world_.service.find(item.title);
-    if (posted == lastPosted_.end() || posted->second < clockMoved_ || offer == nullptr) continue;
+    if (posted == refreshed_.end() || posted->second < clockMoved_ || offer == nullptr) continue;
     const auto activation = activationOf(offer->serialNumber, stored);
     // One that was posted by another setting of the clock counts as not shown until its date comes again.
     if (std::max(activation, offer->displayed) > platform_->clock.now()) continue;
@@ -261,13 +266,15 @@ void Invariants::checkDevice(const std::string& serialNumber, const std::vector<
   const auto stored = preferences();
   const auto dismissed = stored[sha256Hash(serialNumber) + preference::kDismissedSuffix].dateIfAny();
   const bool isFree = !dismissed || (offer.displayed && *dismissed < *offer.displayed);
-  const auto due = offer.postDate(activationOf(serialNumber, stored));
+  const auto* const watch = world_.watch(serialNumber);
+  const auto due = offer.postDate(watch != nullptr ? watch->paired : activationOf(serialNumber, stored));
   if (isFree && (!due || *due <= postedAt)) {
     report("the end state is right",
            "no follow-up of an open offer, due at " + (due ? describe(*due) : std::string("any time")));
   }
 }
 
+/// The earliest that the agent may go by, while a watch is being paired again.
 std::optional<Date> Invariants::activationOf(const std::string& serialNumber, const Value& stored) const {
   if (serialNumber == world_.phone) return stored["DefaultDeviceActivationDate"].dateIfAny();
   const auto* const watch = world_.watch(serialNumber);

@@ -74,11 +74,12 @@ class Invariants {
   /// Activities may run anew.
   void excuseRuns() { runTimes_.clear(); }
   void clockMoved();
+  void suspended(double seconds);
   /// Faults of files begin: what is not recorded then is lost.
-  void excuseFiles() { filesFail_ = true; }
+  void excuseFiles() { filesFail_ = filesFailed_ = true; }
   void endFileFaults() { filesFail_ = false; }
   /// Somebody else changed files.
-  void allowDamage() { damageIsPlanted_ = true; }
+  void allowDamage() { damageIsPlanted_ = filesFailed_ = true; }
   void readFilesAgain();
 
   Figures figures;
@@ -116,11 +117,13 @@ class Invariants {
   std::set<std::string> toBeListed_;
   std::map<std::string, std::string> durable_;
   bool filesFail_ = false;
-  bool filesFailed_ = false;  ///< in this process
+  bool filesFailed_ = false;  ///< in this process, which may know of more than they hold
   bool damageIsPlanted_ = false;
   bool datesAreDamaged_ = false;  ///< and may be missing, until the chain of refreshes begins anew
   double clockMoved_ = -1;
-  std::map<std::string, double> lastPosted_;  ///< by unique identifier, when by `World::now`
+  /// When the refresh activity updated what is shown, by unique identifier. What others updated since has to
+  /// wait for the refresh that was scheduled before.
+  std::map<std::string, double> refreshed_;
   double lastRequest_ = -1e9;
   std::size_t versionRequests_ = 0;
   std::size_t coverageRequests_ = 0;

@@ -84,7 +84,7 @@ class Life {
   double processBegan_ = 0;
   double clockOffset_ = 0;  ///< of the wall clock
   double disturbed_ = 0;
-  double nextLook_ = 0;  ///< whether all is in order
+  double nextLook_ = 0;      ///< whether all is in order
   bool losesPower_ = false;  ///< when the crash under way comes
   std::uint64_t starts_ = 0;
   SimulatedFiles::StepFault stepFault_;

@@ -149,11 +149,9 @@ void Process::answer(const HTTPRequest& request, const SimulatedHTTP::Answer& an
   });
   if (!outcome.response) return;
   simulated.queues.after(outcome.delay, queue, [this, outcome, answer, isCoverage, done] {
-    if (!std::exchange(*done, true)) {
-      --openRequests_;
-      if (isCoverage) invariants_.coverageAnswered(outcome.response->status);
-      if (outcome.offer) world_.service.at(*outcome.offer).lastServed = world_.now;
-    }
+    if (!std::exchange(*done, true)) --openRequests_;
+    if (isCoverage) invariants_.coverageAnswered(outcome.response->status);
+    if (outcome.offer) world_.service.at(*outcome.offer).lastServed = world_.now;
     answer(*outcome.response);
   });
 }

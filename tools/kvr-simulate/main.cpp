@@ -22,6 +22,7 @@ struct Arguments {
   std::vector<std::size_t> only;
   bool isTraced = false;
   bool isWithoutEvents = false;
+  bool isBrief = false;
 };
 
 /// Every few seeds all that is logged is put into words, as an agent does that is being watched.
@@ -47,6 +48,7 @@ void explain(std::uint64_t seed, const Arguments& arguments, const Outcome& outc
               static_cast<unsigned long long>(seed), outcome.breach->invariant.c_str(),
               outcome.breach->detail.c_str(), events.size(), outcome.at / 86400);
   std::fflush(stdout);
+  if (arguments.isBrief) return;
   const auto fewest = minimised(seed, std::move(events), arguments.years, outcome.breach->invariant);
   const auto again = Life(seed, {arguments.years, LogLevel::Debug, false}).live(fewest);
   std::string numbers;
@@ -56,10 +58,9 @@ void explain(std::uint64_t seed, const Arguments& arguments, const Outcome& outc
   for (auto line = lines.size() > 30 ? lines.end() - 30 : lines.begin(); line != lines.end(); ++line) {
     std::printf("    %.300s\n", line->c_str());
   }
-  std::printf(
-      "  again, with %zu events:\n    kvr-simulate --first %llu --seeds 1 --years %g %s --trace\n",
-      fewest.size(), static_cast<unsigned long long>(seed), arguments.years,
-      numbers.empty() ? "--none" : ("--only " + numbers).c_str());
+  std::printf("  again, with %zu events:\n    kvr-simulate --first %llu --seeds 1 --years %g %s --trace\n",
+              fewest.size(), static_cast<unsigned long long>(seed), arguments.years,
+              numbers.empty() ? "--none" : ("--only " + numbers).c_str());
   std::fflush(stdout);
 }
 
@@ -111,6 +112,7 @@ int main(int count, char** texts) {
   app.add_option("--jobs", arguments.jobs, "how many are lived at once");
   app.add_option("--only", arguments.only, "the numbers of the only events that happen")->delimiter(',');
   app.add_flag("--none", arguments.isWithoutEvents, "let nothing happen");
+  app.add_flag("--brief", arguments.isBrief, "do not look for the shortest way to see a failure again");
   app.add_flag("--trace", arguments.isTraced, "print what happens");
   CLI11_PARSE(app, count, texts);
   if (arguments.isTraced) arguments.jobs = 1;
