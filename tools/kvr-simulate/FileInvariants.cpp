@@ -180,13 +180,12 @@ bool Invariants::posting(const FollowUpItem& item, const std::vector<FollowUpIte
   if (!offer->end || *offer->end <= now) {
     report("nothing is posted after its eligibility", describe(item.title));
   }
-  if (!wasPending) checkNewPost(*offer, hash, describe(item.title), now);
+  if (!wasPending) checkNewPost(*offer, describe(item.title), now);
   return wasPending;
 }
 
 /// New follow-ups come from the post activity only, which downloads for every run.
-void Invariants::checkNewPost(const Offer& offer, const std::string& hash, const std::string& name,
-                              Date now) {
+void Invariants::checkNewPost(const Offer& offer, const std::string& name, Date now) {
   const auto stored = preferences();
   const auto due = offer.postDate(activationOf(offer.serialNumber, stored));
   if (due && *due > now) {
@@ -196,12 +195,7 @@ void Invariants::checkNewPost(const Offer& offer, const std::string& hash, const
   if (run == runs_.end() || offer.lastServed < run->second.began) {
     report("what is posted was asked for anew", name);
   }
-  const auto dismissed = listIn(stored[preference::kFollowUpDismissedHashes]);
-  if (std::ranges::find(dismissed, Value(hash)) == dismissed.end()) return;
-  const auto when = stored[hash + preference::kDismissedSuffix].dateIfAny();
-  if (!when || !offer.displayed || *when >= *offer.displayed) {
-    report("what is dismissed stays dismissed", name);
-  }
+  if (isDismissed(offer, stored)) report("what is dismissed stays dismissed", name);
 }
 
 void Invariants::posted(const FollowUpItem& item, bool wasPending, bool isDone) {

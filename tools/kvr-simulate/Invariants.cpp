@@ -264,14 +264,22 @@ void Invariants::checkDevice(const std::string& serialNumber, const std::vector<
     return;
   }
   const auto stored = preferences();
-  const auto dismissed = stored[sha256Hash(serialNumber) + preference::kDismissedSuffix].dateIfAny();
-  const bool isFree = !dismissed || (offer.displayed && *dismissed < *offer.displayed);
+  const bool isFree = !isDismissed(offer, stored);
   const auto* const watch = world_.watch(serialNumber);
   const auto due = offer.postDate(watch != nullptr ? watch->paired : activationOf(serialNumber, stored));
   if (isFree && (!due || *due <= postedAt)) {
     report("the end state is right",
            "no follow-up of an open offer, due at " + (due ? describe(*due) : std::string("any time")));
   }
+}
+
+/// Until the offer begins anew. A dismissal cut off by a crash before its date was stored lasts for good.
+bool Invariants::isDismissed(const Offer& offer, const Value& stored) const {
+  const Value hash = sha256Hash(offer.serialNumber);
+  const auto& list = stored[preference::kFollowUpDismissedHashes];
+  if (!list.isArray() || std::ranges::find(list.array(), hash) == list.array().end()) return false;
+  const auto when = stored[hash.string() + preference::kDismissedSuffix].dateIfAny();
+  return !when || !offer.displayed || *when >= *offer.displayed;
 }
 
 /// The earliest that the agent may go by, while a watch is being paired again.

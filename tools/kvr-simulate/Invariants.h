@@ -100,10 +100,11 @@ class Invariants {
   void checkTargetDateRemoval(const std::string& activity, const Value& before);
   void checkPostedList(const Value& before, const Value& after, const Value& tree);
   void checkFollowUps();
-  void checkNewPost(const Offer& offer, const std::string& hash, const std::string& name, Date now);
+  void checkNewPost(const Offer& offer, const std::string& name, Date now);
   void checkOverdue(const Value& preferences, const Value& registrations);
   void checkShown(const Value& preferences);
   void checkDevice(const std::string& serialNumber, const std::vector<FollowUpItem>& pending, Date postedAt);
+  bool isDismissed(const Offer& offer, const Value& stored) const;
   std::vector<FollowUpItem> pendingItems() const;
   std::optional<Date> activationOf(const std::string& serialNumber, const Value& preferences) const;
   Value preferences() const;

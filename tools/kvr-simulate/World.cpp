@@ -42,7 +42,7 @@ Offer World::drawOffer(Dice& from, const std::string& serialNumber, Date today) 
   };
   if (from.happens(0.95)) offer.end = wholeSeconds(from.between(-3, 70));
   if (from.happens(0.7)) offer.displayed = wholeSeconds(from.between(-20, 40));
-  if (from.happens(0.3)) offer.conversion = wholeSeconds(from.between(-5, 60));
+  if (from.happens(0.5)) offer.conversion = wholeSeconds(from.between(-20, 60));
   if (from.happens(0.7)) offer.daysBeforeEnd = from.between(0, 60);
   return offer;
 }
