@@ -175,7 +175,7 @@ void Invariants::checkCalm() {
   }
   if (filesFailed_) return;
   checkOverdue(stored, registered["activities"]);
-  checkShown(stored);
+  checkShown(stored, registered["activities"]);
 }
 
 void Invariants::checkOverdue(const Value& stored, const Value& registrations) {
@@ -201,12 +201,14 @@ void Invariants::checkOverdue(const Value& stored, const Value& registrations) {
   }
 }
 
-void Invariants::checkShown(const Value& stored) {
+void Invariants::checkShown(const Value& stored, const Value& registrations) {
   const auto pending = pendingItems();
   const auto refresh =
       stored[std::string(activity::kFollowUpRefresh) + preference::kTargetDateSuffix].dateIfAny();
   if (refresh) datesAreDamaged_ = false;
-  if (!pending.empty() && !stored[preference::kFollowUpPostedHashes].isNull() && !refresh &&
+  // The first run after an upgrade clears the date; what is registered stays so.
+  const bool isToCome = refresh || registrations.contains(activity::kFollowUpRefresh);
+  if (!pending.empty() && !stored[preference::kFollowUpPostedHashes].isNull() && !isToCome &&
       !datesAreDamaged_ && !runs_.contains(activity::kFollowUpRefresh) &&
       !runs_.contains(activity::kFollowUpPost)) {
     report("what is shown is kept up to date", "no refresh is to come");

@@ -102,7 +102,7 @@ class Invariants {
   void checkFollowUps();
   void checkNewPost(const Offer& offer, const std::string& name, Date now);
   void checkOverdue(const Value& preferences, const Value& registrations);
-  void checkShown(const Value& preferences);
+  void checkShown(const Value& preferences, const Value& registrations);
   void checkDevice(const std::string& serialNumber, const std::vector<FollowUpItem>& pending, Date postedAt);
   bool isDismissed(const Offer& offer, const Value& stored) const;
   std::vector<FollowUpItem> pendingItems() const;
