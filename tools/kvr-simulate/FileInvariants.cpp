@@ -57,10 +57,10 @@ void Invariants::fileChanged(const std::string& path, bool isDone) {
     report("files are whole", path);
   }
   // What an earlier process left is cleared away before the first file of a directory is replaced.
-  const bool isReplaced = isDone && bytes && path.find(".damaged-") == std::string::npos;
-  if (isReplaced && !filesFailed_) {
-    for (const auto& neighbour : platform_->files.list(path.substr(0, path.rfind('/')))) {
-      if (isTemporary(neighbour)) report("no temporary file stays", neighbour);
+  const bool isCleared = isDone && bytes && path.find(".damaged-") == std::string::npos && !filesFailed_;
+  for (const auto& neighbour : platform_->files.list(path.substr(0, path.rfind('/')))) {
+    if (isTemporary(neighbour) && (isCleared || !leftovers_.contains(neighbour))) {
+      report("no temporary file stays", neighbour);
     }
   }
   if (path == kPreferencesPath) checkPreferences();

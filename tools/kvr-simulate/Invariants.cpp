@@ -52,7 +52,9 @@ void Invariants::beginProcess(SimulatedPlatform& platform) {
   filesFailed_ = filesFail_;
   excuseRuns();
   lastRequest_ = -1e9;
+  leftovers_.clear();
   for (const auto& path : platform.files.list("/")) {
+    leftovers_.insert(path);
     checkNames(path);
     const bool isList = path.ends_with(".plist") && path.find("/.") == std::string::npos;
     if (isList && !damageIsPlanted_ && !readPropertyList(*platform.files.get(path))) {

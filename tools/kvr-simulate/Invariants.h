@@ -116,6 +116,7 @@ class Invariants {
   std::map<std::string, std::deque<double>> runTimes_;
   Value preferences_;  ///< as last seen
   std::set<std::string> toBeListed_;
+  std::set<std::string> leftovers_;  ///< what was there when the process began
   std::map<std::string, std::string> durable_;
   bool filesFail_ = false;
   bool filesFailed_ = false;  ///< in this process, which may know of more than they hold
