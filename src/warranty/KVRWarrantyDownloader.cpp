@@ -19,6 +19,13 @@ constexpr std::int32_t kRetries = 2;
 constexpr double kAttemptTimeout = 30;  // seconds
 constexpr std::size_t kLargestFile = 1U << 20U;
 
+/// The conversion date that was scheduled and could not be stored, if the last one could not: the downloads
+/// of its own outreach would schedule it again, back to back for as long as the disk is full. Guarded by the
+/// turn.
+struct UnstoredDate {
+  std::optional<Date> date;
+};
+
 /// "w.plist" for serial number ABC is "w.ABC.plist"; nothing for a serial number that is no file name.
 std::optional<std::string> variantPath(const std::string& path,
                                        const std::optional<std::string>& serialNumber) {
@@ -207,7 +214,9 @@ void KVRWarrantyDownloader::_scheduleConversionOutreachIfRequiredForWarranty(
   if (!date) return;
   // Downloads of several devices come here at once; of two dates, the earlier one has to stay.
   const auto turn = KVRScheduler::takeTurn(platform_);
-  const auto scheduled = platform_.preferences.dateForKey(preference::kConversionOutreachScheduledDate);
+  const auto unstored = platform_.sharedObjects.get<UnstoredDate>([] { return new UnstoredDate; });
+  auto scheduled = platform_.preferences.dateForKey(preference::kConversionOutreachScheduledDate);
+  if (unstored->date && (!scheduled || *unstored->date < *scheduled)) scheduled = unstored->date;
   if (scheduled && *date >= *scheduled) return;
   if (scheduled) {
     platform_.log.standard("Re-scheduling conversion outreach %@", *date);
@@ -218,6 +227,9 @@ void KVRWarrantyDownloader::_scheduleConversionOutreachIfRequiredForWarranty(
                                                  std::make_shared<KVRConversionOutreachActivity>(platform_))
       ->scheduleActivityForDate(date);
   platform_.preferences.setObject(*date, preference::kConversionOutreachScheduledDate);
+  const bool isStored =
+      platform_.preferences.dateForKey(preference::kConversionOutreachScheduledDate) == date;
+  unstored->date = isStored ? std::nullopt : date;
 }
 
 }  // namespace kvr

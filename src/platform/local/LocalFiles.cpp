@@ -1,5 +1,6 @@
 #include "platform/local/LocalFiles.h"
 
+#include "platform/AtomicReplace.h"
 #include "platform/local/Descriptor.h"
 
 #include <dirent.h>
@@ -154,6 +155,40 @@ std::optional<Error> objectionToReplacing(const std::string& path) {
                                  : Error{"files", EINVAL, path + ": not a regular file"};
 }
 
+class Replacement : public ReplaceSteps {
+ public:
+  explicit Replacement(const std::string& path) : path_(path) {}
+
+  std::optional<Error> createTemporary() override {
+    auto created = kvr::createTemporary(path_, temporary_);
+    if (!created) return created.error();
+    descriptor_ = *std::move(created);
+    return std::nullopt;
+  }
+  std::optional<Error> write(const std::string& bytes) override {
+    return outcome(writeAll(descriptor_.get(), bytes));
+  }
+  std::optional<Error> sync() override { return outcome(::fsync(descriptor_.get()) == 0); }
+  std::optional<Error> moveIntoPlace() override {
+    return outcome(::rename(temporary_.c_str(), path_.c_str()) == 0);
+  }
+  std::optional<Error> syncDirectory() override { return kvr::syncDirectory(directoryOf(path_)); }
+  void removeTemporary() override { isTemporaryLeft_ = ::unlink(temporary_.c_str()) != 0; }
+
+  /// Whether a temporary file could not be removed.
+  bool isTemporaryLeft() const { return isTemporaryLeft_; }
+
+ private:
+  std::optional<Error> outcome(bool done) const {
+    return done ? std::nullopt : std::optional(failure(path_));
+  }
+
+  const std::string& path_;
+  std::string temporary_;
+  Descriptor descriptor_;
+  bool isTemporaryLeft_ = false;
+};
+
 std::string withoutTrailingSlashes(std::string path) {
   while (path.ends_with('/')) path.pop_back();
   return path;
@@ -230,19 +265,13 @@ std::optional<Error> LocalFiles::replace(const std::string& path, const std::str
   if (auto error = objectionTo(path)) return error;
   if (auto error = objectionToReplacing(path)) return error;
   removeLeftovers(directoryOf(path));
-  std::string temporary;
-  const auto descriptor = createTemporary(path, temporary);
-  if (!descriptor) return descriptor.error();
-  if (!writeAll(descriptor->get(), bytes) || ::fsync(descriptor->get()) != 0 ||
-      ::rename(temporary.c_str(), path.c_str()) != 0) {
-    const auto error = failure(path);
-    if (::unlink(temporary.c_str()) != 0) {
-      const std::lock_guard own(mutex_);
-      swept_.erase(directoryOf(path));  // for the next one to sweep
-    }
-    return error;
+  Replacement steps(path);
+  auto error = replaceAtomically(steps, bytes);
+  if (steps.isTemporaryLeft()) {
+    const std::lock_guard own(mutex_);
+    swept_.erase(directoryOf(path));  // for the next one to sweep
   }
-  return syncDirectory(directoryOf(path));
+  return error;
 }
 
 std::optional<Error> LocalFiles::createDirectory(const std::string& path) {

@@ -1,5 +1,6 @@
 #include "platform/simulated/SimulatedFiles.h"
 
+#include "platform/AtomicReplace.h"
 #include "platform/PropertyList.h"
 
 #include <algorithm>
@@ -11,6 +12,8 @@
 
 namespace kvr {
 namespace {
+
+constexpr std::string_view kTemporaryTag = ".kvr-";
 
 Error failure(int code, const std::string& path) {
   return {"files", code, path + ": " + std::generic_category().message(code)};
@@ -72,14 +75,58 @@ std::optional<FileStamp> SimulatedFiles::stamp(const std::string& path) {
   return found->second.stamp;
 }
 
+class SimulatedFiles::Replacement : public ReplaceSteps {
+ public:
+  Replacement(SimulatedFiles& files, const std::string& path)
+      : files_(files),
+        path_(path),
+        temporary_(directoryOf(path) + "/." + path.substr(path.rfind('/') + 1) + std::string(kTemporaryTag) +
+                   std::to_string(files.lastInode_ + 1)) {}
+
+  std::optional<Error> createTemporary() override {
+    if (auto error = files_.begin(Step::CreateTemporary, path_)) return error;
+    files_.store(temporary_, {}, false);
+    return std::nullopt;
+  }
+  std::optional<Error> write(const std::string& bytes) override {
+    if (auto error = files_.begin(Step::Write, path_)) return error;
+    files_.files_.at(temporary_).bytes = bytes;
+    files_.files_.at(temporary_).stamp.size = bytes.size();
+    return std::nullopt;
+  }
+  std::optional<Error> sync() override {
+    if (auto error = files_.begin(Step::Sync, path_)) return error;
+    files_.files_.at(temporary_).isSynced = true;
+    return std::nullopt;
+  }
+  std::optional<Error> moveIntoPlace() override {
+    if (auto error = files_.begin(Step::Rename, path_)) return error;
+    File file = files_.files_.at(temporary_);
+    files_.put(path_, std::move(file));
+    files_.put(temporary_, std::nullopt);
+    return std::nullopt;
+  }
+  std::optional<Error> syncDirectory() override { return files_.syncDirectoryOf(path_); }
+  void removeTemporary() override {
+    if (!files_.hasEnded()) files_.put(temporary_, std::nullopt);
+  }
+
+ private:
+  SimulatedFiles& files_;
+  const std::string& path_;
+  const std::string temporary_;
+};
+
 std::optional<Error> SimulatedFiles::replace(const std::string& path, const std::string& bytes) {
-  const std::lock_guard lock(mutex_);
+  std::unique_lock lock(mutex_);
   if (auto fault = writeFaultOf(path)) return fault;
   if (directories_.contains(path)) return failure(EISDIR, path);
   if (!directories_.contains(directoryOf(path))) return failure(ENOENT, path);
-  store(path, bytes);
-  ++writes_;
-  return std::nullopt;
+  removeLeftovers(directoryOf(path));
+  Replacement steps(*this, path);
+  auto error = replaceAtomically(steps, bytes);
+  tellChange(lock, path, !error);
+  return error;
 }
 
 std::optional<Error> SimulatedFiles::createDirectory(const std::string& path) {
@@ -94,12 +141,15 @@ std::optional<Error> SimulatedFiles::createDirectory(const std::string& path) {
 }
 
 std::optional<Error> SimulatedFiles::remove(const std::string& path) {
-  const std::lock_guard lock(mutex_);
+  std::unique_lock lock(mutex_);
   if (auto fault = writeFaultOf(path)) return fault;
   if (directories_.contains(path)) return failure(EISDIR, path);
-  if (files_.erase(path) == 0) return failure(ENOENT, path);
-  ++writes_;
-  return std::nullopt;
+  if (!files_.contains(path)) return failure(ENOENT, path);
+  if (auto error = begin(Step::Remove, path)) return error;
+  put(path, std::optional<File>());
+  auto error = syncDirectoryOf(path);
+  tellChange(lock, path, !error);
+  return error;
 }
 
 std::optional<Error> SimulatedFiles::rename(const std::string& from, const std::string& to) {
@@ -111,7 +161,7 @@ std::optional<Error> SimulatedFiles::renameToUnused(const std::string& from, con
 }
 
 std::optional<Error> SimulatedFiles::move(const std::string& from, const std::string& to, bool replaces) {
-  const std::lock_guard lock(mutex_);
+  std::unique_lock lock(mutex_);
   if (auto fault = writeFaultOf(from)) return fault;
   if (auto fault = writeFaultOf(to)) return fault;
   const auto found = files_.find(from);
@@ -119,13 +169,16 @@ std::optional<Error> SimulatedFiles::move(const std::string& from, const std::st
   if (!replaces && (files_.contains(to) || directories_.contains(to))) return failure(EEXIST, to);
   if (directories_.contains(to)) return failure(EISDIR, to);
   if (!directories_.contains(directoryOf(to))) return failure(ENOENT, to);
-  ++writes_;
+  if (auto error = begin(Step::Rename, to)) return error;
   if (from == to) return std::nullopt;
-  File file = std::move(found->second);
-  files_.erase(found);
+  File file = found->second;
   file.stamp.changedNanoseconds = nanoseconds(clock_.now());
-  files_.insert_or_assign(to, std::move(file));
-  return std::nullopt;
+  put(to, std::move(file));
+  put(from, std::optional<File>());
+  auto error = syncDirectoryOf(to);
+  tellChange(lock, from, !error);
+  tellChange(lock, to, !error);
+  return error;
 }
 
 std::unique_ptr<FileLock> SimulatedFiles::lock(const std::string& directory) {
@@ -139,7 +192,7 @@ std::unique_ptr<FileLock> SimulatedFiles::lock(const std::string& directory) {
 void SimulatedFiles::put(const std::string& path, std::string bytes) {
   const std::lock_guard lock(mutex_);
   addDirectories(directoryOf(path));
-  store(path, std::move(bytes));
+  store(path, std::move(bytes), true);
 }
 
 void SimulatedFiles::putPropertyList(const std::string& path, const Value& tree) {
@@ -197,31 +250,113 @@ void SimulatedFiles::setWriteFault(const std::string& path, std::optional<Error>
   writeFaults_.set(path, std::move(error));
 }
 
-void SimulatedFiles::killAfterWrites(std::size_t count) {
+void SimulatedFiles::setStepFault(StepFault fault) {
   const std::lock_guard lock(mutex_);
-  lastWrite_ = writes_ + count;
+  stepFault_ = std::move(fault);
+}
+
+void SimulatedFiles::whenChanged(Changed changed) {
+  const std::lock_guard lock(mutex_);
+  changed_ = std::move(changed);
+}
+
+// Ends.
+
+void SimulatedFiles::killAfterSteps(std::size_t count) {
+  const std::lock_guard lock(mutex_);
+  lastStep_ = steps_ + count;
 }
 
 bool SimulatedFiles::isKilled() const {
   const std::lock_guard lock(mutex_);
-  return lastWrite_ && writes_ >= *lastWrite_;
+  return hasEnded();
 }
+
+bool SimulatedFiles::hasEnded() const { return lastStep_ && steps_ >= *lastStep_; }
 
 void SimulatedFiles::takeOver(const SimulatedFiles& other) {
   const std::scoped_lock lock(mutex_, other.mutex_);
   files_ = other.files_;
   directories_ = other.directories_;
   lastInode_ = other.lastInode_;
+  unsynced_ = other.unsynced_;
+}
+
+/// Changes of names are kept in their order, as by a file system with a journal.
+void SimulatedFiles::losePower(std::mt19937_64& random) {
+  const std::lock_guard lock(mutex_);
+  const auto kept = static_cast<std::size_t>(random() % (unsynced_.size() + 1));
+  while (unsynced_.size() > kept) {
+    auto& [path, before] = unsynced_.back();
+    if (before) {
+      files_.insert_or_assign(path, *before);
+    } else {
+      files_.erase(path);
+    }
+    unsynced_.pop_back();
+  }
+  unsynced_.clear();
+  for (auto& [path, file] : files_) {
+    if (std::exchange(file.isSynced, true)) continue;
+    file.bytes.resize(static_cast<std::size_t>(random() % (file.bytes.size() + 1)));
+    file.stamp.size = file.bytes.size();
+    file.stamp.inode = ++lastInode_;
+  }
+}
+
+// Steps, with the mutex held.
+
+std::optional<Error> SimulatedFiles::begin(Step step, const std::string& path) {
+  if (hasEnded()) return failure(EIO, path);
+  if (stepFault_) {
+    if (auto fault = stepFault_(step, path)) return fault;
+  }
+  ++steps_;
+  return std::nullopt;
+}
+
+std::optional<Error> SimulatedFiles::syncDirectoryOf(const std::string& path) {
+  if (auto error = begin(Step::SyncDirectory, path)) return error;
+  const auto directory = directoryOf(path);
+  std::erase_if(unsynced_, [&](const Unsynced& change) { return directoryOf(change.path) == directory; });
+  return std::nullopt;
+}
+
+/// Nothing in the place of a file removes it.
+void SimulatedFiles::put(const std::string& path, std::optional<File> file) {
+  const auto found = files_.find(path);
+  unsynced_.push_back({path, found == files_.end() ? std::nullopt : std::optional(found->second)});
+  if (file) {
+    files_.insert_or_assign(path, *std::move(file));
+  } else if (found != files_.end()) {
+    files_.erase(found);
+  }
+}
+
+/// As a process does once a directory, before it replaces the first file there.
+void SimulatedFiles::removeLeftovers(const std::string& directory) {
+  if (!swept_.insert(directory).second) return;
+  const std::string prefix = directory + "/.";
+  std::vector<std::string> leftovers;
+  for (auto at = files_.lower_bound(prefix); at != files_.end() && at->first.starts_with(prefix); ++at) {
+    if (at->first.find(kTemporaryTag) != std::string::npos) leftovers.push_back(at->first);
+  }
+  for (const auto& path : leftovers) {
+    if (!begin(Step::Remove, path)) put(path, std::optional<File>());
+  }
+}
+
+void SimulatedFiles::tellChange(std::unique_lock<std::mutex>& lock, const std::string& path, bool isDone) {
+  if (!changed_) return;
+  const auto changed = changed_;
+  lock.unlock();
+  changed(path, isDone);
+  lock.lock();
 }
 
 std::optional<Error> SimulatedFiles::writeFaultOf(const std::string& path) const {
-  if (lastWrite_ && writes_ >= *lastWrite_) return failure(EIO, path);
+  if (hasEnded()) return failure(EIO, path);
   return writeFaults_.of(path);
-}
-
-std::size_t SimulatedFiles::writeCount() const {
-  const std::lock_guard lock(mutex_);
-  return writes_;
 }
 
 std::size_t SimulatedFiles::readCount() const {
@@ -230,10 +365,15 @@ std::size_t SimulatedFiles::readCount() const {
 }
 
 /// Every content gets an inode of its own, so that its stamp tells it from all others at once.
-void SimulatedFiles::store(const std::string& path, std::string bytes) {
+void SimulatedFiles::store(const std::string& path, std::string bytes, bool isSynced) {
   const auto now = nanoseconds(clock_.now());
   const FileStamp stamp{1, ++lastInode_, bytes.size(), now, now, true};
-  files_.insert_or_assign(path, File{std::move(bytes), stamp});
+  File file{std::move(bytes), stamp, isSynced};
+  if (isSynced) {
+    files_.insert_or_assign(path, std::move(file));
+  } else {
+    put(path, std::move(file));
+  }
 }
 
 void SimulatedFiles::addDirectories(std::string path) {

@@ -4,8 +4,10 @@
 #include "platform/Files.h"
 #include "platform/Value.h"
 
+#include <functional>
 #include <map>
 #include <mutex>
+#include <random>
 #include <set>
 #include <vector>
 
@@ -14,7 +16,8 @@ namespace kvr {
 /// Files in memory, with faults on demand.
 ///
 /// They outlive whatever uses them, so a crash and a restart are: destroy the users, build them again on the
-/// same files. Thread-safe.
+/// same files. A file is replaced in the same steps as a real one; what was not synced when the power is lost
+/// may be lost with it. Thread-safe.
 class SimulatedFiles : public Files {
  public:
   static constexpr const char* kHomeDirectory = "/home/user";
@@ -50,20 +53,39 @@ class SimulatedFiles : public Files {
   void setWriteFault(std::optional<Error> error);
   void setWriteFault(const std::string& path, std::optional<Error> error);
 
-  /// The end of the process at a point between two changes: after `count` more, no change reaches a file.
-  void killAfterWrites(std::size_t count);
+  /// What one step of a change is.
+  enum class Step { CreateTemporary, Write, Sync, Rename, SyncDirectory, Remove };
+  /// Asked before every step of a change, with the path that is to be changed: the error in its place, if
+  /// any.
+  using StepFault = std::function<std::optional<Error>(Step step, const std::string& path)>;
+  void setStepFault(StepFault fault);
+  using Changed = std::function<void(const std::string& path, bool isDone)>;
+  /// Told the path after every change that was tried, and whether it was done to the end.
+  void whenChanged(Changed changed);
+
+  /// The end of the process at a point between two steps: after `count` more, none reaches a file.
+  void killAfterSteps(std::size_t count);
   bool isKilled() const;
   /// The files as another instance has them, in the place of these.
   void takeOver(const SimulatedFiles& other);
+  /// What was not synced is lost, as far as `random` has it: the latest changes of names, and the end of
+  /// contents.
+  void losePower(std::mt19937_64& random);
 
-  /// How often a file was replaced, renamed or removed so far, and how often one was read as a whole.
-  std::size_t writeCount() const;
+  /// How often a file was read as a whole.
   std::size_t readCount() const;
 
  private:
+  class Replacement;
   struct File {
     std::string bytes;
     FileStamp stamp;
+    bool isSynced = true;
+  };
+  /// A change of what a name leads to that is not durable yet.
+  struct Unsynced {
+    std::string path;
+    std::optional<File> before;
   };
   struct Faults {
     std::optional<Error> all;
@@ -74,7 +96,13 @@ class SimulatedFiles : public Files {
   };
 
   std::optional<Error> writeFaultOf(const std::string& path) const;
-  void store(const std::string& path, std::string bytes);
+  std::optional<Error> begin(Step step, const std::string& path);
+  std::optional<Error> syncDirectoryOf(const std::string& path);
+  void store(const std::string& path, std::string bytes, bool isSynced);
+  void put(const std::string& path, std::optional<File> file);
+  void removeLeftovers(const std::string& directory);
+  bool hasEnded() const;
+  void tellChange(std::unique_lock<std::mutex>& lock, const std::string& path, bool isDone);
   void addDirectories(std::string path);
   std::optional<Error> move(const std::string& from, const std::string& to, bool replaces);
 
@@ -85,8 +113,12 @@ class SimulatedFiles : public Files {
   std::uint64_t lastInode_ = 0;
   Faults readFaults_;
   Faults writeFaults_;
-  std::optional<std::size_t> lastWrite_;
-  std::size_t writes_ = 0;
+  StepFault stepFault_;
+  Changed changed_;
+  std::vector<Unsynced> unsynced_;  ///< the oldest first
+  std::set<std::string> swept_;     ///< directories without leftovers of earlier processes
+  std::optional<std::size_t> lastStep_;
+  std::size_t steps_ = 0;
   std::size_t reads_ = 0;
   std::map<std::string, std::recursive_mutex> locks_;
 };

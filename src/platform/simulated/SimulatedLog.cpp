@@ -40,6 +40,11 @@ void SimulatedLog::clear() {
   lines_.clear();
 }
 
+void SimulatedLog::keepLast(std::size_t count) {
+  const std::lock_guard lock(mutex_);
+  kept_ = count;
+}
+
 std::vector<std::string> SimulatedLog::faults() const {
   const std::lock_guard lock(mutex_);
   return faults_;
@@ -61,6 +66,9 @@ void SimulatedLog::reportMisusedCompletion(std::string_view what, std::string_vi
 void SimulatedLog::write(LogLevel level, const std::string& message) {
   const std::lock_guard lock(mutex_);
   lines_.push_back({level, message});
+  if (kept_ != 0 && lines_.size() >= 2 * kept_) {
+    lines_.erase(lines_.begin(), lines_.end() - static_cast<std::ptrdiff_t>(kept_));
+  }
 }
 
 }  // namespace kvr

@@ -29,6 +29,8 @@ class SimulatedLog : public Log {
   /// Whether a line holds `part`.
   bool contains(std::string_view part) const;
   void clear();
+  /// From here on only the last lines are kept, so many at least.
+  void keepLast(std::size_t count);
 
   std::vector<std::string> faults() const;
   /// The faults so far, which are then no faults any more: for tests that provoke one.
@@ -42,6 +44,7 @@ class SimulatedLog : public Log {
  private:
   mutable std::mutex mutex_;
   std::vector<Line> lines_;
+  std::size_t kept_ = 0;  ///< 0: all of them
   std::vector<std::string> faults_;
 };
 

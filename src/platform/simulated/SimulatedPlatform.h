@@ -41,7 +41,8 @@ namespace kvr {
 struct SimulatedPlatform {
   static constexpr const char* kMainBundleIdentifier = "com.tarsil.kvragent";
 
-  explicit SimulatedPlatform(std::uint64_t seed = 1) : queues(clock, seed), random(seed) {}
+  explicit SimulatedPlatform(std::uint64_t seed = 1, LogLevel leastLogged = LogLevel::Debug)
+      : log(leastLogged), queues(clock, seed), random(seed) {}
   /// What waits finishes and all other work goes while everything it may use is still there.
   ~SimulatedPlatform() {
     log.beginEnding();

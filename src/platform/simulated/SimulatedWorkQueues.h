@@ -51,6 +51,9 @@ class SimulatedWorkQueues : public WorkQueues {
   void run();
   /// Lets `seconds` pass, running everything that becomes due, in the order of time.
   void advance(double seconds);
+  /// Lets `seconds` pass in which nothing runs, as while a device is suspended; what became due meanwhile is
+  /// due at once.
+  void suspend(double seconds) { clock_.elapsed_ += seconds; }
   /// Goes from event to event until `predicate` holds (true) or nothing is left to happen (false). Then no
   /// wait without a limit can end any more: such waits throw std::logic_error inside their items.
   bool runUntil(const std::function<bool()>& predicate);

@@ -3,6 +3,8 @@
 #include "warranty/CacheMetadata.h"
 #include "warranty/KVRWarrantyDownloader.h"
 
+#include <cerrno>
+
 namespace kvr {
 namespace {
 
@@ -142,6 +144,13 @@ TEST_F(ADownload, LeavesTheCacheAloneWhenItFails) {
   for (const Value& url : {Value("gopher://x"), Value(7), Value("file:///none")}) {
     expectFailure(failed, [&] { world.preferences.setObject(url, preference::kWearablesWarrantyURL); });
   }
+}
+
+TEST_F(ADownload, SchedulesAConversionOutreachOnceThoughNothingCanBeStored) {
+  world.coverage = [](auto&) { return HTTPResponse{200, R"({"zubOfferConversionDate":1700000000})", {}}; };
+  world.files.setWriteFault(Error{"files", ENOSPC, "no space"});
+  for (int round = 0; round < 3; ++round) EXPECT_TRUE(download("WATCH").success);
+  EXPECT_EQ(world.log.count("scheduling conversion outreach 2023-11-14 22:13:20 +0000"), 1U);
 }
 
 TEST_F(ADownload, ReadsALocalFileOrItsVariantForTheDeviceInTheServicesPlace) {

@@ -1,0 +1,212 @@
+// Files, preferences and follow-ups.
+
+#include "followup/FollowUpKeys.h"
+#include "kvr-simulate/Invariants.h"
+#include "platform/PropertyList.h"
+#include "scheduling/SchedulingKeys.h"
+#include "signing/SHA256Hash.h"
+#include "warranty/WarrantyKeys.h"
+
+#include <algorithm>
+
+namespace kvr::simulate {
+namespace {
+
+const std::string kPreferencesPath =
+    std::string(SimulatedFiles::kHomeDirectory) + "/Library/Preferences/com.tarsil.kvragent.plist";
+const std::string kFollowUpsPath = std::string(SimulatedFiles::kHomeDirectory) + "/Library/FollowUps/" +
+                                   kFollowUpClientIdentifier + ".plist";
+
+bool isTemporary(const std::string& path) { return path.find(".kvr-") != std::string::npos; }
+
+Value::Array listIn(const Value& value) { return value.isArray() ? value.array() : Value::Array(); }
+
+bool mayBeRemoved(const std::string& key) {
+  return key == preference::kServerVersionCache || key == preference::kCachedWarrantyLastUpdatedDate ||
+         key == preference::kCachedWarrantyLocale || key == preference::kCachedWarrantyVersion;
+}
+
+}  // namespace
+
+Value Invariants::preferences() const { return platform_->files.getPropertyList(kPreferencesPath); }
+
+void Invariants::readFilesAgain() {
+  if (platform_ == nullptr) return;
+  preferences_ = preferences();
+  durable_.clear();
+}
+
+void Invariants::checkNames(const std::string& path) {
+  for (const auto& serialNumber : world_.serialNumbers()) {
+    if (path.find(serialNumber) != std::string::npos) report("no serial number names anything", path);
+  }
+  if (path.find(".damaged-") != std::string::npos && !damageIsPlanted_) report("no file is damaged", path);
+}
+
+void Invariants::fileChanged(const std::string& path, bool isDone) {
+  if (platform_ == nullptr) return;
+  const auto bytes = platform_->files.get(path);
+  if (isDone && bytes) {
+    durable_.insert_or_assign(path, *bytes);
+  } else {
+    durable_.erase(path);
+  }
+  if (!isWatching()) return;
+  checkNames(path);
+  if (bytes && path.ends_with(".plist") && !damageIsPlanted_ && !readPropertyList(*bytes)) {
+    report("files are whole", path);
+  }
+  // What an earlier process left is cleared away before the first file of a directory is replaced.
+  const bool isCleared = isDone && bytes && path.find(".damaged-") == std::string::npos && !filesFailed_;
+  for (const auto& neighbour : platform_->files.list(path.substr(0, path.rfind('/')))) {
+    if (isTemporary(neighbour) && (isCleared || !leftovers_.contains(neighbour))) {
+      report("no temporary file stays", neighbour);
+    }
+  }
+  if (path == kPreferencesPath) checkPreferences();
+  if (path == kFollowUpsPath) checkFollowUps();
+}
+
+// Preferences.
+
+void Invariants::checkPreferences() {
+  const auto before = std::exchange(preferences_, preferences());
+  const auto& after = preferences_;
+  if (!after.isDictionary()) {
+    if (!damageIsPlanted_) report("preferences are never lost", "all of them");
+    datesAreDamaged_ = true;
+    return;
+  }
+  std::set<std::string> keys;
+  if (before.isDictionary()) {
+    for (const auto& [key, value] : before.dictionary()) keys.insert(key);
+  }
+  for (const auto& [key, value] : after.dictionary()) keys.insert(key);
+  std::size_t changed = 0;
+  for (const auto& key : keys) {
+    if (before[key] == after[key]) continue;
+    ++changed;
+    checkChange(key, before[key], after[key], after);
+  }
+  if (changed > 1) report("preferences are never lost", std::to_string(changed) + " changed at once");
+}
+
+void Invariants::checkChange(const std::string& key, const Value& before, const Value& after,
+                             const Value& tree) {
+  for (const auto& serialNumber : world_.serialNumbers()) {
+    if (key.find(serialNumber) != std::string::npos) report("no serial number names anything", key);
+  }
+  if (key == preference::kFollowUpPostedHashes) return checkPostedList(before, after, tree);
+  if (key == preference::kFollowUpDismissedHashes) {
+    const auto earlier = listIn(before);
+    const auto later = listIn(after);
+    if (later.size() < earlier.size() || !std::equal(earlier.begin(), earlier.end(), later.begin())) {
+      report("dismissals are never forgotten", describe(before) + " became " + describe(after));
+    }
+  }
+  if (!after.isNull() || mayBeRemoved(key)) return;
+  if (key.ends_with(preference::kTargetDateSuffix)) {
+    checkTargetDateRemoval(key.substr(0, key.size() - std::string_view(preference::kTargetDateSuffix).size()),
+                           before);
+  } else {
+    report("preferences are never lost", key);
+  }
+}
+
+/// The end of the run that was started for this date removes it, and the very first run after an upgrade all
+/// of them; whoever schedules for no date, none in the agent, would do so as well.
+void Invariants::checkTargetDateRemoval(const std::string& activity, const Value& before) {
+  const auto upgrade = runs_.find(activity::kPostUpgrade);
+  if (upgrade != runs_.end() && upgrade->second.isFirstUpgrade) return;
+  const auto run = runs_.find(activity);
+  if (run != runs_.end() && run->second.startedFor == before) {
+    run->second.removedDate = true;
+  } else {
+    report("target dates are never lost", activity + ": " + describe(before));
+  }
+}
+
+/// Only an offer that begins anew after the dismissal takes a device from the list.
+void Invariants::checkPostedList(const Value& before, const Value& after, const Value& tree) {
+  const auto later = listIn(after);
+  std::set<std::string> seen;
+  for (const auto& hash : later) {
+    if (!seen.insert(hash.string()).second) report("what is posted is remembered", "twice");
+  }
+  for (const auto& hash : listIn(before)) {
+    if (seen.contains(hash.string())) continue;
+    if (tree[hash.string() + preference::kDismissedSuffix].isNull()) {
+      report("what is posted is remembered", hash.string() + " was forgotten");
+    }
+  }
+}
+
+// Follow-ups.
+
+void Invariants::checkFollowUps() {
+  std::set<std::string> serialNumbers;
+  for (const auto& item : pendingItems()) {
+    const auto found = item.userInfo.find(kFollowUpSerialNumberKey);
+    if (found == item.userInfo.end()) continue;
+    if (!serialNumbers.insert(found->second.string()).second) {
+      report("no follow-up is posted twice", found->second.string());
+    }
+  }
+}
+
+bool Invariants::posting(const FollowUpItem& item, const std::vector<FollowUpItem>& pending) {
+  const auto isPending = [&](const std::string& identifier) {
+    return std::ranges::any_of(
+        pending, [&](const FollowUpItem& other) { return other.uniqueIdentifier == identifier; });
+  };
+  const bool isMigrated = isPending(kFollowUpClientIdentifier);
+  const bool wasPending = isMigrated || isPending(item.uniqueIdentifier.value_or(""));
+  if (!isWatching()) return wasPending;
+  const auto now = platform_->clock.now();
+  const auto serial = item.userInfo.find(kFollowUpSerialNumberKey);
+  auto* const offer = world_.service.find(item.title);
+  if (serial == item.userInfo.end() || offer == nullptr || offer->lastServed < 0) {
+    report("follow-ups are made from what the service said", describe(item.title));
+    return wasPending;
+  }
+  const auto hash = sha256Hash(serial->second.string());
+  if (offer->serialNumber != serial->second.string() ||
+      item.uniqueIdentifier != std::string(kFollowUpClientIdentifier) + "." + hash) {
+    report("follow-ups are made from what the service said", "another device's");
+  }
+  // What an earlier version showed is shown on, whatever it is made of.
+  if (isMigrated) return true;
+  if (!offer->isOffered) report("nothing is posted that is not offered", describe(item.title));
+  if (!offer->end || *offer->end <= now) {
+    report("nothing is posted after its eligibility", describe(item.title));
+  }
+  if (!wasPending) checkNewPost(*offer, describe(item.title), now);
+  return wasPending;
+}
+
+/// New follow-ups come from the post activity only, which downloads for every run.
+void Invariants::checkNewPost(const Offer& offer, const std::string& name, Date now) {
+  const auto stored = preferences();
+  const auto due = offer.postDate(activationOf(offer.serialNumber, stored));
+  if (due && *due > now) {
+    report("nothing is posted before its date", name + ", due at " + describe(*due));
+  }
+  const auto run = runs_.find(activity::kFollowUpPost);
+  if (run == runs_.end() || offer.lastServed < run->second.began) {
+    report("what is posted was asked for anew", name);
+  }
+  if (isDismissed(offer, stored)) report("what is dismissed stays dismissed", name);
+}
+
+void Invariants::posted(const FollowUpItem& item, bool wasPending, bool isDone) {
+  if (!isWatching() || !isDone) return;
+  ++figures.posts;
+  if (runs_.contains(activity::kFollowUpRefresh)) {
+    refreshed_[*item.uniqueIdentifier] = world_.now;
+  } else {
+    refreshed_.erase(*item.uniqueIdentifier);
+  }
+  if (!wasPending) toBeListed_.insert(sha256Hash(item.userInfo.at(kFollowUpSerialNumberKey).string()));
+}
+
+}  // namespace kvr::simulate

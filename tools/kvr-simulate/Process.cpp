@@ -1,0 +1,159 @@
+#include "kvr-simulate/Process.h"
+
+#include <algorithm>
+
+namespace kvr::simulate {
+namespace {
+
+class RecordingActivity : public Activity {
+ public:
+  RecordingActivity(std::unique_ptr<Activity> activity, Log& log, Invariants& invariants)
+      : activity_(std::move(activity)), log_(log), invariants_(invariants) {}
+
+  const std::string& identifier() const override { return activity_->identifier(); }
+  void setPreregistered(bool preregistered) override { activity_->setPreregistered(preregistered); }
+  void setCriteria(const ActivityCriteria& criteria) override { activity_->setCriteria(criteria); }
+  void setExpectation(const ActivityExpectation& expectation) override {
+    activity_->setExpectation(expectation);
+  }
+  void setEarliestDate(Date date) override { activity_->setEarliestDate(date); }
+  std::optional<DeferralReason> shouldDefer() const override { return activity_->shouldDefer(); }
+  void schedule(ActivityBlock block) override {
+    activity_->schedule([name = identifier(), block = std::move(block), &log = log_,
+                         &invariants = invariants_](const ActivityHandler& handler) {
+      invariants.runBegins(name);
+      block(ActivityHandler(log, "a run", [name, handler, &invariants](ActivityResult result) {
+        invariants.runEnds(name, result);
+        handler(result);
+      }));
+    });
+  }
+
+ private:
+  const std::unique_ptr<Activity> activity_;
+  Log& log_;
+  Invariants& invariants_;
+};
+
+class RecordingClient : public FollowUpCenterClient {
+ public:
+  RecordingClient(std::unique_ptr<FollowUpCenterClient> client, Invariants& invariants)
+      : client_(std::move(client)), invariants_(invariants) {}
+
+  std::optional<Error> postItem(const FollowUpItem& item) override {
+    const auto pending = client_->pendingItems();
+    const bool wasPending = invariants_.posting(item, pending ? *pending : std::vector<FollowUpItem>());
+    auto error = client_->postItem(item);
+    invariants_.posted(item, wasPending, !error);
+    return error;
+  }
+  std::optional<Error> clearPendingItems(const std::vector<std::string>& uniqueIdentifiers) override {
+    return client_->clearPendingItems(uniqueIdentifiers);
+  }
+  Result<std::vector<FollowUpItem>> pendingItems() override { return client_->pendingItems(); }
+
+ private:
+  const std::unique_ptr<FollowUpCenterClient> client_;
+  Invariants& invariants_;
+};
+
+}  // namespace
+
+std::unique_ptr<Activity> RecordingActivities::newActivity(std::string identifier) {
+  return std::make_unique<RecordingActivity>(scheduler_.newActivity(std::move(identifier)), log_,
+                                             invariants_);
+}
+
+std::unique_ptr<FollowUpCenterClient> RecordingCenter::newClient(std::string clientIdentifier) {
+  return std::make_unique<RecordingClient>(center_.newClient(std::move(clientIdentifier)), invariants_);
+}
+
+Process::Process(World& world, Invariants& invariants, std::uint64_t seed, LogLevel leastLogged,
+                 const SimulatedFiles* files)
+    : simulated(seed, leastLogged),
+      world_(world),
+      invariants_(invariants),
+      activities_(simulated.activities, simulated.log, invariants),
+      followUps_(simulated.followUps, invariants),
+      platform_{simulated.log,
+                simulated.clock,
+                simulated.queues,
+                simulated.files,
+                simulated.propertyLists,
+                simulated.preferences,
+                simulated.locale,
+                simulated.random,
+                simulated.http,
+                simulated.deviceProperties,
+                simulated.featureFlags,
+                simulated.pairedDevices,
+                simulated.accounts,
+                simulated.accountSession,
+                simulated.attestation,
+                simulated.services,
+                simulated.processes,
+                activities_,
+                followUps_,
+                simulated.carriers,
+                simulated.notifications,
+                simulated.cleanExit,
+                simulated.applications,
+                simulated.store,
+                simulated.stringTables,
+                SimulatedPlatform::kMainBundleIdentifier} {
+  simulated.log.keepLast(60);
+  if (files != nullptr) simulated.files.takeOver(*files);
+  world.show(simulated);
+  simulated.files.whenChanged(
+      [&](const std::string& path, bool isDone) { invariants.fileChanged(path, isDone); });
+  simulated.http.handler = [this](const HTTPRequest& request, bool, const SimulatedHTTP::Answer& answer) {
+    this->answer(request, answer);
+  };
+}
+
+Process::~Process() {
+  simulated.files.whenChanged(nullptr);
+  simulated.log.beginEnding();
+  simulated.activities.beginEnding();
+  simulated.queues.beginEnding();
+  startUp_.reset();
+  simulated.notifications.end();
+  simulated.queues.end();
+}
+
+void Process::start() { startUp_ = std::make_unique<StartUp>(platform_); }
+
+void Process::stop() {
+  simulated.log.beginEnding();
+  simulated.activities.beginEnding();
+  simulated.queues.beginEnding();
+  simulated.queues.run();
+}
+
+void Process::answer(const HTTPRequest& request, const SimulatedHTTP::Answer& answer) {
+  const bool isCoverage = request.method == "POST";
+  invariants_.requested(request, isCoverage);
+  simulated.http.clearRequests();
+  Service::Outcome outcome;
+  if (world_.isNetworkReachable) {
+    outcome = isCoverage ? world_.service.answerCoverage(request) : world_.service.answerVersions();
+  } else {
+    outcome.response = HTTPResponse{0, std::nullopt, Error{"http", 7, "There is no network."}};
+  }
+  ++openRequests_;
+  const auto done = std::make_shared<bool>(false);
+  const auto queue = simulated.queues.concurrentQueue(Priority::Default);
+  // A request that nobody answers fails by its own limit.
+  simulated.queues.after(request.timeout, queue, [this, done] {
+    if (!std::exchange(*done, true)) --openRequests_;
+  });
+  if (!outcome.response) return;
+  simulated.queues.after(outcome.delay, queue, [this, outcome, answer, isCoverage, done] {
+    if (!std::exchange(*done, true)) --openRequests_;
+    if (isCoverage) invariants_.coverageAnswered(outcome.response->status);
+    if (outcome.offer) world_.service.at(*outcome.offer).lastServed = world_.now;
+    answer(*outcome.response);
+  });
+}
+
+}  // namespace kvr::simulate

@@ -1,0 +1,69 @@
+#pragma once
+
+#include "agent/StartUp.h"
+#include "kvr-simulate/Invariants.h"
+
+#include <memory>
+#include <string>
+#include <utility>
+
+namespace kvr::simulate {
+
+/// Passes activities on to the simulated scheduler and tells the invariants of their runs.
+class RecordingActivities : public ActivityScheduler {
+ public:
+  RecordingActivities(ActivityScheduler& scheduler, Log& log, Invariants& invariants)
+      : scheduler_(scheduler), log_(log), invariants_(invariants) {}
+
+  std::unique_ptr<Activity> newActivity(std::string identifier) override;
+
+ private:
+  ActivityScheduler& scheduler_;
+  Log& log_;
+  Invariants& invariants_;
+};
+
+/// Passes follow-ups on to the simulated centre and tells the invariants of them.
+class RecordingCenter : public FollowUpCenter {
+ public:
+  RecordingCenter(FollowUpCenter& center, Invariants& invariants)
+      : center_(center), invariants_(invariants) {}
+
+  std::unique_ptr<FollowUpCenterClient> newClient(std::string clientIdentifier) override;
+
+ private:
+  FollowUpCenter& center_;
+  Invariants& invariants_;
+};
+
+/// One life of the agent: a simulated platform that is watched, and the agent on it.
+class Process {
+ public:
+  /// `files`: what the process before left behind, if there was one.
+  Process(World& world, Invariants& invariants, std::uint64_t seed, LogLevel leastLogged,
+          const SimulatedFiles* files);
+  ~Process();
+  Process(const Process&) = delete;
+  Process& operator=(const Process&) = delete;
+
+  void start();
+  /// Ends as on a termination signal.
+  void stop();
+  /// Nothing but what may wait for days is under way.
+  bool isIdle() const { return openRequests_ == 0 && simulated.activities.runsUnderWay() == 0; }
+
+  SimulatedPlatform simulated;
+
+ private:
+  void answer(const HTTPRequest& request, const SimulatedHTTP::Answer& answer);
+
+  World& world_;
+  Invariants& invariants_;
+  int openRequests_ = 0;
+  RecordingActivities activities_;
+  RecordingCenter followUps_;
+  Platform platform_;
+  std::unique_ptr<StartUp> startUp_;
+};
+
+}  // namespace kvr::simulate

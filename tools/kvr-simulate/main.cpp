@@ -1,0 +1,120 @@
+// Lives whole lives of the agent, each from a seed, and looks whether what must always hold does.
+
+#include "kvr-simulate/Minimise.h"
+
+#include <CLI/CLI.hpp>
+
+#include <algorithm>
+#include <atomic>
+#include <cstdio>
+#include <map>
+#include <mutex>
+#include <thread>
+
+namespace kvr::simulate {
+namespace {
+
+struct Arguments {
+  std::uint64_t first = 1;
+  std::uint64_t seeds = 200;
+  double years = 1;
+  unsigned jobs = std::max(std::thread::hardware_concurrency(), 1U);
+  std::vector<std::size_t> only;
+  bool isTraced = false;
+  bool isWithoutEvents = false;
+  bool isBrief = false;
+};
+
+/// Every few seeds all that is logged is put into words, as an agent does that is being watched.
+constexpr std::uint64_t kLoggedSeeds = 8;
+
+LogLevel levelFor(std::uint64_t seed) { return seed % kLoggedSeeds == 0 ? LogLevel::Debug : LogLevel::Error; }
+
+std::vector<Event> eventsFor(std::uint64_t seed, const Arguments& arguments) {
+  if (arguments.isWithoutEvents) return {};
+  auto events = eventsOf(seed, arguments.years);
+  if (!arguments.only.empty()) {
+    std::erase_if(events, [&](const Event& event) {
+      return std::ranges::find(arguments.only, event.number) == arguments.only.end();
+    });
+  }
+  return events;
+}
+
+void explain(std::uint64_t seed, const Arguments& arguments, const Outcome& outcome) {
+  auto events = eventsFor(seed, arguments);
+  events.resize(std::min(events.size(), outcome.afterEvents.value_or(events.size())));
+  std::printf("seed %llu: \"%s\" does not hold: %s\n  after %zu events, %.1f days\n",
+              static_cast<unsigned long long>(seed), outcome.breach->invariant.c_str(),
+              outcome.breach->detail.c_str(), events.size(), outcome.at / 86400);
+  std::fflush(stdout);
+  if (arguments.isBrief) return;
+  const auto fewest = minimised(seed, std::move(events), arguments.years, outcome.breach->invariant);
+  const auto again = Life(seed, {arguments.years, LogLevel::Debug, false}).live(fewest);
+  std::string numbers;
+  for (const auto& event : fewest) numbers += (numbers.empty() ? "" : ",") + std::to_string(event.number);
+  std::printf("  the last lines of its log:\n");
+  const auto& lines = again.lastLines;
+  for (auto line = lines.size() > 30 ? lines.end() - 30 : lines.begin(); line != lines.end(); ++line) {
+    std::printf("    %.300s\n", line->c_str());
+  }
+  std::printf("  again, with %zu events:\n    kvr-simulate --first %llu --seeds 1 --years %g %s --trace\n",
+              fewest.size(), static_cast<unsigned long long>(seed), arguments.years,
+              numbers.empty() ? "--none" : ("--only " + numbers).c_str());
+  std::fflush(stdout);
+}
+
+int simulate(const Arguments& arguments) {
+  std::mutex mutex;  // guards what follows
+  Figures figures;
+  std::map<std::uint64_t, Outcome> broken;
+  std::atomic<std::uint64_t> next{0};
+  const auto work = [&] {
+    for (auto index = next++; index < arguments.seeds; index = next++) {
+      const auto seed = arguments.first + index;
+      const Life::Options options{arguments.years, arguments.isTraced ? LogLevel::Debug : levelFor(seed),
+                                  arguments.isTraced};
+      const auto events = eventsFor(seed, arguments);
+      auto outcome = Life(seed, options).live(events);
+      if (index == 0 && !outcome.breach && Life(seed, options).live(events).digest != outcome.digest) {
+        outcome.breach = Breach{"the same seed is the same life", "it was not"};
+      }
+      const std::lock_guard lock(mutex);
+      figures.add(outcome.figures);
+      if (!outcome.breach) continue;
+      broken.emplace(seed, std::move(outcome));
+      next = arguments.seeds;
+    }
+  };
+  std::vector<std::thread> threads;
+  for (unsigned job = 0; job < arguments.jobs; ++job) threads.emplace_back(work);
+  for (auto& thread : threads) thread.join();
+  std::printf(
+      "%llu seeds of %g years: %zu starts, %zu crashes, %zu losses of power, %zu calls, %zu requests, "
+      "%zu posts, %zu clock jumps, %zu file faults, %zu runs of activities\n",
+      static_cast<unsigned long long>(arguments.seeds), arguments.years, figures.starts, figures.crashes,
+      figures.powerLosses, figures.calls, figures.requests, figures.posts, figures.clockJumps,
+      figures.fileFaults, figures.runs);
+  if (broken.empty()) return EXIT_SUCCESS;
+  explain(broken.begin()->first, arguments, broken.begin()->second);
+  return EXIT_FAILURE;
+}
+
+}  // namespace
+}  // namespace kvr::simulate
+
+int main(int count, char** texts) {
+  kvr::simulate::Arguments arguments;
+  CLI::App app("Lives whole lives of the agent in virtual time and checks what must always hold.");
+  app.add_option("--seeds", arguments.seeds, "how many lives");
+  app.add_option("--years", arguments.years, "how long each is");
+  app.add_option("--first", arguments.first, "the first life's seed");
+  app.add_option("--jobs", arguments.jobs, "how many are lived at once");
+  app.add_option("--only", arguments.only, "the numbers of the only events that happen")->delimiter(',');
+  app.add_flag("--none", arguments.isWithoutEvents, "let nothing happen");
+  app.add_flag("--brief", arguments.isBrief, "do not look for the shortest way to see a failure again");
+  app.add_flag("--trace", arguments.isTraced, "print what happens");
+  CLI11_PARSE(app, count, texts);
+  if (arguments.isTraced) arguments.jobs = 1;
+  return kvr::simulate::simulate(arguments);
+}
