@@ -149,17 +149,30 @@ class FileFollowUpCenter::Client : public FollowUpCenterClient {
     return entries;
   }
 
-  std::optional<Error> change(const std::function<void(Value::Array&)>& apply) {
-    const auto lock = lists_.files().lock(directory_);
+  using Change = std::function<void(Value::Array&)>;
+
+  /// The content after a change, null when it changes nothing.
+  Result<Value> changedBy(const Change& apply) const {
     const auto stored = read();
     if (!stored) return stored.error();
     Value::Array entries = pendingEntries(*stored);
     apply(entries);
     Value::Dictionary tree = stored->isDictionary() ? stored->dictionary() : Value::Dictionary();
     const Value before = tree[kItems];
-    if (before == Value(entries) || (before.isNull() && entries.empty())) return std::nullopt;
+    if (before == Value(entries) || (before.isNull() && entries.empty())) return Value();
     tree.insert_or_assign(kItems, std::move(entries));
-    return lists_.write(path_, std::move(tree), PropertyListEncoding::Binary);
+    return Value(std::move(tree));
+  }
+
+  std::optional<Error> change(const Change& apply) {
+    // A change of nothing, such as clearing what is not there, needs no lock.
+    auto changed = changedBy(apply);
+    if (changed && changed->isNull()) return std::nullopt;
+    const auto lock = lists_.files().lock(directory_);
+    changed = changedBy(apply);
+    if (!changed) return changed.error();
+    if (changed->isNull()) return std::nullopt;
+    return lists_.write(path_, *changed, PropertyListEncoding::Binary);
   }
 
   PropertyListFiles& lists_;

@@ -50,6 +50,21 @@ void FilePreferences::setObject(const Value& value, std::string_view key) {
   update(key, [&value](const Value&) { return value; });
 }
 
+void FilePreferences::setObjects(const Value::Dictionary& values) {
+  const auto lock = lists_.files().lock(directory_);
+  const auto stored = lists_.read(standardPath_, kDictionary, kSetAside);
+  if (!stored) {
+    for (const auto& [key, value] : values) reportUnchanged(key, stored.error());
+    return;
+  }
+  Value::Dictionary tree = stored->isDictionary() ? stored->dictionary() : Value::Dictionary();
+  for (const auto& [key, value] : values) tree.insert_or_assign(key, value);
+  if (Value(tree) == *stored) return;
+  if (const auto error = lists_.write(standardPath_, std::move(tree), PropertyListEncoding::Binary)) {
+    for (const auto& [key, value] : values) reportUnstored(key, *error);
+  }
+}
+
 void FilePreferences::removeObject(std::string_view key) { setObject({}, key); }
 
 std::vector<std::string> FilePreferences::allKeys() const {
@@ -71,7 +86,7 @@ void FilePreferences::update(std::string_view key, const std::function<Value(con
   const auto lock = lists_.files().lock(directory_);
   const auto stored = lists_.read(standardPath_, kDictionary, kSetAside);
   if (!stored) {
-    log_.error("preference %s is not changed, the others cannot be read: %@", key, stored.error());
+    reportUnchanged(key, stored.error());
     return;
   }
   const Value& before = (*stored)[key];
@@ -85,8 +100,16 @@ void FilePreferences::update(std::string_view key, const std::function<Value(con
     tree.insert_or_assign(std::string(key), std::move(after));
   }
   if (const auto error = lists_.write(standardPath_, std::move(tree), PropertyListEncoding::Binary)) {
-    log_.error("preference %s cannot be stored: %@", key, *error);
+    reportUnstored(key, *error);
   }
+}
+
+void FilePreferences::reportUnchanged(std::string_view key, const Error& error) {
+  log_.error("preference %s is not changed, the others cannot be read: %@", key, error);
+}
+
+void FilePreferences::reportUnstored(std::string_view key, const Error& error) {
+  log_.error("preference %s cannot be stored: %@", key, error);
 }
 
 }  // namespace kvr

@@ -18,12 +18,15 @@ class FilePreferences : public Preferences {
   Value objectForKey(std::string_view key) const override;
   Value objectForKey(std::string_view key, std::string_view domain) const override;
   void setObject(const Value& value, std::string_view key) override;
+  void setObjects(const Value::Dictionary& values) override;
   void removeObject(std::string_view key) override;
   std::vector<std::string> allKeys() const override;
   void update(std::string_view key, const std::function<Value(const Value&)>& change) override;
 
  private:
   std::string pathOf(std::string_view domain) const;
+  void reportUnchanged(std::string_view key, const Error& error);
+  void reportUnstored(std::string_view key, const Error& error);
 
   PropertyListFiles& lists_;
   Log& log_;

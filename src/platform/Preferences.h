@@ -27,6 +27,8 @@ class Preferences {
   virtual Value objectForKey(std::string_view key, std::string_view domain) const = 0;
   /// Stores a value; null removes.
   virtual void setObject(const Value& value, std::string_view key) = 0;
+  /// Stores several values, none of them null, in one durable change: all of them or none.
+  virtual void setObjects(const Value::Dictionary& values) = 0;
   virtual void removeObject(std::string_view key) = 0;
   /// Every key that has a stored or a registered value, in ascending order.
   virtual std::vector<std::string> allKeys() const = 0;

@@ -177,9 +177,9 @@ void KVRWarrantyDownloader::store(const KVRWarranty& warranty,
   warranty.cacheWarranty(serialNumber);
   if (!serialNumber) return;  // without one there is no hash to keep the metadata under
   const CacheMetadata metadata(*serialNumber);
-  platform_.preferences.setObject(platform_.clock.now(), metadata.lastUpdatedDateKey);
-  platform_.preferences.setObject(locale, metadata.localeKey);
-  platform_.preferences.setObject(kCacheFormatVersion, metadata.versionKey);
+  platform_.preferences.setObjects({{metadata.lastUpdatedDateKey, platform_.clock.now()},
+                                    {metadata.localeKey, locale},
+                                    {metadata.versionKey, kCacheFormatVersion}});
 }
 
 Value KVRWarrantyDownloader::dictionaryFromURL(const URL& url,

@@ -77,6 +77,8 @@ TEST_P(APreference, KeepsEveryKindOfValueAndSeesChangesFromOutside) {
   EXPECT_EQ(preferences.objectForKey("key"), Value("from outside"));
   preferences.setObject(2, "key");
   EXPECT_EQ(stored(), Value(Value::Dictionary{{"key", 2}, {"other", 1}}));
+  preferences.setObjects({{"key", 3}, {"more", 4}});
+  EXPECT_EQ(stored(), Value(Value::Dictionary{{"key", 3}, {"more", 4}, {"other", 1}}));
 }
 
 TEST_P(APreference, IsWrittenOnlyWhenItChanges) {
@@ -92,6 +94,9 @@ TEST_P(APreference, IsWrittenOnlyWhenItChanges) {
   };
   for (const auto& values : equals) EXPECT_FALSE(writes(values)) << describe(values[0]);
   for (const auto& values : changes) EXPECT_TRUE(writes(values)) << describe(values[0]);
+  const auto inode = inodeOfDomain();
+  preferences.setObjects({{"key", 1}});
+  EXPECT_EQ(inodeOfDomain(), inode);
 }
 
 TEST_P(APreference, OfAnotherDomainIsReadWhereTheNameLeadsNowhereElse) {
@@ -127,10 +132,12 @@ TEST_P(APreference, OfADomainThatCannotBeReadIsNeverOverwritten) {
   EXPECT_THAT(preferences.allKeys(), ElementsAre("a"));
   preferences.setObject(2, "a");
   preferences.update("a", [](const Value&) -> Value { return ADD_FAILURE(), 3; });
+  preferences.setObjects({{"b", 2}, {"c", 3}});
   EXPECT_EQ(world.get(pathOf(kDomain)), large);
   EXPECT_THAT(world.log.texts(LogLevel::Error),
               ElementsAre(HasSubstr("cannot be read"), HasSubstr("preference a is not changed"),
-                          HasSubstr("preference a is not changed")));
+                          HasSubstr("preference a is not changed"), HasSubstr("preference b is not changed"),
+                          HasSubstr("preference c is not changed")));
 }
 
 TEST_P(APreference, LosesNoEntryHoweverManyThreadsAndProcessesAddThem) {

@@ -263,7 +263,7 @@ std::optional<Error> appendRecords(sd_bus_message* message, bool isList, const V
   std::size_t size = 8;
   for (const Value& record : given) {
     if (!record.isDictionary()) return kindError("a{sv}");
-    Result<Value> carried = carriedRecord(record.dictionary(), isList ? 1 : 0);
+    Result<Value> carried = carriedRecord(record, isList ? 1 : 0);
     if (!carried) return carried.error();
     size = endOnBus(size, carried->dictionary());
     if (size > kMaximumBusValueSize) return sizeError();

@@ -63,20 +63,21 @@ Result<Value> packed(const Value& tree) {
   return Value(Value::Bytes(bytes->begin(), bytes->end()));
 }
 
-/// `level` is 0 for the value's own dictionary.
-Result<Value> carriedRecordAt(int level, const Value::Dictionary& record, int containers) {
-  Value::Dictionary result;
-  for (const auto& [key, value] : record) {
+/// `level` is 0 for the value's own dictionary. What travels as it stands is shared, not copied.
+Result<Value> carriedRecordAt(int level, const Value& record, int containers) {
+  std::optional<Value::Dictionary> changed;
+  for (const auto& [key, value] : record.dictionary()) {
     const int inside = containers + kAroundEntry;
     const bool isRecord =
         value.isDictionary() && level + 1 < kBusRecordLevels && canCarryKeys(value.dictionary());
-    Result<Value> carried = isRecord ? carriedRecordAt(level + 1, value.dictionary(), inside)
-                            : canCarry(value, inside) && !looksPacked(value) ? Result<Value>(value)
-                                                                             : packed(value);
+    if (!isRecord && canCarry(value, inside) && !looksPacked(value)) continue;
+    Result<Value> carried = isRecord ? carriedRecordAt(level + 1, value, inside) : packed(value);
     if (!carried) return carried;
-    result.emplace_hint(result.end(), key, *std::move(carried));
+    if (isRecord && &carried->dictionary() == &value.dictionary()) continue;
+    if (!changed) changed = record.dictionary();
+    changed->insert_or_assign(key, *std::move(carried));
   }
-  return Value(std::move(result));
+  return changed ? Value(*std::move(changed)) : record;
 }
 
 constexpr std::size_t aligned(std::size_t offset, std::size_t alignment) {
@@ -122,6 +123,10 @@ std::size_t endOfVariant(std::size_t offset, const Value& tree) {
 
 bool busCanCarryText(std::string_view text) {
   for (std::size_t at = 0; at < text.size();) {
+    if (static_cast<signed char>(text[at]) > 0) {  // ASCII
+      ++at;
+      continue;
+    }
     // Code points that are no characters pass the daemon, but sd-bus refuses them.
     const char32_t point = nextCodePoint(text, at);
     const bool isNoCharacter = (point >= 0xFDD0 && point <= 0xFDEF) || (point & 0xFFFEU) == 0xFFFE;
@@ -130,8 +135,9 @@ bool busCanCarryText(std::string_view text) {
   return true;
 }
 
-Result<Value> carriedRecord(const Value::Dictionary& record, int containers) {
-  if (!canCarryKeys(record)) return Error{"bus", EINVAL, "a record has a key that the bus cannot carry"};
+Result<Value> carriedRecord(const Value& record, int containers) {
+  if (!canCarryKeys(record.dictionary()))
+    return Error{"bus", EINVAL, "a record has a key that the bus cannot carry"};
   return carriedRecordAt(0, record, containers);
 }
 

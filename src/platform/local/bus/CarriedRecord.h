@@ -23,7 +23,7 @@ bool busCanCarryText(std::string_view text);
 /// The record as it travels: every tree that cannot be carried, and data that looks like a property list, is
 /// packed into data. `containers` stand around the record. An error when a key cannot be carried, or a tree
 /// cannot be packed either.
-Result<Value> carriedRecord(const Value::Dictionary& record, int containers);
+Result<Value> carriedRecord(const Value& record, int containers);
 
 /// Where the encoded record ends if it begins at byte `offset` of a message.
 std::size_t endOnBus(std::size_t offset, const Value::Dictionary& record);

@@ -1,0 +1,184 @@
+// What clients see: calls of the agent against calls of the bare service, by one client on one bus.
+
+#include "CoverageAnswer.h"
+#include "Figures.h"
+#include "Measurement.h"
+#include "Programs.h"
+#include "platform/JSON.h"
+#include "platform/PropertyList.h"
+#include "signing/SHA256Hash.h"
+#include "warranty/CacheMetadata.h"
+#include "warranty/WarrantyKeys.h"
+
+#include <systemd/sd-bus.h>
+
+#include <stdexcept>
+
+namespace kvr::bench {
+namespace {
+
+using MakeCall = std::function<BusMessageRef(const RawBusClient&)>;
+
+const MakeCall kAgentCall = [](const RawBusClient& client) { return infoCall(client); };
+const MakeCall kBareCall = bareInfoCall;
+
+Value infoFrom(const RawBusClient& client, const MakeCall& make) {
+  return client.value("a{sv}", {answerTo(client, make(client)), {}, {}});
+}
+
+/// Agent with a filled cache, and a bare service that replies the same.
+void startBoth(Programs& programs) {
+  programs.startAgent();
+  programs.fillCache();
+  const RawBusClient client = programs.newClient();
+  const Value info = infoFrom(client, kAgentCall);
+  programs.startBare(info);
+  if (infoFrom(client, kBareCall) != info)
+    throw std::runtime_error("the bare service replies something else");
+}
+
+/// Median and 99th percentile of single calls, in seconds.
+std::vector<double> singleCalls(const RawBusClient& client, const MakeCall& make) {
+  constexpr int kCalls = 1000;
+  std::vector<double> times;
+  for (int i = 0; i < kCalls; ++i) {
+    times.push_back(secondsOf([&] { answerTo(client, make(client)); }));
+  }
+  return {quantile(times, 0.5), quantile(times, 0.99)};
+}
+
+/// Keeps calls in flight until a number of them has been answered.
+class Flight {
+ public:
+  Flight(const RawBusClient& client, const MakeCall& make) : client_(client), make_(make) {}
+
+  double callsASecond() {
+    constexpr int kInFlight = 32;
+    constexpr int kCalls = 3000;
+    left_ = kCalls;
+    const double seconds = secondsOf([this] {
+      for (int i = 0; i < kInFlight; ++i) send();
+      while (open_ > 0) {
+        if (sd_bus_process(client_.bus(), nullptr) == 0) sd_bus_wait(client_.bus(), UINT64_MAX);
+      }
+    });
+    return kCalls / seconds;
+  }
+
+ private:
+  void send() {
+    --left_;
+    ++open_;
+    const BusMessageRef call = make_(client_);
+    const auto answered = [](sd_bus_message* reply, void* context, sd_bus_error*) {
+      auto& flight = *static_cast<Flight*>(context);
+      if (sd_bus_message_is_method_error(reply, nullptr)) std::terminate();
+      --flight.open_;
+      if (flight.left_ > 0) flight.send();
+      return 0;
+    };
+    if (sd_bus_call_async(client_.bus(), nullptr, call.get(), answered, this, 0) < 0) std::terminate();
+  }
+
+  const RawBusClient& client_;
+  const MakeCall& make_;
+  int left_ = 0;
+  int open_ = 0;
+};
+
+/// Median over clients of connecting and making one call, in seconds.
+double firstCalls(const Programs& programs, const MakeCall& make) {
+  constexpr int kClients = 40;
+  std::vector<double> times;
+  for (int i = 0; i < kClients; ++i) {
+    times.push_back(secondsOf([&] {
+      const RawBusClient client = programs.newClient();
+      answerTo(client, make(client));
+    }));
+  }
+  return quantile(times, 0.5);
+}
+
+/// A cached warranty for each watch, as if downloaded.
+void writeCaches(const Programs& programs, const std::vector<std::string>& serialNumbers) {
+  const Value warranty = *readJSON(coverageAnswer());
+  const std::string bytes = *writePropertyList(warranty, PropertyListEncoding::XML);
+  Value::Dictionary preferences = programs.world.preferences().dictionary();
+  for (const auto& serialNumber : serialNumbers) {
+    programs.world.directory.write(
+        "home/Library/Application Support/com.tarsil.Kavrel/" + sha256Hash(serialNumber) + "_Warranty.plist",
+        bytes);
+    const CacheMetadata metadata(serialNumber);
+    preferences.insert_or_assign(metadata.lastUpdatedDateKey, Date{1'790'000'000});
+    preferences.insert_or_assign(metadata.localeKey, "en_US");
+    preferences.insert_or_assign(metadata.versionKey, kCacheFormatVersion);
+  }
+  programs.world.directory.write("home/Library/Preferences/com.tarsil.kvragent.plist",
+                                 *writePropertyList(preferences, PropertyListEncoding::Binary));
+}
+
+}  // namespace
+
+void lookUp() {
+  Programs programs;
+  startBoth(programs);
+  const RawBusClient client = programs.newClient();
+  const auto series = inTurns(
+      2, [&] { return singleCalls(client, kAgentCall); }, [&] { return singleCalls(client, kBareCall); });
+  printRow({"cached look-up over the bus, p50", "≤ 1.2", "µs", 1e6, 0}, series[0]);
+  printRow({"cached look-up over the bus, p99", "≤ 1.4", "µs", 1e6, 0}, series[1]);
+}
+
+void manyInFlight() {
+  Programs programs;
+  startBoth(programs);
+  const RawBusClient client = programs.newClient();
+  printRow({"the same, 32 in flight, calls a second", "≥ 0.8", "", 1, 0},
+           inTurns([&] { return Flight(client, kAgentCall).callsASecond(); },
+                   [&] { return Flight(client, kBareCall).callsASecond(); }));
+}
+
+void firstCall() {
+  Programs programs;
+  startBoth(programs);
+  printRow({"connect and first call of a new client (bare: an empty call)", "≤ 2.0", "µs", 1e6, 0},
+           inTurns([&] { return firstCalls(programs, kAgentCall); },
+                   [&] { return firstCalls(programs, pingCall); }));
+}
+
+void allInfos() {
+  double before = 0;
+  std::size_t watchesBefore = 0;
+  for (const std::size_t watches : {1U, 10U, 100U, 1000U}) {
+    Programs programs;
+    std::vector<std::string> serialNumbers;
+    for (std::size_t i = 0; i < watches; ++i)
+      serialNumbers.push_back("SNWATCH" + std::to_string(100'000 + i));
+    programs.world.pair(serialNumbers);
+    serialNumbers.emplace_back(AgentWorld::kPhone);
+    writeCaches(programs, serialNumbers);
+    programs.startAgent();
+    const RawBusClient client = programs.newClient();
+    std::vector<double> times;
+    for (int round = 0; round < kRounds + 1; ++round) {
+      Value infos;
+      times.push_back(secondsOf([&] { infos = AgentWorld::allInfos(client, AgentWorld::CacheOnly); }));
+      if (infos.array().size() != watches + 1 || AgentWorld::warrantyIn(infos.array().back()).isNull()) {
+        throw std::runtime_error("the cache does not answer for every watch");
+      }
+    }
+    times.erase(times.begin());
+    const double median = quantile(times, 0.5);
+    const Presentation how{"", "", "ms", 1e3, 2};
+    printRow("all infos from the cache, " + std::to_string(watches) + " watches", shown(how, times), "–",
+             watchesBefore == 0
+                 ? "–"
+                 : number((median - before) * 1e6 / static_cast<double>(watches - watchesBefore), 0) +
+                       " µs a watch more",
+             "linear");
+    before = median;
+    watchesBefore = watches;
+  }
+}
+
+}  // namespace kvr::bench
