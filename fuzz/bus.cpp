@@ -93,7 +93,7 @@ void requireSentOn(const Wire& wire, std::string_view type, const Value& value) 
 
 void run(std::string_view input) {
   static auto wire = std::make_unique<Wire>();
-  constexpr std::size_t kLargest = 64 * 1024;  // what a socket takes at once
+  constexpr std::size_t kLargest = std::size_t{64} * 1024;  // what a socket takes at once
   if (input.empty() || input.size() > kLargest) return;
   const auto type = kTypes[static_cast<unsigned char>(input[0]) % kTypes.size()];
   wire->send(signalWith(type, input.substr(1)));
