@@ -53,7 +53,7 @@ void Invariants::beginProcess(SimulatedPlatform& platform) {
   excuseRuns();
   lastRequest_ = -1e9;
   leftovers_.clear();
-  for (const auto& path : platform.files.list("/")) {
+  for (const auto& path : platform.files.list("")) {
     leftovers_.insert(path);
     checkNames(path);
     const bool isList = path.ends_with(".plist") && path.find("/.") == std::string::npos;

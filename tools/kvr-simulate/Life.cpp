@@ -88,12 +88,15 @@ void Life::runUntil(double time) {
     invariants_.report("no activity spins", error.what());
   }
   if (isBroken()) return;
-  if (simulated.files.isKilled()) {
-    ++(losesPower_ ? invariants_.figures.powerLosses : invariants_.figures.crashes);
-    end(losesPower_, false, world_.dice.oneOf({0.2, 5.0, kHour}));
-  } else if (world_.now < time) {
-    end(false, true, 0.2);
-  }
+  if (!noticeDeath() && world_.now < time) end(false, true, 0.2);
+}
+
+/// Whether the process was cut off from its files, and is over with that.
+bool Life::noticeDeath() {
+  if (!process_ || !process_->simulated.files.isKilled()) return false;
+  ++(losesPower_ ? invariants_.figures.powerLosses : invariants_.figures.crashes);
+  end(losesPower_, false, world_.dice.oneOf({0.2, 5.0, kHour}));
+  return true;
 }
 
 void Life::advanceTo(double time) {
@@ -152,6 +155,7 @@ Outcome Life::live(const std::vector<Event>& events) {
     advanceTo(event.at);
     if (isBroken()) break;
     apply(event);
+    noticeDeath();
     ++happened;
   }
   if (!isBroken()) {

@@ -42,6 +42,7 @@ class Life {
   void end(bool losesPower, bool isStopped, double pause);
   void advanceTo(double time);
   void runUntil(double time);
+  bool noticeDeath();
   void look();
   bool isOver(double time);
   void rest();
