@@ -41,6 +41,9 @@ void write(std::ostream& file, const Value& value, const std::string& key) {
     case Value::Kind::Real:
       open('d') << ' ' << value.real() << '\n';
       return;
+    case Value::Kind::Date:
+      open('(') << ' ' << value.date().secondsSince1970 << '\n';
+      return;
     case Value::Kind::String:
       open('s') << ' ' << value.string() << '\n';
       return;
@@ -132,6 +135,7 @@ void Programs::startBare(const Value& tree) {
   std::vector<std::string> arguments;
   if (!tree.isNull()) {
     std::ostringstream lines;
+    lines.precision(17);
     for (const auto& [key, value] : tree.dictionary()) write(lines, value, key);
     arguments.push_back(world.directory.write("bare-tree", lines.str()).string());
   }
@@ -154,6 +158,16 @@ BusMessageRef infoCall(const RawBusClient& client, std::uint64_t policy) {
 BusMessageRef bareInfoCall(const RawBusClient& client) {
   BusMessageRef call = callOf(client, Programs::kBareName, kBarePath, kBareInterface, "Info");
   sd_bus_message_append(call.get(), "t", std::uint64_t{1});
+  return call;
+}
+
+BusMessageRef allInfosCall(const RawBusClient& client) {
+  return client.newCall("GetAllDeviceInfosUsingPolicy", "tb", {std::uint64_t{AgentWorld::CacheOnly}, false});
+}
+
+BusMessageRef bareAllInfosCall(const RawBusClient& client) {
+  BusMessageRef call = callOf(client, Programs::kBareName, kBarePath, kBareInterface, "Infos");
+  sd_bus_message_append(call.get(), "tb", std::uint64_t{1}, 0);
   return call;
 }
 

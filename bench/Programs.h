@@ -58,6 +58,8 @@ class Programs {
 
 BusMessageRef infoCall(const RawBusClient& client, std::uint64_t policy = AgentWorld::CacheOnly);
 BusMessageRef bareInfoCall(const RawBusClient& client);
+BusMessageRef allInfosCall(const RawBusClient& client);
+BusMessageRef bareAllInfosCall(const RawBusClient& client);
 BusMessageRef pingCall(const RawBusClient& client);
 /// Sends the call and waits; throws what it failed with.
 BusMessageRef answerTo(const RawBusClient& client, const BusMessageRef& call);
