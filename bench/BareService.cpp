@@ -43,8 +43,8 @@ void read(std::istream& file, Node& parent) {
     node.kind = takeWord(line)[0];
     if (parent.kind == '{') node.key = takeWord(line);
     node.text = line;
-    node.number = std::atoll(line.c_str());
-    node.real = std::atof(line.c_str());
+    node.number = std::strtoll(line.c_str(), nullptr, 10);
+    node.real = std::strtod(line.c_str(), nullptr);
     if (node.kind == '{' || node.kind == '[') read(file, node);
   }
 }

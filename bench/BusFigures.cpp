@@ -41,6 +41,7 @@ void startBoth(Programs& programs) {
 std::vector<double> singleCalls(const RawBusClient& client, const MakeCall& make) {
   constexpr int kCalls = 1000;
   std::vector<double> times;
+  times.reserve(kCalls);
   for (int i = 0; i < kCalls; ++i) {
     times.push_back(secondsOf([&] { answerTo(client, make(client)); }));
   }
@@ -90,6 +91,7 @@ class Flight {
 double firstCalls(const Programs& programs, const MakeCall& make) {
   constexpr int kClients = 40;
   std::vector<double> times;
+  times.reserve(kClients);
   for (int i = 0; i < kClients; ++i) {
     times.push_back(secondsOf([&] {
       const RawBusClient client = programs.newClient();

@@ -71,11 +71,22 @@ BusMessageRef callOf(const RawBusClient& client, const char* name, const char* p
   return BusMessageRef(message);
 }
 
+/// The sum of the lines of a process's memory map that begin so, in KiB.
+double memoryNamed(pid_t process, std::string_view beginning) {
+  std::ifstream file("/proc/" + std::to_string(process) + "/smaps_rollup");
+  double sum = 0;
+  for (std::string line; std::getline(file, line);) {
+    if (line.starts_with(beginning)) sum += std::stod(line.substr(line.find(':') + 1));
+  }
+  return sum;
+}
+
 }  // namespace
 
 Program::Program(std::vector<std::string> arguments, std::vector<std::string> environment) {
   const auto pointers = [](std::vector<std::string>& texts) {
     std::vector<char*> result;
+    result.reserve(texts.size() + 1);
     for (std::string& text : texts) result.push_back(text.data());
     result.push_back(nullptr);
     return result;
@@ -181,14 +192,9 @@ BusMessageRef answerTo(const RawBusClient& client, const BusMessageRef& call) {
   return std::move(reply.message);
 }
 
-double privateMemory(pid_t process) {
-  std::ifstream file("/proc/" + std::to_string(process) + "/smaps_rollup");
-  double sum = 0;
-  for (std::string line; std::getline(file, line);) {
-    if (line.starts_with("Private_")) sum += std::stod(line.substr(line.find(':') + 1));
-  }
-  return sum;
-}
+double privateMemory(pid_t process) { return memoryNamed(process, "Private_"); }
+
+double writtenMemory(pid_t process) { return memoryNamed(process, "Private_Dirty:"); }
 
 std::int64_t contextSwitches(pid_t process) {
   std::int64_t sum = 0;

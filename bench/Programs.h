@@ -66,6 +66,8 @@ BusMessageRef answerTo(const RawBusClient& client, const BusMessageRef& call);
 
 /// What a process has in memory for itself alone, in KiB.
 double privateMemory(pid_t process);
+/// What of it the process has written to. The rest is code, which others may share at one time or another.
+double writtenMemory(pid_t process);
 /// How often the threads of a process have been put on and off a processor.
 std::int64_t contextSwitches(pid_t process);
 
