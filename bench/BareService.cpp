@@ -1,8 +1,9 @@
 // The least that can be on the bus: a name, an object, and replies built by sd-bus appends.
 //
 // kvr-bench-bare [TREE]: "Info" replies the dictionary that the file describes, built anew for every call;
-// "Ping" replies nothing. A line of the file is a kind, a key (but in an array) and a value: "s key text",
-// "x key 1", "d key 1.5", "b key 1"; "{ key" and "[ key" open a container, "}" and "]" close it.
+// "Infos" an array of the dictionaries in that one; "Ping" replies nothing. A line of the file is a kind, a
+// key (but in an array) and a value: "s key text", "x key 1", "t key 1", "d key 1.5", "b key 1", "( key 1.5"
+// (a date); "{ key" and "[ key" open a container, "}" and "]" close it.
 
 #include <systemd/sd-bus.h>
 #include <systemd/sd-event.h>
@@ -42,8 +43,8 @@ void read(std::istream& file, Node& parent) {
     node.kind = takeWord(line)[0];
     if (parent.kind == '{') node.key = takeWord(line);
     node.text = line;
-    node.number = std::atoll(line.c_str());
-    node.real = std::atof(line.c_str());
+    node.number = std::strtoll(line.c_str(), nullptr, 10);
+    node.real = std::strtod(line.c_str(), nullptr);
     if (node.kind == '{' || node.kind == '[') read(file, node);
   }
 }
@@ -62,6 +63,8 @@ int appendVariant(sd_bus_message* message, const Node& node) {
       return sd_bus_message_append(message, "v", "d", node.real);
     case 'b':
       return sd_bus_message_append(message, "v", "b", static_cast<int>(node.number));
+    case '(':
+      return sd_bus_message_append(message, "v", "(d)", node.real);
     case '{': {
       int r = sd_bus_message_open_container(message, 'v', "a{sv}");
       if (r >= 0) r = appendDictionary(message, node);
@@ -101,12 +104,26 @@ int handleInfo(sd_bus_message* call, void* userdata, sd_bus_error*) {
   return r;
 }
 
+int handleInfos(sd_bus_message* call, void* userdata, sd_bus_error*) {
+  sd_bus_message* reply = nullptr;
+  int r = sd_bus_message_new_method_return(call, &reply);
+  if (r >= 0) r = sd_bus_message_open_container(reply, 'a', "a{sv}");
+  for (const Node& child : static_cast<const Node*>(userdata)->children) {
+    if (r >= 0) r = appendDictionary(reply, child);
+  }
+  if (r >= 0) r = sd_bus_message_close_container(reply);
+  if (r >= 0) r = sd_bus_send(nullptr, reply, nullptr);
+  sd_bus_message_unref(reply);
+  return r;
+}
+
 int handlePing(sd_bus_message* call, void*, sd_bus_error*) { return sd_bus_reply_method_return(call, ""); }
 
 #pragma GCC diagnostic push
 #pragma GCC diagnostic ignored "-Wpedantic"  // the macros of sd-bus-vtable.h
 const sd_bus_vtable kMethods[] = {
     SD_BUS_VTABLE_START(0), SD_BUS_METHOD("Info", "t", "a{sv}", handleInfo, SD_BUS_VTABLE_UNPRIVILEGED),
+    SD_BUS_METHOD("Infos", "tb", "aa{sv}", handleInfos, SD_BUS_VTABLE_UNPRIVILEGED),
     SD_BUS_METHOD("Ping", "", "", handlePing, SD_BUS_VTABLE_UNPRIVILEGED), SD_BUS_VTABLE_END};
 #pragma GCC diagnostic pop
 

@@ -41,6 +41,7 @@ void startBoth(Programs& programs) {
 std::vector<double> singleCalls(const RawBusClient& client, const MakeCall& make) {
   constexpr int kCalls = 1000;
   std::vector<double> times;
+  times.reserve(kCalls);
   for (int i = 0; i < kCalls; ++i) {
     times.push_back(secondsOf([&] { answerTo(client, make(client)); }));
   }
@@ -90,6 +91,7 @@ class Flight {
 double firstCalls(const Programs& programs, const MakeCall& make) {
   constexpr int kClients = 40;
   std::vector<double> times;
+  times.reserve(kClients);
   for (int i = 0; i < kClients; ++i) {
     times.push_back(secondsOf([&] {
       const RawBusClient client = programs.newClient();
@@ -159,23 +161,23 @@ void allInfos() {
     writeCaches(programs, serialNumbers);
     programs.startAgent();
     const RawBusClient client = programs.newClient();
-    std::vector<double> times;
-    for (int round = 0; round < kRounds + 1; ++round) {
-      Value infos;
-      times.push_back(secondsOf([&] { infos = AgentWorld::allInfos(client, AgentWorld::CacheOnly); }));
-      if (infos.array().size() != watches + 1 || AgentWorld::warrantyIn(infos.array().back()).isNull()) {
-        throw std::runtime_error("the cache does not answer for every watch");
-      }
+    const Value infos = AgentWorld::allInfos(client, AgentWorld::CacheOnly);
+    if (infos.array().size() != watches + 1 || AgentWorld::warrantyIn(infos.array().back()).isNull()) {
+      throw std::runtime_error("the cache does not answer for every watch");
     }
-    times.erase(times.begin());
-    const double median = quantile(times, 0.5);
-    const Presentation how{"", "", "ms", 1e3, 2};
-    printRow("all infos from the cache, " + std::to_string(watches) + " watches", shown(how, times), "–",
-             watchesBefore == 0
-                 ? "–"
-                 : number((median - before) * 1e6 / static_cast<double>(watches - watchesBefore), 0) +
-                       " µs a watch more",
-             "linear");
+    Value::Dictionary tree;
+    for (std::size_t i = 0; i <= watches; ++i) tree.emplace(std::to_string(i), infos.array()[i]);
+    programs.startBare(tree);
+    const auto series =
+        inTurns([&] { return secondsOf([&] { answerTo(client, allInfosCall(client)); }); },
+                [&] { return secondsOf([&] { answerTo(client, bareAllInfosCall(client)); }); });
+    const double median = quantile(series.agent, 0.5);
+    const double slope = (median - before) * 1e6 / static_cast<double>(watches - watchesBefore);
+    const std::string goal =
+        watchesBefore == 0 ? "linear" : "linear; " + number(slope, 0) + " µs a watch more";
+    printRow({"all infos from the cache, " + std::to_string(watches) + (watches == 1 ? " watch" : " watches"),
+              goal, "ms", 1e3, 2},
+             series);
     before = median;
     watchesBefore = watches;
   }

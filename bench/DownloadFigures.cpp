@@ -104,6 +104,7 @@ double stored(Platform& platform, const Canned& canned) {
 
 double medianOf(int runs, const std::function<double()>& once) {
   std::vector<double> times;
+  times.reserve(static_cast<std::size_t>(runs));
   for (int i = 0; i < runs; ++i) times.push_back(once());
   return quantile(times, 0.5);
 }
@@ -190,6 +191,7 @@ void refresh() {
   constexpr int kWatches = 50;
   Programs programs;
   std::vector<std::string> serialNumbers;
+  serialNumbers.reserve(kWatches);
   for (int i = 0; i < kWatches; ++i) serialNumbers.push_back("SNWATCH" + std::to_string(100'000 + i));
   programs.world.pair(serialNumbers);
   programs.startAgent();

@@ -41,6 +41,9 @@ void write(std::ostream& file, const Value& value, const std::string& key) {
     case Value::Kind::Real:
       open('d') << ' ' << value.real() << '\n';
       return;
+    case Value::Kind::Date:
+      open('(') << ' ' << value.date().secondsSince1970 << '\n';
+      return;
     case Value::Kind::String:
       open('s') << ' ' << value.string() << '\n';
       return;
@@ -68,11 +71,22 @@ BusMessageRef callOf(const RawBusClient& client, const char* name, const char* p
   return BusMessageRef(message);
 }
 
+/// The sum of the lines of a process's memory map that begin so, in KiB.
+double memoryNamed(pid_t process, std::string_view beginning) {
+  std::ifstream file("/proc/" + std::to_string(process) + "/smaps_rollup");
+  double sum = 0;
+  for (std::string line; std::getline(file, line);) {
+    if (line.starts_with(beginning)) sum += std::stod(line.substr(line.find(':') + 1));
+  }
+  return sum;
+}
+
 }  // namespace
 
 Program::Program(std::vector<std::string> arguments, std::vector<std::string> environment) {
   const auto pointers = [](std::vector<std::string>& texts) {
     std::vector<char*> result;
+    result.reserve(texts.size() + 1);
     for (std::string& text : texts) result.push_back(text.data());
     result.push_back(nullptr);
     return result;
@@ -132,6 +146,7 @@ void Programs::startBare(const Value& tree) {
   std::vector<std::string> arguments;
   if (!tree.isNull()) {
     std::ostringstream lines;
+    lines.precision(17);
     for (const auto& [key, value] : tree.dictionary()) write(lines, value, key);
     arguments.push_back(world.directory.write("bare-tree", lines.str()).string());
   }
@@ -157,6 +172,16 @@ BusMessageRef bareInfoCall(const RawBusClient& client) {
   return call;
 }
 
+BusMessageRef allInfosCall(const RawBusClient& client) {
+  return client.newCall("GetAllDeviceInfosUsingPolicy", "tb", {std::uint64_t{AgentWorld::CacheOnly}, false});
+}
+
+BusMessageRef bareAllInfosCall(const RawBusClient& client) {
+  BusMessageRef call = callOf(client, Programs::kBareName, kBarePath, kBareInterface, "Infos");
+  sd_bus_message_append(call.get(), "tb", std::uint64_t{1}, 0);
+  return call;
+}
+
 BusMessageRef pingCall(const RawBusClient& client) {
   return callOf(client, Programs::kBareName, kBarePath, kBareInterface, "Ping");
 }
@@ -167,14 +192,9 @@ BusMessageRef answerTo(const RawBusClient& client, const BusMessageRef& call) {
   return std::move(reply.message);
 }
 
-double privateMemory(pid_t process) {
-  std::ifstream file("/proc/" + std::to_string(process) + "/smaps_rollup");
-  double sum = 0;
-  for (std::string line; std::getline(file, line);) {
-    if (line.starts_with("Private_")) sum += std::stod(line.substr(line.find(':') + 1));
-  }
-  return sum;
-}
+double privateMemory(pid_t process) { return memoryNamed(process, "Private_"); }
+
+double writtenMemory(pid_t process) { return memoryNamed(process, "Private_Dirty:"); }
 
 std::int64_t contextSwitches(pid_t process) {
   std::int64_t sum = 0;

@@ -58,12 +58,16 @@ class Programs {
 
 BusMessageRef infoCall(const RawBusClient& client, std::uint64_t policy = AgentWorld::CacheOnly);
 BusMessageRef bareInfoCall(const RawBusClient& client);
+BusMessageRef allInfosCall(const RawBusClient& client);
+BusMessageRef bareAllInfosCall(const RawBusClient& client);
 BusMessageRef pingCall(const RawBusClient& client);
 /// Sends the call and waits; throws what it failed with.
 BusMessageRef answerTo(const RawBusClient& client, const BusMessageRef& call);
 
 /// What a process has in memory for itself alone, in KiB.
 double privateMemory(pid_t process);
+/// What of it the process has written to. The rest is code, which others may share at one time or another.
+double writtenMemory(pid_t process);
 /// How often the threads of a process have been put on and off a processor.
 std::int64_t contextSwitches(pid_t process);
 

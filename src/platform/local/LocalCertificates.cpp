@@ -161,6 +161,12 @@ Verdict verify(const Certificate& certificate, const Certificate& authority, Dat
   }
 }
 
+bool isInDate(const Certificate& certificate, Date now) {
+  std::time_t time = secondsOf(now);
+  return X509_cmp_time(X509_get0_notBefore(certificate.get()), &time) < 0 &&
+         X509_cmp_time(X509_get0_notAfter(certificate.get()), &time) > 0;
+}
+
 Result<std::string> sign(const Key& key, std::string_view message) {
   const auto* bytes = reinterpret_cast<const unsigned char*>(message.data());
   const DigestContextHandle context(EVP_MD_CTX_new());

@@ -45,6 +45,9 @@ enum class Verdict { Good, OutOfDate, Bad };
 /// Whether `authority` (trusted) issued `certificate` for signing, as of `now`.
 Verdict verify(const openssl::Certificate& certificate, const openssl::Certificate& authority, Date now);
 
+/// Whether a certificate that was verified once is within its dates as of `now`.
+bool isInDate(const openssl::Certificate& certificate, Date now);
+
 /// The signature of a message: ECDSA with SHA-256, in DER form.
 Result<std::string> sign(const openssl::Key& key, std::string_view message);
 

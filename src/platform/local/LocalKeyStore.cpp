@@ -39,12 +39,14 @@ Result<AttestedCredentials> LocalKeyStore::credentialsFor(const Request& request
     return Error{"keys", EINVAL, "label, kind or validity is out of bounds"};
   }
   const auto directory = files_.homeDirectory() + "/Library/Keys/" + request.label;
+  if (auto held = heldCredentials(directory, request)) return *std::move(held);
   if (auto error = files_.createDirectory(directory)) return *error;
   const auto lock = files_.lock(directory);
 
+  const auto base = directory + "/" + request.kind;
+  auto stamps = stampsOf(directory, base);
   const auto authority = authorityIn(directory);
   if (!authority) return authority.error();
-  const auto base = directory + "/" + request.kind;
   std::optional<CertifiedKey> leaf;
   if (!authority->isNew) {
     const auto kept = keptLeaf(base, request, authority->pair.certificate);
@@ -52,6 +54,7 @@ Result<AttestedCredentials> LocalKeyStore::credentialsFor(const Request& request
     leaf = *kept;
   }
   if (!leaf) {
+    stamps.reset();
     const auto issued = issueLeaf(base, request, authority->pair);
     if (!issued) return issued.error();
     leaf = *issued;
@@ -61,7 +64,42 @@ Result<AttestedCredentials> LocalKeyStore::credentialsFor(const Request& request
   if (!leafBytes) return leafBytes.error();
   const auto issuerBytes = derOf(authority->pair.certificate);
   if (!issuerBytes) return issuerBytes.error();
-  return AttestedCredentials{std::make_shared<LocalAttestedKey>(leaf->key), *leafBytes, *issuerBytes};
+  AttestedCredentials credentials{std::make_shared<LocalAttestedKey>(leaf->key), *leafBytes, *issuerBytes};
+  const std::lock_guard own(mutex_);
+  held_.erase(base);
+  if (stamps) {
+    held_.emplace(base,
+                  Held{*std::move(stamps), credentials, leaf->certificate, authority->pair.certificate});
+  }
+  return credentials;
+}
+
+std::optional<AttestedCredentials> LocalKeyStore::heldCredentials(const std::string& directory,
+                                                                  const Request& request) {
+  const auto base = directory + "/" + request.kind;
+  const auto stamps = stampsOf(directory, base);
+  const auto now = clock_.now();
+  const std::lock_guard own(mutex_);
+  const auto found = held_.find(base);
+  if (found == held_.end() || stamps != found->second.stamps) return std::nullopt;
+  const auto& [ignored, credentials, leaf, authority] = found->second;
+  if (!isInDate(leaf, now) || !isInDate(authority, now) || !hasSubject(leaf, request.subject)) {
+    return std::nullopt;
+  }
+  return credentials;
+}
+
+std::optional<std::vector<FileStamp>> LocalKeyStore::stampsOf(const std::string& directory,
+                                                              const std::string& base) {
+  std::vector<FileStamp> stamps;
+  for (const auto& pair : {directory + "/authority", base}) {
+    for (const auto& path : {keyPath(pair), certificatePath(pair)}) {
+      const auto stamp = files_.stamp(path);
+      if (!stamp || !stamp->settled) return std::nullopt;
+      stamps.push_back(*stamp);
+    }
+  }
+  return stamps;
 }
 
 Result<LocalKeyStore::Authority> LocalKeyStore::authorityIn(const std::string& directory) {

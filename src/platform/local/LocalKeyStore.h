@@ -11,6 +11,7 @@
 #include <mutex>
 #include <optional>
 #include <string>
+#include <vector>
 
 namespace kvr {
 
@@ -27,7 +28,9 @@ struct AttestedCredentials {
 ///
 /// What is asked for is issued once and answered from there until it is out of date or the device is no
 /// longer what it attests. A file that is missing is made anew; so is one that is damaged or does not match
-/// the others, after it was reported once at error level. Any thread, and any number of processes.
+/// the others, after it was reported once at error level. What was read and verified is held, and answered
+/// without reading it again, for as long as none of its files has changed. Any thread, and any number of
+/// processes.
 class LocalKeyStore {
  public:
   struct Request {
@@ -48,11 +51,21 @@ class LocalKeyStore {
     openssl::Key key;
     std::vector<openssl::Certificate> certificates;
   };
+  /// What was answered from files, and the stamps they had.
+  struct Held {
+    std::vector<FileStamp> stamps;
+    AttestedCredentials credentials;
+    openssl::Certificate leaf;
+    openssl::Certificate authority;
+  };
   struct Authority {
     CertifiedKey pair;
     bool isNew;
   };
 
+  std::optional<AttestedCredentials> heldCredentials(const std::string& directory, const Request& request);
+  /// The stamps of all files that belong to a key; nothing while one is missing or too young.
+  std::optional<std::vector<FileStamp>> stampsOf(const std::string& directory, const std::string& base);
   Result<Authority> authorityIn(const std::string& directory);
   Result<std::optional<CertifiedKey>> keptLeaf(const std::string& base, const Request& request,
                                                const openssl::Certificate& authority);
@@ -69,6 +82,7 @@ class LocalKeyStore {
   Log& log_;
   std::mutex mutex_;  ///< guards what follows
   std::map<std::string, FileStamp> reported_;
+  std::map<std::string, Held> held_;  ///< by the path of the key's files
 };
 
 }  // namespace kvr
