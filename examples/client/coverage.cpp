@@ -22,8 +22,8 @@ int main() {
   }
   for (const auto& info : *infos) {
     const auto coverage = Coverage::from(info.warranty);
-    std::printf("%s: %s\n", info.device.name.value_or("unnamed").c_str(),
-                coverage.isCovered ? coverage.label.value_or("covered").c_str()
-                                   : "not covered, as far as is known");
+    std::printf(
+        "%s: %s\n", info.device.name.value_or("unnamed").c_str(),
+        coverage.isCovered ? coverage.label.value_or("covered").c_str() : "not covered, as far as is known");
   }
 }
