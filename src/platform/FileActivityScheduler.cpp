@@ -116,9 +116,9 @@ void FileActivityScheduler::checkIn(const Handle& handle, ActivityBlock block) {
   if (identifier == occasions_.afterUpgrade) version = device_.answer(DeviceProperties::kProductVersion);
   bool changed = false;
   ActivityBlock replaced;
+  load();
   {
     const std::lock_guard lock(mutex_);
-    load();
     if (expected && !table_.isRegisteredFor(identifier, expected->date, now())) {
       replaced = table_.add(identifier, expected->criteria, std::move(block), now(), fraction);
       changed = true;
@@ -138,9 +138,9 @@ void FileActivityScheduler::checkIn(const Handle& handle, ActivityBlock block) {
 void FileActivityScheduler::registerAnew(const Handle& handle, ActivityBlock block) {
   const double fraction = draw();
   ActivityBlock replaced;
+  load();
   {
     const std::lock_guard lock(mutex_);
-    load();
     replaced = table_.add(handle.identifier(), handle.criteria(), std::move(block), now(), fraction);
   }
   save();
@@ -232,14 +232,16 @@ void FileActivityScheduler::end(const std::string& identifier, std::uint64_t num
 
 // The file.
 
-/// With the mutex held.
+/// Without the mutex: a damaged file is set aside under the file's lock, and writing takes that one first.
 void FileActivityScheduler::load() {
-  if (std::exchange(loaded_, true)) return;
-  const bool isThere = lists_.files().stamp(path_).has_value();
-  const auto tree = lists_.read(path_, kDictionary, kSetAside, ActivityTable::complaintAbout);
-  unreadable_ = !tree;
-  registrationsLost_ = unreadable_ || (isThere && tree->isNull());
-  if (tree) table_.adopt(*tree);
+  std::call_once(loaded_, [this] {
+    const bool isThere = lists_.files().stamp(path_).has_value();
+    const auto tree = lists_.read(path_, kDictionary, kSetAside, ActivityTable::complaintAbout);
+    const std::lock_guard lock(mutex_);
+    unreadable_ = !tree;
+    registrationsLost_ = unreadable_ || (isThere && tree->isNull());
+    if (tree) table_.adopt(*tree);
+  });
 }
 
 void FileActivityScheduler::save() {

@@ -91,7 +91,7 @@ class FileActivityScheduler : public ActivityScheduler {
   std::mutex saving_;         ///< held while the file is written; taken before `mutex_`
   mutable std::mutex mutex_;  ///< guards what follows
   ActivityTable table_;
-  bool loaded_ = false;
+  std::once_flag loaded_;
   bool unreadable_ = false;  ///< the file, so far: nothing may be written in its place
   bool registrationsLost_ = false;
   bool networkReachable_ = true;
