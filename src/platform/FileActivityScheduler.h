@@ -88,10 +88,10 @@ class FileActivityScheduler : public ActivityScheduler {
   const std::string path_;
   const ActivityOccasions occasions_;
 
+  std::once_flag loaded_;     ///< the file, before anything else is done with the table
   std::mutex saving_;         ///< held while the file is written; taken before `mutex_`
   mutable std::mutex mutex_;  ///< guards what follows
   ActivityTable table_;
-  std::once_flag loaded_;
   bool unreadable_ = false;  ///< the file, so far: nothing may be written in its place
   bool registrationsLost_ = false;
   bool networkReachable_ = true;
