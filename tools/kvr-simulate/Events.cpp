@@ -60,9 +60,11 @@ const char* nameOf(EventKind kind) {
 std::vector<Event> eventsOf(std::uint64_t seed, double years) {
   Dice dice(seed);
   std::vector<Event> events;
-  for (double at = drawGap(dice); at < years * kYear; at += drawGap(dice)) {
+  double at = drawGap(dice);
+  while (at < years * kYear) {
     const auto kind = drawKind(dice);
     events.push_back({events.size(), at, kind, dice.number()});
+    at += drawGap(dice);
   }
   return events;
 }

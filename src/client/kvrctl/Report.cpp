@@ -8,7 +8,7 @@ namespace kvr::client {
 namespace {
 
 constexpr std::size_t kShownSerialCharacters = 4;
-constexpr int kDaySeconds = 86400;
+constexpr long long kDaySeconds = 86400;
 
 void appendWarranty(std::vector<std::pair<std::string, std::string>>& lines, const Value& warranty) {
   if (warranty.isNull()) {
@@ -33,7 +33,7 @@ void appendWarranty(std::vector<std::pair<std::string, std::string>>& lines, con
 
 /// Whole days from one date to another, rounded up; "0" for one that has passed.
 std::string daysBetween(Date from, Date until) {
-  const Date days{std::ceil((until - from) / kDaySeconds)};
+  const Date days{std::ceil((until - from) / static_cast<double>(kDaySeconds))};
   return isInCalendar(days) ? std::to_string(std::max(0LL, static_cast<long long>(days.secondsSince1970)))
                             : "";
 }
