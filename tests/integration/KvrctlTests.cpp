@@ -42,10 +42,9 @@ class Kvrctl : public BusFixture {
 
   ChildProcess start(std::vector<std::string> arguments) {
     arguments.insert(arguments.begin(), kProgram);
-    return ChildProcess(std::move(arguments), {{"DBUS_SESSION_BUS_ADDRESS", bus.address()},
-                                               {"HOME", home_.path()},
-                                               {"LC_ALL", "C"},
-                                               {"TZ", "UTC"}});
+    return ChildProcess(
+        std::move(arguments),
+        {{"DBUS_SESSION_BUS_ADDRESS", bus.address()}, {"HOME", home.path()}, {"LC_ALL", "C"}, {"TZ", "UTC"}});
   }
   static Outcome outcomeOf(ChildProcess& program) {
     const int status = program.wait();
@@ -75,6 +74,7 @@ class Kvrctl : public BusFixture {
   }
 
   static constexpr const char* kProgram = KVR_PROGRAMS "/kvrctl";
+  const TemporaryDirectory home;
 
  private:
   mutable std::mutex mutex_;
@@ -83,7 +83,6 @@ class Kvrctl : public BusFixture {
   std::string heldMember_;
   std::promise<void> isHeld_;
   std::vector<ServiceReply> held_;
-  const TemporaryDirectory home_;
 };
 
 Value device(const std::string& name) {
@@ -156,7 +155,11 @@ TEST_F(Kvrctl, TellsWhyItGotNoAnswerAndWhatHelps) {
   unanswered.wait();
   serving.reset();
   EXPECT_THAT(outcomeOf(waiting), IsFailure(3, HasSubstr("cannot be reached")));
+  auto monitor = start({"monitor"});
+  monitor.waitForOutput("watching");
   bus.kill();
+  EXPECT_EQ(monitor.wait(), 3);
+  EXPECT_THAT(monitor.errorOutput(), HasSubstr("the session bus has gone"));
   EXPECT_THAT(run({"device"}), IsFailure(3, HasSubstr("DBUS_SESSION_BUS_ADDRESS")));
 }
 
@@ -196,6 +199,22 @@ TEST_F(Kvrctl, WritesOneDocumentWithAVersionWhateverItIsAsked) {
   ASSERT_TRUE(told);
   EXPECT_EQ((*told)["event"]["event"], Value("posted"));
   EXPECT_EQ(monitor.terminate(), 0);
+}
+
+TEST_F(Kvrctl, TellsOfAnActivityHowItEndedAndWhatItWaitsFor) {
+  home.write("Library/Activities/com.tarsil.kvragent.plist",
+             "<plist><dict><key>activities</key><dict><key>late</key><dict><key>dueDate</key>"
+             "<date>2026-01-01T00:00:00Z</date></dict></dict><key>lastRuns</key><dict>"
+             "<key>late</key><dict><key>result</key><string>deferred</string></dict>"
+             "<key>over</key><dict><key>result</key><string>finished</string></dict></dict></dict></plist>");
+  const auto document = readJSON(run({"activities", "--json"}).output);
+  ASSERT_TRUE(document);
+  const auto& activities = (*document)["activities"].array();
+  ASSERT_EQ(activities.size(), 2U);
+  EXPECT_EQ(activities[0]["lastResult"], Value("deferred"));
+  EXPECT_EQ(activities[0]["waitsFor"], Value("the agent, to start"));
+  EXPECT_EQ(activities[1]["lastResult"], Value("finished"));
+  EXPECT_TRUE(activities[1]["waitsFor"].isNull());
 }
 
 TEST_F(Kvrctl, PrintsTextThatCannotCommandATerminal) {

@@ -194,7 +194,8 @@ Status monitor(const Report& report, bool inJSON) {
   teller.tell("monitor", "", "watching");
   const int status = loop.run();
   sd_bus_detach_event(opened);
-  return status == EXIT_SUCCESS ? kFine : kUnreachable;
+  if (status == EXIT_SUCCESS) return kFine;
+  return fail({std::string(kErrorDomain), NoBus, "the session bus has gone"});
 }
 
 }  // namespace kvr::client
