@@ -9,7 +9,9 @@
 #include "platform/local/LocalDeviceProperties.h"
 #include "platform/local/LocalEntitlements.h"
 #include "platform/local/LocalFeatureFlags.h"
+#include "platform/local/LocalNetwork.h"
 #include "platform/local/LocalPairedDeviceRegistry.h"
+#include "platform/local/LocalProcesses.h"
 #include "platform/local/LocalStore.h"
 #include "platform/local/LocalStringTables.h"
 #include "platform/local/LocalUserLocale.h"
@@ -46,6 +48,7 @@ struct Device {
   LocalCarrierInfo carriers{root};
   LocalDeviceAttestation attestation{root, properties, files, clock, log};
   LocalStringTables tables{root, locale, "/nowhere"};
+  LocalProcesses processes{lists};
 
   void ask();
   void askAccounts();
@@ -63,6 +66,8 @@ void Device::ask() {
   static_cast<void>(applications.installedApplication("com.tarsil.supportapp"));
   static_cast<void>(attestation.isSupported());
   static_cast<void>(entitlements.valueFor({1, 2}, "com.tarsil.private.kvragent"));
+  static_cast<void>(LocalNetwork::isReachable(root.dictionary("Network.plist"), "/nowhere"));
+  static_cast<void>(processes.bundleAt(directory.path().string()));
   const auto language = locale.preferredIdentifier();
   require(!language.empty() && language.find('/') == std::string::npos, "a locale can be part of a path");
   static_cast<void>(tables.localizedString("KavrelUI", "Localizable", "KEY", "default"));
@@ -97,10 +102,17 @@ void Device::askAccounts() {
 
 void run(std::string_view input) {
   static Device device;
-  const std::vector<std::string> dictionaries = {
-      "Accounts.plist",         "Applications.plist", "Attestation.plist",
-      "DeviceProperties.plist", "Entitlements.plist", "FeatureFlags.plist",
-      "Locale.plist",           "Store.plist",        "Resources/KavrelUI/en/Localizable.plist"};
+  const std::vector<std::string> dictionaries = {"Accounts.plist",
+                                                 "Applications.plist",
+                                                 "Attestation.plist",
+                                                 "DeviceProperties.plist",
+                                                 "Entitlements.plist",
+                                                 "FeatureFlags.plist",
+                                                 "Info.plist",
+                                                 "Locale.plist",
+                                                 "Network.plist",
+                                                 "Store.plist",
+                                                 "Resources/KavrelUI/en/Localizable.plist"};
   const std::vector<std::string> arrays = {"Carriers.plist", "PairedDevices.plist"};
   for (const auto* names : {&dictionaries, &arrays}) {
     for (const auto& name : *names) device.files.put(device.root.pathOf(name), std::string(input));

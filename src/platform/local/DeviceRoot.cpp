@@ -38,6 +38,14 @@ std::optional<std::string> distrustOf(const std::string& path) {
   return std::nullopt;
 }
 
+/// Whether `resolved` is the file, not a link, that `given` leads to.
+bool isSameFile(const std::string& given, const std::string& resolved) {
+  struct stat one {};
+  struct stat other {};
+  return ::stat(given.c_str(), &one) == 0 && ::lstat(resolved.c_str(), &other) == 0 &&
+         one.st_dev == other.st_dev && one.st_ino == other.st_ino;
+}
+
 }  // namespace
 
 std::string DeviceRoot::directoryFromEnvironment() {
@@ -61,17 +69,29 @@ Value DeviceRoot::array(std::string_view file) const {
 Value DeviceRoot::trustedDictionary(std::string_view file) const {
   // A symbolic link is followed first, so that what is examined is what is read.
   std::error_code error;
-  const auto path = std::filesystem::canonical(pathOf(file), error);
+  const auto path = resolved(file, error);
   if (error == std::errc::no_such_file_or_directory) return {};
   if (error) return dictionary(file);  // which cannot be read either, and says why
-  if (!isTrusted(path.string())) return {};
-  auto tree = lists_.read(path.string(), PropertyListFiles::Expected::Dictionary, kLeave);
+  if (!isTrusted(path)) return {};
+  auto tree = lists_.read(path, PropertyListFiles::Expected::Dictionary, kLeave);
   return tree ? *std::move(tree) : Value();
+}
+
+/// The file's path without symbolic links. A path found earlier holds as long as it is no link itself and
+/// leads to the same file.
+std::string DeviceRoot::resolved(std::string_view file, std::error_code& error) const {
+  const auto given = pathOf(file);
+  const std::lock_guard lock(mutex_);
+  auto& found = resolved_[given];
+  if (!found.empty() && isSameFile(given, found)) return found;
+  found = std::filesystem::canonical(given, error).string();
+  return found;
 }
 
 bool DeviceRoot::isTrusted(const std::string& path) const {
   auto reason = distrustOf(directory_);
-  if (!reason) reason = distrustOf(std::filesystem::path(path).parent_path().string());
+  const auto parent = path.substr(0, path.rfind('/'));
+  if (!reason && parent != directory_) reason = distrustOf(parent.empty() ? "/" : parent);
   if (!reason) reason = distrustOf(path);
   const std::lock_guard lock(mutex_);
   if (!reason) {

@@ -6,6 +6,7 @@
 #include <mutex>
 #include <string>
 #include <string_view>
+#include <system_error>
 
 namespace kvr {
 
@@ -34,12 +35,14 @@ class DeviceRoot {
   PropertyListFiles& lists() const { return lists_; }
 
  private:
+  std::string resolved(std::string_view file, std::error_code& error) const;
   bool isTrusted(const std::string& path) const;
 
   PropertyListFiles& lists_;
   Log& log_;
   const std::string directory_;
   mutable std::mutex mutex_;
+  mutable std::map<std::string, std::string> resolved_;  ///< by path as given
   mutable std::map<std::string, std::string> distrust_;  ///< why, by the path of each file that is ignored
 };
 

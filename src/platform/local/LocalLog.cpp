@@ -3,14 +3,15 @@
 #define SD_JOURNAL_SUPPRESS_LOCATION
 #include <poll.h>
 #include <sys/stat.h>
+#include <sys/sysmacros.h>
 #include <sys/uio.h>
 #include <systemd/sd-journal.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <charconv>
-#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <ctime>
@@ -59,14 +60,35 @@ bool leadsToJournal(int descriptor) {
   return environment("JOURNAL_STREAM") == std::to_string(status.st_dev) + ":" + std::to_string(status.st_ino);
 }
 
-std::string timestamp() {
+/// A line waits for the reader of a terminal, a pipe or a socket; a file and the null device take it at once.
+bool mayBlock(int descriptor) {
+  struct stat status {};
+  if (::fstat(descriptor, &status) != 0) return true;
+  const bool isNull = S_ISCHR(status.st_mode) && ::major(status.st_rdev) == 1 && ::minor(status.st_rdev) == 3;
+  return !S_ISREG(status.st_mode) && !isNull;
+}
+
+void appendNumber(std::string& text, long long number, std::size_t width) {
+  std::array<char, 24> digits{};
+  auto* const end = std::to_chars(digits.data(), digits.data() + digits.size(), number).ptr;
+  const auto count = static_cast<std::size_t>(end - digits.data());
+  if (count < width) text.append(width - count, '0');
+  text.append(digits.data(), count);
+}
+
+/// "2026-11-24T16:04:43.012345Z"
+void appendTimestamp(std::string& line) {
   timespec now{};
   ::clock_gettime(CLOCK_REALTIME, &now);
   const auto time = calendarTime(now.tv_sec);
-  char text[120];
-  std::snprintf(text, sizeof text, "%04lld-%02d-%02dT%02d:%02d:%02d.%06ldZ", time.year, time.month, time.day,
-                time.hour, time.minute, time.second, now.tv_nsec / 1000);
-  return text;
+  appendNumber(line, time.year, 4);
+  appendNumber(line += '-', time.month, 2);
+  appendNumber(line += '-', time.day, 2);
+  appendNumber(line += 'T', time.hour, 2);
+  appendNumber(line += ':', time.minute, 2);
+  appendNumber(line += ':', time.second, 2);
+  appendNumber(line += '.', now.tv_nsec / 1000, 6);
+  line += 'Z';
 }
 
 /// Line breaks as \n and \r; other control characters, and Unicode's own line breaks, as \xNN a byte.
@@ -78,7 +100,13 @@ void appendEscaped(std::string& line, std::string_view message) {
     line += kDigits[byte >> 4U];
     line += kDigits[byte & 0xFU];
   };
+  const auto isPlain = [](char c) { return c >= ' ' && c <= '~'; };
   for (std::size_t at = 0; at < message.size(); ++at) {
+    const auto* const run = message.data() + at;
+    const auto* const end = std::find_if_not(run, message.data() + message.size(), isPlain);
+    line.append(run, end);
+    at += static_cast<std::size_t>(end - run);
+    if (at == message.size()) break;
     const char c = message[at];
     const auto rest = message.substr(at);
     if (c == '\n') {
@@ -121,7 +149,7 @@ std::unique_ptr<LocalLog> LocalLog::fromEnvironment() {
 }
 
 LocalLog::LocalLog(LogLevel least, bool revealPrivate, Sink sink, int descriptor)
-    : Log(least, revealPrivate), sink_(sink), descriptor_(descriptor) {}
+    : Log(least, revealPrivate), sink_(sink), descriptor_(descriptor), mayBlock_(mayBlock(descriptor)) {}
 
 void LocalLog::write(LogLevel level, const std::string& message) {
   if (sink_ == Sink::Journal && sendToJournal(level, message)) return;
@@ -129,8 +157,9 @@ void LocalLog::write(LogLevel level, const std::string& message) {
 }
 
 void LocalLog::writeLine(LogLevel level, const std::string& message) {
-  std::string line = timestamp();
-  line.reserve(line.size() + message.size() + 64);
+  std::string line;
+  line.reserve(message.size() + 96);
+  appendTimestamp(line);
   line.append(" ").append(nameOf(level)).append(" ");
   line.append(kSubsystem).append(":").append(kCategory).append(" ");
   appendEscaped(line, message);
@@ -147,6 +176,7 @@ void LocalLog::writeLine(LogLevel level, const std::string& message) {
 /// Whether the reader takes lines. One that takes none for a while costs lines, not the agent's time: it is
 /// waited for again only after it has taken one.
 bool LocalLog::isReady() {
+  if (!mayBlock_) return true;
   pollfd state{descriptor_, POLLOUT, 0};
   const bool ready = ::poll(&state, 1, stuck_ ? 0 : kPatienceMilliseconds) != 0;
   stuck_ = !ready;

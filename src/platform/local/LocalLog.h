@@ -30,6 +30,7 @@ class LocalLog : public Log {
 
   const Sink sink_;
   const int descriptor_;
+  const bool mayBlock_;
   std::atomic<bool> stuck_{false};  ///< nobody took the last line
 };
 
