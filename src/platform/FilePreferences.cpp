@@ -15,6 +15,13 @@ bool isUsable(std::string_view domain) {
          domain.find('\0') == std::string_view::npos && domain.find("..") == std::string_view::npos;
 }
 
+/// "one, another"
+std::string keysOf(const Value::Dictionary& values) {
+  std::string keys;
+  for (const auto& [key, value] : values) keys.append(keys.empty() ? "" : ", ").append(key);
+  return keys;
+}
+
 }  // namespace
 
 FilePreferences::FilePreferences(PropertyListFiles& lists, Log& log, const std::string& standardDomain)
@@ -54,14 +61,14 @@ void FilePreferences::setObjects(const Value::Dictionary& values) {
   const auto lock = lists_.files().lock(directory_);
   const auto stored = lists_.read(standardPath_, kDictionary, kSetAside);
   if (!stored) {
-    for (const auto& [key, value] : values) reportUnchanged(key, stored.error());
+    reportUnchanged(keysOf(values), stored.error());
     return;
   }
   Value::Dictionary tree = stored->isDictionary() ? stored->dictionary() : Value::Dictionary();
   for (const auto& [key, value] : values) tree.insert_or_assign(key, value);
   if (Value(tree) == *stored) return;
   if (const auto error = lists_.write(standardPath_, std::move(tree), PropertyListEncoding::Binary)) {
-    for (const auto& [key, value] : values) reportUnstored(key, *error);
+    reportUnstored(keysOf(values), *error);
   }
 }
 
