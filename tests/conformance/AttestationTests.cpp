@@ -12,10 +12,6 @@ namespace kvr {
 namespace {
 
 namespace fs = std::filesystem;
-using ::testing::Each;
-using ::testing::HasSubstr;
-using ::testing::IsEmpty;
-using ::testing::SizeIs;
 
 constexpr double kDay = 24 * 60 * 60;
 constexpr const char* kLabel = "com.tarsil.kvragent.kestCertificates";
@@ -145,7 +141,7 @@ TEST_F(AnAttestation, SignsWithAKeyThatTheLocalAuthorityCertifiesForTheDevice) {
     EXPECT_THAT(leaf, HasSubstr("Phone14,2"));
     // The SHA-256 of the serial number.
     EXPECT_THAT(leaf, HasSubstr("f4ba7148758c1fb5b89f69efee398edc03ab60cde388cf19c382dc080f4f8afc"));
-    EXPECT_THAT(leaf, ::testing::Not(HasSubstr("C39SERIAL")));
+    EXPECT_THAT(leaf, Not(HasSubstr("C39SERIAL")));
   }
 }
 

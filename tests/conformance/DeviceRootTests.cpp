@@ -21,11 +21,6 @@ namespace kvr {
 namespace {
 
 namespace fs = std::filesystem;
-using ::testing::ElementsAre;
-using ::testing::HasSubstr;
-using ::testing::IsEmpty;
-using ::testing::SizeIs;
-using Dictionary = Value::Dictionary;
 
 class ADevice : public ::testing::Test {
  protected:
@@ -51,12 +46,7 @@ TEST_F(ADevice, IsTrustedOnlyWhereNobodyElseCanWrite) {
   fs::create_directory(pathOf("open"));
   fs::create_symlink("open/F.plist", pathOf("linked.plist"));
   put("open/F.plist", Dictionary{{"a", 1}});
-  const struct {
-    const char* changed;
-    mode_t mode;
-    const char* asked;
-    const char* reason;  ///< null: trusted
-  } cases[] = {
+  const std::tuple<const char*, mode_t, const char*, const char*> cases[] = {
       {"F.plist", 0600, "F.plist", nullptr},
       {"F.plist", 0620, "F.plist", "by group"},
       {"F.plist", 0602, "F.plist", "by everyone"},
@@ -262,11 +252,7 @@ TEST_F(AnAccount, IsTheOneThatTheFileHolds) {
 
 TEST_F(AnAccount, IsRenewedAsScriptedUntilTheFileChanges) {
   const Value tokens = Dictionary{{"s", "new"}, {"t", 1}};
-  const struct {
-    Value renewal;
-    Outcome outcome;
-    std::string token;
-  } cases[] = {
+  const std::tuple<Value, Outcome, std::string> cases[] = {
       {{}, {1, "there is no renewal service for the account"}, "held"},
       {Dictionary{{"resultCode", 0}, {"tokens", tokens}, {"delay", -1}}, {0, ""}, "new"},
       {Dictionary{{"tokens", tokens}, {"delay", NAN}, {"error", "still"}}, {0, "still"}, "new"},

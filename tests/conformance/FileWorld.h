@@ -1,11 +1,10 @@
 #pragma once
 
+#include "Prelude.h"
 #include "platform/local/LocalFiles.h"
 #include "platform/simulated/SimulatedClock.h"
 #include "platform/simulated/SimulatedFiles.h"
 #include "platform/simulated/SimulatedLog.h"
-
-#include <gmock/gmock.h>
 
 #include <algorithm>
 #include <cstdlib>

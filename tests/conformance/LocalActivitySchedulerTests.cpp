@@ -12,10 +12,6 @@
 namespace kvr {
 namespace {
 
-using ::testing::ElementsAre;
-using ::testing::IsEmpty;
-using ::testing::SizeIs;
-
 constexpr const char* kUpgrade = "com.tarsil.kvragent.upgrade";
 constexpr const char* kBoot = "com.tarsil.kvragent.boot";
 
@@ -81,7 +77,7 @@ class ALocalScheduler : public ::testing::Test {
   Value stored() { return *readPropertyList(*world.get(path)); }
   void setNetwork(bool reachable) {
     writeFile(device + "/Network.plist",
-              *writePropertyList(Value::Dictionary{{"reachable", reachable}}, PropertyListEncoding::XML));
+              *writePropertyList(Dictionary{{"reachable", reachable}}, PropertyListEncoding::XML));
   }
 
   FileWorld world{true};
@@ -188,9 +184,8 @@ TEST(LocalCarriers, AreNamedByTheirIndex) {
   const DeviceRoot root(lists, world.log, world.path("device"));
   const LocalCarrierInfo carriers(root);
   EXPECT_THAT(carriers.subscriptions(), IsEmpty());
-  const Value list =
-      Value::Array{Value::Dictionary{{"mobileCountryCode", "001"}, {"mobileNetworkCode", "01"}}, 7,
-                   Value::Dictionary{{"mobileNetworkCode", 5}}};
+  const Value list = Array{Dictionary{{"mobileCountryCode", "001"}, {"mobileNetworkCode", "01"}}, 7,
+                           Dictionary{{"mobileNetworkCode", 5}}};
   world.put(root.pathOf("Carriers.plist"), *writePropertyList(list, PropertyListEncoding::XML));
   const auto subscriptions = carriers.subscriptions();
   ASSERT_THAT(subscriptions, SizeIs(2));

@@ -1,16 +1,10 @@
 #include "integration/support/AgentWorld.h"
 #include "platform/JSON.h"
 
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
-
 #include <chrono>
 
 namespace kvr::testing {
 namespace {
-
-using ::testing::SizeIs;
-using ::testing::UnorderedElementsAre;
 
 using World = AgentWorld;
 
@@ -22,15 +16,14 @@ class ANewDevice : public ::testing::Test {
   ANewDevice() {
     using Seconds = std::chrono::duration<double>;
     const auto now = std::chrono::duration_cast<Seconds>(std::chrono::system_clock::now().time_since_epoch());
-    const Value offer =
-        Value::Dictionary{{"zubOfferEligibleUntil", now.count() + 10 * kDay},
-                          {"zubOfferFollowupDisplayDate", now.count() - kDay},
-                          {"zubLocalizedOfferLabel", "Zub"},
-                          {"zubLocalizedOfferDesc", "Add it"},
-                          {"zubLocalizedOfferSingularDesc", "One day left"},
-                          {"zubLocalizedOfferPluralDescFormat", "%@ days left"},
-                          {"zubLocalizedOfferCTA", "Add"},
-                          {"featureToggleParameters", Value::Dictionary{{"zubOfferDisplay", true}}}};
+    const Value offer = Dictionary{{"zubOfferEligibleUntil", now.count() + 10 * kDay},
+                                   {"zubOfferFollowupDisplayDate", now.count() - kDay},
+                                   {"zubLocalizedOfferLabel", "Zub"},
+                                   {"zubLocalizedOfferDesc", "Add it"},
+                                   {"zubLocalizedOfferSingularDesc", "One day left"},
+                                   {"zubLocalizedOfferPluralDescFormat", "%@ days left"},
+                                   {"zubLocalizedOfferCTA", "Add"},
+                                   {"featureToggleParameters", Dictionary{{"zubOfferDisplay", true}}}};
     world.setCoverage("default", *writeJSON(offer));
     world.becomeNewDevice();
   }

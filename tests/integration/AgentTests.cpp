@@ -3,8 +3,6 @@
 #include "platform/PropertyList.h"
 #include "signing/SHA256Hash.h"
 
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
 #include <signal.h>
 
 #include <algorithm>
@@ -16,12 +14,6 @@
 
 namespace kvr::testing {
 namespace {
-
-using ::testing::Each;
-using ::testing::HasSubstr;
-using ::testing::IsEmpty;
-using ::testing::Not;
-using ::testing::SizeIs;
 
 using World = AgentWorld;
 
@@ -101,9 +93,8 @@ TEST_F(TheAgent, DownloadsOnceAndThenAnswersFromTheCacheUntilTheLanguageChanges)
 }
 
 TEST_F(TheAgent, RenewsTheTokenAfterA401) {
-  world.setAccount(Value::Dictionary{
-      {"resultCode", 0},
-      {"tokens", Value::Dictionary{{"com.tarsil.vornic.supportapp.auth", "renewed-token"}}}});
+  world.setAccount(Dictionary{
+      {"resultCode", 0}, {"tokens", Dictionary{{"com.tarsil.vornic.supportapp.auth", "renewed-token"}}}});
   world.misbehave(R"([{"status":401,"times":2}])");
   world.startAgent();
   const auto client = world.newClient();
@@ -122,8 +113,8 @@ TEST_F(TheAgent, ServesOthersWhileSomeWaitForRenewalsAndAttestations) {
   ASSERT_EQ(label(World::info(polite, World::kFirstWatch, World::Default)), Value("Warranty"));
 
   // Both answers take an hour: whoever waits for them waits out its limit, or the end of the agent.
-  world.setAccount(Value::Dictionary{{"resultCode", 0}, {"delay", 3600}});
-  world.writeDeviceFile("Attestation.plist", Value::Dictionary{{"Delay", 3600}});
+  world.setAccount(Dictionary{{"resultCode", 0}, {"delay", 3600}});
+  world.writeDeviceFile("Attestation.plist", Dictionary{{"Delay", 3600}});
   world.misbehave(R"([{"status":401,"serialNumber":"SNWATCH00002"}])");
   std::vector<RawBusClient> waiting;
   for (int i = 0; i < 64; ++i) {
@@ -145,7 +136,7 @@ TEST_F(TheAgent, ServesOthersWhileSomeWaitForRenewalsAndAttestations) {
 
 TEST_F(TheAgent, SendsTheRequestWithWhateverAttestationHeadersCouldBeMade) {
   struct Case {
-    Value::Dictionary behaviour;
+    Dictionary behaviour;
     bool attested;
     const char* line;
   };
@@ -288,12 +279,10 @@ TEST_F(TheAgent, FollowsTheFileOfPairedWatches) {
 }
 
 TEST_F(TheAgent, KnowsTheSupportApplicationInTheUsersLanguage) {
-  world.writeDeviceFile(
-      "Applications.plist",
-      Value::Dictionary{{"com.tarsil.support", Value::Dictionary{{"localizedName", "Support"}}}});
-  world.writeDeviceFile("Store.plist", Value::Dictionary{{"purchaseDelay", 3600}});
-  world.writeDeviceFile("Resources/KavrelUI/nl/Localizable.plist",
-                        Value::Dictionary{{"INSTALLED", "Aanwezig"}});
+  world.writeDeviceFile("Applications.plist",
+                        Dictionary{{"com.tarsil.support", Dictionary{{"localizedName", "Support"}}}});
+  world.writeDeviceFile("Store.plist", Dictionary{{"purchaseDelay", 3600}});
+  world.writeDeviceFile("Resources/KavrelUI/nl/Localizable.plist", Dictionary{{"INSTALLED", "Aanwezig"}});
   world.startAgent();
   const auto waiting = world.newClient();
   // For the store, which holds up nobody else.

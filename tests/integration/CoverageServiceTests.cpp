@@ -1,3 +1,4 @@
+#include "Prelude.h"
 #include "integration/support/ChildProcess.h"
 #include "integration/support/RecordingLog.h"
 #include "integration/support/TemporaryDirectory.h"
@@ -8,8 +9,6 @@
 #include "platform/local/LocalWorkQueues.h"
 #include "signing/Base64.h"
 
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
 #include <zlib.h>
 
 #include <ctime>
@@ -18,8 +17,6 @@
 
 namespace kvr::testing {
 namespace {
-
-using ::testing::HasSubstr;
 
 constexpr char kLocal[] = "/api/v3/coverage/summary";
 constexpr char kOther[] = "/api/v2/coverage/summary";
@@ -47,9 +44,8 @@ struct Identity {
   static CertifiedKey authorityOf(const openssl::Key& key) { return {key, *newAuthorityCertificate(key)}; }
   /// The JSON of the chain.
   std::string chain(JSONSlashes slashes = JSONSlashes::Escaped) const {
-    const Value::Array certificates{base64Encoded(*derOf(leaf)),
-                                    base64Encoded(*derOf(authority.certificate))};
-    return *writeJSON(Value::Dictionary{{"certs", certificates}}, slashes);
+    const Array certificates{base64Encoded(*derOf(leaf)), base64Encoded(*derOf(authority.certificate))};
+    return *writeJSON(Dictionary{{"certs", certificates}}, slashes);
   }
   void attest(HTTPRequest& request) const {
     request.headers.set("X-Tarsil-Kest-S", base64Encoded(*sign(key, request.body)));
@@ -156,7 +152,7 @@ TEST_F(ACoverageService, RefusesEveryBrokenRuleWithAReason) {
       {"does not lead to the authority", [&](auto& request) { stranger.attest(request); }},
   };
   const auto expectRefusal = [this](const HTTPRequest& request, const char* reason) {
-    EXPECT_THAT(ask(request), ::testing::AllOf(::testing::StartsWith("400 "), HasSubstr(reason)));
+    EXPECT_THAT(ask(request), AllOf(::testing::StartsWith("400 "), HasSubstr(reason)));
   };
   for (const auto& [reason, change] : signedCases) {
     HTTPRequest request = goodRequest();

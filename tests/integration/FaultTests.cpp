@@ -5,8 +5,6 @@
 #include "signing/SHA256Hash.h"
 
 #include <fcntl.h>
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
 #include <sys/mman.h>
 #include <unistd.h>
 
@@ -32,7 +30,7 @@ constexpr std::size_t kMostComplaints = 4;
 Value steady(const Value& tree) {
   if (tree.isDate()) return Date{0};
   if (!tree.isDictionary()) return tree;
-  Value::Dictionary entries;
+  Dictionary entries;
   for (const auto& [key, value] : tree.dictionary()) entries.emplace(key, steady(value));
   return entries;
 }
@@ -80,7 +78,7 @@ std::vector<Store> allStores() {
 class TheAgentsStores : public ::testing::Test {
  protected:
   /// What the files of a store hold, by their names.
-  using State = Value::Dictionary;
+  using State = Dictionary;
 
   void SetUp() override {
     if (KVR_SANITIZED) GTEST_SKIP() << "a sanitizer's runtime stands before the injector's calls";
@@ -93,13 +91,12 @@ class TheAgentsStores : public ::testing::Test {
     world.moreEnvironment = {{"LD_PRELOAD", KVR_PROGRAMS "/libkvr-injector.so"},
                              {Injection::kVariable, file.string()}};
 
-    Value::Array items;
+    Array items;
     for (const auto* serialNumber : {World::kPhone, World::kFirstWatch}) {
-      items.push_back(
-          Value::Dictionary{{"uniqueIdentifier", "com.tarsil.Kavrel." + sha256Hash(serialNumber)}});
+      items.push_back(Dictionary{{"uniqueIdentifier", "com.tarsil.Kavrel." + sha256Hash(serialNumber)}});
     }
     world.directory.write("home/Library/FollowUps/com.tarsil.Kavrel.plist",
-                          *writePropertyList(Value::Dictionary{{"items", items}}, PropertyListEncoding::XML));
+                          *writePropertyList(Dictionary{{"items", items}}, PropertyListEncoding::XML));
     world.startAgent();
     World::info(world.newClient(), World::kFirstWatch, World::Refresh);
     ASSERT_EQ(world.agent().terminate(), 0);

@@ -1,3 +1,4 @@
+#include "Prelude.h"
 #include "integration/support/RecordingLog.h"
 #include "platform/local/Descriptor.h"
 #include "platform/local/EventLoop.h"
@@ -5,8 +6,6 @@
 #include "platform/local/LocalWorkQueues.h"
 
 #include <arpa/inet.h>
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
 #include <netinet/in.h>
 #include <sys/socket.h>
 
@@ -20,8 +19,6 @@
 
 namespace kvr::testing {
 namespace {
-
-using ::testing::HasSubstr;
 
 constexpr std::size_t kMebibyte = std::size_t{1} << 20;
 constexpr int kCouldNotConnect = 7;
@@ -243,13 +240,7 @@ TEST_F(OverHTTP, AResponseIsTakenOnlyWhole) {
     return "HTTP/1.1 301 Moved\r\nLocation: " + location + "\r\nContent-Length: 1\r\n\r\nr";
   };
   const std::optional<std::string> none;
-  const struct {
-    const char* name;
-    std::string sent;
-    int status;
-    std::optional<std::string> body;
-    int code;
-  } cases[] = {
+  const std::tuple<const char*, std::string, int, std::optional<std::string>, int> cases[] = {
       {"plain", response("404 Not Found", "no"), 404, "no", 0},
       {"until closed", untilClosed + "all", 200, "all", 0},
       {"exactly 1 MiB", response("200 OK", mebibyte), 200, mebibyte, 0},
@@ -268,13 +259,13 @@ TEST_F(OverHTTP, AResponseIsTakenOnlyWhole) {
       {"another answer with a location",
        "HTTP/1.1 201 Created\r\nLocation: https://127.0.0.1:1/\r\nContent-Length: 1\r\n\r\nc", 201, "c", 0},
   };
-  for (const auto& c : cases) {
-    SCOPED_TRACE(c.name);
-    const ScriptedServer server(sends(c.sent));
+  for (const auto& [name, sent, status, body, code] : cases) {
+    SCOPED_TRACE(name);
+    const ScriptedServer server(sends(sent));
     const HTTPResponse got = exchange(get(server.url()));
-    EXPECT_EQ(got.status, c.status);
-    EXPECT_TRUE(got.body == c.body) << got.body.value_or("none").substr(0, 100);
-    EXPECT_EQ(codeOf(got), c.code);
+    EXPECT_EQ(got.status, status);
+    EXPECT_TRUE(got.body == body) << got.body.value_or("none").substr(0, 100);
+    EXPECT_EQ(codeOf(got), code);
   }
   const ScriptedServer server(sends(movedTo("https://127.0.0.1:1/")));
   HTTPRequest unfollowed = get(server.url());

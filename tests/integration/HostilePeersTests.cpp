@@ -1,8 +1,5 @@
 #include "integration/support/AgentWorld.h"
 
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
-
 #include <algorithm>
 #include <chrono>
 #include <fstream>
@@ -11,7 +8,6 @@
 namespace kvr::testing {
 namespace {
 
-using ::testing::HasSubstr;
 using World = AgentWorld;
 
 constexpr const char* kLimits = "org.freedesktop.DBus.Error.LimitsExceeded";
@@ -163,7 +159,7 @@ TEST_F(TheAgentAmongHostilePeers, AnswersWithAnErrorWhateverIsNoCallOfItsInterfa
 }
 
 TEST_F(TheAgentAmongHostilePeers, BoundsWhatOneConnectionLeavesWaiting) {
-  world.writeDeviceFile("Store.plist", Value::Dictionary{{"purchaseDelay", 3600}});
+  world.writeDeviceFile("Store.plist", Dictionary{{"purchaseDelay", 3600}});
   begin();
   struct Flood {
     std::size_t textSize;
@@ -228,7 +224,7 @@ TEST_F(TheAgentAmongHostilePeers, ServesAThousandConnectionsAtOnceAndLetsGoOfTho
   EXPECT_EQ(World::allInfos(*polite, World::Default).size(), 3U);
   expectNothingIsLeft("after a thousand");
   EXPECT_EQ(world.agent().terminate(), 0);
-  EXPECT_THAT(world.agent().errorOutput(), ::testing::Not(HasSubstr("without an answer")));
+  EXPECT_THAT(world.agent().errorOutput(), Not(HasSubstr("without an answer")));
 }
 
 TEST_F(TheAgentAmongHostilePeers, HandlesTheLastOfAFloodOfNotifications) {

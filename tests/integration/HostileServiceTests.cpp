@@ -1,13 +1,10 @@
 #include "integration/support/AgentWorld.h"
 
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
 #include <signal.h>
 
 namespace kvr::testing {
 namespace {
 
-using ::testing::HasSubstr;
 using World = AgentWorld;
 
 constexpr const char* kFailure = "kvragent failed to load warranty";
@@ -43,8 +40,8 @@ class TheAgentOfAHostileService : public ::testing::Test {
 };
 
 TEST_F(TheAgentOfAHostileService, MakesTheAttemptsItMayAndFailsOnce) {
-  world.setAccount(Value::Dictionary{
-      {"resultCode", 0}, {"tokens", Value::Dictionary{{"com.tarsil.vornic.supportapp.auth", "renewed"}}}});
+  world.setAccount(Dictionary{{"resultCode", 0},
+                              {"tokens", Dictionary{{"com.tarsil.vornic.supportapp.auth", "renewed"}}}});
   const std::string kilobyte(1000, 'a');
   const std::string ok = R"(HTTP/1.1 200 OK\r\n)";
   const std::string five = ok + R"(Content-Length: 5\r\n\r\n)";

@@ -2,8 +2,6 @@
 #include "integration/support/AgentWorld.h"
 #include "platform/PropertyList.h"
 
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
 #include <signal.h>
 #include <sys/socket.h>
 #include <unistd.h>
@@ -15,8 +13,6 @@ namespace kvr::testing {
 namespace {
 
 namespace fs = std::filesystem;
-using ::testing::HasSubstr;
-using ::testing::Not;
 
 constexpr uid_t kNobody = 65534;
 constexpr const char* kRefusal =
@@ -43,7 +39,7 @@ class TheAgentsPeer : public ::testing::Test {
     // Another user can get at the bus and the programs. What a member does is done at once.
     fs::permissions(busDirectory(), fs::perms(0711));
     fs::permissions(world.directory.path(), fs::perms(0711));
-    Value::Dictionary preferences = world.preferences().dictionary();
+    Dictionary preferences = world.preferences().dictionary();
     preferences["PostUpgradeOutreachDelay"] = 0;
     world.directory.write("home/Library/Preferences/com.tarsil.kvragent.plist",
                           *writePropertyList(preferences, PropertyListEncoding::Binary));
@@ -58,9 +54,8 @@ class TheAgentsPeer : public ::testing::Test {
   }
   fs::path device() const { return world.directory / "device"; }
   static void grant(const AgentWorld& world, const fs::path& program, const Value& value = true) {
-    world.writeDeviceFile(
-        "Entitlements.plist",
-        Value::Dictionary{{program.string(), Value::Dictionary{{"com.tarsil.private.kvragent", value}}}});
+    world.writeDeviceFile("Entitlements.plist",
+                          Dictionary{{program.string(), Dictionary{{"com.tarsil.private.kvragent", value}}}});
   }
   void grant(const fs::path& program, const Value& value = true) const { grant(world, program, value); }
   /// A program of its own, with nothing granted to it yet.
@@ -163,8 +158,8 @@ TEST_F(TheAgentsPeer, IsServedOnlyWhenItIsAGrantedProgramOfTheAgentsUser) {
       {"granted a text", false, valued("true")},
       {"granted a date", false, valued(Date{1})},
       {"granted data", false, valued(Value::Bytes{1})},
-      {"granted an array", false, valued(Value::Array{true})},
-      {"granted a dictionary", false, valued(Value::Dictionary{{"a", true}})},
+      {"granted an array", false, valued(Array{true})},
+      {"granted a dictionary", false, valued(Dictionary{{"a", true}})},
       {"without an entry", false,
        [&] {
          grant(program("other"));

@@ -3,17 +3,11 @@
 #include "platform/JSON.h"
 #include "platform/local/BusIntrospection.h"
 
-#include <gmock/gmock.h>
-
 #include <fstream>
 #include <iterator>
 
 namespace kvr::testing {
 namespace {
-
-using ::testing::AllOf;
-using ::testing::HasSubstr;
-using ::testing::Not;
 
 /// The command-line client on a bus where this process plays the agent.
 class Kvrctl : public BusFixture {
@@ -27,7 +21,7 @@ class Kvrctl : public BusFixture {
   Kvrctl() {
     entitle(true, kProgram);
     newBehaviour = [this] {
-      return [this](const std::string& member, const Value::Array& arguments, const ServiceReply& reply) {
+      return [this](const std::string& member, const Array& arguments, const ServiceReply& reply) {
         const std::lock_guard lock(mutex_);
         asked_ = member + describe(Value(arguments));
         if (member == heldMember_) {
@@ -86,31 +80,27 @@ class Kvrctl : public BusFixture {
 };
 
 Value device(const std::string& name) {
-  return Value::Dictionary{
+  return Dictionary{
       {"name", name}, {"serialNumber", "C02XY1234"}, {"activationDate", Date{86400}}, {"deviceType", 1}};
 }
 
 Value info(const Value& warranty) {
-  Value::Dictionary record{{"device", device("a watch")}};
-  if (!warranty.isNull()) record["warranty"] = Value::Dictionary{{"DictionaryRepresentation", warranty}};
+  Dictionary record{{"device", device("a watch")}};
+  if (!warranty.isNull()) record["warranty"] = Dictionary{{"DictionaryRepresentation", warranty}};
   return record;
 }
 
 TEST_F(Kvrctl, AsksWhatItIsTold) {
   const auto serving = serveAgent();
-  setAnswer("GetDeviceInfoForSerialNumber", info(Value::Dictionary{{"covered", true}}));
+  setAnswer("GetDeviceInfoForSerialNumber", info(Dictionary{{"covered", true}}));
   setAnswer("GetDefaultDeviceInfoUsingPolicy", info(Value()));
-  setAnswer("GetAllDeviceInfosUsingPolicy", Value::Array{info(Value()), info(Value::Dictionary{})});
+  setAnswer("GetAllDeviceInfosUsingPolicy", Array{info(Value()), info(Dictionary{})});
   for (const auto* member : {"DismissFollowUpForSerialNumber", "ScheduleOutreachAfter"})
     setAnswer(member, true);
   setAnswer("TarsilAccountAdded", false);
-  setAnswer("DefaultDevice", Value::Dictionary{{"name", 7}, {"deviceType", "x"}});
-  setAnswer("PairedDevices", Value::Array{device("a watch")});
-  const struct {
-    std::vector<std::string> arguments;
-    const char* asked;
-    int status;
-  } cases[] = {
+  setAnswer("DefaultDevice", Dictionary{{"name", 7}, {"deviceType", "x"}});
+  setAnswer("PairedDevices", Array{device("a watch")});
+  const std::tuple<std::vector<std::string>, const char*, int> cases[] = {
       {{"device"}, "DefaultDevice()", 0},
       {{"paired"}, "PairedDevices()", 0},
       {{}, "GetAllDeviceInfosUsingPolicy(1, 0)", 0},
@@ -124,10 +114,10 @@ TEST_F(Kvrctl, AsksWhatItIsTold) {
       {{"info", "S1", "--policy", "refresh"}, "GetDeviceInfoForSerialNumber(S1, 2)", 0},
       {{"info", "--all", "--policy", "cache"}, "GetAllDeviceInfosUsingPolicy(1, 0)", 0},
   };
-  for (const auto& one : cases) {
-    const Outcome outcome = run(one.arguments);
-    EXPECT_EQ(outcome.status, one.status) << outcome.errors;
-    EXPECT_EQ(asked(), one.asked);
+  for (const auto& [arguments, asked, status] : cases) {
+    const Outcome outcome = run(arguments);
+    EXPECT_EQ(outcome.status, status) << outcome.errors;
+    EXPECT_EQ(asked(), asked);
     EXPECT_EQ(outcome.errors, "");
   }
 }
@@ -219,10 +209,9 @@ TEST_F(Kvrctl, TellsOfAnActivityHowItEndedAndWhatItWaitsFor) {
 
 TEST_F(Kvrctl, PrintsTextThatCannotCommandATerminal) {
   const auto serving = serveAgent();
-  setAnswer(
-      "GetDefaultDeviceInfoUsingPolicy",
-      info(Value::Dictionary{{"covered", true},
-                             {"coverageLocalizedLabel", "\x1B]0;owned\x07 \u009B2J\r\nCovered: no\u202E"}}));
+  setAnswer("GetDefaultDeviceInfoUsingPolicy",
+            info(Dictionary{{"covered", true},
+                            {"coverageLocalizedLabel", "\x1B]0;owned\x07 \u009B2J\r\nCovered: no\u202E"}}));
   const Outcome text = run({"info"});
   EXPECT_THAT(text.output,
               HasSubstr("Coverage:      \\u001b]0;owned\\u0007 \\u009b2J\\u000d\\u000aCovered: no\\u202e\n"));
@@ -234,25 +223,24 @@ TEST_F(Kvrctl, PrintsTextThatCannotCommandATerminal) {
 
 TEST_F(Kvrctl, WritesOneJSONDocumentOfEverythingTheAgentKnows) {
   const auto serving = serveAgent();
-  const Value warranty = Value::Dictionary{{"since", Date{86400.5}},
-                                           {"data", Value::Bytes{1, 2, 3}},
-                                           {"null", Value()},
-                                           {"big", ~std::uint64_t{0}}};
-  setAnswer("GetAllDeviceInfosUsingPolicy", Value::Array{info(warranty), info(Value())});
+  const Value warranty = Dictionary{{"since", Date{86400.5}},
+                                    {"data", Value::Bytes{1, 2, 3}},
+                                    {"null", Value()},
+                                    {"big", ~std::uint64_t{0}}};
+  setAnswer("GetAllDeviceInfosUsingPolicy", Array{info(warranty), info(Value())});
   const Result<Value> document = readJSON(run({"info", "--all", "--json", "--show-serial"}).output);
   ASSERT_TRUE(document) << describe(document.error());
-  const Value told = Value::Dictionary{{"name", "a watch"},
-                                       {"serialNumber", "C02XY1234"},
-                                       {"activationDate", "1970-01-02T00:00:00Z"},
-                                       {"deviceType", 1},
-                                       {"type", "Watch"}};
-  const Value known = Value::Dictionary{
+  const Value told = Dictionary{{"name", "a watch"},
+                                {"serialNumber", "C02XY1234"},
+                                {"activationDate", "1970-01-02T00:00:00Z"},
+                                {"deviceType", 1},
+                                {"type", "Watch"}};
+  const Value known = Dictionary{
       {"since", "1970-01-02T00:00:00Z"}, {"data", "AQID"}, {"null", Value()}, {"big", ~std::uint64_t{0}}};
   EXPECT_EQ(*document,
-            Value(Value::Dictionary{
-                {"version", 1},
-                {"deviceInfos", Value::Array{Value::Dictionary{{"device", told}, {"warranty", known}},
-                                             Value::Dictionary{{"device", told}, {"warranty", Value()}}}}}));
+            Value(Dictionary{{"version", 1},
+                             {"deviceInfos", Array{Dictionary{{"device", told}, {"warranty", known}},
+                                                   Dictionary{{"device", told}, {"warranty", Value()}}}}}));
 }
 
 /// What the file declares, without its comments and line breaks.

@@ -57,4 +57,6 @@ struct CoverageWorld : SimulatedPlatform {
   std::function<HTTPResponse(const HTTPRequest&)> coverage;
 };
 
+using CoverageTest = TestIn<CoverageWorld>;
+
 }  // namespace kvr

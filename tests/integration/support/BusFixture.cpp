@@ -27,7 +27,7 @@ class BusFixture::Object : public ServiceObject {
   Object(const Object&) = delete;
   Object& operator=(const Object&) = delete;
 
-  void invoke(std::size_t method, const Value::Array& arguments, ServiceReply reply) override {
+  void invoke(std::size_t method, const Array& arguments, ServiceReply reply) override {
     behaviour_(interface_.methods[method].member, arguments, std::move(reply));
   }
 
@@ -39,7 +39,7 @@ class BusFixture::Object : public ServiceObject {
 
 BusFixture::BusFixture()
     : newBehaviour([] {
-        return [](const std::string&, const Value::Array& arguments, const ServiceReply& reply) {
+        return [](const std::string&, const Array& arguments, const ServiceReply& reply) {
           reply(arguments.at(0));
         };
       }) {
@@ -63,9 +63,9 @@ void BusFixture::stop() {
 
 void BusFixture::entitle(const Value& value, const std::string& program) {
   const auto path = std::filesystem::canonical(program).string();
-  const Value::Dictionary granted{{std::string(kEntitlement), value}};
-  const auto problem = lists_.write(root_ / "Entitlements.plist", Value::Dictionary{{path, granted}},
-                                    PropertyListEncoding::XML);
+  const Dictionary granted{{std::string(kEntitlement), value}};
+  const auto problem =
+      lists_.write(root_ / "Entitlements.plist", Dictionary{{path, granted}}, PropertyListEncoding::XML);
   if (problem) throw std::runtime_error(describe(*problem));
 }
 

@@ -38,8 +38,7 @@ std::string RawBusClient::uniqueName() const {
   return name;
 }
 
-BusMessageRef RawBusClient::newCall(const char* member, const char* signature,
-                                    const Value::Array& arguments) const {
+BusMessageRef RawBusClient::newCall(const char* member, const char* signature, const Array& arguments) const {
   sd_bus_message* message = nullptr;
   require(sd_bus_message_new_method_call(bus_.get(), &message, kName, kPath, kInterface, member), member);
   BusMessageRef held(message);
@@ -61,7 +60,7 @@ RawBusClient::Reply RawBusClient::call(const BusMessageRef& message) const {
 }
 
 RawBusClient::Reply RawBusClient::call(const char* member, const char* signature,
-                                       const Value::Array& arguments) const {
+                                       const Array& arguments) const {
   return call(newCall(member, signature, arguments));
 }
 
