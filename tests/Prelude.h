@@ -6,7 +6,12 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <functional>
+#include <map>
+#include <string>
 #include <string_view>
+#include <tuple>
+#include <vector>
 
 namespace kvr {
 

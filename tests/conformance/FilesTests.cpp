@@ -1,5 +1,4 @@
 #include "conformance/FileWorld.h"
-#include "platform/PropertyListFiles.h"
 #include "platform/local/Descriptor.h"
 #include "platform/local/LocalLog.h"
 
@@ -198,7 +197,7 @@ class LocalFilesOf : public ::testing::Test {
   }
 
   TemporaryDirectory directory;
-  const std::string home = directory.path();
+  const std::string home = directory.path().string();
   SimulatedLog log;
   LocalFiles files{log, home + "/", 0.01};
 };
@@ -262,7 +261,7 @@ class ALogLine : public ::testing::Test {
   std::string written() const { return contentOfFile(path).value_or(""); }
 
   TemporaryDirectory directory;
-  const std::string path = directory.path() + "/log";
+  const std::string path = directory.path().string() + "/log";
   const Descriptor descriptor{::open(path.c_str(), O_CREAT | O_WRONLY | O_APPEND | O_CLOEXEC, 0600)};
 };
 

@@ -47,9 +47,10 @@ struct Start {
     activity->setCriteria(criteria);
     activity->schedule(recorder(identifier));
   }
-  void monitor(const std::string& identifier) {
+  void monitor(const std::string& identifier, const std::optional<ActivityExpectation>& expected = {}) {
     const auto activity = scheduler.newActivity(identifier);
     activity->setPreregistered(true);
+    if (expected) activity->setExpectation(*expected);
     activity->schedule(recorder(identifier));
   }
   /// Ends this start in order; what ran in it.
@@ -75,10 +76,6 @@ class ALocalScheduler : public ::testing::Test {
     return std::make_unique<Start>(world.files(), world, device, properties, world.clock);
   }
   Value stored() { return *readPropertyList(*world.get(path)); }
-  void setNetwork(bool reachable) {
-    writeFile(device + "/Network.plist",
-              *writePropertyList(Dictionary{{"reachable", reachable}}, PropertyListEncoding::XML));
-  }
 
   FileWorld world{true};
   const std::string device = world.path("device");
@@ -91,19 +88,16 @@ TEST_F(ALocalScheduler, TakesARegistrationUpAgainAndRunsItOnce) {
   const auto before = stored()["activities"]["a"];
   EXPECT_GE(before["dueDate"].date(), world.clock.now() + 3600);
   EXPECT_LE(before["dueDate"].date(), world.clock.now() + 3960);
-  {
-    const auto early = start();
-    early->monitor("a");
-    EXPECT_THAT(early->finish(), IsEmpty());
-  }
+  const auto monitored = [&](bool isDue) {
+    const auto local = start();
+    local->monitor("a");
+    if (isDue) local->loop.run();
+    return local->finish();
+  };
+  EXPECT_THAT(monitored(false), IsEmpty());
   EXPECT_EQ(stored()["activities"]["a"], before) << "nothing is drawn anew";
   world.clock.moveBy(3960);
-  {
-    const auto due = start();
-    due->monitor("a");
-    due->loop.run();
-    EXPECT_THAT(due->finish(), ElementsAre("a"));
-  }
+  EXPECT_THAT(monitored(true), ElementsAre("a"));
   EXPECT_TRUE(stored()["activities"]["a"].isNull());
 }
 
@@ -116,32 +110,25 @@ TEST_F(ALocalScheduler, RunsWhatBecomesDueByItsTimer) {
 }
 
 TEST_F(ALocalScheduler, WaitsForTheNetworkWithoutAskingAgain) {
-  setNetwork(false);
-  const auto local = start();
-  local->add("a", {0, 0, true});
-  EXPECT_EQ(local->scheduler.runsUnderWay(), 0U);
-  setNetwork(true);
-  local->loop.run();
-  EXPECT_THAT(local->finish(), ElementsAre("a"));
-}
-
-TEST_F(ALocalScheduler, BelievesTheHostsNetworkServiceWhereTheDeviceDoesNotSay) {
-  writeFile(device + "/netif", "# networkd\nCARRIER_STATE=no-carrier\nOPER_STATE=no-carrier\n");
-  const auto local = start();
-  local->add("a", {0, 0, true});
-  EXPECT_EQ(local->scheduler.runsUnderWay(), 0U);
-  writeFile(device + "/netif", "OPER_STATE=routable\n");
-  local->loop.run();
-  EXPECT_THAT(local->finish(), ElementsAre("a"));
-}
-
-TEST_F(ALocalScheduler, NoticesThatTheDeviceDirectoryHasGone) {
-  setNetwork(false);
-  const auto local = start();
-  local->add("a", {0, 0, true});
-  std::filesystem::remove_all(device);
-  local->loop.run();
-  EXPECT_THAT(local->finish(), ElementsAre("a"));
+  const auto setNetwork = [&](bool isReachable) {
+    world.put(device + "/Network.plist",
+              *writePropertyList(Dictionary{{"reachable", isReachable}}, PropertyListEncoding::XML));
+  };
+  // The device says so, goes away, or does not say and the host's network service is believed.
+  const std::pair<std::function<void()>, std::function<void()>> cases[] = {
+      {[&] { setNetwork(false); }, [&] { setNetwork(true); }},
+      {[&] { setNetwork(false); }, [&] { std::filesystem::remove_all(device); }},
+      {[&] { world.put(device + "/netif", "# networkd\nCARRIER_STATE=no-carrier\nOPER_STATE=no-carrier\n"); },
+       [&] { world.put(device + "/netif", "OPER_STATE=routable\n"); }}};
+  for (const auto& [lose, regain] : cases) {
+    lose();
+    const auto local = start();
+    local->add("a", {0, 0, true});
+    EXPECT_EQ(local->scheduler.runsUnderWay(), 0U);
+    regain();
+    local->loop.run();
+    EXPECT_THAT(local->finish(), ElementsAre("a"));
+  }
 }
 
 TEST_F(ALocalScheduler, RunsOccasionsAfterUpgradeBootAndDamage) {
@@ -166,14 +153,7 @@ TEST_F(ALocalScheduler, RunsOccasionsAfterUpgradeBootAndDamage) {
 }
 
 TEST_F(ALocalScheduler, RegistersAnewWhatItsClientSaysIsScheduled) {
-  {
-    const auto local = start();
-    const auto activity = local->scheduler.newActivity("a");
-    activity->setPreregistered(true);
-    activity->setExpectation({world.clock.now() + 500, {500, 0, true}});
-    activity->schedule(local->recorder("a"));
-    EXPECT_THAT(local->finish(), IsEmpty());
-  }
+  start()->monitor("a", ActivityExpectation{world.clock.now() + 500, {500, 0, true}});
   EXPECT_EQ(stored()["activities"]["a"]["dueDate"].date(), world.clock.now() + 500);
   EXPECT_TRUE(stored()["activities"]["a"]["requiresNetwork"].asBool());
 }

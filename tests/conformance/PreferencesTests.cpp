@@ -107,17 +107,6 @@ TEST_P(APreference, OfAnotherDomainIsReadWhereTheNameLeadsNowhereElse) {
   EXPECT_THAT(world.log.lines(), IsEmpty());
 }
 
-TEST_P(APreference, OfADamagedDomainIsAbsentAndTheDomainStartsAfresh) {
-  preferences.registerDefaults({{"a", 1}});
-  world.put(pathOf(kDomain), "garbage {");
-  EXPECT_EQ(preferences.integerForKey("a"), 1);
-  preferences.setObject(2, "b");
-  EXPECT_EQ(stored(), Value(Dictionary{{"b", 2}}));
-  EXPECT_THAT(world.names(folder),
-              ElementsAre(kDomain + ".plist", kDomain + ".plist.damaged-20261124T160443Z"));
-  EXPECT_THAT(world.log.texts(LogLevel::Error), SizeIs(1));
-}
-
 TEST_P(APreference, OfADomainThatCannotBeReadIsNeverOverwritten) {
   preferences.registerDefaults({{"a", 1}});
   const std::string large(PropertyListFiles::kLimit + 1, ' ');

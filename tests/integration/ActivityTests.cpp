@@ -58,20 +58,5 @@ TEST_F(ANewDevice, GetsItsFollowUpsWhereverTheAgentIsKilledOnTheWay) {
   EXPECT_EQ(world.agent().terminate(), 0);
 }
 
-TEST_F(ANewDevice, IsDoneWithTwoHundredWatchesThoughEverySecondDownloadFails) {
-  std::vector<std::string> watches;
-  for (int index = 0; index < 200; ++index) watches.push_back("WATCH" + std::to_string(index));
-  world.pair(watches);
-  world.misbehave(R"([{"every":2,"status":500}])");
-  world.startAgent();
-  world.agent().waitForErrorOutput("Complete activity and schedule followUp post for");
-  const auto log = world.agent().errorOutput();
-  std::size_t failed = 0;
-  for (std::size_t at = log.find("Warranty failed to download"); at != std::string::npos; ++failed) {
-    at = log.find("Warranty failed to download", at + 1);
-  }
-  EXPECT_EQ(failed, 100U);
-}
-
 }  // namespace
 }  // namespace kvr::testing

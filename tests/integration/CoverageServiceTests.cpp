@@ -1,19 +1,14 @@
 #include "Prelude.h"
 #include "integration/support/ChildProcess.h"
-#include "integration/support/RecordingLog.h"
+#include "integration/support/HTTPClient.h"
 #include "integration/support/TemporaryDirectory.h"
 #include "platform/JSON.h"
-#include "platform/local/EventLoop.h"
 #include "platform/local/LocalCertificates.h"
-#include "platform/local/LocalHTTP.h"
-#include "platform/local/LocalWorkQueues.h"
 #include "signing/Base64.h"
 
 #include <zlib.h>
 
 #include <ctime>
-#include <functional>
-#include <future>
 
 namespace kvr::testing {
 namespace {
@@ -88,9 +83,7 @@ class ACoverageService : public ::testing::Test {
   }
   /// The status and the body of the answer.
   std::string ask(const HTTPRequest& request) {
-    std::promise<HTTPResponse> promise;
-    http_.sharedSession().send(request, [&](HTTPResponse it) { promise.set_value(std::move(it)); });
-    const HTTPResponse answer = promise.get_future().get();
+    const HTTPResponse answer = client_.exchange(request);
     return std::to_string(answer.status) + " " + answer.body.value_or("");
   }
 
@@ -98,10 +91,7 @@ class ACoverageService : public ::testing::Test {
   std::string url_;
 
  private:
-  RecordingLog log_;
-  EventLoop loop_;
-  LocalWorkQueues queues_{loop_, log_};
-  LocalHTTP http_{queues_, log_};
+  HTTPClient client_;
   std::optional<ChildProcess> service_;
 };
 

@@ -1,7 +1,6 @@
 // The real agent, ended or refused at each of its calls about files in turn.
 #include "integration/support/AgentWorld.h"
 #include "integration/support/Injection.h"
-#include "platform/PropertyList.h"
 #include "signing/SHA256Hash.h"
 
 #include <fcntl.h>
@@ -10,11 +9,7 @@
 
 #include <algorithm>
 #include <cstring>
-#include <fstream>
-#include <functional>
-#include <iterator>
 #include <limits>
-#include <map>
 
 namespace kvr::testing {
 namespace {
@@ -36,8 +31,7 @@ Value steady(const Value& tree) {
 }
 
 Value contentOf(const fs::path& path) {
-  std::ifstream file(path, std::ios::binary);
-  const std::string bytes(std::istreambuf_iterator<char>(file), {});
+  const std::string bytes = *contentOfFile(path);
   if (path.extension() == ".plist") return steady(*readPropertyList(bytes));
   return bytes.starts_with("-----BEGIN ") && bytes.ends_with("-----\n") ? "PEM" : bytes;
 }
@@ -185,10 +179,7 @@ class TheAgentsStores : public ::testing::Test {
     world.newClient().call("GetDeviceInfoForSerialNumber", "st", {mark, World::CacheOnly});
     world.agent().waitForErrorOutput(mark);
     const auto log = world.agent().errorOutput();
-    std::size_t lines = 0;
-    for (auto at = log.find(" error com."); at != std::string::npos; at = log.find(" error com.", at + 1))
-      ++lines;
-    return lines;
+    return countOf(" error com.", log);
   }
 
   mutable AgentWorld world;

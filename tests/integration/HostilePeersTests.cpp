@@ -3,7 +3,6 @@
 #include <algorithm>
 #include <chrono>
 #include <fstream>
-#include <functional>
 
 namespace kvr::testing {
 namespace {
@@ -50,11 +49,6 @@ class TheAgentAmongHostilePeers : public ::testing::Test {
     return std::distance(all, std::filesystem::directory_iterator());
   }
 
-  /// Sends without waiting for an answer, and without reading any.
-  static void send(const RawBusClient& client, const BusMessageRef& message) {
-    std::uint64_t number = 0;  // without one, no answer would be expected
-    ASSERT_GE(sd_bus_send(client.bus(), message.get(), &number), 0);
-  }
   /// Reads what has come and what comes until `count` calls have been answered: by error, "" for none.
   static std::map<std::string, int> answers(const RawBusClient& client, int count) {
     std::map<std::string, int> found;
@@ -171,7 +165,7 @@ TEST_F(TheAgentAmongHostilePeers, BoundsWhatOneConnectionLeavesWaiting) {
   for (const auto& flood : floods) {
     RawBusClient client = world.newClient();
     for (int i = 0; i < flood.calls; ++i)
-      send(client, client.newCall("AppSupportAvailability", "s", {std::string(flood.textSize, 'x')}));
+      client.send(client.newCall("AppSupportAvailability", "s", {std::string(flood.textSize, 'x')}));
     const auto found = answers(client, flood.calls - flood.served);
     EXPECT_EQ(found, (std::map<std::string, int>{{kLimits, flood.calls - flood.served}})) << flood.textSize;
     expectPoliteService("beside a flood of calls");
@@ -189,7 +183,7 @@ TEST_F(TheAgentAmongHostilePeers, TurnsAwayWhoeverDoesNotReadAndServesThemOnceTh
     sd_bus_message* call = nullptr;
     sd_bus_message_new_method_call(client.bus(), &call, RawBusClient::kName, RawBusClient::kPath,
                                    "org.freedesktop.DBus.Introspectable", "Introspect");
-    send(client, BusMessageRef(call));
+    client.send(BusMessageRef(call));
   }
   ASSERT_GE(sd_bus_flush(client.bus()), 0);
   world.agent().waitForErrorOutput("does not read what it is answered", from);
@@ -210,14 +204,12 @@ TEST_F(TheAgentAmongHostilePeers, ServesAThousandConnectionsAtOnceAndLetsGoOfTho
   std::vector<RawBusClient> clients;
   for (int i = 0; i < 1000; ++i) clients.push_back(world.newClient());
   for (const auto& client : clients) {
-    send(client, client.newCall("DefaultDevice"));
-    ASSERT_GE(sd_bus_flush(client.bus()), 0);
+    client.send(client.newCall("DefaultDevice"));
   }
   for (const auto& client : clients) EXPECT_EQ(answers(client, 1), (std::map<std::string, int>{{"", 1}}));
   clients.erase(clients.begin() + 50, clients.end());
   for (auto& client : clients) {
-    send(client, client.newCall("GetAllDeviceInfosUsingPolicy", "tb", {World::Refresh, true}));
-    ASSERT_GE(sd_bus_flush(client.bus()), 0);
+    client.send(client.newCall("GetAllDeviceInfosUsingPolicy", "tb", {World::Refresh, true}));
     client.leave();
   }
   world.misbehave("[]");
@@ -249,10 +241,8 @@ TEST_F(TheAgentAmongHostilePeers, HandlesTheLastOfAFloodOfNotifications) {
   ASSERT_GE(sd_bus_flush(client.bus()), 0);
   world.agent().waitForErrorOutput(std::string(World::kFirstWatch) + " : warranty download attempt");
   const auto seconds = std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
-  const std::string log = world.agent().errorOutput();
-  const std::string handled = "-[KVRPairedDevicesMonitor _pairedOrActiveDevicesDidChange:]";
-  double count = 0;
-  for (auto at = log.find(handled); at != std::string::npos; at = log.find(handled, at + 1)) ++count;
+  const auto* const handled = "-[KVRPairedDevicesMonitor _pairedOrActiveDevicesDidChange:]";
+  const auto count = static_cast<double>(countOf(handled, world.agent().errorOutput()));
   EXPECT_LE(count, 2 + seconds * 2) << "two calls a second";
   expectNothingIsLeft("after a flood of notifications");
 }

@@ -1,12 +1,8 @@
 #pragma once
 
-#include "platform/PropertyList.h"
 #include "signing/SHA256Hash.h"
 #include "unit/SimulatedTest.h"
 #include "warranty/WarrantyKeys.h"
-
-#include <functional>
-#include <string>
 
 namespace kvr {
 

@@ -1,14 +1,12 @@
 #include "integration/support/AgentWorld.h"
 
 #include "platform/JSON.h"
-#include "platform/PropertyList.h"
 #include "signing/SHA256Hash.h"
 
 #include <httplib.h>
 #include <systemd/sd-bus.h>
 
 #include <algorithm>
-#include <fstream>
 #include <iterator>
 #include <stdexcept>
 
@@ -20,11 +18,6 @@ constexpr const char* kAuthority = "home/Library/Keys/com.tarsil.kvragent.kestCe
 
 constexpr const char* kActivities = "Library/Activities/com.tarsil.kvragent.plist";
 
-std::string contentOf(const std::filesystem::path& path) {
-  std::ifstream file(path, std::ios::binary);
-  return {std::istreambuf_iterator<char>(file), {}};
-}
-
 Value watch(const std::string& serialNumber) {
   return Dictionary{{"name", "Watch " + serialNumber},
                     {"serialNumber", serialNumber},
@@ -34,7 +27,7 @@ Value watch(const std::string& serialNumber) {
 
 }  // namespace
 
-AgentWorld::AgentWorld(Attestation attestation) {
+AgentWorld::AgentWorld() {
   const auto binary = [](const Value& tree) {
     return *writePropertyList(tree, PropertyListEncoding::Binary);
   };
@@ -54,12 +47,9 @@ AgentWorld::AgentWorld(Attestation attestation) {
   setLocale("en_US");
   entitle(true);
 
-  std::vector<std::string> command{KVR_PROGRAMS "/kvr-coverage-service", "--root",
-                                   (directory / "service").string()};
-  if (attestation == Attestation::Required) {
-    command.insert(command.end(), {"--authority", (directory / kAuthority).string()});
-  }
-  service_ = std::make_unique<ChildProcess>(command);
+  service_ = std::make_unique<ChildProcess>(std::vector<std::string>{KVR_PROGRAMS "/kvr-coverage-service",
+                                                                     "--root", directory / "service",
+                                                                     "--authority", directory / kAuthority});
   constexpr std::string_view kListening = "listening on ";
   serviceURL_ = service_->waitForOutput(kListening).substr(kListening.size());
   directory.write(std::string("home/") + kActivities, "{ OSVersion = \"17.9\"; activities = {}; }");
@@ -159,7 +149,7 @@ std::vector<Value> AgentWorld::requests() const {
   }
   std::ranges::sort(paths);
   std::vector<Value> requests;
-  for (const auto& path : paths) requests.push_back(*readJSON(contentOf(path)));
+  for (const auto& path : paths) requests.push_back(*readJSON(*contentOfFile(path)));
   return requests;
 }
 
@@ -169,7 +159,9 @@ std::vector<Value> AgentWorld::coverageRequests() const {
   return all;
 }
 
-Value AgentWorld::file(const std::string& path) const { return *readPropertyList(contentOf(home() / path)); }
+Value AgentWorld::file(const std::string& path) const {
+  return *readPropertyList(*contentOfFile(home() / path));
+}
 
 Value AgentWorld::preferences() const { return file("Library/Preferences/com.tarsil.kvragent.plist"); }
 

@@ -7,8 +7,6 @@
 #include "integration/support/TemporaryDirectory.h"
 
 #include <memory>
-#include <string>
-#include <vector>
 
 namespace kvr::testing {
 
@@ -24,10 +22,8 @@ class AgentWorld {
   static constexpr const char* kSecondWatch = "SNWATCH00002";
   enum Policy : std::uint64_t { Default = 0, CacheOnly = 1, Refresh = 2 };
 
-  /// Whether the service insists on attested requests about the phone.
-  enum class Attestation { Required, Optional };
-
-  explicit AgentWorld(Attestation attestation = Attestation::Required);
+  /// The service insists on attested requests about the phone.
+  AgentWorld();
 
   /// From here on it is the device's first start.
   void becomeNewDevice() const;

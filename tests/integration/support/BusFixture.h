@@ -11,12 +11,9 @@
 #include "platform/local/LocalServiceListeners.h"
 #include "platform/local/LocalWorkQueues.h"
 
-#include <functional>
 #include <future>
 #include <memory>
 #include <mutex>
-#include <string>
-#include <vector>
 
 namespace kvr::testing {
 

@@ -64,6 +64,12 @@ RawBusClient::Reply RawBusClient::call(const char* member, const char* signature
   return call(newCall(member, signature, arguments));
 }
 
+void RawBusClient::send(const BusMessageRef& message) const {
+  std::uint64_t number = 0;  // without one, no answer would be expected
+  require(sd_bus_send(bus_.get(), message.get(), &number), "sd_bus_send");
+  require(sd_bus_flush(bus_.get()), "sd_bus_flush");
+}
+
 Value RawBusClient::value(const char* type, const Reply& reply) const {
   if (!reply.message) throw std::runtime_error(reply.error + ": " + reply.errorText);
   Result<Value> value = readBusValue(reply.message.get(), type);

@@ -4,8 +4,6 @@
 #include "platform/local/bus/BusHandles.h"
 
 #include <optional>
-#include <string>
-#include <vector>
 
 namespace kvr::testing {
 
@@ -31,6 +29,8 @@ class RawBusClient {
   /// Sends a call and waits for its reply.
   Reply call(const BusMessageRef& message) const;
   Reply call(const char* member, const char* signature = "", const Array& arguments = {}) const;
+  /// Sends a call and waits for nothing; an answer is expected all the same.
+  void send(const BusMessageRef& message) const;
   /// The value that a call replied; throws when it was an error.
   Value value(const char* type, const Reply& reply) const;
   /// Makes this client leave the bus at once.

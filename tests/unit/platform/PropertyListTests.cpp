@@ -1,5 +1,4 @@
 #include "platform/BinaryPropertyList.h"
-#include "platform/PropertyList.h"
 #include "unit/platform/Trees.h"
 
 #include <cmath>

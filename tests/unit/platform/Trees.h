@@ -2,10 +2,8 @@
 
 #include "Prelude.h"
 #include "platform/JSON.h"
-#include "platform/PropertyList.h"
 #include "platform/UTF8.h"
 
-#include <functional>
 #include <limits>
 
 namespace kvr {

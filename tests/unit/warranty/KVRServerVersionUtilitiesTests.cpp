@@ -1,4 +1,3 @@
-#include "platform/PropertyList.h"
 #include "unit/SimulatedTest.h"
 #include "warranty/KVRServerVersionUtilities.h"
 #include "warranty/WarrantyKeys.h"

@@ -131,6 +131,20 @@ TEST_F(ADownload, LeavesTheCacheAloneWhenItFails) {
   }
 }
 
+TEST_F(ADownload, AnswersWhatTheCacheCannotHoldAndLeavesTheOldFile) {
+  ASSERT_TRUE(download("WATCH").success);
+  const auto fileBefore = world.files.get(cachedFile("WATCH"));
+  const auto dateKey = CacheMetadata("WATCH").lastUpdatedDateKey;
+  for (const char* unwritable : {R"({"x":null})", R"({"x":"\u0000"})", R"({"x":"\uffff"})"}) {
+    const auto dateBefore = world.preferences.objectForKey(dateKey);
+    world.queues.advance(10);
+    world.coverage = [&](auto&) { return HTTPResponse{200, unwritable, {}}; };
+    EXPECT_EQ(download("WATCH").warranty->dictionaryRepresentation(), *readJSON(unwritable));
+    EXPECT_EQ(world.files.get(cachedFile("WATCH")), fileBefore);
+    EXPECT_NE(world.preferences.objectForKey(dateKey), dateBefore) << "the date moves on";
+  }
+}
+
 TEST_F(ADownload, SchedulesAConversionOutreachOnceThoughNothingCanBeStored) {
   world.coverage = [](auto&) { return HTTPResponse{200, R"({"zubOfferConversionDate":1700000000})", {}}; };
   world.files.setWriteFault(Error{"files", ENOSPC, "no space"});
