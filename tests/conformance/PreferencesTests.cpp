@@ -101,9 +101,7 @@ TEST_P(APreference, OfAnotherDomainIsReadWhereTheNameLeadsNowhereElse) {
   preferences.registerDefaults({{"size", "default"}});
   const std::string domains[] = {
       "", "..", "../outside", "com.tarsil.Widgetry/", "missing", std::string("com.tarsil.Widgetry\0", 20)};
-  for (const auto& domain : domains) {
-    EXPECT_TRUE(preferences.objectForKey("size", domain).isNull()) << domain;
-  }
+  for (const auto& domain : domains) EXPECT_TRUE(preferences.objectForKey("size", domain).isNull()) << domain;
   EXPECT_THAT(world.log.lines(), IsEmpty());
 }
 

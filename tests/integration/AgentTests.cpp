@@ -1,9 +1,6 @@
 #include "integration/support/AgentWorld.h"
-#include "platform/JSON.h"
 
 #include <signal.h>
-
-#include <fstream>
 
 namespace kvr::testing {
 namespace {
@@ -72,47 +69,6 @@ TEST_F(TheAgent, ServesOthersWhileSomeWaitForRenewalsAndAttestations) {
   }
   EXPECT_EQ(world.agent().terminate(), 0) << "the end does not wait for remote answers\n"
                                           << world.agent().errorOutput();
-}
-
-TEST_F(TheAgent, CarriesEveryValueFromTheServiceToTheClientAndThroughTheCache) {
-  const std::string hard =
-      R"({"big":9223372036854775807,"bigger":18446744073709551615,"low":-9223372036854775808,"date":10000000000,)"
-      R"("real":0.1,"huge":1e300,"empty":"","planes":"aé漢😀𠀀\udb40\udc01\udbc0\udc00","breaks":"\n\r\r\n\u0085\u2028",)"
-      R"("list":[[],{},true,false],"nested":{"":"key"}})";
-  world.setCoverage("default", hard);
-  world.startAgent();
-  const auto client = world.newClient();
-  const Value expected = *readJSON(hard);
-  EXPECT_EQ(World::warrantyIn(World::info(client, World::kFirstWatch, World::Refresh)), expected);
-  const auto cached = World::warrantyIn(World::info(client, World::kFirstWatch, World::CacheOnly));
-  EXPECT_EQ(cached, expected);
-  EXPECT_EQ(*readJSON(*writeJSON(cached)), expected);
-}
-
-TEST_F(TheAgent, ReportsBadInputAndGoesOn) {
-  world.startAgent();
-  const auto client = world.newClient();
-  const auto warranty = [&](const std::string& serialNumber, World::Policy policy) {
-    return World::warrantyIn(World::info(client, serialNumber, policy))["coverageLocalizedLabel"];
-  };
-  const std::string watch = World::kFirstWatch;
-  ASSERT_EQ(warranty(watch, World::Refresh), Value("Warranty"));
-  const std::filesystem::path file = world.cacheFileOf(watch);
-  const std::tuple<const char*, std::function<void()>, std::string, World::Policy, Value> cases[] = {
-      {"it is empty", {}, "", World::Refresh, {}},
-      {"it is too long", {}, std::string(100'000, 'x'), World::Refresh, {}},
-      {"it holds a slash", {}, "../../x", World::Refresh, {}},
-      {"set aside as", [&] { std::ofstream(file) << "<plist><dict><key>half"; }, watch, World::CacheOnly, {}},
-      {"Locale.plist is damaged and counts as missing",
-       [&] { world.directory.write("device/Locale.plist", "garbage {"); }, watch, World::Default, "Warranty"},
-  };
-  for (const auto& [complaint, spoil, serialNumber, policy, label] : cases) {
-    const auto from = world.agent().errorOutput().size();
-    if (spoil) spoil();
-    EXPECT_EQ(warranty(serialNumber, policy), label) << complaint;
-    EXPECT_THAT(world.agent().waitForErrorOutput(complaint, from),
-                HasSubstr(" error com.tarsil.Kavrel:core "));
-  }
 }
 
 TEST_F(TheAgent, EndsWithAnErrorWhenItLosesTheBus) {

@@ -24,9 +24,7 @@ TEST_F(AService, DeliversTheCallsOfAConnectionInTheirOrderFromTheVeryFirst) {
   };
   const auto serving = serve();
   const RawBusClient client = newClient();
-  for (std::uint64_t i = 1; i < kCalls; ++i) {
-    client.send(client.newCall("EchoNumber", "t", {i}));
-  }
+  for (std::uint64_t i = 1; i < kCalls; ++i) client.send(client.newCall("EchoNumber", "t", {i}));
   EXPECT_EQ(client.value("t", client.call("EchoNumber", "t", {kCalls})), Value(kCalls));
   std::vector<std::uint64_t> expected(kCalls);
   std::iota(expected.begin(), expected.end(), 1U);

@@ -208,7 +208,6 @@ TEST_F(OverHTTP, AResponseIsTakenOnlyWhole) {
   const std::string untilClosed = "HTTP/1.1 200 OK\r\n\r\n";
   const std::string chunked = "HTTP/1.1 200 OK\r\nTransfer-Encoding: chunked\r\n\r\n";
   const std::string oneChunk = chunked + "100000\r\n" + mebibyte + "\r\n";
-  const std::string fiveBytes = "HTTP/1.1 200 OK\r\nContent-Length: 5\r\n\r\n";
   const auto movedTo = [](const std::string& location) {
     return "HTTP/1.1 301 Moved\r\nLocation: " + location + "\r\nContent-Length: 1\r\n\r\nr";
   };
@@ -220,12 +219,7 @@ TEST_F(OverHTTP, AResponseIsTakenOnlyWhole) {
       {"a byte more", response("401 Unauthorized", mebibyte + "a"), 401, none, kTooLarge},
       {"1 MiB in chunks", oneChunk + "0\r\n\r\n", 200, mebibyte, 0},
       {"a chunk more", oneChunk + "1\r\na\r\n0\r\n\r\n", 200, none, kTooLarge},
-      {"a byte more, until closed", untilClosed + mebibyte + "a", 200, none, kTooLarge},
-      {"compressed unasked", "HTTP/1.1 200 OK\r\nContent-Encoding: gzip\r\n\r\nz", 200, "z", 0},
-      {"shorter than it says", fiveBytes + "four", 0, none, 18},
       {"broken chunk", chunked + "zz\r\n", 0, none, 56},
-      {"not HTTP", "hello\r\n\r\n", 0, none, 1},
-      {"nothing", "", 0, none, 52},
       {"redirect to plain http", movedTo("http://127.0.0.1:1/"), 301, none, 1},
       {"redirect to a file", movedTo("file:///etc/hosts"), 301, none, 1},
       {"redirect to https", movedTo("https://127.0.0.1:1/"), 0, none, kCouldNotConnect},

@@ -76,46 +76,36 @@ class TheAgentAmongHostilePeers : public ::testing::Test {
 
 TEST_F(TheAgentAmongHostilePeers, AnswersWithAnErrorWhateverIsNoCallOfItsInterface) {
   begin();
-  const auto nested = [](char type, int depth) {
+  using Fill = std::function<void(sd_bus_message*)>;
+  const auto nested = [](char type, int depth) -> Fill {
     return [type, depth](sd_bus_message* call) {
       for (int i = depth; i > 0; --i) {
-        const std::string inner =
-            type == 'v' ? (i > 1 ? "v" : "s") : std::string(static_cast<std::size_t>(i) - 1, 'a') + "s";
-        sd_bus_message_open_container(call, type, inner.c_str());
+        const auto inner = std::string(static_cast<std::size_t>(i) - 1, 'a') + "s";
+        sd_bus_message_open_container(call, type, type == 'a' ? inner.c_str() : i > 1 ? "v" : "s");
       }
       sd_bus_message_append(call, "s", "x");
       for (int i = 0; i < depth; ++i) sd_bus_message_close_container(call);
     };
   };
-  const auto text = [](std::size_t size) {
+  const auto text = [](std::size_t size) -> Fill {
     return [size](sd_bus_message* call) { sd_bus_message_append(call, "s", std::string(size, 'x').c_str()); };
   };
-  const auto bytes = [](std::size_t size) {
-    return [size](sd_bus_message* call) {
-      const std::string data(size, 'x');
-      sd_bus_message_append_array(call, 'y', data.data(), data.size());
-    };
+  const Fill bytes = [](sd_bus_message* call) {
+    const std::string data(30U << 20U, 'x');
+    sd_bus_message_append_array(call, 'y', data.data(), data.size());
   };
-  const auto entries = [](int count) {
-    return [count](sd_bus_message* call) {
-      sd_bus_message_open_container(call, 'a', "{sv}");
-      for (int i = 0; i < count; ++i) sd_bus_message_append(call, "{sv}", std::to_string(i).c_str(), "i", i);
-      sd_bus_message_close_container(call);
-    };
+  const Fill entries = [](sd_bus_message* call) {
+    sd_bus_message_open_container(call, 'a', "{sv}");
+    for (int i = 0; i < 200'000; ++i) sd_bus_message_append(call, "{sv}", std::to_string(i).c_str(), "i", i);
+    sd_bus_message_close_container(call);
   };
-  const auto nothing = [](sd_bus_message*) {};
-  struct Call {
-    const char* path;
-    const char* interface;
-    const char* member;
-    std::function<void(sd_bus_message*)> fill;
-    const char* error;
-  };
+  const Fill descriptor = [](sd_bus_message* call) { sd_bus_message_append(call, "h", 0); };
+  const Fill nothing = [](sd_bus_message*) {};
   const char* const path = RawBusClient::kPath;
   const char* const own = RawBusClient::kInterface;
   const char* const text1 = "DismissFollowUpForSerialNumber";
   const std::string longName(255, 'M');
-  const Call calls[] = {
+  const std::tuple<const char*, const char*, const char*, Fill, const char*> calls[] = {
       {path, own, "Nothing", nothing, kUnknown},
       {path, own, "defaultDevice", nothing, kUnknown},
       {path, own, longName.c_str(), nothing, kUnknown},
@@ -128,26 +118,22 @@ TEST_F(TheAgentAmongHostilePeers, AnswersWithAnErrorWhateverIsNoCallOfItsInterfa
       {path, own, text1, nothing, kInvalid},
       {path, own, text1, text((1U << 20U) + 1), kInvalid},
       {path, own, text1, text(10U << 20U), kInvalid},
-      {path, own, text1, bytes(30U << 20U), kInvalid},
-      {path, own, text1, entries(200'000), kInvalid},
-      {path, own, text1, [](sd_bus_message* call) { sd_bus_message_append(call, "h", 0); },
-       "org.freedesktop.DBus.Error.NotSupported"},
+      {path, own, text1, bytes, kInvalid},
+      {path, own, text1, entries, kInvalid},
+      {path, own, text1, descriptor, "org.freedesktop.DBus.Error.NotSupported"},
       {path, own, text1, nested('v', 32), kInvalid},
       {path, own, text1, nested('v', 62), kInvalid},
       {path, own, text1, nested('v', 64), kInvalid},
       {path, own, text1, nested('a', 32), kInvalid},
   };
   const RawBusClient client = world.newClient();
-  for (const auto& call : calls) {
+  for (const auto& [at, interface, member, fill, error] : calls) {
     sd_bus_message* made = nullptr;
-    ASSERT_GE(sd_bus_message_new_method_call(client.bus(), &made, RawBusClient::kName, call.path,
-                                             call.interface, call.member),
-              0);
+    sd_bus_message_new_method_call(client.bus(), &made, RawBusClient::kName, at, interface, member);
     const BusMessageRef message(made);
-    call.fill(made);
-    EXPECT_EQ(client.call(message).error, call.error)
-        << call.path << " " << call.interface << "." << call.member << " "
-        << sd_bus_message_get_signature(made, 1);
+    fill(made);
+    EXPECT_EQ(client.call(message).error, error)
+        << at << " " << interface << "." << member << " " << sd_bus_message_get_signature(made, 1);
   }
   expectNothingIsLeft("after calls that are none");
 }
@@ -155,19 +141,14 @@ TEST_F(TheAgentAmongHostilePeers, AnswersWithAnErrorWhateverIsNoCallOfItsInterfa
 TEST_F(TheAgentAmongHostilePeers, BoundsWhatOneConnectionLeavesWaiting) {
   world.writeDeviceFile("Store.plist", Dictionary{{"purchaseDelay", 3600}});
   begin();
-  struct Flood {
-    std::size_t textSize;
-    int calls;
-    int served;
-  };
   // Each of these waits for the store, some seconds long.
-  const Flood floods[] = {{16, 1500, 1024}, {1U << 20U, 12, 4}};
-  for (const auto& flood : floods) {
+  const std::tuple<std::size_t, int, int> floods[] = {{16, 1500, 1024}, {1U << 20U, 12, 4}};
+  for (const auto& [textSize, calls, served] : floods) {
     RawBusClient client = world.newClient();
-    for (int i = 0; i < flood.calls; ++i)
-      client.send(client.newCall("AppSupportAvailability", "s", {std::string(flood.textSize, 'x')}));
-    const auto found = answers(client, flood.calls - flood.served);
-    EXPECT_EQ(found, (std::map<std::string, int>{{kLimits, flood.calls - flood.served}})) << flood.textSize;
+    for (int i = 0; i < calls; ++i)
+      client.send(client.newCall("AppSupportAvailability", "s", {std::string(textSize, 'x')}));
+    const auto found = answers(client, calls - served);
+    EXPECT_EQ(found, (std::map<std::string, int>{{kLimits, calls - served}})) << textSize;
     expectPoliteService("beside a flood of calls");
     client.leave();
   }
@@ -203,9 +184,7 @@ TEST_F(TheAgentAmongHostilePeers, ServesAThousandConnectionsAtOnceAndLetsGoOfTho
   begin();
   std::vector<RawBusClient> clients;
   for (int i = 0; i < 1000; ++i) clients.push_back(world.newClient());
-  for (const auto& client : clients) {
-    client.send(client.newCall("DefaultDevice"));
-  }
+  for (const auto& client : clients) client.send(client.newCall("DefaultDevice"));
   for (const auto& client : clients) EXPECT_EQ(answers(client, 1), (std::map<std::string, int>{{"", 1}}));
   clients.erase(clients.begin() + 50, clients.end());
   for (auto& client : clients) {

@@ -103,11 +103,14 @@ class TheAgentsPeer : public ::testing::Test {
 
 TEST_F(TheAgentsPeer, IsServedOnlyWhenItIsAGrantedProgramOfTheAgentsUser) {
   const std::pair<bool, std::vector<Value>> values[] = {
-      {true, {true, 1}},
-      {false, {0, false, "true", Date{1}, Value::Bytes{1}, Array{true}, Dictionary{{"a", true}}}}};
+      {true, {true, 1, 2.5}},
+      {false, {0, 0.0, false, "true", Date{1}, Value::Bytes{1}, Array{true}, Dictionary{{"a", true}}}}};
   for (const auto& [isServed, granted] : values) {
-    for (const auto& value : granted)
-      expect(isServed, "granted " + describe(value), {{grantedProgram(value)}});
+    const std::string reason =
+        isServed ? "connection added from" : "Rejecting connection to kvragent: missing";
+    for (const auto& value : granted) {
+      expect(isServed, "granted " + describe(value), {{grantedProgram(value)}}, reason);
+    }
   }
   expect(false, "without a file of entitlements", {{program("granted")}});
   grant(program("other"));
@@ -162,16 +165,6 @@ TEST_F(TheAgentsPeer, IsServedOnlyWhenItIsAGrantedProgramOfTheAgentsUser) {
   EXPECT_EQ(::chown(grantedProgram().c_str(), kNobody, kNobody), 0);
   fs::permissions(path, fs::perms(04755));
   expect(false, "set to another user", {{path}}, "it belongs to another user");
-}
-
-TEST_F(TheAgentsPeer, KeepsWhatWasDecidedForAsLongAsItIsConnected) {
-  for (const bool isServed : {true, false}) {
-    world.entitle(isServed);
-    const auto client = world.newClient();
-    EXPECT_EQ(client.call("DefaultDevice").message != nullptr, isServed);
-    world.entitle(!isServed);
-    EXPECT_EQ(client.call("DefaultDevice").message != nullptr, isServed);
-  }
 }
 
 /// Answers to calls that the agent may have made, with each of `numbers`: the bus's answer about a client,

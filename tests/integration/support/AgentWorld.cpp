@@ -27,7 +27,7 @@ Value watch(const std::string& serialNumber) {
 
 }  // namespace
 
-AgentWorld::AgentWorld() {
+AgentWorld::AgentWorld(Attestation attestation) {
   const auto binary = [](const Value& tree) {
     return *writePropertyList(tree, PropertyListEncoding::Binary);
   };
@@ -47,9 +47,11 @@ AgentWorld::AgentWorld() {
   setLocale("en_US");
   entitle(true);
 
-  service_ = std::make_unique<ChildProcess>(std::vector<std::string>{KVR_PROGRAMS "/kvr-coverage-service",
-                                                                     "--root", directory / "service",
-                                                                     "--authority", directory / kAuthority});
+  std::vector<std::string> command{KVR_PROGRAMS "/kvr-coverage-service", "--root", directory / "service"};
+  if (attestation == Attestation::Required) {
+    command.insert(command.end(), {"--authority", (directory / kAuthority).string()});
+  }
+  service_ = std::make_unique<ChildProcess>(command);
   constexpr std::string_view kListening = "listening on ";
   serviceURL_ = service_->waitForOutput(kListening).substr(kListening.size());
   directory.write(std::string("home/") + kActivities, "{ OSVersion = \"17.9\"; activities = {}; }");

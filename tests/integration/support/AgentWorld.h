@@ -22,8 +22,10 @@ class AgentWorld {
   static constexpr const char* kSecondWatch = "SNWATCH00002";
   enum Policy : std::uint64_t { Default = 0, CacheOnly = 1, Refresh = 2 };
 
-  /// The service insists on attested requests about the phone.
-  AgentWorld();
+  /// Whether the service insists on attested requests about the phone.
+  enum class Attestation { Required, Optional };
+
+  explicit AgentWorld(Attestation attestation = Attestation::Required);
 
   /// From here on it is the device's first start.
   void becomeNewDevice() const;

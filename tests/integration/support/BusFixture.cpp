@@ -14,7 +14,6 @@ const ServiceInterface& BusFixture::echoInterface() {
        {"EchoText", {{"text", "s"}}, {"text", "s"}},
        {"EchoNumber", {{"number", "t"}}, {"number", "t"}},
        {"EchoReal", {{"real", "d"}}, {"real", "d"}},
-       {"EchoFlag", {{"flag", "b"}}, {"flag", "b"}},
        {"Record", {{"text", "s"}, {"number", "t"}}, {"record", "a{sv}"}}}};
   return kInterface;
 }

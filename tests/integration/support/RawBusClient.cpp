@@ -32,12 +32,6 @@ RawBusClient::RawBusClient(const std::string& address) {
   require(sd_bus_start(bus), "sd_bus_start");
 }
 
-std::string RawBusClient::uniqueName() const {
-  const char* name = nullptr;
-  require(sd_bus_get_unique_name(bus_.get(), &name), "sd_bus_get_unique_name");
-  return name;
-}
-
 BusMessageRef RawBusClient::newCall(const char* member, const char* signature, const Array& arguments) const {
   sd_bus_message* message = nullptr;
   require(sd_bus_message_new_method_call(bus_.get(), &message, kName, kPath, kInterface, member), member);

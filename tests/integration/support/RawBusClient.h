@@ -23,7 +23,6 @@ class RawBusClient {
   explicit RawBusClient(const std::string& address);
 
   sd_bus* bus() const { return bus_.get(); }
-  std::string uniqueName() const;
   /// A call of the service's interface with arguments of the bus's basic types and records.
   BusMessageRef newCall(const char* member, const char* signature = "", const Array& arguments = {}) const;
   /// Sends a call and waits for its reply.

@@ -50,6 +50,7 @@ TEST_F(Migration, BringsWhatThereIsOfTheOldLayoutToTheNewOneOnce) {
     EXPECT_EQ(preferences.integerForKey(preference::kMigrationVersion), runs ? 2 : level);
     EXPECT_EQ(world.files.get(kLegacyFile).has_value(), hasFile && !moves);
     EXPECT_EQ(KVRWarranty::cachedWarrantyForSerialNumber(world.platform, "LOCAL") != nullptr, moves);
+    EXPECT_EQ(KVRWarranty::cachedWarrantyForSerialNumber(world.platform, {}) != nullptr, hasFile && !moves);
     EXPECT_EQ(world.files.list("/home/user/Library/Application Support").size(), hasFile ? 1U : 0U);
     EXPECT_EQ(preferences.dateForKey(metadata.lastUpdatedDateKey), dateWhere(moves && hasDate));
     EXPECT_EQ(preferences.dateForKey("CachedWarrantyLastUpdatedDate"), dateWhere(hasDate && !moves));

@@ -18,19 +18,6 @@ class TheService : public SimulatedTest {
   StartUp startUp{world.platform};
 };
 
-TEST_F(TheService, AdmitsATrueNumberUnderTheEntitlementAndNothingElse) {
-  for (const Value& value : {Value(true), Value(2.5)}) {
-    EXPECT_TRUE(connect({{kRequiredEntitlement, value}})->isAccepted()) << describe(value);
-  }
-  for (const Value& value : {Value("true"), Value(0.0), Value(false), Value(Array{1}), Value()}) {
-    world.log.clear();
-    EXPECT_TRUE(connect({{kRequiredEntitlement, value}})->isRefused()) << describe(value);
-    EXPECT_TRUE(world.log.contains(
-        "Rejecting connection to kvragent: missing entitlement 'com.tarsil.private.kvragent'"));
-  }
-  EXPECT_TRUE(connect({})->isRefused());
-}
-
 TEST_F(TheService, KnowsItsCallersBundleWhereThereIsOne) {
   const auto fallback = "callingProcessBundleID is nil. Falling back to Preferences Bundle ID";
   connect(entitled());

@@ -102,6 +102,14 @@ TEST_F(AFollowUp, IsPostedByTheFirstRuleThatApplies) {
   }
 }
 
+TEST_F(AFollowUp, ConvertsAgainOnceADismissedOffersDisplayDateMoves) {
+  followUp.postFollowUpWithDevicesInfo({info("SN", shownInDays(-1, 30)), info("B", due(3))});
+  followUp.dismissFollowUpForSerialNumber("SN");
+  EXPECT_FALSE(followUp.postFollowUpWithDevicesInfo({info("SN", shownInDays(2, 30))}));
+  EXPECT_THAT(hashes(kPosted), ElementsAre(sha256Hash("B"))) << "at the first decision after the move";
+  EXPECT_THAT(pendingSerials(), ElementsAre("B"));
+}
+
 TEST_F(AFollowUp, RecordsNothingThatTheCentreRefused) {
   provider->postError = provider->clearError = Error{"centre", 5, "full"};
   EXPECT_TRUE(recorded.postFollowUpWithDevicesInfo({info("SN", due(5))})) << "it was picked";

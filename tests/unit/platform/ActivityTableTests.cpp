@@ -170,18 +170,6 @@ TEST_F(AnActivityTable, ComplainsOfATreeThatIsNotItsOwn) {
   }
 }
 
-TEST_F(AnActivityTable, HasAnOccasionWhenTheSystemVersionIsNotTheRecordedOne) {
-  const std::optional<std::string> none;
-  const std::pair<std::optional<std::string>, bool> starts[] = {
-      {none, true}, {none, false}, {"17.1", true}, {"17.1", false}, {"17.2", true}, {none, false}};
-  for (const auto& [version, runs] : starts) {
-    table.checkIn("upgrade", kBlock);
-    table.noticeSystemVersion("upgrade", version);
-    EXPECT_EQ(started().size(), runs ? 1U : 0U);
-    EXPECT_TRUE(!runs || end("upgrade", kFinished).changesTree || !version);
-  }
-}
-
 TEST_F(AnActivityTable, ServesOneOccasionAfterTheOtherAndRecordsItAtTheEnd) {
   EXPECT_TRUE(table.noticeBoot("boot", "one", false)) << "the first boot is only recorded";
   EXPECT_THAT(started(), IsEmpty());

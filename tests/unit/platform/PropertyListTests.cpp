@@ -227,11 +227,10 @@ TEST(ATreesText, MayBeNestedToTheLimitAndNoFurther) {
       {readPropertyList, "", "{k=", "v", ";}", ""},
       {readPropertyList, "<plist>", "<array>", "", "</array>", "</plist>"}};
   for (const auto& [read, start, open, innermost, close, end] : cases) {
-    const auto nested = [&](std::size_t depth) {
-      return read(start + repeated(open, depth) + innermost + repeated(close, depth) + end);
-    };
-    EXPECT_TRUE(nested(kMaximumDepth)) << open;
-    EXPECT_FALSE(nested(kMaximumDepth + 1)) << open;
+    for (const auto depth : {kMaximumDepth, kMaximumDepth + 1}) {
+      const auto text = start + repeated(open, depth) + innermost + repeated(close, depth) + end;
+      EXPECT_EQ(static_cast<bool>(read(text)), depth == kMaximumDepth) << open;
+    }
     EXPECT_FALSE(read(start + repeated(open, 100'000))) << open;
   }
   for (const auto* start : {"a=(", "/*", "\"\\", "<dict><key>k</key>", "<unknown>"}) {

@@ -50,6 +50,7 @@ TEST_F(ADownload, GoesOnceToTheEndpointOfItsDeviceForItsClient) {
 TEST_F(ADownload, LogsEachStepInItsOrder) {
   EXPECT_TRUE(download("WATCH").success);
   const auto path = cachedFile("WATCH");
+  EXPECT_THAT(*world.files.get(path), ::testing::StartsWith("<?xml"));
   std::vector<std::string> lines;
   for (const auto& line : world.log.lines()) {
     if (line.level == LogLevel::Default && !line.text.starts_with("default device"))
