@@ -242,11 +242,27 @@ TEST_P(WorkQueuesTest, WorkThatNeverRanIsReleasedAtTheEnd) {
   for (int i = 0; i < kMany; ++i) queue->async([&late, held = marker] { ++late; });
   await(begun);
   timer->invalidate();
-  world->beginEnding();
-  EXPECT_FALSE(newSignal()->wait(std::nullopt));
   world.reset();
   EXPECT_EQ(late, 0);
   EXPECT_EQ(marker.use_count(), 1);
+}
+
+TEST_P(WorkQueuesTest, EndingEndsEveryWait) {
+  const auto never = newSignal();
+  std::atomic<int> begun{0};
+  std::atomic<int> ended{0};
+  const auto allBegun = newSignal();
+  for (int i = 0; i < kMany; ++i) {
+    concurrent()->async([&, limit = i % 2 == 0 ? std::optional(1e6) : std::nullopt] {
+      if (++begun == kMany) allBegun->signal();
+      if (!never->wait(limit)) ++ended;
+    });
+  }
+  await(allBegun);
+  world->beginEnding();
+  EXPECT_FALSE(never->wait(std::nullopt));
+  world.reset();
+  EXPECT_EQ(ended, kMany);
 }
 
 // What only real threads do.
