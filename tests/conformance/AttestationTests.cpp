@@ -1,5 +1,4 @@
 #include "conformance/FileWorld.h"
-#include "platform/PropertyListFiles.h"
 #include "platform/local/LocalDeviceAttestation.h"
 #include "platform/simulated/SimulatedDeviceProperties.h"
 
@@ -12,10 +11,6 @@ namespace kvr {
 namespace {
 
 namespace fs = std::filesystem;
-using ::testing::Each;
-using ::testing::HasSubstr;
-using ::testing::IsEmpty;
-using ::testing::SizeIs;
 
 constexpr double kDay = 24 * 60 * 60;
 constexpr const char* kLabel = "com.tarsil.kvragent.kestCertificates";
@@ -124,7 +119,7 @@ class AnAttestation : public ::testing::Test {
     EXPECT_FALSE(isSignatureOf(*answer.key->sign(body), "another body", answer.chain->front()));
     EXPECT_EQ(verdictOn(answer.chain->front(), keys() / "authority.pem", clock_.now()), "ok");
   }
-  std::string home() const { return directory_.path(); }
+  std::string home() const { return directory_.path().string(); }
   fs::path keys() const { return fs::path(home()) / "Library/Keys" / kLabel; }
   std::string kept(const char* file) const { return *contentOfFile(keys() / file); }
 
@@ -145,7 +140,7 @@ TEST_F(AnAttestation, SignsWithAKeyThatTheLocalAuthorityCertifiesForTheDevice) {
     EXPECT_THAT(leaf, HasSubstr("Phone14,2"));
     // The SHA-256 of the serial number.
     EXPECT_THAT(leaf, HasSubstr("f4ba7148758c1fb5b89f69efee398edc03ab60cde388cf19c382dc080f4f8afc"));
-    EXPECT_THAT(leaf, ::testing::Not(HasSubstr("C39SERIAL")));
+    EXPECT_THAT(leaf, Not(HasSubstr("C39SERIAL")));
   }
 }
 
@@ -205,6 +200,26 @@ TEST_F(AnAttestation, IsIssuedAnewWhenWhatIsKeptIsNoGoodAndSaysSoOnceWhenItIsDam
     EXPECT_NE(after.chain, before.chain);
     EXPECT_EQ(issued().chain, after.chain);
     EXPECT_THAT(log_.texts(LogLevel::Error), SizeIs(spoiling.isDamage ? 1 : 0));
+  }
+}
+
+TEST_F(AnAttestation, DoesWhatTheDevicesFileSays) {
+  const std::tuple<Dictionary, bool, std::int64_t, bool> cases[] = {
+      {{{"Supported", false}}, false, 0, true},
+      {{{"PreferredError", -11}}, false, -11, false},
+      {{{"PreferredError", -11}}, true, 0, true},
+      {{{"PreferredError", -4}, {"FallbackError", 9}}, true, 9, false},
+      {{{"OmitChain", true}}, false, 0, false},
+      {{}, false, 0, true},
+  };
+  for (const auto& [behaviour, usesFallbackKind, code, hasChain] : cases) {
+    writeFile(home() + "/device/Attestation.plist", *writePropertyList(behaviour, PropertyListEncoding::XML));
+    EXPECT_EQ(Process(*this).attestation.isSupported(), !behaviour.contains("Supported"));
+    const auto answer = issued(usesFallbackKind);
+    EXPECT_EQ(answer.error ? answer.error->code : 0, code) << describe(Value(behaviour));
+    EXPECT_TRUE(!answer.error || answer.error->domain == DeviceAttestation::kErrorDomain);
+    EXPECT_EQ(answer.chain.has_value(), hasChain) << describe(Value(behaviour));
+    EXPECT_EQ(answer.key != nullptr, code == 0);
   }
 }
 

@@ -1,51 +1,24 @@
 #pragma once
 
+#include "Prelude.h"
+#include "integration/support/TemporaryDirectory.h"
 #include "platform/local/LocalFiles.h"
 #include "platform/simulated/SimulatedClock.h"
 #include "platform/simulated/SimulatedFiles.h"
 #include "platform/simulated/SimulatedLog.h"
 
-#include <gmock/gmock.h>
-
 #include <algorithm>
-#include <cstdlib>
 #include <filesystem>
 #include <fstream>
-#include <iterator>
-#include <stdexcept>
 
 namespace kvr {
 
-/// An empty directory for one test.
-class TemporaryDirectory {
- public:
-  TemporaryDirectory() {
-    std::string pattern = (std::filesystem::temp_directory_path() / "kvr-test-XXXXXX").string();
-    if (::mkdtemp(pattern.data()) == nullptr) throw std::runtime_error("no temporary directory");
-    path_ = pattern;
-  }
-  TemporaryDirectory(const TemporaryDirectory&) = delete;
-  TemporaryDirectory& operator=(const TemporaryDirectory&) = delete;
-  ~TemporaryDirectory() {
-    std::error_code ignored;
-    std::filesystem::remove_all(path_, ignored);
-  }
-
-  const std::string& path() const { return path_; }
-
- private:
-  std::string path_;
-};
+using testing::contentOfFile;
+using testing::TemporaryDirectory;
 
 inline void writeFile(const std::string& path, const std::string& bytes) {
   std::filesystem::create_directories(std::filesystem::path(path).parent_path());
   std::ofstream(path, std::ios::binary | std::ios::trunc) << bytes;
-}
-
-inline std::optional<std::string> contentOfFile(const std::string& path) {
-  std::ifstream file(path, std::ios::binary);
-  if (!file) return std::nullopt;
-  return std::string(std::istreambuf_iterator<char>(file), {});
 }
 
 /// One user's files, of this machine or simulated, as they are seen from outside.
@@ -54,7 +27,7 @@ class FileWorld {
   explicit FileWorld(bool isLocal) {
     if (isLocal) {
       directory_ = std::make_unique<TemporaryDirectory>();
-      local_ = std::make_unique<LocalFiles>(log, directory_->path());
+      local_ = std::make_unique<LocalFiles>(log, directory_->path().string());
     } else {
       simulated_ = std::make_unique<SimulatedFiles>(clock);
     }
@@ -63,7 +36,7 @@ class FileWorld {
   Files& files() { return local_ ? static_cast<Files&>(*local_) : *simulated_; }
   /// The same files as another process has them.
   std::unique_ptr<Files> filesOfAnotherProcess() {
-    return local_ ? std::make_unique<LocalFiles>(log, directory_->path()) : nullptr;
+    return local_ ? std::make_unique<LocalFiles>(log, directory_->path().string()) : nullptr;
   }
   std::string path(const std::string& name) { return files().homeDirectory() + "/" + name; }
 

@@ -1,5 +1,4 @@
 #include "conformance/FileWorld.h"
-#include "platform/PropertyListFiles.h"
 #include "platform/local/Descriptor.h"
 #include "platform/local/LocalLog.h"
 
@@ -14,10 +13,6 @@ namespace kvr {
 namespace {
 
 namespace fs = std::filesystem;
-using ::testing::ElementsAre;
-using ::testing::HasSubstr;
-using ::testing::IsEmpty;
-using ::testing::SizeIs;
 using Expected = PropertyListFiles::Expected;
 using WhenDamaged = PropertyListFiles::WhenDamaged;
 
@@ -100,7 +95,7 @@ TEST_P(APropertyListFile, IsReadAsItIsNow) {
   EXPECT_TRUE(read().isNull());
   // Contents of equal size, one right after the other: no stamp may hide one.
   for (int round = 0; round < 50; ++round) {
-    world.put(path, bytesOf(Value::Dictionary{{"round", round}}));
+    world.put(path, bytesOf(Dictionary{{"round", round}}));
     EXPECT_EQ(read()["round"], Value(round));
   }
   world.erase(path);
@@ -109,8 +104,8 @@ TEST_P(APropertyListFile, IsReadAsItIsNow) {
 }
 
 TEST_P(APropertyListFile, IsSetAsideUnderANameOfItsOwnWhenItIsDamaged) {
-  ASSERT_EQ(codeOf(lists.write(path, Value::Dictionary{}, PropertyListEncoding::XML)), 0);
-  const std::string damaged[] = {"", "garbage {", bytesOf(Value::Array{1}), bytesOf(Value("text"))};
+  ASSERT_EQ(codeOf(lists.write(path, Dictionary{}, PropertyListEncoding::XML)), 0);
+  const std::string damaged[] = {"", "garbage {", bytesOf(Array{1}), bytesOf(Value("text"))};
   for (const auto& bytes : damaged) {
     world.put(path, bytes);
     EXPECT_TRUE(read().isNull());
@@ -132,8 +127,8 @@ TEST_P(APropertyListFile, IsLeftAndReportedOnceAStateWhereItIsNotOurs) {
     return world.log.texts(LogLevel::Error).size();
   };
   EXPECT_EQ(complaintsAfter("garbage {"), 1U);
-  EXPECT_EQ(complaintsAfter(bytesOf(Value::Array{1})), 2U);
-  EXPECT_EQ(read(WhenDamaged::Leave, Expected::Array), Value(Value::Array{1}));
+  EXPECT_EQ(complaintsAfter(bytesOf(Array{1})), 2U);
+  EXPECT_EQ(read(WhenDamaged::Leave, Expected::Array), Value(Array{1}));
   EXPECT_EQ(complaintsAfter("garbage {"), 3U);
   EXPECT_THAT(world.names(world.files().homeDirectory()), ElementsAre("list.plist"));
 }
@@ -145,17 +140,17 @@ TEST_P(APropertyListFile, IsAnErrorReportedOnceWhileItCannotBeRead) {
       EXPECT_EQ(codeOf(lists.read(path, Expected::Dictionary, WhenDamaged::SetAside)), EFBIG);
     }
     EXPECT_THAT(world.log.texts(LogLevel::Error), SizeIs(complaints));
-    world.put(path, bytesOf(Value::Dictionary{{"a", 1}}));
+    world.put(path, bytesOf(Dictionary{{"a", 1}}));
     EXPECT_EQ(read()["a"], Value(1));
   }
   EXPECT_THAT(world.names(world.files().homeDirectory()), ElementsAre("list.plist"));
 }
 
 TEST_P(APropertyListFile, KeepsItsContentWhenANewOneCannotBeWritten) {
-  ASSERT_EQ(codeOf(lists.write(path, Value::Dictionary{{"a", 1}}, PropertyListEncoding::XML)), 0);
-  EXPECT_TRUE(lists.write(path, Value::Dictionary{{"a", Value()}}, PropertyListEncoding::XML));
+  ASSERT_EQ(codeOf(lists.write(path, Dictionary{{"a", 1}}, PropertyListEncoding::XML)), 0);
+  EXPECT_TRUE(lists.write(path, Dictionary{{"a", Value()}}, PropertyListEncoding::XML));
   const std::string large(PropertyListFiles::kLimit, 'x');
-  EXPECT_EQ(codeOf(lists.write(path, Value::Dictionary{{"a", large}}, PropertyListEncoding::Binary)), EFBIG);
+  EXPECT_EQ(codeOf(lists.write(path, Dictionary{{"a", large}}, PropertyListEncoding::Binary)), EFBIG);
   EXPECT_EQ(read()["a"], Value(1));
 }
 
@@ -173,7 +168,7 @@ TEST_F(ASimulatedPropertyListFile, IsParsedOnceWhileTheMemoryForItLastsAndItIsUn
     EXPECT_TRUE(lists.read(path, Expected::Dictionary, WhenDamaged::Leave));
     return files.readCount() != before;
   };
-  const auto large = bytesOf(Value::Dictionary{{"text", std::string(1500 * 1024, 'x')}});
+  const auto large = bytesOf(Dictionary{{"text", std::string(1500 * 1024, 'x')}});
   for (const auto* path : {"/a", "/b", "/c"}) files.put(path, large);
   files.put("/damaged", "garbage {");
   const std::pair<const char*, bool> reads[] = {
@@ -202,7 +197,7 @@ class LocalFilesOf : public ::testing::Test {
   }
 
   TemporaryDirectory directory;
-  const std::string home = directory.path();
+  const std::string home = directory.path().string();
   SimulatedLog log;
   LocalFiles files{log, home + "/", 0.01};
 };
@@ -236,8 +231,7 @@ TEST_F(LocalFilesOf, AKilledProcessGoWhileALivingOnesStay) {
   const Descriptor writer(::open((home + "/.list.plist.kvr-ghijkl").c_str(), O_RDWR | O_CLOEXEC));
   ASSERT_EQ(::flock(writer.get(), LOCK_EX), 0);
   ASSERT_EQ(codeOf(files.replace(home + "/list.plist", "x")), 0);
-  EXPECT_THAT(names(),
-              ::testing::UnorderedElementsAre("list.plist", ".list.plist.abcdef", ".list.plist.kvr-ghijkl"));
+  EXPECT_THAT(names(), UnorderedElementsAre("list.plist", ".list.plist.abcdef", ".list.plist.kvr-ghijkl"));
 }
 
 TEST_F(LocalFilesOf, ADirectoryAreLockedAgainstOtherProcessesWhileThatIsPossible) {
@@ -267,7 +261,7 @@ class ALogLine : public ::testing::Test {
   std::string written() const { return contentOfFile(path).value_or(""); }
 
   TemporaryDirectory directory;
-  const std::string path = directory.path() + "/log";
+  const std::string path = directory.path().string() + "/log";
   const Descriptor descriptor{::open(path.c_str(), O_CREAT | O_WRONLY | O_APPEND | O_CLOEXEC, 0600)};
 };
 

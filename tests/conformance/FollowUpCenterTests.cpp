@@ -7,10 +7,6 @@
 namespace kvr {
 namespace {
 
-using ::testing::ElementsAre;
-using ::testing::IsEmpty;
-using ::testing::SizeIs;
-
 const std::string kClient = "com.tarsil.Kavrel";
 
 FollowUpItem itemNamed(const std::string& identifier) {
@@ -78,7 +74,7 @@ TEST_P(AFollowUpCenter, RefusesWhatItCannotKeep) {
 }
 
 TEST_P(AFollowUpCenter, SetsADamagedListAsideAndGoesOn) {
-  const Value damaged[] = {Value::Dictionary{{"items", "x"}}, Value::Dictionary{{"items", Value::Array{1}}}};
+  const Value damaged[] = {Dictionary{{"items", "x"}}, Dictionary{{"items", Array{1}}}};
   for (const auto& tree : damaged) {
     put(tree);
     EXPECT_THAT(pending(), IsEmpty());
@@ -86,7 +82,7 @@ TEST_P(AFollowUpCenter, SetsADamagedListAsideAndGoesOn) {
     EXPECT_THAT(pending(), ElementsAre("a"));
     world.clock.moveBy(60);
   }
-  EXPECT_THAT(world.names(folder), ::testing::Contains(::testing::HasSubstr(".damaged-")).Times(2));
+  EXPECT_THAT(world.names(folder), Contains(HasSubstr(".damaged-")).Times(2));
   EXPECT_THAT(world.log.texts(LogLevel::Error), SizeIs(2));
 }
 

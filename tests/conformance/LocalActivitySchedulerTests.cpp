@@ -12,10 +12,6 @@
 namespace kvr {
 namespace {
 
-using ::testing::ElementsAre;
-using ::testing::IsEmpty;
-using ::testing::SizeIs;
-
 constexpr const char* kUpgrade = "com.tarsil.kvragent.upgrade";
 constexpr const char* kBoot = "com.tarsil.kvragent.boot";
 
@@ -79,10 +75,6 @@ class ALocalScheduler : public ::testing::Test {
     return std::make_unique<Start>(world.files(), world, device, properties, world.clock);
   }
   Value stored() { return *readPropertyList(*world.get(path)); }
-  void setNetwork(bool reachable) {
-    writeFile(device + "/Network.plist",
-              *writePropertyList(Value::Dictionary{{"reachable", reachable}}, PropertyListEncoding::XML));
-  }
 
   FileWorld world{true};
   const std::string device = world.path("device");
@@ -95,19 +87,16 @@ TEST_F(ALocalScheduler, TakesARegistrationUpAgainAndRunsItOnce) {
   const auto before = stored()["activities"]["a"];
   EXPECT_GE(before["dueDate"].date(), world.clock.now() + 3600);
   EXPECT_LE(before["dueDate"].date(), world.clock.now() + 3960);
-  {
-    const auto early = start();
-    early->monitor("a");
-    EXPECT_THAT(early->finish(), IsEmpty());
-  }
+  const auto monitored = [&](bool isDue) {
+    const auto local = start();
+    local->monitor("a");
+    if (isDue) local->loop.run();
+    return local->finish();
+  };
+  EXPECT_THAT(monitored(false), IsEmpty());
   EXPECT_EQ(stored()["activities"]["a"], before) << "nothing is drawn anew";
   world.clock.moveBy(3960);
-  {
-    const auto due = start();
-    due->monitor("a");
-    due->loop.run();
-    EXPECT_THAT(due->finish(), ElementsAre("a"));
-  }
+  EXPECT_THAT(monitored(true), ElementsAre("a"));
   EXPECT_TRUE(stored()["activities"]["a"].isNull());
 }
 
@@ -120,32 +109,25 @@ TEST_F(ALocalScheduler, RunsWhatBecomesDueByItsTimer) {
 }
 
 TEST_F(ALocalScheduler, WaitsForTheNetworkWithoutAskingAgain) {
-  setNetwork(false);
-  const auto local = start();
-  local->add("a", {0, 0, true});
-  EXPECT_EQ(local->scheduler.runsUnderWay(), 0U);
-  setNetwork(true);
-  local->loop.run();
-  EXPECT_THAT(local->finish(), ElementsAre("a"));
-}
-
-TEST_F(ALocalScheduler, BelievesTheHostsNetworkServiceWhereTheDeviceDoesNotSay) {
-  writeFile(device + "/netif", "# networkd\nCARRIER_STATE=no-carrier\nOPER_STATE=no-carrier\n");
-  const auto local = start();
-  local->add("a", {0, 0, true});
-  EXPECT_EQ(local->scheduler.runsUnderWay(), 0U);
-  writeFile(device + "/netif", "OPER_STATE=routable\n");
-  local->loop.run();
-  EXPECT_THAT(local->finish(), ElementsAre("a"));
-}
-
-TEST_F(ALocalScheduler, NoticesThatTheDeviceDirectoryHasGone) {
-  setNetwork(false);
-  const auto local = start();
-  local->add("a", {0, 0, true});
-  std::filesystem::remove_all(device);
-  local->loop.run();
-  EXPECT_THAT(local->finish(), ElementsAre("a"));
+  const auto setNetwork = [&](bool isReachable) {
+    world.put(device + "/Network.plist",
+              *writePropertyList(Dictionary{{"reachable", isReachable}}, PropertyListEncoding::XML));
+  };
+  // The device says so, goes away, or does not say and the host's network service is believed.
+  const std::pair<std::function<void()>, std::function<void()>> cases[] = {
+      {[&] { setNetwork(false); }, [&] { setNetwork(true); }},
+      {[&] { setNetwork(false); }, [&] { std::filesystem::remove_all(device); }},
+      {[&] { world.put(device + "/netif", "# networkd\nCARRIER_STATE=no-carrier\nOPER_STATE=no-carrier\n"); },
+       [&] { world.put(device + "/netif", "OPER_STATE=routable\n"); }}};
+  for (const auto& [lose, regain] : cases) {
+    lose();
+    const auto local = start();
+    local->add("a", {0, 0, true});
+    EXPECT_EQ(local->scheduler.runsUnderWay(), 0U);
+    regain();
+    local->loop.run();
+    EXPECT_THAT(local->finish(), ElementsAre("a"));
+  }
 }
 
 TEST_F(ALocalScheduler, RunsOccasionsAfterUpgradeBootAndDamage) {
@@ -162,24 +144,15 @@ TEST_F(ALocalScheduler, RunsOccasionsAfterUpgradeBootAndDamage) {
   EXPECT_THAT(runsOfAStart(), ElementsAre(kBoot));
   properties.answers["ProductVersion"] = "17.2";
   EXPECT_THAT(runsOfAStart(), ElementsAre(kUpgrade));
+  properties.answers.erase("ProductVersion");
+  EXPECT_THAT(runsOfAStart(), IsEmpty());
+  properties.answers["ProductVersion"] = "17.2";
+  EXPECT_THAT(runsOfAStart(), IsEmpty());
   EXPECT_THAT(world.log.texts(LogLevel::Error), IsEmpty());
   world.put(path, "damaged");
   EXPECT_THAT(runsOfAStart(), ElementsAre(kUpgrade, kBoot));
   EXPECT_THAT(world.log.texts(LogLevel::Error), SizeIs(1));
   EXPECT_EQ(stored()["bootIdentifier"], Value("two"));
-}
-
-TEST_F(ALocalScheduler, RegistersAnewWhatItsClientSaysIsScheduled) {
-  {
-    const auto local = start();
-    const auto activity = local->scheduler.newActivity("a");
-    activity->setPreregistered(true);
-    activity->setExpectation({world.clock.now() + 500, {500, 0, true}});
-    activity->schedule(local->recorder("a"));
-    EXPECT_THAT(local->finish(), IsEmpty());
-  }
-  EXPECT_EQ(stored()["activities"]["a"]["dueDate"].date(), world.clock.now() + 500);
-  EXPECT_TRUE(stored()["activities"]["a"]["requiresNetwork"].asBool());
 }
 
 TEST(LocalCarriers, AreNamedByTheirIndex) {
@@ -188,9 +161,8 @@ TEST(LocalCarriers, AreNamedByTheirIndex) {
   const DeviceRoot root(lists, world.log, world.path("device"));
   const LocalCarrierInfo carriers(root);
   EXPECT_THAT(carriers.subscriptions(), IsEmpty());
-  const Value list =
-      Value::Array{Value::Dictionary{{"mobileCountryCode", "001"}, {"mobileNetworkCode", "01"}}, 7,
-                   Value::Dictionary{{"mobileNetworkCode", 5}}};
+  const Value list = Array{Dictionary{{"mobileCountryCode", "001"}, {"mobileNetworkCode", "01"}}, 7,
+                           Dictionary{{"mobileNetworkCode", 5}}};
   world.put(root.pathOf("Carriers.plist"), *writePropertyList(list, PropertyListEncoding::XML));
   const auto subscriptions = carriers.subscriptions();
   ASSERT_THAT(subscriptions, SizeIs(2));

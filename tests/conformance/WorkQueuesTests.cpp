@@ -1,7 +1,5 @@
+#include "Prelude.h"
 #include "conformance/QueuesWorld.h"
-
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
 
 #include <atomic>
 #include <cmath>
@@ -10,10 +8,6 @@
 
 namespace kvr {
 namespace {
-
-using ::testing::Contains;
-using ::testing::ElementsAre;
-using ::testing::IsEmpty;
 
 constexpr int kMany = 200;
 

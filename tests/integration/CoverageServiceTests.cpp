@@ -1,25 +1,17 @@
+#include "Prelude.h"
 #include "integration/support/ChildProcess.h"
-#include "integration/support/RecordingLog.h"
+#include "integration/support/HTTPClient.h"
 #include "integration/support/TemporaryDirectory.h"
 #include "platform/JSON.h"
-#include "platform/local/EventLoop.h"
 #include "platform/local/LocalCertificates.h"
-#include "platform/local/LocalHTTP.h"
-#include "platform/local/LocalWorkQueues.h"
 #include "signing/Base64.h"
 
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
 #include <zlib.h>
 
 #include <ctime>
-#include <functional>
-#include <future>
 
 namespace kvr::testing {
 namespace {
-
-using ::testing::HasSubstr;
 
 constexpr char kLocal[] = "/api/v3/coverage/summary";
 constexpr char kOther[] = "/api/v2/coverage/summary";
@@ -47,9 +39,8 @@ struct Identity {
   static CertifiedKey authorityOf(const openssl::Key& key) { return {key, *newAuthorityCertificate(key)}; }
   /// The JSON of the chain.
   std::string chain(JSONSlashes slashes = JSONSlashes::Escaped) const {
-    const Value::Array certificates{base64Encoded(*derOf(leaf)),
-                                    base64Encoded(*derOf(authority.certificate))};
-    return *writeJSON(Value::Dictionary{{"certs", certificates}}, slashes);
+    const Array certificates{base64Encoded(*derOf(leaf)), base64Encoded(*derOf(authority.certificate))};
+    return *writeJSON(Dictionary{{"certs", certificates}}, slashes);
   }
   void attest(HTTPRequest& request) const {
     request.headers.set("X-Tarsil-Kest-S", base64Encoded(*sign(key, request.body)));
@@ -92,9 +83,7 @@ class ACoverageService : public ::testing::Test {
   }
   /// The status and the body of the answer.
   std::string ask(const HTTPRequest& request) {
-    std::promise<HTTPResponse> promise;
-    http_.sharedSession().send(request, [&](HTTPResponse it) { promise.set_value(std::move(it)); });
-    const HTTPResponse answer = promise.get_future().get();
+    const HTTPResponse answer = client_.exchange(request);
     return std::to_string(answer.status) + " " + answer.body.value_or("");
   }
 
@@ -102,10 +91,7 @@ class ACoverageService : public ::testing::Test {
   std::string url_;
 
  private:
-  RecordingLog log_;
-  EventLoop loop_;
-  LocalWorkQueues queues_{loop_, log_};
-  LocalHTTP http_{queues_, log_};
+  HTTPClient client_;
   std::optional<ChildProcess> service_;
 };
 
@@ -156,7 +142,7 @@ TEST_F(ACoverageService, RefusesEveryBrokenRuleWithAReason) {
       {"does not lead to the authority", [&](auto& request) { stranger.attest(request); }},
   };
   const auto expectRefusal = [this](const HTTPRequest& request, const char* reason) {
-    EXPECT_THAT(ask(request), ::testing::AllOf(::testing::StartsWith("400 "), HasSubstr(reason)));
+    EXPECT_THAT(ask(request), AllOf(::testing::StartsWith("400 "), HasSubstr(reason)));
   };
   for (const auto& [reason, change] : signedCases) {
     HTTPRequest request = goodRequest();

@@ -1,22 +1,15 @@
 // The real agent, ended or refused at each of its calls about files in turn.
 #include "integration/support/AgentWorld.h"
 #include "integration/support/Injection.h"
-#include "platform/PropertyList.h"
 #include "signing/SHA256Hash.h"
 
 #include <fcntl.h>
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
 #include <sys/mman.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cstring>
-#include <fstream>
-#include <functional>
-#include <iterator>
 #include <limits>
-#include <map>
 
 namespace kvr::testing {
 namespace {
@@ -35,14 +28,13 @@ constexpr std::size_t kMostComplaintsOfLasting = 4;
 Value steady(const Value& tree) {
   if (tree.isDate()) return Date{0};
   if (!tree.isDictionary()) return tree;
-  Value::Dictionary entries;
+  Dictionary entries;
   for (const auto& [key, value] : tree.dictionary()) entries.emplace(key, steady(value));
   return entries;
 }
 
 Value contentOf(const fs::path& path) {
-  std::ifstream file(path, std::ios::binary);
-  const std::string bytes(std::istreambuf_iterator<char>(file), {});
+  const std::string bytes = *contentOfFile(path);
   if (path.extension() == ".plist") return steady(*readPropertyList(bytes));
   return bytes.starts_with("-----BEGIN ") && bytes.ends_with("-----\n") ? "PEM" : bytes;
 }
@@ -83,7 +75,7 @@ std::vector<Store> allStores() {
 class TheAgentsStores : public ::testing::Test {
  protected:
   /// What the files of a store hold, by their names.
-  using State = Value::Dictionary;
+  using State = Dictionary;
 
   void SetUp() override {
     if (KVR_SANITIZED) GTEST_SKIP() << "a sanitizer's runtime stands before the injector's calls";
@@ -96,13 +88,12 @@ class TheAgentsStores : public ::testing::Test {
     world.moreEnvironment = {{"LD_PRELOAD", KVR_PROGRAMS "/libkvr-injector.so"},
                              {Injection::kVariable, file.string()}};
 
-    Value::Array items;
+    Array items;
     for (const auto* serialNumber : {World::kPhone, World::kFirstWatch}) {
-      items.push_back(
-          Value::Dictionary{{"uniqueIdentifier", "com.tarsil.Kavrel." + sha256Hash(serialNumber)}});
+      items.push_back(Dictionary{{"uniqueIdentifier", "com.tarsil.Kavrel." + sha256Hash(serialNumber)}});
     }
     world.directory.write("home/Library/FollowUps/com.tarsil.Kavrel.plist",
-                          *writePropertyList(Value::Dictionary{{"items", items}}, PropertyListEncoding::XML));
+                          *writePropertyList(Dictionary{{"items", items}}, PropertyListEncoding::XML));
     world.startAgent();
     World::info(world.newClient(), World::kFirstWatch, World::Refresh);
     ASSERT_EQ(world.agent().terminate(), 0);
@@ -191,10 +182,7 @@ class TheAgentsStores : public ::testing::Test {
     world.newClient().call("GetDeviceInfoForSerialNumber", "st", {mark, World::CacheOnly});
     world.agent().waitForErrorOutput(mark);
     const auto log = world.agent().errorOutput();
-    std::size_t lines = 0;
-    for (auto at = log.find(" error com."); at != std::string::npos; at = log.find(" error com.", at + 1))
-      ++lines;
-    return lines;
+    return countOf(" error com.", log);
   }
 
   mutable AgentWorld world;

@@ -1,17 +1,12 @@
 #include "integration/support/AgentWorld.h"
 
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
-
 #include <algorithm>
 #include <chrono>
 #include <fstream>
-#include <functional>
 
 namespace kvr::testing {
 namespace {
 
-using ::testing::HasSubstr;
 using World = AgentWorld;
 
 constexpr const char* kLimits = "org.freedesktop.DBus.Error.LimitsExceeded";
@@ -54,11 +49,6 @@ class TheAgentAmongHostilePeers : public ::testing::Test {
     return std::distance(all, std::filesystem::directory_iterator());
   }
 
-  /// Sends without waiting for an answer, and without reading any.
-  static void send(const RawBusClient& client, const BusMessageRef& message) {
-    std::uint64_t number = 0;  // without one, no answer would be expected
-    ASSERT_GE(sd_bus_send(client.bus(), message.get(), &number), 0);
-  }
   /// Reads what has come and what comes until `count` calls have been answered: by error, "" for none.
   static std::map<std::string, int> answers(const RawBusClient& client, int count) {
     std::map<std::string, int> found;
@@ -86,46 +76,36 @@ class TheAgentAmongHostilePeers : public ::testing::Test {
 
 TEST_F(TheAgentAmongHostilePeers, AnswersWithAnErrorWhateverIsNoCallOfItsInterface) {
   begin();
-  const auto nested = [](char type, int depth) {
+  using Fill = std::function<void(sd_bus_message*)>;
+  const auto nested = [](char type, int depth) -> Fill {
     return [type, depth](sd_bus_message* call) {
       for (int i = depth; i > 0; --i) {
-        const std::string inner =
-            type == 'v' ? (i > 1 ? "v" : "s") : std::string(static_cast<std::size_t>(i) - 1, 'a') + "s";
-        sd_bus_message_open_container(call, type, inner.c_str());
+        const auto inner = std::string(static_cast<std::size_t>(i) - 1, 'a') + "s";
+        sd_bus_message_open_container(call, type, type == 'a' ? inner.c_str() : i > 1 ? "v" : "s");
       }
       sd_bus_message_append(call, "s", "x");
       for (int i = 0; i < depth; ++i) sd_bus_message_close_container(call);
     };
   };
-  const auto text = [](std::size_t size) {
+  const auto text = [](std::size_t size) -> Fill {
     return [size](sd_bus_message* call) { sd_bus_message_append(call, "s", std::string(size, 'x').c_str()); };
   };
-  const auto bytes = [](std::size_t size) {
-    return [size](sd_bus_message* call) {
-      const std::string data(size, 'x');
-      sd_bus_message_append_array(call, 'y', data.data(), data.size());
-    };
+  const Fill bytes = [](sd_bus_message* call) {
+    const std::string data(30U << 20U, 'x');
+    sd_bus_message_append_array(call, 'y', data.data(), data.size());
   };
-  const auto entries = [](int count) {
-    return [count](sd_bus_message* call) {
-      sd_bus_message_open_container(call, 'a', "{sv}");
-      for (int i = 0; i < count; ++i) sd_bus_message_append(call, "{sv}", std::to_string(i).c_str(), "i", i);
-      sd_bus_message_close_container(call);
-    };
+  const Fill entries = [](sd_bus_message* call) {
+    sd_bus_message_open_container(call, 'a', "{sv}");
+    for (int i = 0; i < 200'000; ++i) sd_bus_message_append(call, "{sv}", std::to_string(i).c_str(), "i", i);
+    sd_bus_message_close_container(call);
   };
-  const auto nothing = [](sd_bus_message*) {};
-  struct Call {
-    const char* path;
-    const char* interface;
-    const char* member;
-    std::function<void(sd_bus_message*)> fill;
-    const char* error;
-  };
+  const Fill descriptor = [](sd_bus_message* call) { sd_bus_message_append(call, "h", 0); };
+  const Fill nothing = [](sd_bus_message*) {};
   const char* const path = RawBusClient::kPath;
   const char* const own = RawBusClient::kInterface;
   const char* const text1 = "DismissFollowUpForSerialNumber";
   const std::string longName(255, 'M');
-  const Call calls[] = {
+  const std::tuple<const char*, const char*, const char*, Fill, const char*> calls[] = {
       {path, own, "Nothing", nothing, kUnknown},
       {path, own, "defaultDevice", nothing, kUnknown},
       {path, own, longName.c_str(), nothing, kUnknown},
@@ -138,46 +118,37 @@ TEST_F(TheAgentAmongHostilePeers, AnswersWithAnErrorWhateverIsNoCallOfItsInterfa
       {path, own, text1, nothing, kInvalid},
       {path, own, text1, text((1U << 20U) + 1), kInvalid},
       {path, own, text1, text(10U << 20U), kInvalid},
-      {path, own, text1, bytes(30U << 20U), kInvalid},
-      {path, own, text1, entries(200'000), kInvalid},
-      {path, own, text1, [](sd_bus_message* call) { sd_bus_message_append(call, "h", 0); },
-       "org.freedesktop.DBus.Error.NotSupported"},
+      {path, own, text1, bytes, kInvalid},
+      {path, own, text1, entries, kInvalid},
+      {path, own, text1, descriptor, "org.freedesktop.DBus.Error.NotSupported"},
       {path, own, text1, nested('v', 32), kInvalid},
       {path, own, text1, nested('v', 62), kInvalid},
       {path, own, text1, nested('v', 64), kInvalid},
       {path, own, text1, nested('a', 32), kInvalid},
   };
   const RawBusClient client = world.newClient();
-  for (const auto& call : calls) {
+  for (const auto& [at, interface, member, fill, error] : calls) {
     sd_bus_message* made = nullptr;
-    ASSERT_GE(sd_bus_message_new_method_call(client.bus(), &made, RawBusClient::kName, call.path,
-                                             call.interface, call.member),
-              0);
+    sd_bus_message_new_method_call(client.bus(), &made, RawBusClient::kName, at, interface, member);
     const BusMessageRef message(made);
-    call.fill(made);
-    EXPECT_EQ(client.call(message).error, call.error)
-        << call.path << " " << call.interface << "." << call.member << " "
-        << sd_bus_message_get_signature(made, 1);
+    fill(made);
+    EXPECT_EQ(client.call(message).error, error)
+        << at << " " << interface << "." << member << " " << sd_bus_message_get_signature(made, 1);
   }
   expectNothingIsLeft("after calls that are none");
 }
 
 TEST_F(TheAgentAmongHostilePeers, BoundsWhatOneConnectionLeavesWaiting) {
-  world.writeDeviceFile("Store.plist", Value::Dictionary{{"purchaseDelay", 3600}});
+  world.writeDeviceFile("Store.plist", Dictionary{{"purchaseDelay", 3600}});
   begin();
-  struct Flood {
-    std::size_t textSize;
-    int calls;
-    int served;
-  };
   // Each of these waits for the store, some seconds long.
-  const Flood floods[] = {{16, 1500, 1024}, {1U << 20U, 12, 4}};
-  for (const auto& flood : floods) {
+  const std::tuple<std::size_t, int, int> floods[] = {{16, 1500, 1024}, {1U << 20U, 12, 4}};
+  for (const auto& [textSize, calls, served] : floods) {
     RawBusClient client = world.newClient();
-    for (int i = 0; i < flood.calls; ++i)
-      send(client, client.newCall("AppSupportAvailability", "s", {std::string(flood.textSize, 'x')}));
-    const auto found = answers(client, flood.calls - flood.served);
-    EXPECT_EQ(found, (std::map<std::string, int>{{kLimits, flood.calls - flood.served}})) << flood.textSize;
+    for (int i = 0; i < calls; ++i)
+      client.send(client.newCall("AppSupportAvailability", "s", {std::string(textSize, 'x')}));
+    const auto found = answers(client, calls - served);
+    EXPECT_EQ(found, (std::map<std::string, int>{{kLimits, calls - served}})) << textSize;
     expectPoliteService("beside a flood of calls");
     client.leave();
   }
@@ -193,7 +164,7 @@ TEST_F(TheAgentAmongHostilePeers, TurnsAwayWhoeverDoesNotReadAndServesThemOnceTh
     sd_bus_message* call = nullptr;
     sd_bus_message_new_method_call(client.bus(), &call, RawBusClient::kName, RawBusClient::kPath,
                                    "org.freedesktop.DBus.Introspectable", "Introspect");
-    send(client, BusMessageRef(call));
+    client.send(BusMessageRef(call));
   }
   ASSERT_GE(sd_bus_flush(client.bus()), 0);
   world.agent().waitForErrorOutput("does not read what it is answered", from);
@@ -213,22 +184,18 @@ TEST_F(TheAgentAmongHostilePeers, ServesAThousandConnectionsAtOnceAndLetsGoOfTho
   begin();
   std::vector<RawBusClient> clients;
   for (int i = 0; i < 1000; ++i) clients.push_back(world.newClient());
-  for (const auto& client : clients) {
-    send(client, client.newCall("DefaultDevice"));
-    ASSERT_GE(sd_bus_flush(client.bus()), 0);
-  }
+  for (const auto& client : clients) client.send(client.newCall("DefaultDevice"));
   for (const auto& client : clients) EXPECT_EQ(answers(client, 1), (std::map<std::string, int>{{"", 1}}));
   clients.erase(clients.begin() + 50, clients.end());
   for (auto& client : clients) {
-    send(client, client.newCall("GetAllDeviceInfosUsingPolicy", "tb", {World::Refresh, true}));
-    ASSERT_GE(sd_bus_flush(client.bus()), 0);
+    client.send(client.newCall("GetAllDeviceInfosUsingPolicy", "tb", {World::Refresh, true}));
     client.leave();
   }
   world.misbehave("[]");
   EXPECT_EQ(World::allInfos(*polite, World::Default).size(), 3U);
   expectNothingIsLeft("after a thousand");
   EXPECT_EQ(world.agent().terminate(), 0);
-  EXPECT_THAT(world.agent().errorOutput(), ::testing::Not(HasSubstr("without an answer")));
+  EXPECT_THAT(world.agent().errorOutput(), Not(HasSubstr("without an answer")));
 }
 
 TEST_F(TheAgentAmongHostilePeers, HandlesTheLastOfAFloodOfNotifications) {
@@ -253,10 +220,8 @@ TEST_F(TheAgentAmongHostilePeers, HandlesTheLastOfAFloodOfNotifications) {
   ASSERT_GE(sd_bus_flush(client.bus()), 0);
   world.agent().waitForErrorOutput(std::string(World::kFirstWatch) + " : warranty download attempt");
   const auto seconds = std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
-  const std::string log = world.agent().errorOutput();
-  const std::string handled = "-[KVRPairedDevicesMonitor _pairedOrActiveDevicesDidChange:]";
-  double count = 0;
-  for (auto at = log.find(handled); at != std::string::npos; at = log.find(handled, at + 1)) ++count;
+  const auto* const handled = "-[KVRPairedDevicesMonitor _pairedOrActiveDevicesDidChange:]";
+  const auto count = static_cast<double>(countOf(handled, world.agent().errorOutput()));
   EXPECT_LE(count, 2 + seconds * 2) << "two calls a second";
   expectNothingIsLeft("after a flood of notifications");
 }

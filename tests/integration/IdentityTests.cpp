@@ -1,49 +1,35 @@
 #include "agent/KVRAgentProtocol.h"
 #include "integration/support/AgentWorld.h"
-#include "platform/PropertyList.h"
 
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
 #include <signal.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
 #include <cstring>
-#include <functional>
 
 namespace kvr::testing {
 namespace {
 
 namespace fs = std::filesystem;
-using ::testing::HasSubstr;
-using ::testing::Not;
 
 constexpr uid_t kNobody = 65534;
 constexpr const char* kRefusal =
     " org.freedesktop.DBus.Error.AccessDenied: missing entitlement 'com.tarsil.private.kvragent'";
 
-/// Who calls: how the device and a program are prepared, and how the program is run then.
+/// How a program is run that calls.
 struct Launch {
   std::vector<std::string> command;
-  ChildProcess::Environment changes;
-  std::function<void()> beforeItCalls;  ///< it has connected, and waits
+  ChildProcess::Environment changes{};
+  std::function<void()> beforeItCalls{};  ///< it has connected, and waits
 };
 
 class TheAgentsPeer : public ::testing::Test {
  protected:
-  struct Kind {
-    const char* name;
-    bool isServed;
-    std::function<Launch()> prepare;
-    const char* reason = "";  ///< in the agent's log
-    bool needsRoot = false;
-  };
-
   TheAgentsPeer() {
     // Another user can get at the bus and the programs. What a member does is done at once.
     fs::permissions(busDirectory(), fs::perms(0711));
     fs::permissions(world.directory.path(), fs::perms(0711));
-    Value::Dictionary preferences = world.preferences().dictionary();
+    Dictionary preferences = world.preferences().dictionary();
     preferences["PostUpgradeOutreachDelay"] = 0;
     world.directory.write("home/Library/Preferences/com.tarsil.kvragent.plist",
                           *writePropertyList(preferences, PropertyListEncoding::Binary));
@@ -57,12 +43,10 @@ class TheAgentsPeer : public ::testing::Test {
     return fs::path(address.substr(from, address.find(',') - from)).parent_path();
   }
   fs::path device() const { return world.directory / "device"; }
-  static void grant(const AgentWorld& world, const fs::path& program, const Value& value = true) {
-    world.writeDeviceFile(
-        "Entitlements.plist",
-        Value::Dictionary{{program.string(), Value::Dictionary{{"com.tarsil.private.kvragent", value}}}});
+  void grant(const fs::path& program, const Value& value = true) const {
+    const Value entitlements = Dictionary{{"com.tarsil.private.kvragent", value}};
+    world.writeDeviceFile("Entitlements.plist", Dictionary{{program.string(), entitlements}});
   }
-  void grant(const fs::path& program, const Value& value = true) const { grant(world, program, value); }
   /// A program of its own, with nothing granted to it yet.
   fs::path program(const std::string& name) const {
     const auto path = world.directory / name;
@@ -102,142 +86,85 @@ class TheAgentsPeer : public ::testing::Test {
     probe.waitForOutput(std::string(last) + " ");
     return probe.output();
   }
-  void expectAnswers(const Kind& kind) {
+  /// Whether each member serves who calls so, and with what reason in the log; the device is ordinary then.
+  void expect(bool isServed, const std::string& name, const Launch& run, const std::string& reason = "") {
     const auto from = world.agent().errorOutput().size();
-    const auto answers = answersTo(kind.prepare());
+    const auto answers = answersTo(run);
     for (const auto& method : agentServiceInterface().methods) {
-      const std::string expected = kind.isServed ? " answered: " : kRefusal;
-      EXPECT_THAT(answers, HasSubstr(method.member + expected + "\n")) << kind.name;
+      const std::string expected = isServed ? " answered: " : kRefusal;
+      EXPECT_THAT(answers, HasSubstr(method.member + expected + "\n")) << name;
     }
-    if (*kind.reason != '\0') world.agent().waitForErrorOutput(kind.reason, from);
+    if (!reason.empty()) world.agent().waitForErrorOutput(reason, from);
+    makeOrdinary();
   }
 
   AgentWorld world;
 };
 
 TEST_F(TheAgentsPeer, IsServedOnlyWhenItIsAGrantedProgramOfTheAgentsUser) {
-  const auto valued = [this](const Value& value) {
-    return [this, value] { return Launch{{grantedProgram(value).string()}, {}, {}}; };
-  };
-  const auto writable = [this](const std::string& file, int mode) {
-    return [this, file, mode] {
-      const Launch run{{grantedProgram().string()}, {}, {}};
-      fs::permissions(device() / file, fs::perms(mode));
-      return run;
-    };
-  };
-  /// The program changes once it runs.
-  const auto changed = [this](const std::function<void(const fs::path&)>& change) {
-    return [this, change] {
-      const auto path = grantedProgram();
-      return Launch{{path.string()}, {}, [change, path] { change(path); }};
-    };
-  };
-  /// Another name of a program; either is granted.
-  const auto linked = [this](void (*link)(const fs::path&, const fs::path&), bool isLinkGranted) {
-    return [this, link, isLinkGranted] {
-      const auto path = program("granted");
-      const auto other = world.directory / "other";
-      link(path, other);
-      grant(isLinkGranted ? other : path);
-      return Launch{{(isLinkGranted ? path : other).string()}, {}, {}};
-    };
-  };
-  const auto symbolic = [](const fs::path& path, const fs::path& link) { fs::create_symlink(path, link); };
-  const auto hard = [](const fs::path& path, const fs::path& link) { fs::create_hard_link(path, link); };
-  const auto script = [this](bool isScriptGranted) {
-    return [this, isScriptGranted] {
-      const auto interpreter = program("granted");
-      const auto path = world.directory.write("script", "#!" + interpreter.string() + "\n");
-      fs::permissions(path, fs::perms(0755));
-      grant(isScriptGranted ? path : interpreter);
-      return Launch{{path.string()}, {}, {}};
-    };
-  };
-  const std::string nobody = std::to_string(kNobody);
-  const Kind kinds[] = {
-      {"granted true", true, valued(true)},
-      {"granted 1", true, valued(1)},
-      {"granted 0", false, valued(0)},
-      {"granted false", false, valued(false)},
-      {"granted a text", false, valued("true")},
-      {"granted a date", false, valued(Date{1})},
-      {"granted data", false, valued(Value::Bytes{1})},
-      {"granted an array", false, valued(Value::Array{true})},
-      {"granted a dictionary", false, valued(Value::Dictionary{{"a", true}})},
-      {"without an entry", false,
-       [&] {
-         grant(program("other"));
-         return Launch{{program("granted").string()}, {}, {}};
-       }},
-      {"without a file of entitlements", false,
-       [&] {
-         return Launch{{program("granted").string()}, {}, {}};
-       }},
-      {"a copy of the granted program", false,
-       [&] {
-         grantedProgram();
-         return Launch{{program("other").string()}, {}, {}};
-       }},
-      {"replaced", false, changed([this](const fs::path& path) { fs::rename(program("other"), path); })},
-      {"deleted", false, changed([](const fs::path& path) { fs::remove(path); })},
-      {"moved elsewhere", false,
-       changed([this](const fs::path& path) { fs::rename(path, world.directory / "other"); })},
-      {"ended after it had connected", false,
-       [&] {
-         return Launch{{grantedProgram().string()}, {{"KVR_PROBE_LEAVES", "1"}}, {}};
-       },
-       "Error Domain=process"},
-      {"run through a symbolic link", true, linked(symbolic, false)},
-      {"granted through a symbolic link", true, linked(symbolic, true)},
-      {"run through a hard link", true, linked(hard, false)},
-      {"granted through a hard link", true, linked(hard, true)},
-      {"a script of a granted interpreter", true, script(false)},
-      {"a granted script", false, script(true)},
-      {"everyone may write the grants", false, writable("Entitlements.plist", 0666),
-       "can be written by everyone"},
-      {"a group may write the grants", false, writable("Entitlements.plist", 0660),
-       "can be written by group"},
-      {"everyone may write the device root", false, writable("", 0777), "can be written by everyone"},
-      {"another user has the grants", false,
-       [&] {
-         const Launch run{{grantedProgram().string()}, {}, {}};
-         EXPECT_EQ(::chown((device() / "Entitlements.plist").c_str(), kNobody, kNobody), 0);
-         return run;
-       },
-       "belongs to user", true},
-      {"run by another user", false,
-       [&] {
-         return Launch{{"setpriv", "--reuid", nobody, "--clear-groups", grantedProgram().string()}, {}, {}};
-       },
-       "it belongs to another user", true},
-      {"set to another user", false,
-       [&] {
-         const auto path = grantedProgram();
-         EXPECT_EQ(::chown(path.c_str(), kNobody, kNobody), 0);
-         fs::permissions(path, fs::perms(04755));
-         return Launch{{path.string()}, {}, {}};
-       },
-       "it belongs to another user", true},
-  };
-  for (const auto& kind : kinds) {
-    if (kind.needsRoot && ::geteuid() != 0) {
-      std::printf("skipped, for it takes root to prepare: %s\n", kind.name);
-      continue;
+  const std::pair<bool, std::vector<Value>> values[] = {
+      {true, {true, 1, 2.5}},
+      {false, {0, 0.0, false, "true", Date{1}, Value::Bytes{1}, Array{true}, Dictionary{{"a", true}}}}};
+  for (const auto& [isServed, granted] : values) {
+    const std::string reason =
+        isServed ? "connection added from" : "Rejecting connection to kvragent: missing";
+    for (const auto& value : granted) {
+      expect(isServed, "granted " + describe(value), {{grantedProgram(value)}}, reason);
     }
-    makeOrdinary();
-    expectAnswers(kind);
   }
-}
+  expect(false, "without a file of entitlements", {{program("granted")}});
+  grant(program("other"));
+  expect(false, "without an entry", {{program("granted")}});
+  grantedProgram();
+  expect(false, "a copy of the granted program", {{program("other")}});
+  const auto other = world.directory / "other";
 
-TEST_F(TheAgentsPeer, KeepsWhatWasDecidedForAsLongAsItIsConnected) {
-  for (const bool isServed : {true, false}) {
-    world.entitle(isServed);
-    const auto client = world.newClient();
-    EXPECT_EQ(client.call("DefaultDevice").message != nullptr, isServed);
-    world.entitle(!isServed);
-    EXPECT_EQ(client.call("DefaultDevice").message != nullptr, isServed);
+  // The program changes once it runs.
+  const auto expectNoneOnce = [&](const char* name, const std::function<void(const fs::path&)>& change) {
+    const auto path = grantedProgram();
+    expect(false, name, {{path}, {}, [&] { change(path); }});
+  };
+  expectNoneOnce("replaced", [&](const fs::path& path) { fs::rename(program("other"), path); });
+  expectNoneOnce("deleted", [](const fs::path& path) { fs::remove(path); });
+  expectNoneOnce("moved elsewhere", [&](const fs::path& path) { fs::rename(path, other); });
+  expect(false, "ended after it had connected", {{grantedProgram()}, {{"KVR_PROBE_LEAVES", "1"}}},
+         "Error Domain=process");
+
+  // It has another name, and either is granted.
+  for (const bool isSymbolic : {true, false}) {
+    for (const bool isLinkGranted : {true, false}) {
+      const auto path = program("granted");
+      isSymbolic ? fs::create_symlink(path, other) : fs::create_hard_link(path, other);
+      grant(isLinkGranted ? other : path);
+      expect(true, isSymbolic ? "a symbolic link" : "a hard link", {{isLinkGranted ? path : other}});
+    }
   }
+  for (const bool isScriptGranted : {true, false}) {
+    const auto interpreter = program("granted");
+    const auto script = world.directory.write("script", "#!" + interpreter.string() + "\n");
+    fs::permissions(script, fs::perms(0755));
+    grant(isScriptGranted ? script : interpreter);
+    expect(!isScriptGranted, "a script", {{script}});
+  }
+  const std::tuple<const char*, int, const char*> writable[] = {
+      {"Entitlements.plist", 0666, "can be written by everyone"},
+      {"Entitlements.plist", 0660, "can be written by group"},
+      {"", 0777, "can be written by everyone"}};
+  for (const auto& [file, mode, reason] : writable) {
+    const auto path = grantedProgram();
+    fs::permissions(device() / file, fs::perms(mode));
+    expect(false, reason, {{path}}, reason);
+  }
+  if (::geteuid() != 0) GTEST_SKIP() << "another user's file, program and process take root to prepare";
+  const std::string nobody = std::to_string(kNobody);
+  const auto path = grantedProgram();
+  EXPECT_EQ(::chown((device() / "Entitlements.plist").c_str(), kNobody, kNobody), 0);
+  expect(false, "another user has the grants", {{path}}, "belongs to user");
+  expect(false, "run by another user", {{"setpriv", "--reuid", nobody, "--clear-groups", grantedProgram()}},
+         "it belongs to another user");
+  EXPECT_EQ(::chown(grantedProgram().c_str(), kNobody, kNobody), 0);
+  fs::permissions(path, fs::perms(04755));
+  expect(false, "set to another user", {{path}}, "it belongs to another user");
 }
 
 /// Answers to calls that the agent may have made, with each of `numbers`: the bus's answer about a client,

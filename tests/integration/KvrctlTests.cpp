@@ -3,17 +3,11 @@
 #include "platform/JSON.h"
 #include "platform/local/BusIntrospection.h"
 
-#include <gmock/gmock.h>
-
-#include <fstream>
 #include <iterator>
+#include <sstream>
 
 namespace kvr::testing {
 namespace {
-
-using ::testing::AllOf;
-using ::testing::HasSubstr;
-using ::testing::Not;
 
 /// The command-line client on a bus where this process plays the agent.
 class Kvrctl : public BusFixture {
@@ -27,7 +21,7 @@ class Kvrctl : public BusFixture {
   Kvrctl() {
     entitle(true, kProgram);
     newBehaviour = [this] {
-      return [this](const std::string& member, const Value::Array& arguments, const ServiceReply& reply) {
+      return [this](const std::string& member, const Array& arguments, const ServiceReply& reply) {
         const std::lock_guard lock(mutex_);
         asked_ = member + describe(Value(arguments));
         if (member == heldMember_) {
@@ -85,49 +79,50 @@ class Kvrctl : public BusFixture {
   std::vector<ServiceReply> held_;
 };
 
+std::vector<std::string> wordsOf(const std::string& line) {
+  std::istringstream words(line);
+  return {std::istream_iterator<std::string>(words), {}};
+}
+
 Value device(const std::string& name) {
-  return Value::Dictionary{
+  return Dictionary{
       {"name", name}, {"serialNumber", "C02XY1234"}, {"activationDate", Date{86400}}, {"deviceType", 1}};
 }
 
 Value info(const Value& warranty) {
-  Value::Dictionary record{{"device", device("a watch")}};
-  if (!warranty.isNull()) record["warranty"] = Value::Dictionary{{"DictionaryRepresentation", warranty}};
+  Dictionary record{{"device", device("a watch")}};
+  if (!warranty.isNull()) record["warranty"] = Dictionary{{"DictionaryRepresentation", warranty}};
   return record;
 }
 
 TEST_F(Kvrctl, AsksWhatItIsTold) {
   const auto serving = serveAgent();
-  setAnswer("GetDeviceInfoForSerialNumber", info(Value::Dictionary{{"covered", true}}));
+  setAnswer("GetDeviceInfoForSerialNumber", info(Dictionary{{"covered", true}}));
   setAnswer("GetDefaultDeviceInfoUsingPolicy", info(Value()));
-  setAnswer("GetAllDeviceInfosUsingPolicy", Value::Array{info(Value()), info(Value::Dictionary{})});
+  setAnswer("GetAllDeviceInfosUsingPolicy", Array{info(Value()), info(Dictionary{})});
   for (const auto* member : {"DismissFollowUpForSerialNumber", "ScheduleOutreachAfter"})
     setAnswer(member, true);
   setAnswer("TarsilAccountAdded", false);
-  setAnswer("DefaultDevice", Value::Dictionary{{"name", 7}, {"deviceType", "x"}});
-  setAnswer("PairedDevices", Value::Array{device("a watch")});
-  const struct {
-    std::vector<std::string> arguments;
-    const char* asked;
-    int status;
-  } cases[] = {
-      {{"device"}, "DefaultDevice()", 0},
-      {{"paired"}, "PairedDevices()", 0},
-      {{}, "GetAllDeviceInfosUsingPolicy(1, 0)", 0},
-      {{"refresh"}, "GetAllDeviceInfosUsingPolicy(2, 0)", 0},
-      {{"dismiss", "…1234"}, "DismissFollowUpForSerialNumber(C02XY1234)", 0},
-      {{"schedule-outreach", "--after", "60"}, "ScheduleOutreachAfter(60)", 0},
-      {{"account-added"}, "TarsilAccountAdded()", 2},
-      {{"support-app", "b"}, "AppSupportAvailability(b)", 0},
-      {{"web-url"}, "ReadWebURLOverride()", 2},
-      {{"info"}, "GetDefaultDeviceInfoUsingPolicy(0)", 2},
-      {{"info", "S1", "--policy", "refresh"}, "GetDeviceInfoForSerialNumber(S1, 2)", 0},
-      {{"info", "--all", "--policy", "cache"}, "GetAllDeviceInfosUsingPolicy(1, 0)", 0},
+  setAnswer("DefaultDevice", Dictionary{{"name", 7}, {"deviceType", "x"}});
+  setAnswer("PairedDevices", Array{device("a watch")});
+  const std::tuple<const char*, const char*, int> cases[] = {
+      {"device", "DefaultDevice()", 0},
+      {"paired", "PairedDevices()", 0},
+      {"", "GetAllDeviceInfosUsingPolicy(1, 0)", 0},
+      {"refresh", "GetAllDeviceInfosUsingPolicy(2, 0)", 0},
+      {"dismiss …1234", "DismissFollowUpForSerialNumber(C02XY1234)", 0},
+      {"schedule-outreach --after 60", "ScheduleOutreachAfter(60)", 0},
+      {"account-added", "TarsilAccountAdded()", 2},
+      {"support-app b", "AppSupportAvailability(b)", 0},
+      {"web-url", "ReadWebURLOverride()", 2},
+      {"info", "GetDefaultDeviceInfoUsingPolicy(0)", 2},
+      {"info S1 --policy refresh", "GetDeviceInfoForSerialNumber(S1, 2)", 0},
+      {"info --all --policy cache", "GetAllDeviceInfosUsingPolicy(1, 0)", 0},
   };
-  for (const auto& one : cases) {
-    const Outcome outcome = run(one.arguments);
-    EXPECT_EQ(outcome.status, one.status) << outcome.errors;
-    EXPECT_EQ(asked(), one.asked);
+  for (const auto& [arguments, call, status] : cases) {
+    const Outcome outcome = run(wordsOf(arguments));
+    EXPECT_EQ(outcome.status, status) << outcome.errors;
+    EXPECT_EQ(asked(), call);
     EXPECT_EQ(outcome.errors, "");
   }
 }
@@ -167,28 +162,13 @@ TEST_F(Kvrctl, WritesOneDocumentWithAVersionWhateverItIsAsked) {
   const auto serving = serveAgent();
   setAnswer("DefaultDevice", device("a phone"));
   setAnswer("DismissFollowUpForSerialNumber", true);
-  for (const std::vector<std::string>& command :
-       std::vector<std::vector<std::string>>{{},
-                                             {"device"},
-                                             {"paired"},
-                                             {"info"},
-                                             {"refresh"},
-                                             {"dismiss", "…1234"},
-                                             {"schedule-outreach"},
-                                             {"account-added"},
-                                             {"account-added", "--no-wait"},
-                                             {"support-app", "b"},
-                                             {"web-url"},
-                                             {"timeline"},
-                                             {"notify", "n"},
-                                             {"follow-ups"},
-                                             {"activities"},
-                                             {"doctor"}}) {
-    auto arguments = command;
-    arguments.emplace_back("--json");
-    const Outcome outcome = run(arguments);
+  for (const std::string command :
+       {"", "device", "paired", "info", "refresh", "dismiss …1234", "schedule-outreach", "account-added",
+        "account-added --no-wait", "support-app b", "web-url", "timeline", "notify n", "follow-ups",
+        "activities", "doctor"}) {
+    const Outcome outcome = run(wordsOf(command + " --json"));
     const auto document = readJSON(outcome.output);
-    ASSERT_TRUE(document) << outcome.output << outcome.errors;
+    ASSERT_TRUE(document) << command << outcome.output << outcome.errors;
     EXPECT_EQ((*document)["version"], Value(1)) << outcome.output;
     EXPECT_EQ(outcome.errors, "");
   }
@@ -209,20 +189,18 @@ TEST_F(Kvrctl, TellsOfAnActivityHowItEndedAndWhatItWaitsFor) {
              "<key>over</key><dict><key>result</key><string>finished</string></dict></dict></dict></plist>");
   const auto document = readJSON(run({"activities", "--json"}).output);
   ASSERT_TRUE(document);
-  const auto& activities = (*document)["activities"].array();
-  ASSERT_EQ(activities.size(), 2U);
-  EXPECT_EQ(activities[0]["lastResult"], Value("deferred"));
-  EXPECT_EQ(activities[0]["waitsFor"], Value("the agent, to start"));
-  EXPECT_EQ(activities[1]["lastResult"], Value("finished"));
-  EXPECT_TRUE(activities[1]["waitsFor"].isNull());
+  std::vector<std::string> told;
+  for (const auto& it : (*document)["activities"].array()) {
+    told.push_back(describe(it["lastResult"]) + ", waits for " + describe(it["waitsFor"]));
+  }
+  EXPECT_THAT(told, ElementsAre("deferred, waits for the agent, to start", "finished, waits for (null)"));
 }
 
 TEST_F(Kvrctl, PrintsTextThatCannotCommandATerminal) {
   const auto serving = serveAgent();
-  setAnswer(
-      "GetDefaultDeviceInfoUsingPolicy",
-      info(Value::Dictionary{{"covered", true},
-                             {"coverageLocalizedLabel", "\x1B]0;owned\x07 \u009B2J\r\nCovered: no\u202E"}}));
+  setAnswer("GetDefaultDeviceInfoUsingPolicy",
+            info(Dictionary{{"covered", true},
+                            {"coverageLocalizedLabel", "\x1B]0;owned\x07 \u009B2J\r\nCovered: no\u202E"}}));
   const Outcome text = run({"info"});
   EXPECT_THAT(text.output,
               HasSubstr("Coverage:      \\u001b]0;owned\\u0007 \\u009b2J\\u000d\\u000aCovered: no\\u202e\n"));
@@ -234,25 +212,19 @@ TEST_F(Kvrctl, PrintsTextThatCannotCommandATerminal) {
 
 TEST_F(Kvrctl, WritesOneJSONDocumentOfEverythingTheAgentKnows) {
   const auto serving = serveAgent();
-  const Value warranty = Value::Dictionary{{"since", Date{86400.5}},
-                                           {"data", Value::Bytes{1, 2, 3}},
-                                           {"null", Value()},
-                                           {"big", ~std::uint64_t{0}}};
-  setAnswer("GetAllDeviceInfosUsingPolicy", Value::Array{info(warranty), info(Value())});
-  const Result<Value> document = readJSON(run({"info", "--all", "--json", "--show-serial"}).output);
-  ASSERT_TRUE(document) << describe(document.error());
-  const Value told = Value::Dictionary{{"name", "a watch"},
-                                       {"serialNumber", "C02XY1234"},
-                                       {"activationDate", "1970-01-02T00:00:00Z"},
-                                       {"deviceType", 1},
-                                       {"type", "Watch"}};
-  const Value known = Value::Dictionary{
-      {"since", "1970-01-02T00:00:00Z"}, {"data", "AQID"}, {"null", Value()}, {"big", ~std::uint64_t{0}}};
-  EXPECT_EQ(*document,
-            Value(Value::Dictionary{
-                {"version", 1},
-                {"deviceInfos", Value::Array{Value::Dictionary{{"device", told}, {"warranty", known}},
-                                             Value::Dictionary{{"device", told}, {"warranty", Value()}}}}}));
+  const Value warranty = Dictionary{{"since", Date{86400.5}},
+                                    {"data", Value::Bytes{1, 2, 3}},
+                                    {"null", Value()},
+                                    {"big", ~std::uint64_t{0}}};
+  setAnswer("GetAllDeviceInfosUsingPolicy", Array{info(warranty), info(Value())});
+  const std::string told =
+      R"({"device":{"name":"a watch","serialNumber":"C02XY1234","deviceType":1,"type":"Watch",)"
+      R"("activationDate":"1970-01-02T00:00:00Z"},"warranty":)";
+  EXPECT_EQ(
+      *readJSON(run({"info", "--all", "--json", "--show-serial"}).output),
+      *readJSON(R"({"version":1,"deviceInfos":[)" + told +
+                R"({"since":"1970-01-02T00:00:00Z","data":"AQID","null":null,"big":18446744073709551615}},)" +
+                told + "null}]}"));
 }
 
 /// What the file declares, without its comments and line breaks.
@@ -270,9 +242,8 @@ std::string declarationsIn(std::string text) {
 }
 
 TEST(TheInstalledInterface, IsTheOneThatTheAgentServes) {
-  std::ifstream file(KVR_INTERFACE_FILE);
-  const std::string text{std::istreambuf_iterator<char>(file), {}};
-  EXPECT_EQ(declarationsIn(text), declarationsIn(introspectionDocument(agentServiceInterface())));
+  EXPECT_EQ(declarationsIn(*contentOfFile(KVR_INTERFACE_FILE)),
+            declarationsIn(introspectionDocument(agentServiceInterface())));
 }
 
 }  // namespace

@@ -1,12 +1,8 @@
 #pragma once
 
-#include "platform/PropertyList.h"
 #include "signing/SHA256Hash.h"
 #include "unit/SimulatedTest.h"
 #include "warranty/WarrantyKeys.h"
-
-#include <functional>
-#include <string>
 
 namespace kvr {
 
@@ -56,5 +52,7 @@ struct CoverageWorld : SimulatedPlatform {
 
   std::function<HTTPResponse(const HTTPRequest&)> coverage;
 };
+
+using CoverageTest = TestIn<CoverageWorld>;
 
 }  // namespace kvr

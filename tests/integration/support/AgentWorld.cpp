@@ -1,14 +1,12 @@
 #include "integration/support/AgentWorld.h"
 
 #include "platform/JSON.h"
-#include "platform/PropertyList.h"
 #include "signing/SHA256Hash.h"
 
 #include <httplib.h>
 #include <systemd/sd-bus.h>
 
 #include <algorithm>
-#include <fstream>
 #include <iterator>
 #include <stdexcept>
 
@@ -20,16 +18,11 @@ constexpr const char* kAuthority = "home/Library/Keys/com.tarsil.kvragent.kestCe
 
 constexpr const char* kActivities = "Library/Activities/com.tarsil.kvragent.plist";
 
-std::string contentOf(const std::filesystem::path& path) {
-  std::ifstream file(path, std::ios::binary);
-  return {std::istreambuf_iterator<char>(file), {}};
-}
-
 Value watch(const std::string& serialNumber) {
-  return Value::Dictionary{{"name", "Watch " + serialNumber},
-                           {"serialNumber", serialNumber},
-                           {"pairedDate", Date{1'750'000'000}},
-                           {"isPaired", true}};
+  return Dictionary{{"name", "Watch " + serialNumber},
+                    {"serialNumber", serialNumber},
+                    {"pairedDate", Date{1'750'000'000}},
+                    {"isPaired", true}};
 }
 
 }  // namespace
@@ -44,19 +37,17 @@ AgentWorld::AgentWorld(Attestation attestation) {
     setCoverage(std::string(serialNumber) + ".fr_FR",
                 R"({"covered":true,"coverageLocalizedLabel":"Garantie"})");
   }
-  writeDeviceFile("DeviceProperties.plist", Value::Dictionary{{"SerialNumber", kPhone},
-                                                              {"UserAssignedDeviceName", "Phone"},
-                                                              {"ProductType", "Phone1,2"},
-                                                              {"ProductVersion", "17.9"}});
-  writeDeviceFile("FeatureFlags.plist",
-                  Value::Dictionary{{"Kavrel", Value::Dictionary{{"Bravik_3_0", true}}}});
+  writeDeviceFile("DeviceProperties.plist", Dictionary{{"SerialNumber", kPhone},
+                                                       {"UserAssignedDeviceName", "Phone"},
+                                                       {"ProductType", "Phone1,2"},
+                                                       {"ProductVersion", "17.9"}});
+  writeDeviceFile("FeatureFlags.plist", Dictionary{{"Kavrel", Dictionary{{"Bravik_3_0", true}}}});
   pair({kFirstWatch, kSecondWatch});
   setAccount({});
   setLocale("en_US");
   entitle(true);
 
-  std::vector<std::string> command{KVR_PROGRAMS "/kvr-coverage-service", "--root",
-                                   (directory / "service").string()};
+  std::vector<std::string> command{KVR_PROGRAMS "/kvr-coverage-service", "--root", directory / "service"};
   if (attestation == Attestation::Required) {
     command.insert(command.end(), {"--authority", (directory / kAuthority).string()});
   }
@@ -64,11 +55,10 @@ AgentWorld::AgentWorld(Attestation attestation) {
   constexpr std::string_view kListening = "listening on ";
   serviceURL_ = service_->waitForOutput(kListening).substr(kListening.size());
   directory.write(std::string("home/") + kActivities, "{ OSVersion = \"17.9\"; activities = {}; }");
-  directory.write(
-      "home/Library/Preferences/com.tarsil.kvragent.plist",
-      binary(Value::Dictionary{{"ServerVersionURL", serviceURL_ + "/library/TARSIL/asset/kvrV2.plist"},
-                               {"WarrantyURL", serviceURL_ + "/api/v3/coverage/summary"},
-                               {"WearablesWarrantyURL", serviceURL_ + "/api/v2/coverage/summary"}}));
+  directory.write("home/Library/Preferences/com.tarsil.kvragent.plist",
+                  binary(Dictionary{{"ServerVersionURL", serviceURL_ + "/library/TARSIL/asset/kvrV2.plist"},
+                                    {"WarrantyURL", serviceURL_ + "/api/v3/coverage/summary"},
+                                    {"WearablesWarrantyURL", serviceURL_ + "/api/v2/coverage/summary"}}));
 }
 
 void AgentWorld::becomeNewDevice() const { std::filesystem::remove(home() / kActivities); }
@@ -118,32 +108,30 @@ void AgentWorld::writeDeviceFile(const std::string& name, const Value& tree) con
 }
 
 void AgentWorld::entitle(const Value& value) const {
-  Value::Dictionary granted;
+  Dictionary granted;
   if (!value.isNull()) granted.emplace("com.tarsil.private.kvragent", value);
   writeDeviceFile("Entitlements.plist",
-                  Value::Dictionary{{std::filesystem::read_symlink("/proc/self/exe").string(), granted}});
+                  Dictionary{{std::filesystem::read_symlink("/proc/self/exe").string(), granted}});
 }
 
 void AgentWorld::setLocale(const std::string& identifier) const {
-  writeDeviceFile("Locale.plist", Value::Dictionary{{"identifier", identifier}});
+  writeDeviceFile("Locale.plist", Dictionary{{"identifier", identifier}});
 }
 
 void AgentWorld::pair(const std::vector<std::string>& serialNumbers) const {
-  Value::Array watches;
+  Array watches;
   std::ranges::transform(serialNumbers, std::back_inserter(watches), watch);
   writeDeviceFile("PairedDevices.plist", watches);
 }
 
 void AgentWorld::setAccount(const Value& renewal) const {
-  Value::Dictionary authentication{
-      {"alternateDSID", "alternate"},
-      {"tokens", Value::Dictionary{{"com.tarsil.vornic.supportapp.auth", "first-token"}}}};
+  Dictionary authentication{{"alternateDSID", "alternate"},
+                            {"tokens", Dictionary{{"com.tarsil.vornic.supportapp.auth", "first-token"}}}};
   if (!renewal.isNull()) authentication.emplace("renewal", renewal);
-  writeDeviceFile(
-      "Accounts.plist",
-      Value::Dictionary{{"primaryAccount", Value::Dictionary{{"altDSID", "alt"},
-                                                             {"storefront", "143441"},
-                                                             {"authenticationAccount", authentication}}}});
+  writeDeviceFile("Accounts.plist",
+                  Dictionary{{"primaryAccount", Dictionary{{"altDSID", "alt"},
+                                                           {"storefront", "143441"},
+                                                           {"authenticationAccount", authentication}}}});
 }
 
 void AgentWorld::setCoverage(const std::string& name, const std::string& json) const {
@@ -163,7 +151,7 @@ std::vector<Value> AgentWorld::requests() const {
   }
   std::ranges::sort(paths);
   std::vector<Value> requests;
-  for (const auto& path : paths) requests.push_back(*readJSON(contentOf(path)));
+  for (const auto& path : paths) requests.push_back(*readJSON(*contentOfFile(path)));
   return requests;
 }
 
@@ -173,7 +161,9 @@ std::vector<Value> AgentWorld::coverageRequests() const {
   return all;
 }
 
-Value AgentWorld::file(const std::string& path) const { return *readPropertyList(contentOf(home() / path)); }
+Value AgentWorld::file(const std::string& path) const {
+  return *readPropertyList(*contentOfFile(home() / path));
+}
 
 Value AgentWorld::preferences() const { return file("Library/Preferences/com.tarsil.kvragent.plist"); }
 
@@ -187,7 +177,7 @@ Value AgentWorld::info(const RawBusClient& client, const std::string& serialNumb
   return client.value("a{sv}", client.call("GetDeviceInfoForSerialNumber", "st", {serialNumber, policy}));
 }
 
-Value::Array AgentWorld::allInfos(const RawBusClient& client, std::uint64_t policy) {
+Array AgentWorld::allInfos(const RawBusClient& client, std::uint64_t policy) {
   return client.value("aa{sv}", client.call("GetAllDeviceInfosUsingPolicy", "tb", {policy, false})).array();
 }
 

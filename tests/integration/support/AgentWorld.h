@@ -1,14 +1,12 @@
 #pragma once
 
+#include "Prelude.h"
 #include "integration/support/ChildProcess.h"
 #include "integration/support/PrivateBus.h"
 #include "integration/support/RawBusClient.h"
 #include "integration/support/TemporaryDirectory.h"
-#include "platform/Value.h"
 
 #include <memory>
-#include <string>
-#include <vector>
 
 namespace kvr::testing {
 
@@ -64,7 +62,7 @@ class AgentWorld {
 
   // Calls by a client, and what they reply.
   static Value info(const RawBusClient& client, const std::string& serialNumber, std::uint64_t policy);
-  static Value::Array allInfos(const RawBusClient& client, std::uint64_t policy);
+  static Array allInfos(const RawBusClient& client, std::uint64_t policy);
   /// The warranty's dictionary in a device info, null for none.
   static Value warrantyIn(const Value& info);
 

@@ -14,7 +14,6 @@ const ServiceInterface& BusFixture::echoInterface() {
        {"EchoText", {{"text", "s"}}, {"text", "s"}},
        {"EchoNumber", {{"number", "t"}}, {"number", "t"}},
        {"EchoReal", {{"real", "d"}}, {"real", "d"}},
-       {"EchoFlag", {{"flag", "b"}}, {"flag", "b"}},
        {"Record", {{"text", "s"}, {"number", "t"}}, {"record", "a{sv}"}}}};
   return kInterface;
 }
@@ -27,7 +26,7 @@ class BusFixture::Object : public ServiceObject {
   Object(const Object&) = delete;
   Object& operator=(const Object&) = delete;
 
-  void invoke(std::size_t method, const Value::Array& arguments, ServiceReply reply) override {
+  void invoke(std::size_t method, const Array& arguments, ServiceReply reply) override {
     behaviour_(interface_.methods[method].member, arguments, std::move(reply));
   }
 
@@ -39,7 +38,7 @@ class BusFixture::Object : public ServiceObject {
 
 BusFixture::BusFixture()
     : newBehaviour([] {
-        return [](const std::string&, const Value::Array& arguments, const ServiceReply& reply) {
+        return [](const std::string&, const Array& arguments, const ServiceReply& reply) {
           reply(arguments.at(0));
         };
       }) {
@@ -63,9 +62,9 @@ void BusFixture::stop() {
 
 void BusFixture::entitle(const Value& value, const std::string& program) {
   const auto path = std::filesystem::canonical(program).string();
-  const Value::Dictionary granted{{std::string(kEntitlement), value}};
-  const auto problem = lists_.write(root_ / "Entitlements.plist", Value::Dictionary{{path, granted}},
-                                    PropertyListEncoding::XML);
+  const Dictionary granted{{std::string(kEntitlement), value}};
+  const auto problem =
+      lists_.write(root_ / "Entitlements.plist", Dictionary{{path, granted}}, PropertyListEncoding::XML);
   if (problem) throw std::runtime_error(describe(*problem));
 }
 

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "Prelude.h"
 #include "integration/support/PrivateBus.h"
 #include "integration/support/RawBusClient.h"
 #include "integration/support/RecordingLog.h"
@@ -10,14 +11,9 @@
 #include "platform/local/LocalServiceListeners.h"
 #include "platform/local/LocalWorkQueues.h"
 
-#include <gtest/gtest.h>
-
-#include <functional>
 #include <future>
 #include <memory>
 #include <mutex>
-#include <string>
-#include <vector>
 
 namespace kvr::testing {
 
@@ -30,7 +26,7 @@ class BusFixture : public ::testing::Test, public ServiceListenerDelegate {
   static constexpr std::chrono::seconds kLimit{60};
 
   using Behaviour =
-      std::function<void(const std::string& member, const Value::Array& arguments, ServiceReply reply)>;
+      std::function<void(const std::string& member, const Array& arguments, ServiceReply reply)>;
 
   BusFixture();
   ~BusFixture() override;

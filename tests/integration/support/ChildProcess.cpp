@@ -24,15 +24,11 @@ constexpr std::chrono::seconds kLimit{60};
 
 [[noreturn]] void fail(const char* what) { throw std::system_error(errno, std::generic_category(), what); }
 
-struct Pipe {
-  int read = -1;
-  int write = -1;
-};
-
-Pipe newPipe() {
+/// The ends to read from and to write to.
+std::pair<Descriptor, Descriptor> newPipe() {
   std::array<int, 2> ends{};
   if (::pipe2(ends.data(), O_CLOEXEC) < 0) fail("pipe2");
-  return {ends[0], ends[1]};
+  return {Descriptor(ends[0]), Descriptor(ends[1])};
 }
 
 std::vector<std::string> environmentWith(const ChildProcess::Environment& changes) {
@@ -62,8 +58,8 @@ ChildProcess::ChildProcess(std::vector<std::string> arguments, const Environment
   std::vector<std::string> environment = environmentWith(changes);
   const std::vector<char*> argumentPointers = pointersTo(arguments);
   const std::vector<char*> environmentPointers = pointersTo(environment);
-  const Pipe output = newPipe();
-  const Pipe errors = newPipe();
+  auto output = newPipe();
+  auto errors = newPipe();
   const pid_t parent = ::getpid();
   pid_ = ::fork();
   if (pid_ < 0) fail("fork");
@@ -71,38 +67,30 @@ ChildProcess::ChildProcess(std::vector<std::string> arguments, const Environment
     // A test that crashes leaves nothing running behind.
     ::prctl(PR_SET_PDEATHSIG, SIGKILL);
     if (::getppid() != parent) ::_exit(127);
-    ::dup2(output.write, STDOUT_FILENO);
-    ::dup2(errors.write, STDERR_FILENO);
+    ::dup2(output.second.get(), STDOUT_FILENO);
+    ::dup2(errors.second.get(), STDERR_FILENO);
     ::execvpe(argumentPointers[0], argumentPointers.data(), environmentPointers.data());
     ::_exit(127);
   }
-  ::close(output.write);
-  ::close(errors.write);
-  outputDescriptor_ = output.read;
-  errorDescriptor_ = errors.read;
-  processDescriptor_ = static_cast<int>(::syscall(SYS_pidfd_open, pid_, 0));
-  stopDescriptor_ = ::eventfd(0, EFD_CLOEXEC);
-  if (processDescriptor_ < 0 || stopDescriptor_ < 0) fail("pidfd_open");
+  outputs_[0] = std::move(output.first);
+  outputs_[1] = std::move(errors.first);
+  process_ = Descriptor(static_cast<int>(::syscall(SYS_pidfd_open, pid_, 0)));
+  stop_ = Descriptor(::eventfd(0, EFD_CLOEXEC));
+  if (!process_ || !stop_) fail("pidfd_open");
   reader_ = std::thread([this] { readOutput(); });
 }
 
 ChildProcess::~ChildProcess() {
-  if (!reaped_) {
-    ::kill(pid_, SIGKILL);
-    ::waitpid(pid_, nullptr, 0);
-  }
+  if (!reaped_ && ::kill(pid_, SIGKILL) == 0) ::waitpid(pid_, nullptr, 0);
   // Something the child started may hold the pipes open still.
   const std::uint64_t one = 1;
-  if (::write(stopDescriptor_, &one, sizeof one) != sizeof one) std::terminate();
+  if (::write(stop_.get(), &one, sizeof one) != sizeof one) std::terminate();
   reader_.join();
-  for (const int descriptor : {processDescriptor_, outputDescriptor_, errorDescriptor_, stopDescriptor_}) {
-    ::close(descriptor);
-  }
 }
 
 void ChildProcess::readOutput() {
-  std::array<pollfd, 3> sources{pollfd{outputDescriptor_, POLLIN, 0}, pollfd{errorDescriptor_, POLLIN, 0},
-                                pollfd{stopDescriptor_, POLLIN, 0}};
+  std::array<pollfd, 3> sources{pollfd{outputs_[0].get(), POLLIN, 0}, pollfd{outputs_[1].get(), POLLIN, 0},
+                                pollfd{stop_.get(), POLLIN, 0}};
   std::array<char, 65536> buffer{};
   while ((sources[0].fd >= 0 || sources[1].fd >= 0) && !sources[2].revents) {
     if (::poll(sources.data(), sources.size(), -1) < 0 && errno != EINTR) break;
@@ -161,24 +149,15 @@ std::string ChildProcess::printed() const {
   return "; standard output:\n" + output_ + "\nstandard error:\n" + errorOutput_;
 }
 
-bool ChildProcess::isRunning() const {
-  if (reaped_) return false;
-  pollfd process{processDescriptor_, POLLIN, 0};
-  return ::poll(&process, 1, 0) == 0;
-}
-
 void ChildProcess::send(int signal) const {
-  if (::syscall(SYS_pidfd_send_signal, processDescriptor_, signal, nullptr, 0) < 0) fail("pidfd_send_signal");
+  if (::syscall(SYS_pidfd_send_signal, process_.get(), signal, nullptr, 0) < 0) fail("pidfd_send_signal");
 }
 
 int ChildProcess::wait() {
   if (reaped_) return status_;
-  pollfd process{processDescriptor_, POLLIN, 0};
+  pollfd process{process_.get(), POLLIN, 0};
   const int milliseconds = static_cast<int>(std::chrono::milliseconds(kLimit).count());
-  int ready = 0;
-  do {
-    ready = ::poll(&process, 1, milliseconds);
-  } while (ready < 0 && errno == EINTR);
+  const int ready = ::poll(&process, 1, milliseconds);
   std::unique_lock lock(mutex_);
   if (ready != 1) throw std::runtime_error(name_ + " did not end" + printed());
   int status = 0;
@@ -190,12 +169,12 @@ int ChildProcess::wait() {
 }
 
 int ChildProcess::terminate() {
-  if (isRunning()) send(SIGTERM);
+  if (!reaped_) send(SIGTERM);
   return wait();
 }
 
 int ChildProcess::kill() {
-  if (isRunning()) send(SIGKILL);
+  if (!reaped_) send(SIGKILL);
   return wait();
 }
 

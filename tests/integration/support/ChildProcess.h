@@ -1,5 +1,7 @@
 #pragma once
 
+#include "platform/local/Descriptor.h"
+
 #include <sys/types.h>
 
 #include <condition_variable>
@@ -36,7 +38,6 @@ class ChildProcess {
   std::string waitForOutput(std::string_view text, std::size_t from = 0);
   std::string waitForErrorOutput(std::string_view text, std::size_t from = 0);
 
-  bool isRunning() const;
   void send(int signal) const;
   /// Waits for the end and returns the exit status, or minus the signal that ended it. All it printed has
   /// been read by then.
@@ -51,10 +52,9 @@ class ChildProcess {
 
   const std::string name_;
   pid_t pid_ = -1;
-  int processDescriptor_ = -1;
-  int outputDescriptor_ = -1;
-  int errorDescriptor_ = -1;
-  int stopDescriptor_ = -1;
+  Descriptor outputs_[2];  ///< what it prints, and prints as errors
+  Descriptor process_;
+  Descriptor stop_;
   mutable std::mutex mutex_;  ///< guards what follows
   std::condition_variable changed_;
   std::string output_;

@@ -18,7 +18,6 @@ class PrivateBus {
   /// The bus itself; what the programs it starts print as errors is printed there.
   ChildProcess& daemon() { return daemon_; }
   const std::string& address() const { return address_; }
-  pid_t pid() const { return daemon_.pid(); }
   /// Ends the bus the hard way; every connection is lost.
   void kill() { daemon_.kill(); }
 

@@ -32,14 +32,7 @@ RawBusClient::RawBusClient(const std::string& address) {
   require(sd_bus_start(bus), "sd_bus_start");
 }
 
-std::string RawBusClient::uniqueName() const {
-  const char* name = nullptr;
-  require(sd_bus_get_unique_name(bus_.get(), &name), "sd_bus_get_unique_name");
-  return name;
-}
-
-BusMessageRef RawBusClient::newCall(const char* member, const char* signature,
-                                    const Value::Array& arguments) const {
+BusMessageRef RawBusClient::newCall(const char* member, const char* signature, const Array& arguments) const {
   sd_bus_message* message = nullptr;
   require(sd_bus_message_new_method_call(bus_.get(), &message, kName, kPath, kInterface, member), member);
   BusMessageRef held(message);
@@ -61,8 +54,14 @@ RawBusClient::Reply RawBusClient::call(const BusMessageRef& message) const {
 }
 
 RawBusClient::Reply RawBusClient::call(const char* member, const char* signature,
-                                       const Value::Array& arguments) const {
+                                       const Array& arguments) const {
   return call(newCall(member, signature, arguments));
+}
+
+void RawBusClient::send(const BusMessageRef& message) const {
+  std::uint64_t number = 0;  // without one, no answer would be expected
+  require(sd_bus_send(bus_.get(), message.get(), &number), "sd_bus_send");
+  require(sd_bus_flush(bus_.get()), "sd_bus_flush");
 }
 
 Value RawBusClient::value(const char* type, const Reply& reply) const {

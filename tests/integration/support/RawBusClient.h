@@ -1,11 +1,9 @@
 #pragma once
 
-#include "platform/Value.h"
+#include "Prelude.h"
 #include "platform/local/bus/BusHandles.h"
 
 #include <optional>
-#include <string>
-#include <vector>
 
 namespace kvr::testing {
 
@@ -25,13 +23,13 @@ class RawBusClient {
   explicit RawBusClient(const std::string& address);
 
   sd_bus* bus() const { return bus_.get(); }
-  std::string uniqueName() const;
   /// A call of the service's interface with arguments of the bus's basic types and records.
-  BusMessageRef newCall(const char* member, const char* signature = "",
-                        const Value::Array& arguments = {}) const;
+  BusMessageRef newCall(const char* member, const char* signature = "", const Array& arguments = {}) const;
   /// Sends a call and waits for its reply.
   Reply call(const BusMessageRef& message) const;
-  Reply call(const char* member, const char* signature = "", const Value::Array& arguments = {}) const;
+  Reply call(const char* member, const char* signature = "", const Array& arguments = {}) const;
+  /// Sends a call and waits for nothing; an answer is expected all the same.
+  void send(const BusMessageRef& message) const;
   /// The value that a call replied; throws when it was an error.
   Value value(const char* type, const Reply& reply) const;
   /// Makes this client leave the bus at once.

@@ -4,6 +4,7 @@
 
 #include <cerrno>
 #include <fstream>
+#include <iterator>
 #include <system_error>
 
 namespace kvr::testing {
@@ -27,6 +28,12 @@ std::filesystem::path TemporaryDirectory::write(std::string_view name, std::stri
   file.close();
   if (!file) throw std::system_error(EIO, std::generic_category(), path.string());
   return path;
+}
+
+std::optional<std::string> contentOfFile(const std::filesystem::path& path) {
+  std::ifstream file(path, std::ios::binary);
+  if (!file) return std::nullopt;
+  return std::string(std::istreambuf_iterator<char>(file), {});
 }
 
 }  // namespace kvr::testing

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <filesystem>
+#include <optional>
 #include <string>
 #include <string_view>
 
@@ -22,5 +23,8 @@ class TemporaryDirectory {
  private:
   std::filesystem::path path_;
 };
+
+/// Nothing for a file that cannot be opened.
+std::optional<std::string> contentOfFile(const std::filesystem::path& path);
 
 }  // namespace kvr::testing

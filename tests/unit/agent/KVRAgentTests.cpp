@@ -5,18 +5,10 @@
 namespace kvr {
 namespace {
 
-using ::testing::ElementsAre;
-using ::testing::IsEmpty;
-using ::testing::SizeIs;
-
-class AnAgent : public ::testing::Test {
+class AnAgent : public CoverageTest {
  protected:
   AnAgent() : agent(KVRAgent::initWithCallingProcessBundleID(world.platform, "com.example.client")) {
     world.featureFlags.enabled.insert({"Kavrel", "Bravik_3_0"});
-  }
-  void TearDown() override {
-    world.queues.run();
-    EXPECT_THAT(world.faults(), IsEmpty());
   }
   void pair(int watches) {
     for (int i = 0; i < watches; ++i) {
@@ -51,7 +43,6 @@ class AnAgent : public ::testing::Test {
     return *reply;
   }
 
-  CoverageWorld world;
   std::shared_ptr<KVRAgent> agent;
   std::shared_ptr<std::optional<bool>> pending;
 };
@@ -94,13 +85,13 @@ TEST_F(AnAgent, AnswersOverlappingCallsAfterTheLookupsOfBothWithOneRecordADevice
 }
 
 TEST_F(AnAgent, MapsSerialNumbersThroughTheTwoTables) {
-  world.preferences.setObject(Value::Dictionary{{"S", "T"}, {"X", "Z"}, {"bad", 7}},
+  world.preferences.setObject(Dictionary{{"S", "T"}, {"X", "Z"}, {"bad", 7}},
                               "PairedBluetoothDevicesSerialNumbers");
   EXPECT_EQ(*info("S", 2)->device()->serialNumber(), "T");
   EXPECT_EQ(serialNumberIn(world.http.requests().back().request), "T");
   EXPECT_TRUE(world.log.contains("serialNumberOverride for Serial Number: S with serial: T"));
   EXPECT_TRUE(world.log.contains("Override Serial Number: T found for SN: S"));
-  world.preferences.setObject(Value::Dictionary{{"X", "Y"}}, "PairedWatchesSerialNumbers");
+  world.preferences.setObject(Dictionary{{"X", "Y"}}, "PairedWatchesSerialNumbers");
   EXPECT_EQ(*info("X", 1)->device()->serialNumber(), "Y");
   EXPECT_EQ(*info("bad", 1)->device()->serialNumber(), "bad");
   EXPECT_EQ(*info("none", 1)->device()->serialNumber(), "none");

@@ -47,20 +47,20 @@ class ALookup : public SimulatedTest {
  protected:
   ALookup()
       : provider(std::make_shared<FakeWarrantyProvider>()),
-        agent(std::make_shared<KVRAgent>(simulated.platform, provider, nullptr)),
+        agent(std::make_shared<KVRAgent>(world.platform, provider, nullptr)),
         fromCache(warranty("cache")),
         fromDownload(warranty("download")) {
-    simulated.clock.set(Date{1'800'000'000});
+    world.clock.set(Date{1'800'000'000});
   }
 
   KVRWarrantyRef warranty(const char* mark) {
-    return KVRWarranty::initWithDictionary(simulated.platform, Value::Dictionary{{"quorURL", mark}});
+    return KVRWarranty::initWithDictionary(world.platform, Dictionary{{"quorURL", mark}});
   }
   KVRWarrantyRef lookUp(std::uint64_t policy, const std::optional<std::string>& serialNumber = "SN") {
     std::optional<KVRWarrantyRef> answer;
     agent->getWarrantyUsingPolicy(
         policy, serialNumber,
-        KVRAgent::WarrantyReply(simulated.log, "test", [&](const KVRWarrantyRef& it) { answer = it; }));
+        KVRAgent::WarrantyReply(world.log, "test", [&](const KVRWarrantyRef& it) { answer = it; }));
     return answer.value();
   }
 
@@ -73,13 +73,7 @@ class ALookup : public SimulatedTest {
 TEST_F(ALookup, DecidesBetweenCacheAndDownload) {
   enum class Cache { Missing, Invalid, Stale, Undated, Fresh };
   const KVRWarrantyRef nothing;
-  const struct {
-    std::uint64_t policy;
-    Cache cache;
-    bool downloads;
-    KVRWarrantyRef whenItYields;
-    KVRWarrantyRef otherwise;
-  } cases[] = {
+  const std::tuple<std::uint64_t, Cache, bool, KVRWarrantyRef, KVRWarrantyRef> cases[] = {
       {0, Cache::Fresh, false, fromCache, fromCache},     {0, Cache::Stale, true, fromDownload, fromCache},
       {0, Cache::Undated, true, fromDownload, fromCache}, {0, Cache::Invalid, true, fromDownload, nothing},
       {0, Cache::Missing, true, fromDownload, nothing},   {1, Cache::Stale, false, fromCache, fromCache},
@@ -87,19 +81,18 @@ TEST_F(ALookup, DecidesBetweenCacheAndDownload) {
       {7, Cache::Stale, false, fromCache, fromCache},     {7, Cache::Missing, false, nothing, nothing},
       {2, Cache::Fresh, true, fromDownload, nothing},     {2, Cache::Missing, true, fromDownload, nothing},
   };
-  for (const auto& test : cases) {
-    provider->cached = test.cache == Cache::Missing ? nullptr : fromCache;
-    provider->version = test.cache == Cache::Invalid ? "1" : "2";
+  for (const auto& [policy, cache, downloads, whenItYields, otherwise] : cases) {
+    provider->cached = cache == Cache::Missing ? nullptr : fromCache;
+    provider->version = cache == Cache::Invalid ? "1" : "2";
     // A cache exactly at the end of its validity is stale.
-    const double age = test.cache == Cache::Stale ? 86400 : 3600;
-    provider->lastUpdated =
-        test.cache == Cache::Undated ? std::nullopt : std::optional(simulated.clock.now() - age);
+    const double age = cache == Cache::Stale ? 86400 : 3600;
+    provider->lastUpdated = cache == Cache::Undated ? std::nullopt : std::optional(world.clock.now() - age);
     for (const bool yields : {true, false}) {
       provider->downloaded = yields ? fromDownload : nullptr;
       provider->downloads = 0;
-      EXPECT_EQ(lookUp(test.policy), yields ? test.whenItYields : test.otherwise)
-          << test.policy << " " << static_cast<int>(test.cache) << yields;
-      EXPECT_EQ(provider->downloads, test.downloads ? 1U : 0U);
+      EXPECT_EQ(lookUp(policy), yields ? whenItYields : otherwise)
+          << policy << " " << static_cast<int>(cache) << yields;
+      EXPECT_EQ(provider->downloads, downloads ? 1U : 0U);
     }
   }
 }
@@ -110,20 +103,20 @@ TEST_F(ALookup, SaysWhyItTrustsTheCacheOrNot) {
     *provider = FakeWarrantyProvider();
     provider->cached = fromCache;
     change(*provider);
-    simulated.log.clear();
+    world.log.clear();
     lookUp(policy);
     lines.insert(lines.begin(), format("getting warranty using policy SN: %lu", policy));
     lines.push_back(format(
         "-[KVRAgent getWarrantyUsingPolicy:serialNumber:withReply:]: shouldDownloadWarranty: %d", downloads));
     lines.emplace_back("getWarrantyUsingPolicy completionBlock SN : 0");
-    EXPECT_EQ(simulated.log.texts(), lines);
+    EXPECT_EQ(world.log.texts(), lines);
   };
   const std::string has = "Has cached warranty : SN";
   const std::string valid =
       "cached warranty is for locale ('en_US') and version ('2') match system, consider it valid";
   const std::string examine = "Default policy query: cached warranty is valid, examine expiration date";
   const std::string invalid = "Default policy query: cached warranty is invalid, refresh it";
-  const auto now = simulated.clock.now();
+  const auto now = world.clock.now();
   expect(1, [](auto& p) { p.cached = nullptr; }, false, {"no cached warranty : SN"});
   expect(0, [](auto& p) { p.version.reset(); }, true,
          {has, "cached warranty is of outdated version '(null)', current version is '2', consider it invalid",
@@ -142,15 +135,15 @@ TEST_F(ALookup, SaysWhyItTrustsTheCacheOrNot) {
 
 TEST_F(ALookup, RefusesWhatIsNoSerialNumber) {
   provider->cached = fromCache;
-  provider->lastUpdated = simulated.clock.now();
+  provider->lastUpdated = world.clock.now();
   for (const auto& serialNumber :
        {std::optional<std::string>(), std::optional<std::string>(""),
         std::optional(std::string(100'000, 'x')), std::optional<std::string>("a/../b"),
         std::optional(std::string("A\0B", 3)), std::optional<std::string>("A\nB")}) {
-    simulated.log.clear();
+    world.log.clear();
     EXPECT_EQ(lookUp(2, serialNumber), nullptr);
-    EXPECT_EQ(simulated.log.texts(LogLevel::Error).size(), 1U);
-    EXPECT_EQ(simulated.log.lines().size(), 1U);
+    EXPECT_EQ(world.log.texts(LogLevel::Error).size(), 1U);
+    EXPECT_EQ(world.log.lines().size(), 1U);
   }
   EXPECT_EQ(provider->downloads, 0U);
   EXPECT_EQ(lookUp(1, "Ünicode serial-1.2"), fromCache);

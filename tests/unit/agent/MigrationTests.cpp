@@ -9,12 +9,6 @@ constexpr const char* kLegacyFile = "/home/user/Library/Application Support/com.
 
 class Migration : public AnOfferTest {
  protected:
-  void pend(const std::string& uniqueIdentifier) {
-    FollowUpItem item;
-    item.uniqueIdentifier = uniqueIdentifier;
-    item.displayStyle = 2;
-    EXPECT_FALSE(world.followUps.newClient(kFollowUpClientIdentifier)->postItem(item));
-  }
   std::vector<std::string> pendingIdentifiers() {
     std::vector<std::string> identifiers;
     for (const auto& item : pending()) identifiers.push_back(*item.uniqueIdentifier);
@@ -30,9 +24,10 @@ TEST_F(Migration, BringsWhatThereIsOfTheOldLayoutToTheNewOneOnce) {
   const std::string own = legacy + "." + sha256Hash("LOCAL");
   const CacheMetadata metadata("LOCAL");
   auto& preferences = world.preferences;
-  for (int bits = 0; bits < 64; ++bits) {
-    const bool hasFile = bits & 1, hasItem = bits & 2, hasDate = bits & 4, hasSerial = bits & 8;
-    const int level = bits / 16;
+  for (int bits = 0; bits < 128; ++bits) {
+    const bool hasFile = bits & 1, hasItem = bits & 2, hasDate = bits & 4, hasSerial = bits & 8,
+               hasLocale = bits & 16, hasVersion = !hasItem;
+    const int level = bits / 32;
     SCOPED_TRACE(bits);
     for (const auto& key : preferences.allKeys()) preferences.removeObject(key);
     world.files.erase("/home/user/Library/FollowUps/com.tarsil.Kavrel.plist");
@@ -42,27 +37,31 @@ TEST_F(Migration, BringsWhatThereIsOfTheOldLayoutToTheNewOneOnce) {
     if (!hasSerial) world.deviceProperties.answers.erase("SerialNumber");
     if (hasFile) world.files.putPropertyList(kLegacyFile, offer(10));
     if (hasItem) pend(legacy);
-    if (hasDate) {
-      preferences.setObject(inDays(-1), "CachedWarrantyLastUpdatedDate");
-      preferences.setObject("en_US", "CachedWarrantyLocale");
-      preferences.setObject("1", "CachedWarrantyVersion");
-    }
+    if (hasDate) preferences.setObject(inDays(-1), "CachedWarrantyLastUpdatedDate");
+    if (hasLocale) preferences.setObject("en_US", "CachedWarrantyLocale");
+    if (hasVersion) preferences.setObject("1", "CachedWarrantyVersion");
+    preferences.setObject("stale", metadata.versionKey);
     if (level > 0) preferences.setObject(level, preference::kMigrationVersion);
     migrate();
 
+    const auto dateWhere = [&](bool it) { return it ? std::optional(inDays(-1)) : std::nullopt; };
     const bool runs = level < 2;
     const bool moves = runs && hasFile && hasSerial;
     EXPECT_EQ(preferences.integerForKey(preference::kMigrationVersion), runs ? 2 : level);
     EXPECT_EQ(world.files.get(kLegacyFile).has_value(), hasFile && !moves);
     EXPECT_EQ(KVRWarranty::cachedWarrantyForSerialNumber(world.platform, "LOCAL") != nullptr, moves);
+    EXPECT_EQ(KVRWarranty::cachedWarrantyForSerialNumber(world.platform, {}) != nullptr, hasFile && !moves);
     EXPECT_EQ(world.files.list("/home/user/Library/Application Support").size(), hasFile ? 1U : 0U);
-    EXPECT_EQ(preferences.dateForKey(metadata.lastUpdatedDateKey).has_value(), moves && hasDate);
-    EXPECT_EQ(preferences.stringForKey(metadata.localeKey).has_value(), moves && hasDate);
-    EXPECT_EQ(preferences.stringForKey("CachedWarrantyVersion").has_value(), hasDate && !moves);
-    const std::vector<std::string> expected = !hasItem ? std::vector<std::string>{}
-                                              : !runs  ? std::vector{legacy}
-                                              : moves  ? std::vector{own}
-                                                       : std::vector<std::string>{};
+    EXPECT_EQ(preferences.dateForKey(metadata.lastUpdatedDateKey), dateWhere(moves && hasDate));
+    EXPECT_EQ(preferences.dateForKey("CachedWarrantyLastUpdatedDate"), dateWhere(hasDate && !moves));
+    const bool pairMoves = moves && hasLocale;  // a version goes with its locale
+    const Value locale = hasLocale ? Value("en_US") : Value(), version = hasVersion ? Value("1") : Value();
+    EXPECT_EQ(preferences.objectForKey(metadata.localeKey), pairMoves ? locale : Value());
+    EXPECT_EQ(preferences.objectForKey("CachedWarrantyLocale"), pairMoves ? Value() : locale);
+    EXPECT_EQ(preferences.objectForKey(metadata.versionKey), pairMoves ? version : Value("stale"));
+    EXPECT_EQ(preferences.objectForKey("CachedWarrantyVersion"), pairMoves ? Value() : version);
+    std::vector<std::string> expected;
+    if (hasItem && !(runs && !moves)) expected = {runs ? own : legacy};
     EXPECT_EQ(pendingIdentifiers(), expected);
   }
 }

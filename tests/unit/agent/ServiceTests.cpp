@@ -6,37 +6,17 @@
 namespace kvr {
 namespace {
 
-using ::testing::IsEmpty;
-
-class TheService : public ::testing::Test {
+class TheService : public SimulatedTest {
  protected:
-  void TearDown() override {
-    world.queues.run();
-    EXPECT_THAT(world.faults(), IsEmpty());
-  }
-  auto connect(Value::Dictionary entitlements) {
+  auto connect(Dictionary entitlements) {
     auto client = world.services.connect(kServiceName, {std::move(entitlements), 1234});
     world.queues.run();
     return client;
   }
-  static Value::Dictionary entitled() { return {{kRequiredEntitlement, true}}; }
+  static Dictionary entitled() { return {{kRequiredEntitlement, true}}; }
 
-  SimulatedPlatform world;
   StartUp startUp{world.platform};
 };
-
-TEST_F(TheService, AdmitsATrueNumberUnderTheEntitlementAndNothingElse) {
-  for (const Value& value : {Value(true), Value(2.5)}) {
-    EXPECT_TRUE(connect({{kRequiredEntitlement, value}})->isAccepted()) << describe(value);
-  }
-  for (const Value& value : {Value("true"), Value(0.0), Value(false), Value(Value::Array{1}), Value()}) {
-    world.log.clear();
-    EXPECT_TRUE(connect({{kRequiredEntitlement, value}})->isRefused()) << describe(value);
-    EXPECT_TRUE(world.log.contains(
-        "Rejecting connection to kvragent: missing entitlement 'com.tarsil.private.kvragent'"));
-  }
-  EXPECT_TRUE(connect({})->isRefused());
-}
 
 TEST_F(TheService, KnowsItsCallersBundleWhereThereIsOne) {
   const auto fallback = "callingProcessBundleID is nil. Falling back to Preferences Bundle ID";
@@ -62,36 +42,33 @@ TEST_F(TheService, KnowsItsCallersBundleWhereThereIsOne) {
 TEST_F(TheService, ServesEachMemberWithTheOperationBehindIt) {
   world.deviceProperties.answers = {{"SerialNumber", "LOCAL"}};
   const Value device =
-      Value::Dictionary{{"serialNumber", "LOCAL"}, {"deviceType", 0}, {"activationDate", world.clock.now()}};
-  const Value unknown = Value::Dictionary{{"name", "<unknown>"}, {"serialNumber", "X"}, {"deviceType", 2}};
-  const auto info = [](const Value& it) { return Value(Value::Dictionary{{"device", it}}); };
-  const struct {
-    const char* member;
-    Value::Array arguments;
-    Value reply;
-  } cases[] = {
+      Dictionary{{"serialNumber", "LOCAL"}, {"deviceType", 0}, {"activationDate", world.clock.now()}};
+  const Value unknown = Dictionary{{"name", "<unknown>"}, {"serialNumber", "X"}, {"deviceType", 2}};
+  const auto info = [](const Value& it) { return Value(Dictionary{{"device", it}}); };
+  const std::tuple<const char*, Array, Value> cases[] = {
       {"ScheduleOutreach", {}, true},
       {"ScheduleOutreachAfter", {5.0}, true},
       {"TarsilAccountAdded", {}, true},
-      {"CheckIsAvailableInStore", {"b"}, Value::Dictionary{{"AppAvailabilityType", 0}}},
-      {"AppSupportAvailability", {"b"}, Value::Dictionary{{"AppBundleID", "b"}, {"AppAvailabilityType", 0}}},
+      {"CheckIsAvailableInStore", {"b"}, Dictionary{{"AppAvailabilityType", 0}}},
+      {"AppSupportAvailability", {"b"}, Dictionary{{"AppBundleID", "b"}, {"AppAvailabilityType", 0}}},
       {"ReadWebURLOverride", {}, {}},
       {"DefaultDevice", {}, device},
-      {"PairedDevices", {}, Value::Array{}},
+      {"PairedDevices", {}, Array{}},
       {"GetDefaultDeviceInfoUsingPolicy", {1}, info(device)},
       {"GetDeviceInfoForSerialNumber", {"X", 0xFFFFFFFFFFFFFFFF}, info(unknown)},
-      {"GetAllDeviceInfosUsingPolicy", {1, false}, Value::Array{info(device)}},
+      {"GetAllDeviceInfosUsingPolicy", {1, false}, Array{info(device)}},
       {"DismissFollowUpForSerialNumber", {"X"}, true},
   };
   const auto client = connect(entitled());
   const auto& methods = client->exportedInterface()->methods;
   ASSERT_EQ(methods.size(), std::size(cases));
   for (std::size_t i = 0; i < methods.size(); ++i) {
-    EXPECT_STREQ(methods[i].member, cases[i].member);
-    EXPECT_EQ(methods[i].in.size(), cases[i].arguments.size());
-    const auto call = client->invoke(cases[i].member, cases[i].arguments);
+    const auto& [member, arguments, reply] = cases[i];
+    EXPECT_STREQ(methods[i].member, member);
+    EXPECT_EQ(methods[i].in.size(), arguments.size());
+    const auto call = client->invoke(member, arguments);
     world.queues.run();
-    EXPECT_EQ(call->reply, cases[i].reply) << cases[i].member;
+    EXPECT_EQ(call->reply, reply) << member;
   }
   EXPECT_TRUE(world.log.contains("getting warranty using policy X: 18446744073709551615"));
 }

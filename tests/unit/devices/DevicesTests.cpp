@@ -5,22 +5,18 @@
 namespace kvr {
 namespace {
 
-using ::testing::ElementsAre;
-using ::testing::IsEmpty;
-using ::testing::Key;
-
 TEST(ADevice, KeepsItsPropertiesThroughItsCodedForm) {
   const KVRDevice watch("Watch", "SN1", Date{86400}, KVRDevice::kWatch);
   EXPECT_EQ(watch.description(), "Watch (SN1) (1970-01-02 00:00:00 +0000) - Watch");
   EXPECT_EQ(KVRDevice::initWithCoder(watch.encodeWithCoder())->description(), watch.description());
 
   const KVRDevice bare(std::nullopt, std::nullopt, std::nullopt, 0xFFFFFFFFFFFFFFFF);
-  EXPECT_EQ(bare.encodeWithCoder(), Value(Value::Dictionary{{"deviceType", 0xFFFFFFFFFFFFFFFF}}));
+  EXPECT_EQ(bare.encodeWithCoder(), Value(Dictionary{{"deviceType", 0xFFFFFFFFFFFFFFFF}}));
   EXPECT_EQ(KVRDevice::initWithCoder(bare.encodeWithCoder())->deviceType(), 0xFFFFFFFFFFFFFFFF);
   EXPECT_EQ(bare.description(), "(null) ((null)) ((null)) - Default");
 
-  const auto wrong = KVRDevice::initWithCoder(Value::Dictionary{
-      {"name", 7}, {"serialNumber", Value::Array{}}, {"activationDate", 5}, {"deviceType", "1"}});
+  const auto wrong = KVRDevice::initWithCoder(
+      Dictionary{{"name", 7}, {"serialNumber", Array{}}, {"activationDate", 5}, {"deviceType", "1"}});
   EXPECT_EQ(wrong->description(), bare.description()) << "a wrong kind is an absent property";
 }
 
@@ -28,9 +24,8 @@ class ADeviceInfo : public SimulatedTest {
  protected:
   KVRWarrantyRef warranty(bool display) {
     return KVRWarranty::initWithDictionary(
-        simulated.platform,
-        Value::Dictionary{{"zubOfferEligibleUntil", 86400},
-                          {"featureToggleParameters", Value::Dictionary{{"zubOfferDisplay", display}}}});
+        world.platform, Dictionary{{"zubOfferEligibleUntil", 86400},
+                                   {"featureToggleParameters", Dictionary{{"zubOfferDisplay", display}}}});
   }
 };
 
@@ -39,15 +34,15 @@ TEST_F(ADeviceInfo, TellsItsOfferAndDecodesPartByPart) {
   EXPECT_EQ(KVRDeviceInfo(device, warranty(false)).description(), "P (S) ((null)) - Default: No offer");
   EXPECT_EQ(KVRDeviceInfo(device, nullptr).description(), "P (S) ((null)) - Default: No offer");
   Value coded = KVRDeviceInfo(device, warranty(true)).encodeWithCoder();
-  EXPECT_EQ(KVRDeviceInfo::initWithCoder(simulated.platform, coded)->description(),
+  EXPECT_EQ(KVRDeviceInfo::initWithCoder(world.platform, coded)->description(),
             "P (S) ((null)) - Default: Eligible until 1970-01-02 00:00:00 +0000");
-  coded = Value::Dictionary{{"device", "x"}, {"warranty", coded["warranty"]}};
-  const auto half = KVRDeviceInfo::initWithCoder(simulated.platform, coded);
+  coded = Dictionary{{"device", "x"}, {"warranty", coded["warranty"]}};
+  const auto half = KVRDeviceInfo::initWithCoder(world.platform, coded);
   EXPECT_EQ(half->device(), nullptr);
   EXPECT_NE(half->warranty(), nullptr);
 }
 
-class TheDevicesManager : public ::testing::Test {
+class TheDevicesManager : public CoverageTest {
  protected:
   TheDevicesManager() {
     world.featureFlags.enabled.insert({"Kavrel", "Bravik_3_0"});
@@ -60,10 +55,7 @@ class TheDevicesManager : public ::testing::Test {
         {"Nameless", "Model", std::nullopt, Date{1}, true, false},
     };
   }
-  void TearDown() override { EXPECT_THAT(world.faults(), IsEmpty()); }
   KVRDevicesManager& manager() { return *KVRDevicesManager::sharedManager(world.platform); }
-
-  CoverageWorld world;
 };
 
 TEST_F(TheDevicesManager, FindsTheWatchesThatArePairedNow) {
@@ -82,7 +74,7 @@ TEST_F(TheDevicesManager, FindsTheWatchesThatArePairedNow) {
 }
 
 TEST_F(TheDevicesManager, IgnoresWatchesThatFlagOrServiceDoNotSupport) {
-  world.preferences.setObject(Value::Dictionary{{"LowServerVersion", 1}, {"HighServerVersion", 2}},
+  world.preferences.setObject(Dictionary{{"LowServerVersion", 1}, {"HighServerVersion", 2}},
                               preference::kServerVersionCache);
   EXPECT_THAT(manager().pairedDevices(), IsEmpty());
   EXPECT_TRUE(world.log.contains("Bravik 3.0 disabled by server, ignore paired devices"));
@@ -95,8 +87,7 @@ TEST_F(TheDevicesManager, IgnoresWatchesThatFlagOrServiceDoNotSupport) {
 TEST_F(TheDevicesManager, HonoursOverridesOnInternalInstallationsOnly) {
   world.clock.set(Date{1000000});
   world.preferences.setObject("OVERRIDE", "SerialNumber");
-  world.preferences.setObject(Value::Dictionary{{"a", "S1"}, {"b", "S2"}, {"c", 3}},
-                              "PairedWatchesSerialNumbers");
+  world.preferences.setObject(Dictionary{{"a", "S1"}, {"b", "S2"}, {"c", 3}}, "PairedWatchesSerialNumbers");
   world.preferences.setObject(-86400, "S1.activationInterval");
   EXPECT_EQ(manager().defaultDevice()->serialNumber(), "LOCAL");
   EXPECT_THAT(manager().pairedDevices(), ElementsAre(Key("W1"), Key("W2")));
@@ -109,7 +100,7 @@ TEST_F(TheDevicesManager, HonoursOverridesOnInternalInstallationsOnly) {
   EXPECT_EQ(watches.at("S1")->activationDate(), Date{1000000 - 86400});
   EXPECT_EQ(watches.at("S2")->activationDate(), Date{1000000});
   EXPECT_EQ(watches.at("S2")->deviceType(), KVRDevice::kWatch);
-  world.preferences.setObject(Value::Dictionary{}, "PairedWatchesSerialNumbers");
+  world.preferences.setObject(Dictionary{}, "PairedWatchesSerialNumbers");
   EXPECT_THAT(manager().pairedDevices(), IsEmpty());
 }
 

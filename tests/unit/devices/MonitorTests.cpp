@@ -9,9 +9,6 @@
 namespace kvr {
 namespace {
 
-using ::testing::ElementsAre;
-using ::testing::IsEmpty;
-
 class Monitors : public AnOfferTest {
  protected:
   Monitors() {
@@ -44,23 +41,10 @@ TEST_F(Monitors, LookUpAllDevicesAndScheduleThePostWhenAWatchIsPairedOrUnpaired)
       "Watch paired after phone's refreshActivity has already finished. Schedule followUp post for: %@",
       inDays(2))));
 
-  FollowUpItem shown;
-  shown.uniqueIdentifier = KVRFollowUp::uniqueIdentfierForSerialNumber("GONE");
-  shown.userInfo = {{kFollowUpSerialNumberKey, "GONE"}};
-  EXPECT_FALSE(world.followUps.newClient(kFollowUpClientIdentifier)->postItem(shown));
+  pend(KVRFollowUp::uniqueIdentfierForSerialNumber("GONE"), {{kFollowUpSerialNumberKey, "GONE"}});
   world.notifications.post(PairedDeviceRegistry::kDeviceDidUnpair);
   world.queues.run();
   EXPECT_THAT(pending(), IsEmpty()) << "of a watch that is tracked no more";
-}
-
-TEST_F(Monitors, ServeAThousandNotificationsOneByOne) {
-  const auto monitor = KVRPairedDevicesMonitor::initWithAgent(world.platform, agent);
-  monitor->start();
-  for (int i = 0; i < 1000; ++i) world.notifications.post(PairedDeviceRegistry::kDeviceDidPair);
-  world.queues.advance(60);
-  EXPECT_EQ(world.log.count("Devices followups to be posted, if required, after paired device change"),
-            1000U);
-  EXPECT_EQ(postDate(), world.clock.now() - 60 + 2 * kDay);
 }
 
 TEST_F(Monitors, CheckFiveSecondsAfterEveryChangeOfLanguageAndEndThen) {
@@ -77,10 +61,7 @@ TEST_F(Monitors, CheckFiveSecondsAfterEveryChangeOfLanguageAndEndThen) {
   EXPECT_THAT(world.cleanExit.requests, ElementsAre(start + 5, start + 6));
   EXPECT_THAT(world.http.requests(), IsEmpty());
 
-  FollowUpItem shown;
-  shown.uniqueIdentifier = "shown";
-  shown.userInfo = {{kFollowUpSerialNumberKey, "LOCAL"}};
-  EXPECT_FALSE(world.followUps.newClient(kFollowUpClientIdentifier)->postItem(shown));
+  pend("shown", {{kFollowUpSerialNumberKey, "LOCAL"}});
   change();
   world.queues.advance(10);
   EXPECT_EQ(world.http.requests().size(), 2U);

@@ -35,13 +35,10 @@ class AFollowUpActivity : public AnOfferTest {
 };
 
 TEST_F(AFollowUpActivity, FindsTheNextPostDate) {
-  const auto off = Value::Dictionary{{"zubOfferEligibleUntil", inDays(-1).secondsSince1970}};
-  world.preferences.setObject(Value::Array{sha256Hash("posted")}, preference::kFollowUpPostedHashes);
+  const auto off = Dictionary{{"zubOfferEligibleUntil", inDays(-1).secondsSince1970}};
+  world.preferences.setObject(Array{sha256Hash("posted")}, preference::kFollowUpPostedHashes);
   const auto old = inDays(-100);
-  const struct {
-    KVRDeviceInfoList list;
-    std::optional<double> next;
-  } cases[] = {
+  const std::tuple<KVRDeviceInfoList, std::optional<double>> cases[] = {
       {{}, {}},
       {{info("A", shownInDays(5, 30), old), info("B", shownInDays(3, 30), old)}, 3},
       {{info("A", shownInDays(4, 2), old)}, 2},
@@ -53,19 +50,15 @@ TEST_F(AFollowUpActivity, FindsTheNextPostDate) {
       {{info("A", offer(30), inDays(7))}, 7},  // never the end less its duration
       {{info("A", offer(30), old)}, {}},
   };
-  for (const auto& test : cases) {
-    const auto next = KVRFollowUpPost::nextFollowUpPostDateWithDevicesInfo(world.platform, test.list);
-    EXPECT_EQ(days(next), test.next) << describe(test.list);
+  for (const auto& [list, next] : cases) {
+    const auto found = KVRFollowUpPost::nextFollowUpPostDateWithDevicesInfo(world.platform, list);
+    EXPECT_EQ(days(found), next) << describe(list);
   }
 }
 
 TEST_F(AFollowUpActivity, FindsTheNextRefreshDate) {
   const auto old = inDays(-100);
-  const struct {
-    KVRDeviceInfoList list;
-    std::optional<double> initial;
-    double otherwise;
-  } cases[] = {
+  const std::tuple<KVRDeviceInfoList, std::optional<double>, double> cases[] = {
       {{}, {}, 1},
       {{info("A", shownInDays(-1, 2.5), old)}, 0.5, 0.5},
       {{info("A", shownInDays(-1, 10. / 24), old)}, {}, 0.417},
@@ -73,45 +66,46 @@ TEST_F(AFollowUpActivity, FindsTheNextRefreshDate) {
       {{info("A", shownInDays(0.25, 20), old)}, 0.25, 0.25},
       {{info("A", shownInDays(-1, 20.75), old), info("B", shownInDays(-1, 3.25), old)}, 0.25, 0.25},
       {{info("A", offer(-1), old), info("B", shownInDays(-1, 2.5), old)}, -1, -1},  // ends the scan
-      {{info("A", Value::Dictionary{}), info("B", {})}, {}, 1},
+      {{info("A", Dictionary{}), info("B", {})}, {}, 1},
       {{info("A", offer(2.5))}, {}, 0.5},  // shown from no known date
   };
-  for (const auto& test : cases) {
-    for (const bool initial : {true, false}) {
-      const auto next =
-          KVRFollowUpRefresh::nextFollowUpRefreshDateWithDevicesInfo(world.platform, test.list, initial);
-      EXPECT_EQ(days(next), initial ? test.initial : test.otherwise) << describe(test.list);
-    }
+  const auto next = [&](const KVRDeviceInfoList& list, bool isInitial) {
+    return days(KVRFollowUpRefresh::nextFollowUpRefreshDateWithDevicesInfo(world.platform, list, isInitial));
+  };
+  for (const auto& [list, initial, otherwise] : cases) {
+    EXPECT_EQ(next(list, true), initial) << describe(list);
+    EXPECT_EQ(next(list, false), otherwise) << describe(list);
   }
 }
 
 TEST_F(AFollowUpActivity, PostsAndSchedulesWhatFollows) {
   const std::string perform = "-[KVRFollowUpPost performActivityForScheduler:withCompletionHandler:]";
   const auto old = inDays(-100);
-  const struct {
-    std::optional<KVRDeviceInfoList> list;
-    ActivityResult result;
-    std::optional<double> post, refresh;
-  } cases[] = {
-      {std::nullopt, ActivityResult::Deferred, {}, {}},
-      {KVRDeviceInfoList{}, ActivityResult::Finished, {}, {}},
-      {KVRDeviceInfoList{info("A", shownInDays(2, 30), old)}, ActivityResult::Finished, 2, {}},
-      {KVRDeviceInfoList{info("A", shownInDays(-2, 2.5), old)}, ActivityResult::Finished, {}, 0.5},
-      {KVRDeviceInfoList{info("A", shownInDays(-2, 0.25), old)}, ActivityResult::Finished, {}, 0.25},
-      {KVRDeviceInfoList{info("B", offer(-1), old)}, ActivityResult::Finished, 1, {}},  // not back to back
+  const auto one = [&](const Dictionary& warranty, const char* serialNumber = "A") {
+    return KVRDeviceInfoList{info(serialNumber, warranty, old)};
   };
-  for (const auto& test : cases) {
+  using Days = std::optional<double>;
+  const std::tuple<std::optional<KVRDeviceInfoList>, Days, Days> cases[] = {
+      {std::nullopt, {}, {}},
+      {KVRDeviceInfoList{}, {}, {}},
+      {one(shownInDays(2, 30)), 2, {}},
+      {one(shownInDays(-2, 2.5)), {}, 0.5},
+      {one(shownInDays(-2, 0.25)), {}, 0.25},
+      {one(offer(-1), "B"), 1, {}},  // not back to back
+  };
+  for (const auto& [list, post, refresh] : cases) {
     KVRScheduler::clearScheduledActivities(world.platform);
     world.log.clear();
     std::uint64_t policy = 0;
-    EXPECT_EQ(run<KVRFollowUpPost>(test.list, &policy), test.result);
+    EXPECT_EQ(run<KVRFollowUpPost>(list, &policy),
+              list ? ActivityResult::Finished : ActivityResult::Deferred);
     EXPECT_EQ(policy, 2U);
-    EXPECT_EQ(targetDays(activity::kFollowUpPost), test.post);
-    EXPECT_EQ(targetDays(activity::kFollowUpRefresh), test.refresh);
-    EXPECT_EQ(world.log.count(perform + " -> " + describe(test.list)), 1U);
-    EXPECT_EQ(world.log.count("Unable to load devices info, defer"), test.list ? 0U : 1U);
-    EXPECT_EQ(world.log.contains(perform + ": Re-schedule followUp post for: "), test.post.has_value());
-    EXPECT_EQ(world.log.contains(perform + ": Schedule refresh for: "), test.refresh.has_value());
+    EXPECT_EQ(targetDays(activity::kFollowUpPost), post);
+    EXPECT_EQ(targetDays(activity::kFollowUpRefresh), refresh);
+    EXPECT_EQ(world.log.count(perform + " -> " + describe(list)), 1U);
+    EXPECT_EQ(world.log.count("Unable to load devices info, defer"), list ? 0U : 1U);
+    EXPECT_EQ(world.log.contains(perform + ": Re-schedule followUp post for: "), post.has_value());
+    EXPECT_EQ(world.log.contains(perform + ": Schedule refresh for: "), refresh.has_value());
   }
 }
 
@@ -127,7 +121,7 @@ TEST_F(AFollowUpActivity, DropsTheAnswerOfAPostRunThatWasDeferredMeanwhile) {
   EXPECT_EQ(world.log.count("FollowUp Post activity deferred."), 1U);
   EXPECT_EQ(post->followUpPostTimer(), nullptr);
   held[0](KVRDeviceInfoList{info("A", due(5), inDays(-9))});
-  EXPECT_THAT(pendingSerials(), ::testing::ElementsAre("A")) << "the work is done all the same";
+  EXPECT_THAT(pendingSerials(), ElementsAre("A")) << "the work is done all the same";
   EXPECT_EQ(world.log.count("activity run was answered already, result 1 dropped"), 1U);
   EXPECT_TRUE(world.preferences.dateForKey("com.tarsil.kvragent.followuppost.TargetDate").has_value());
 }

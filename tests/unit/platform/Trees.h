@@ -1,12 +1,9 @@
 #pragma once
 
+#include "Prelude.h"
 #include "platform/JSON.h"
-#include "platform/PropertyList.h"
 #include "platform/UTF8.h"
 
-#include <gtest/gtest.h>
-
-#include <functional>
 #include <limits>
 
 namespace kvr {
@@ -15,14 +12,13 @@ namespace kvr {
 inline Value treeForEveryEncoding() {
   std::string planes;
   for (char32_t plane = 0; plane <= 16; ++plane) appendUTF8(planes, plane * 0x10000 + 0x1234);
-  return Value::Dictionary{
-      {"integers",
-       Value::Array{0, -1, 127, 255, 256, 65535, 65536, 4294967295, 4294967296, 10'000'000'000,
-                    std::numeric_limits<std::int64_t>::min(), std::numeric_limits<std::int64_t>::max(),
-                    std::uint64_t{1} << 63U, std::numeric_limits<std::uint64_t>::max()}},
-      {"reals", Value::Array{0.1, 1e300, -0.0, 1.0, 5e-324, 1.7976931348623157e308, 1e22, 123456789012.0}},
-      {"bools", Value::Array{true, false}},
-      {"empty", Value::Array{"", Value::Array{}, Value::Dictionary{}, Value::Dictionary{{"", ""}}}},
+  return Dictionary{
+      {"integers", Array{0, -1, 127, 255, 256, 65535, 65536, 4294967295, 4294967296, 10'000'000'000,
+                         std::numeric_limits<std::int64_t>::min(), std::numeric_limits<std::int64_t>::max(),
+                         std::uint64_t{1} << 63U, std::numeric_limits<std::uint64_t>::max()}},
+      {"reals", Array{0.1, 1e300, -0.0, 1.0, 5e-324, 1.7976931348623157e308, 1e22, 123456789012.0}},
+      {"bools", Array{true, false}},
+      {"empty", Array{"", Array{}, Dictionary{}, Dictionary{{"", ""}}}},
       {"planes", planes},
       {"line breaks", "a\nb\rc\r\nd\u0085e\u2028f\u2029\r\n"},
       {"blanks", "  leading, trailing and \t tab \n"},
@@ -34,7 +30,7 @@ inline Value treeForEveryEncoding() {
 
 inline Value nestedArrays(std::size_t depth) {
   Value tree = "innermost";
-  for (std::size_t i = 0; i < depth; ++i) tree = Value::Array{tree};
+  for (std::size_t i = 0; i < depth; ++i) tree = Array{tree};
   return tree;
 }
 
@@ -62,13 +58,6 @@ inline void expectFaults(const TreeReader& read, const std::string& domain, cons
     const auto found = read(text);
     ASSERT_FALSE(found) << text;
     EXPECT_EQ(found.error(), (Error{domain, 0, message})) << text;
-  }
-}
-
-inline void expectRefusedWhereverItIsCut(const std::string& sample, const TreeReader& read) {
-  ASSERT_TRUE(read(sample));
-  for (std::size_t size = 0; size < sample.size(); ++size) {
-    EXPECT_FALSE(read(std::string_view(sample).substr(0, size))) << "cut at " << size;
   }
 }
 

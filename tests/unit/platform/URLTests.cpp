@@ -1,42 +1,37 @@
+#include "Prelude.h"
 #include "platform/URL.h"
-
-#include <gtest/gtest.h>
 
 namespace kvr {
 namespace {
 
 TEST(AURL, IsTakenApart) {
-  struct Case {
-    const char *text, *scheme, *host, *filePath;
-    bool isLoopback;
+  const std::tuple<const char*, const char*, const char*, const char*, bool> cases[] = {
+      {"https://a.example/b?c#d", "https", "a.example", "", false},
+      {"HTTPS://A.Example:443", "https", "a.example", "", false},
+      {"http://localhost:80/", "http", "localhost", "", true},
+      {"http://127.0.0.1", "http", "127.0.0.1", "", true},
+      {"http://127.255.3.4:1/x", "http", "127.255.3.4", "", true},
+      {"http://[::1]:8080/x", "http", "::1", "", true},
+      {"http://localhost@a.example/", "http", "a.example", "", false},
+      {"http://a@b@localhost:1/", "http", "localhost", "", true},
+      {"http://a.example/@localhost", "http", "a.example", "", false},
+      {"http://localhost.a.example", "http", "localhost.a.example", "", false},
+      {"http://127.0.0.256/", "http", "127.0.0.256", "", false},
+      {"http://127.0.0.1./", "http", "127.0.0.1.", "", false},
+      {"http://[::ffff:1.2.3.4]/", "http", "::ffff:1.2.3.4", "", false},
+      {"file:///a/b%20c.plist", "file", "", "/a/b c.plist", false},
+      {"file://localhost/a?b", "file", "", "/a", false},
+      {"file:/a/%C3%A9", "file", "", "/a/\xC3\xA9", false},
+      {"mailto:a@b", "mailto", "", "", false},
   };
-  for (const Case& c : {
-           Case{"https://a.example/b?c#d", "https", "a.example", "", false},
-           Case{"HTTPS://A.Example:443", "https", "a.example", "", false},
-           Case{"http://localhost:80/", "http", "localhost", "", true},
-           Case{"http://127.0.0.1", "http", "127.0.0.1", "", true},
-           Case{"http://127.255.3.4:1/x", "http", "127.255.3.4", "", true},
-           Case{"http://[::1]:8080/x", "http", "::1", "", true},
-           Case{"http://localhost@a.example/", "http", "a.example", "", false},
-           Case{"http://a@b@localhost:1/", "http", "localhost", "", true},
-           Case{"http://a.example/@localhost", "http", "a.example", "", false},
-           Case{"http://localhost.a.example", "http", "localhost.a.example", "", false},
-           Case{"http://127.0.0.256/", "http", "127.0.0.256", "", false},
-           Case{"http://127.1/", "http", "127.1", "", false},
-           Case{"http://127.0.0.1./", "http", "127.0.0.1.", "", false},
-           Case{"http://[::ffff:1.2.3.4]/", "http", "::ffff:1.2.3.4", "", false},
-           Case{"file:///a/b%20c.plist", "file", "", "/a/b c.plist", false},
-           Case{"file://localhost/a?b", "file", "", "/a", false},
-           Case{"file:/a/%C3%A9", "file", "", "/a/\xC3\xA9", false},
-           Case{"mailto:a@b", "mailto", "", "", false},
-       }) {
-    const auto url = URL::parse(c.text);
-    ASSERT_TRUE(url) << c.text;
-    EXPECT_EQ(url->text(), c.text);
-    EXPECT_EQ(url->scheme(), c.scheme) << c.text;
-    EXPECT_EQ(url->host(), c.host) << c.text;
-    EXPECT_EQ(url->filePath(), c.filePath) << c.text;
-    EXPECT_EQ(url->isLoopback(), c.isLoopback) << c.text;
+  for (const auto& [text, scheme, host, filePath, isLoopback] : cases) {
+    const auto url = URL::parse(text);
+    ASSERT_TRUE(url) << text;
+    EXPECT_EQ(url->text(), text);
+    EXPECT_EQ(url->scheme(), scheme) << text;
+    EXPECT_EQ(url->host(), host) << text;
+    EXPECT_EQ(url->filePath(), filePath) << text;
+    EXPECT_EQ(url->isLoopback(), isLoopback) << text;
   }
 }
 

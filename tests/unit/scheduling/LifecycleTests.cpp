@@ -1,7 +1,4 @@
 #include "agent/AgentKeys.h"
-#include "agent/KVRAgent.h"
-#include "agent/StartUp.h"
-#include "followup/KVRFollowUpPost.h"
 #include "platform/JSON.h"
 #include "scheduling/KVRConversionOutreachActivity.h"
 #include "scheduling/KVROutreachActivity.h"
@@ -13,10 +10,6 @@
 
 namespace kvr {
 namespace {
-
-using ::testing::Contains;
-using ::testing::ElementsAre;
-using ::testing::IsEmpty;
 
 /// The agent's activities in a world whose coverage service answers from a table.
 class TheAgentsLife : public AnOfferTest {
@@ -62,11 +55,11 @@ class TheAgentsLife : public AnOfferTest {
 TEST_F(TheAgentsLife, SchedulesThePostAtTheEarliestDateOfAnOutreach) {
   auto excluded = shownInDays(1, 20);
   excluded["featureToggleParameters"] =
-      Value::Dictionary{{"zubOfferDisplay", true}, {"zubOfferToggle", Value::Array{"00101"}}};
+      Dictionary{{"zubOfferDisplay", true}, {"zubOfferToggle", Array{"00101"}}};
   auto lasting = offer(20);
   lasting["featureToggleParameters"] =
-      Value::Dictionary{{"zubOfferDisplay", true}, {"zubOfferDurationDaysBeforeEndDate", 15}};
-  const Value off = Value::Dictionary{}, none;
+      Dictionary{{"zubOfferDisplay", true}, {"zubOfferDurationDaysBeforeEndDate", 15}};
+  const Value off = Dictionary{}, none;
   const Value in3 = shownInDays(3, 20), in10 = shownInDays(10, 20), before = shownInDays(-4, 20);
   const std::tuple<Value, Value, std::optional<double>> cases[] = {
       {in10, in3, 3},   {in10, lasting, 5}, {excluded, in3, 3},  {off, before, -4},
@@ -90,13 +83,13 @@ TEST_F(TheAgentsLife, SchedulesThePostAtTheEarliestDateOfAnOutreach) {
                 (phone.isNull() ? 1U : 0U) + (watch.isNull() ? 1U : 0U));
     }
   }
-  for (const char* line :
+  for (const std::string line :
        {"serialNumber: W success: 1 -- Conversion: 1", "Warranty downloaded successfully",
         "Coverage check shows device should display Zub offer, check on-device state",
         "Configuration does not support current device. Complete activity without scheduling followup",
         "Warranty shows device is ineligible, complete activity without scheduling followup",
         "carrierID: (null)", "carrierID: 00101"}) {
-    EXPECT_EQ(world.log.count(line), std::string_view(line).starts_with("Warranty down") ? 2U : 1U) << line;
+    EXPECT_EQ(world.log.count(line), line.starts_with("Warranty down") ? 2U : 1U) << line;
   }
   EXPECT_THAT(world.log.texts(LogLevel::Error),
               Contains("No mobileCountryCode for networkInfo: {1 = (null)/(null); 2 = 001/01; }, carrier: "
@@ -120,34 +113,31 @@ TEST_F(TheAgentsLife, BeginsWithTheFirstPostUpgradeRun) {
     EXPECT_EQ(world.preferences.boolForKey(preference::kInitialOutreachActivityScheduled), hasAccount);
     EXPECT_TRUE(world.preferences.boolForKey(preference::kPostUpgradeActivityCompleted));
     EXPECT_EQ(world.preferences.stringForKey(preference::kPostUpgradeOSVersion), "17.9");
-    EXPECT_EQ(world.log.count("No primary account detected. Finishing post upgrade activity without "
-                              "scheduling outreach"),
-              hasAccount ? 0U : 1U);
+    const auto* const alone =
+        "No primary account detected. Finishing post upgrade activity without scheduling outreach";
+    EXPECT_EQ(world.log.count(alone), hasAccount ? 0U : 1U);
     KVRScheduler::clearScheduledActivities(world.platform);
   }
 }
 
 TEST_F(TheAgentsLife, ForcesAConversionOutreachWhenTheOSVersionHasGoneUp) {
-  const struct {
-    std::optional<std::string> recorded, current;
-    bool outreachPending, forces;
-  } cases[] = {{"17.9", "17.10", false, true},  {"17.9", "17.10", true, false},
-               {"17.9", "17.9", false, false},  {"17.10", "17.9", false, false},
-               {"17.9", "17.09", false, false}, {{}, "17.9", false, true},
-               {"17.9", {}, false, false},      {"17", "17.0.1", false, true}};
+  const std::tuple<std::optional<std::string>, std::optional<std::string>, bool, bool> cases[] = {
+      {"17.9", "17.10", false, true},  {"17.9", "17.10", true, false},  {"17.9", "17.9", false, false},
+      {"17.10", "17.9", false, false}, {"17.9", "17.09", false, false}, {{}, "17.9", false, true},
+      {"17.9", {}, false, false},      {"17", "17.0.1", false, true}};
   world.preferences.setObject(true, preference::kPostUpgradeActivityCompleted);
-  for (const auto& test : cases) {
+  for (const auto& [recorded, current, outreachPending, forces] : cases) {
     KVRScheduler::clearScheduledActivities(world.platform);
-    setOSVersions(test.recorded, test.current);
-    if (test.outreachPending) setTarget(activity::kOutreach, inDays(1));
+    setOSVersions(recorded, current);
+    if (outreachPending) setTarget(activity::kOutreach, inDays(1));
     EXPECT_EQ(run<KVRPostUpgradeActivity>(), ActivityResult::Finished);
-    EXPECT_EQ(target(activity::kConversionOutreach).has_value(), test.forces);
-    EXPECT_EQ(world.log.count(test.forces ? "Forcing conversion outreach on upgrade"
-                                          : "post upgrade activity already performed"),
+    EXPECT_EQ(target(activity::kConversionOutreach).has_value(), forces);
+    EXPECT_EQ(world.log.count(forces ? "Forcing conversion outreach on upgrade"
+                                     : "post upgrade activity already performed"),
               1U);
     EXPECT_EQ(world.preferences.stringForKey(preference::kPostUpgradeOSVersion),
-              test.current ? test.current : test.recorded);
-    EXPECT_EQ(world.log.count("Unable to get OS version"), test.current ? 0U : 1U);
+              current ? current : recorded);
+    EXPECT_EQ(world.log.count("Unable to get OS version"), current ? 0U : 1U);
   }
 }
 
@@ -168,50 +158,22 @@ TEST_F(TheAgentsLife, RegistersAgainAfterABootWhatIsPendingAndNothingElse) {
 
 TEST_F(TheAgentsLife, MovesTheConversionOutreachToEarlierDatesOnly) {
   world.preferences.setObject(true, preference::kPostUpgradeActivityCompleted);
-  const struct {
-    std::optional<double> days;
-    double scheduled;
-    const char* line;
-  } cases[] = {{50, 50, "scheduling conversion outreach %"},    {60, 50, ""}, {{}, 50, ""}, {40, 50, ""},
-               {30, 30, "Re-scheduling conversion outreach %"}, {30, 30, ""}};
-  for (const auto& test : cases) {  // a record without a date is no reason to schedule, nor is one after it
-    Value::Dictionary warranty;
-    if (test.days) warranty["zubOfferConversionDate"] = inDays(*test.days).secondsSince1970;
+  const std::tuple<std::optional<double>, double, const char*> cases[] = {
+      {50, 50, "scheduling conversion outreach %"},    {60, 50, ""}, {{}, 50, ""}, {40, 50, ""},
+      {30, 30, "Re-scheduling conversion outreach %"}, {30, 30, ""}};
+  // A record without a date is no reason to schedule, nor is one after it.
+  for (const auto& [days, scheduled, said] : cases) {
+    Dictionary warranty;
+    if (days) warranty["zubOfferConversionDate"] = inDays(*days).secondsSince1970;
     warranties["LOCAL"] = warranty;
     run<KVROutreachActivity>();
-    EXPECT_EQ(target(activity::kConversionOutreach), inDays(test.scheduled));
-    EXPECT_EQ(world.preferences.dateForKey(preference::kConversionOutreachScheduledDate),
-              inDays(test.scheduled));
-    std::string line = test.line;
-    if (!line.empty()) line.replace(line.size() - 1, 1, describe(inDays(test.scheduled)));
+    EXPECT_EQ(target(activity::kConversionOutreach), inDays(scheduled));
+    EXPECT_EQ(world.preferences.dateForKey(preference::kConversionOutreachScheduledDate), inDays(scheduled));
+    std::string line = said;
+    if (!line.empty()) line.replace(line.size() - 1, 1, describe(inDays(scheduled)));
     EXPECT_EQ(world.log.contains("cheduling conversion outreach"), !line.empty());
     EXPECT_EQ(world.log.count(line), line.empty() ? 0U : 1U);
   }
-}
-
-TEST_F(TheAgentsLife, LosesNoDismissalThatComesDuringAPostRun) {
-  pair("W", 100);
-  warranties = {{"LOCAL", shownInDays(-1, 9)}, {"W", shownInDays(-1, 9)}};
-  const StartUp startUp(world.platform);
-  world.queues.advance(60);
-  const auto plain = world.http.handler;
-  std::vector<std::pair<HTTPRequest, SimulatedHTTP::Answer>> waiting;
-  world.http.handler = [&](const HTTPRequest& request, bool, const SimulatedHTTP::Answer& answer) {
-    waiting.emplace_back(request, answer);
-  };
-  KVRScheduler::newSchedulerWithActivityDelegate(world.platform,
-                                                 std::make_shared<KVRFollowUpPost>(world.platform))
-      ->scheduleActivityForDate(world.clock.now());
-  world.queues.run();
-  ASSERT_FALSE(waiting.empty());
-  const auto agent = KVRAgent::initWithCallingProcessBundleID(world.platform, "client");
-  agent->dismissFollowUpForSerialNumber("W", BoolReply(world.log, "test", [](bool) {}));
-  world.http.handler = plain;
-  for (const auto& [request, answer] : waiting) plain(request, false, answer);
-  world.queues.advance(60);
-  EXPECT_THAT(pendingSerials(), ElementsAre("LOCAL"));
-  EXPECT_THAT(hashes(preference::kFollowUpDismissedHashes), ElementsAre(sha256Hash("W")));
-  EXPECT_EQ(hashes(preference::kFollowUpPostedHashes).size(), 2U);
 }
 
 }  // namespace

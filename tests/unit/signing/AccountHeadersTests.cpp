@@ -5,43 +5,30 @@
 namespace kvr {
 namespace {
 
-using ::testing::ElementsAre;
-using ::testing::IsEmpty;
-using ::testing::Pair;
-
 constexpr const char* kService = "com.tarsil.vornic.supportapp.auth";
 
-class ACoverageRequest : public ::testing::Test {
+class ACoverageRequest : public CoverageTest {
  protected:
-  void TearDown() override {
-    world.queues.run();
-    EXPECT_THAT(world.faults(), IsEmpty());
-  }
   bool sign(bool force) { return kvr_signWithAccountHeaders(world.platform, request, force, true); }
 
-  CoverageWorld world;
   HTTPRequest request;
 };
 
 TEST_F(ACoverageRequest, SaysWhichDeviceAndWhenAndWhere) {
   world.locale.identifier = "pt_BR";
-  const struct {
-    double now;
-    long offset;
-    std::int64_t milliseconds;
-    int hours;
-  } cases[] = {{1'800'000'000.9999, 19800, 1'800'000'000'999, 5},
-               {1, -12600, 1000, -3},
-               {-5, 3599, 0, 0},
-               {20'000'000'000, 0, 20'000'000'000'000, 0}};
-  for (const auto& test : cases) {
-    world.clock.set(Date{test.now});
-    world.locale.offset = test.offset;
+  const std::tuple<double, long, std::int64_t, int> cases[] = {
+      {1'800'000'000.9999, 19800, 1'800'000'000'999, 5},
+      {1, -12600, 1000, -3},
+      {-5, 3599, 0, 0},
+      {20'000'000'000, 0, 20'000'000'000'000, 0}};
+  for (const auto& [now, offset, milliseconds, hours] : cases) {
+    world.clock.set(Date{now});
+    world.locale.offset = offset;
     request.body = "before";
     kvr_setCoverageRequestBodyWithSerialNumber(world.platform, request, "S/\"é");
     EXPECT_EQ(request.body, format("{\"locale\":\"pt_BR\",\"requestTimestamp\":%ld,\"requestTimezone\":%d,"
                                    "\"serialNumber\":\"S/\\\"é\"}",
-                                   test.milliseconds, test.hours));
+                                   milliseconds, hours));
     EXPECT_EQ(bodyDescription(request), request.body);
   }
   EXPECT_EQ(request.method, "POST");
@@ -144,7 +131,7 @@ TEST_F(ACoverageRequest, IsNotSignedWithoutAnAccount) {
 
 TEST_F(ACoverageRequest, OffersCarryTheirOwnHeaders) {
   const auto widgetry = "/home/user/Library/Preferences/com.tarsil.Widgetry.plist";
-  world.files.putPropertyList(widgetry, Value::Dictionary{{"UIPreferredContentSizeCategoryName", "Large"}});
+  world.files.putPropertyList(widgetry, Dictionary{{"UIPreferredContentSizeCategoryName", "Large"}});
   kvr_addMirelHeadersWithOfferID(world.platform, request, "offer-7", "SN");
   const auto first = *request.headers.value("X-Tarsil-Txn-ID");
   EXPECT_THAT(request.headers.fields(),

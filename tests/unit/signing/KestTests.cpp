@@ -9,9 +9,6 @@
 namespace kvr {
 namespace {
 
-using ::testing::ElementsAre;
-using ::testing::IsEmpty;
-
 constexpr const char* kBegin =
     "-[HTTPRequest(AccountHeaders) addKestAuthenticationHeadersWithBody:]: Initiating device authentication";
 constexpr const char* kSupported = "-[KVRKestManager generateKestCertficate:]: isSupported: 1";
@@ -32,14 +29,14 @@ std::string certificate(unsigned seed) {
 class DeviceAttestationHeaders : public SimulatedTest {
  protected:
   DeviceAttestationHeaders() {
-    simulated.attestation.preferred.chain = chain;
-    simulated.attestation.fallback.chain = chain;
+    world.attestation.preferred.chain = chain;
+    world.attestation.fallback.chain = chain;
   }
 
   std::optional<std::string> signature() const { return request.headers.value("X-Tarsil-Kest-S"); }
   std::optional<std::string> chainHeader() const { return request.headers.value("X-Tarsil-Kest"); }
-  std::vector<std::string> standardLines() const { return simulated.log.texts(LogLevel::Default); }
-  std::vector<std::string> errorLines() const { return simulated.log.texts(LogLevel::Error); }
+  std::vector<std::string> standardLines() const { return world.log.texts(LogLevel::Default); }
+  std::vector<std::string> errorLines() const { return world.log.texts(LogLevel::Error); }
 
   const CertificateChain chain = {certificate(1), certificate(2)};
   HTTPRequest request;
@@ -47,9 +44,9 @@ class DeviceAttestationHeaders : public SimulatedTest {
 
 TEST_F(DeviceAttestationHeaders, CarryTheSignatureOfTheBodyAndTheChain) {
   request.body = std::string("{\"a\":\"\0\"}", 9);
-  addKestAuthenticationHeadersWithBody(simulated.platform, request, request.body);
+  addKestAuthenticationHeadersWithBody(world.platform, request, request.body);
 
-  EXPECT_THAT(simulated.attestation.key->messages, ElementsAre(request.body));
+  EXPECT_THAT(world.attestation.key->messages, ElementsAre(request.body));
   EXPECT_EQ(signature(), base64Encoded("signature"));
   ASSERT_TRUE(chainHeader());
   EXPECT_THAT(standardLines(),
@@ -161,19 +158,19 @@ TEST_F(DeviceAttestationHeaders, AreLeftOutAndTheReasonLoggedWhenTheyCannotBeMad
 }
 
 TEST_F(DeviceAttestationHeaders, AreNotTouchedByAnAnswerThatComesTooLate) {
-  simulated.attestation.preferred = SimulatedDeviceAttestation::failed(-11, 70);
-  simulated.attestation.fallback = SimulatedDeviceAttestation::failed(9, 20);
-  addKestAuthenticationHeadersWithBody(simulated.platform, request, "body");
-  EXPECT_EQ(simulated.clock.elapsed(), 60);
-  simulated.queues.advance(100);
+  world.attestation.preferred = SimulatedDeviceAttestation::failed(-11, 70);
+  world.attestation.fallback = SimulatedDeviceAttestation::failed(9, 20);
+  addKestAuthenticationHeadersWithBody(world.platform, request, "body");
+  EXPECT_EQ(world.clock.elapsed(), 60);
+  world.queues.advance(100);
   EXPECT_THAT(errorLines(), ElementsAre(fellBack(-11), generationFailed(issueError(9))));
   EXPECT_THAT(request.headers.fields(), IsEmpty());
 }
 
 TEST_F(DeviceAttestationHeaders, CanBeMadeForASerialNumberAlone) {
   request.body = "the request's own";
-  addKestAuthenticationHeadersWithSerialNumber(simulated.platform, request, "C39/\"1\"");
-  EXPECT_THAT(simulated.attestation.key->messages, ElementsAre(R"({"serialNumber":"C39/\"1\""})"));
+  addKestAuthenticationHeadersWithSerialNumber(world.platform, request, "C39/\"1\"");
+  EXPECT_THAT(world.attestation.key->messages, ElementsAre(R"({"serialNumber":"C39/\"1\""})"));
   EXPECT_EQ(request.body, "the request's own");
   EXPECT_TRUE(signature() && chainHeader());
 }

@@ -11,22 +11,21 @@ class TheSupportApplication : public SimulatedTest {
  protected:
   /// What the whole answer, or the store's part, holds besides the bundle.
   Value answer(bool storeOnly = false) {
-    Value::Array answers;
-    const DictionaryReply reply(simulated.log, "test", [&](const Value& it) { answers.push_back(it); });
-    simulated.queues.concurrentQueue(Priority::Default)->async([this, reply, storeOnly] {
-      const KVRTarsilSupportManager manager(simulated.platform);
+    Array answers;
+    const DictionaryReply reply(world.log, "test", [&](const Value& it) { answers.push_back(it); });
+    world.queues.concurrentQueue(Priority::Default)->async([this, reply, storeOnly] {
+      const KVRTarsilSupportManager manager(world.platform);
       storeOnly ? manager.checkIsAvailableInStore(kBundle, reply)
                 : manager.appSupportAvailability(kBundle, reply);
     });
-    simulated.queues.advance(10);
+    world.queues.advance(10);
     if (answers.size() != 1) return "not one answer";
     if (!answers[0].isDictionary()) return answers[0];
     auto entries = answers[0].dictionary();
     EXPECT_EQ(storeOnly, entries.erase(availability::kBundleID) == 0);
     return entries;
   }
-  static Value::Dictionary entries(std::int64_t type, const char* text, const char* title,
-                                   const char* vendor) {
+  static Dictionary entries(std::int64_t type, const char* text, const char* title, const char* vendor) {
     return {{availability::kType, type},
             {availability::kText, text},
             {availability::kTitle, title},
@@ -35,8 +34,8 @@ class TheSupportApplication : public SimulatedTest {
 };
 
 TEST_F(TheSupportApplication, IsInstalledBoughtInTheStoreOrNotThere) {
-  auto& store = simulated.store;
-  EXPECT_EQ(answer(), Value(Value::Dictionary{{availability::kType, availability::NotFound}}));
+  auto& store = world.store;
+  EXPECT_EQ(answer(), Value(Dictionary{{availability::kType, availability::NotFound}}));
   const CatalogueItem item{"Support", "Tarsil", "https://store/x", {"https://icon", "https://other"}};
   auto inStore = entries(availability::InStore, "Free – On the Quillmart", "Support", "Tarsil");
   inStore[availability::kLinkURL] = "https://store/x?pt=2003&ct=coverage.settings&mt=8";
@@ -45,19 +44,18 @@ TEST_F(TheSupportApplication, IsInstalledBoughtInTheStoreOrNotThere) {
   EXPECT_EQ(answer(), Value(inStore));
   EXPECT_EQ(answer(true), Value(inStore));
   store.catalogue = {{item, item}};
-  EXPECT_EQ(answer(), Value(Value::Dictionary{{availability::kType, availability::NotFound}}));
+  EXPECT_EQ(answer(), Value(Dictionary{{availability::kType, availability::NotFound}}));
   store.catalogue = {{CatalogueItem{}}};
   auto bare = entries(availability::InStore, "Free – On the Quillmart", "", "");
   bare[availability::kLinkURL] = bare[availability::kIconURL] = "";
   EXPECT_EQ(answer(), Value(bare));
   store.catalogueError = Error{"store", 7, "closed"};
-  EXPECT_EQ(answer(), Value(Value::Dictionary{}));
+  EXPECT_EQ(answer(), Value(Dictionary{}));
   EXPECT_TRUE(answer(true).isNull());
-  EXPECT_TRUE(
-      simulated.log.contains("Lookup for com.tarsil.support in the Quillmart failed with error Error "));
+  EXPECT_TRUE(world.log.contains("Lookup for com.tarsil.support in the Quillmart failed with error Error "));
 
-  simulated.accounts.primary = CloudAccount{"alt"};
-  simulated.accounts.store = StoreAccount{42, {}};
+  world.accounts.primary = CloudAccount{"alt"};
+  world.accounts.store = StoreAccount{42, {}};
   store.purchases = {{"another", "A", "B", "C"}, {kBundle, {}, {}, ""}};
   auto bought = entries(availability::Purchased, "DOWNLOAD", "== Tarsil Support ==", "== Tarsil ==");
   bought[availability::kLinkURL] = "";
@@ -65,29 +63,29 @@ TEST_F(TheSupportApplication, IsInstalledBoughtInTheStoreOrNotThere) {
   EXPECT_EQ(store.purchaseQueries.back(), 42);
 
   const auto queries = store.purchaseQueries.size();
-  simulated.applications.installed[kBundle] = {};
+  world.applications.installed[kBundle] = {};
   EXPECT_EQ(answer(), Value(entries(availability::Installed, "INSTALLED", "", "")));
-  simulated.applications.installed[kBundle] = {"Support", "Tarsil"};
-  simulated.stringTables.texts[{"KavrelUI", "Localizable", "INSTALLED"}] = "Installé";
+  world.applications.installed[kBundle] = {"Support", "Tarsil"};
+  world.stringTables.texts[{"KavrelUI", "Localizable", "INSTALLED"}] = "Installé";
   EXPECT_EQ(answer(), Value(entries(availability::Installed, "Installé", "Support", "Tarsil")));
   EXPECT_EQ(store.purchaseQueries.size(), queries);
 }
 
 TEST_F(TheSupportApplication, CountsAsNotBoughtWhenThatIsNotKnownInFiveSeconds) {
-  simulated.store.purchases = {{kBundle, "S", "T", "U"}};
+  world.store.purchases = {{kBundle, "S", "T", "U"}};
   for (const double delay : {4.9, 5.1}) {
-    simulated.store.purchaseDelay = delay;
+    world.store.purchaseDelay = delay;
     EXPECT_EQ(answer()[availability::kType],
               Value(delay < 5 ? availability::Purchased : availability::NotFound));
   }
 }
 
 TEST_F(TheSupportApplication, CanBeOverriddenWithoutTheStoreBeingAsked) {
-  simulated.preferences.setObject(true, preference::kAppSupportAvailability);
+  world.preferences.setObject(true, preference::kAppSupportAvailability);
   const Value overridden = entries(availability::Installed, "OVERRIDE", "Tarsil Support", "Tarsil");
   EXPECT_EQ(answer(), overridden);
   EXPECT_EQ(answer(true), overridden);
-  EXPECT_EQ(simulated.store.lookups, 0U);
+  EXPECT_EQ(world.store.lookups, 0U);
 }
 
 }  // namespace

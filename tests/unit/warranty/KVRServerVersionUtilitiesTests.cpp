@@ -1,4 +1,3 @@
-#include "platform/PropertyList.h"
 #include "unit/SimulatedTest.h"
 #include "warranty/KVRServerVersionUtilities.h"
 #include "warranty/WarrantyKeys.h"
@@ -6,12 +5,10 @@
 namespace kvr {
 namespace {
 
-using ::testing::ElementsAre;
-using ::testing::IsEmpty;
 using Utilities = KVRServerVersionUtilities;
 
 Value pairOf(Value low, Value high) {
-  return Value::Dictionary{{"LowServerVersion", std::move(low)}, {"HighServerVersion", std::move(high)}};
+  return Dictionary{{"LowServerVersion", std::move(low)}, {"HighServerVersion", std::move(high)}};
 }
 
 std::string asset(const Value& tree) { return *writePropertyList(tree, PropertyListEncoding::XML); }
@@ -41,34 +38,27 @@ struct Client : SimulatedPlatform {
 };
 
 TEST(TheVersionNegotiation, SharesTheVersionsThatBothSidesSpeak) {
-  const struct {
-    Value server;
-    bool supported;
-    bool high;
-    std::vector<std::string> errors;
-  } cases[] = {
+  const Value low = Dictionary{{"LowServerVersion", 2}};
+  const std::tuple<Value, bool, bool, std::vector<std::string>> cases[] = {
       {pairOf(3, 4), true, true, {}},
       {pairOf(1, 2), true, false, {}},
       {pairOf("2", "3"), true, true, {}},
       {pairOf("3rd", "x"), true, true, {}},
       {pairOf(3.0, 9), true, true, {}},
       {pairOf(1, 5), false, false, {}},
-      {pairOf(Value::Array{}, true), false, false, {}},
-      {Value::Dictionary{{"LowServerVersion", 2}},
-       false,
-       false,
-       {"Server version dictionary missing key 'HighServerVersion'"}},
+      {pairOf(Array{}, true), false, false, {}},
+      {low, false, false, {"Server version dictionary missing key 'HighServerVersion'"}},
       {"text", false, false, {"Incorrect serverDictionary format"}},
   };
-  for (const auto& test : cases) {
-    SCOPED_TRACE(describe(test.server));
+  for (const auto& [server, supported, high, errors] : cases) {
+    SCOPED_TRACE(describe(server));
     Client client;
-    client.preferences.setObject(test.server, preference::kServerVersionOverride);
-    EXPECT_EQ(client.supported(), test.supported);
-    EXPECT_EQ(client.log.texts(LogLevel::Error), test.errors);
-    EXPECT_EQ(client.highEnabled(Utilities::kDefault), test.high);
-    EXPECT_EQ(Utilities::isHighServerVersionFeaturesetEnabled(client.platform), test.high);
-    EXPECT_EQ(client.cache(), test.server);
+    client.preferences.setObject(server, preference::kServerVersionOverride);
+    EXPECT_EQ(client.supported(), supported);
+    EXPECT_EQ(client.log.texts(LogLevel::Error), errors);
+    EXPECT_EQ(client.highEnabled(Utilities::kDefault), high);
+    EXPECT_EQ(Utilities::isHighServerVersionFeaturesetEnabled(client.platform), high);
+    EXPECT_EQ(client.cache(), server);
     EXPECT_THAT(client.http.requests(), IsEmpty());
     EXPECT_THAT(client.faults(), IsEmpty());
   }
@@ -79,13 +69,7 @@ TEST(TheVersionNegotiation, TakesTheServersPairFromThePolicysSources) {
   // anew.
   const Value cached = pairOf(1, 2);
   const Value published = pairOf(3, 9);
-  const struct {
-    std::uint64_t policy;
-    bool hasCache, hasAsset;
-    bool high;
-    std::size_t requests;
-    Value cacheAfter;
-  } cases[] = {
+  const std::tuple<std::uint64_t, bool, bool, bool, std::size_t, Value> cases[] = {
       {Utilities::kDefault, true, true, false, 0, cached},
       {Utilities::kDefault, false, true, true, 1, published},
       {Utilities::kDefault, false, false, true, 1, {}},
@@ -97,52 +81,43 @@ TEST(TheVersionNegotiation, TakesTheServersPairFromThePolicysSources) {
       {Utilities::kRefresh, true, false, false, 1, cached},
       {Utilities::kRefresh, false, false, true, 1, pairOf(2, 3)},
   };
-  for (const auto& test : cases) {
-    SCOPED_TRACE(format("%d %d %d", test.policy, test.hasCache, test.hasAsset));
+  for (const auto& [policy, hasCache, hasAsset, high, requests, cacheAfter] : cases) {
+    SCOPED_TRACE(format("%d %d %d", policy, hasCache, hasAsset));
     Client client;
-    if (test.hasCache) client.preferences.setObject(cached, preference::kServerVersionCache);
-    if (test.hasAsset) client.http.respond(404, asset(published));  // the status plays no part
-    EXPECT_EQ(client.highEnabled(test.policy), test.high);
-    EXPECT_EQ(client.http.requests().size(), test.requests);
-    EXPECT_EQ(client.cache(), test.cacheAfter);
-    EXPECT_EQ(client.log.contains("Using Client version"),
-              !test.hasCache && (!test.hasAsset || test.requests == 0));
+    if (hasCache) client.preferences.setObject(cached, preference::kServerVersionCache);
+    if (hasAsset) client.http.respond(404, asset(published));  // the status plays no part
+    EXPECT_EQ(client.highEnabled(policy), high);
+    EXPECT_EQ(client.http.requests().size(), requests);
+    EXPECT_EQ(client.cache(), cacheAfter);
+    EXPECT_EQ(client.log.contains("Using Client version"), !hasCache && (!hasAsset || requests == 0));
     EXPECT_THAT(client.faults(), IsEmpty());
   }
 }
 
 TEST(TheVersionNegotiation, GoesOnAfterAnyFailedFetchAndAsksOnceMoreForAnAssetThatIsNoDictionary) {
   const std::string url = "https://assets.example/kvrV2.plist";
+  const std::string from = " from URL '" + url + "'", failed = "Failed to fetch plist data";
   const Value client = pairOf(2, 3);
-  const struct {
-    Value url;
-    std::vector<std::string> responses;
-    Value cacheAfter;
-    std::string lastError;
-  } cases[] = {
+  const std::tuple<Value, std::vector<std::string>, Value, std::string> cases[] = {
       {url, {"(1)", asset(pairOf(3, 3))}, pairOf(3, 3), "Incorrect format in response detected. retrying..."},
       {url,
        {"(1)", "(2)"},
        client,
-       "Incorrect format in response detected from URL '" + url +
-           "'. Response: (2). Aborting without retry."},
-      {url, {"<html>"}, client, "Error serializing plist file from URL '" + url + "'"},
-      {url,
-       {},
-       client,
-       "Failed to fetch plist data from URL '" + url + "' with error: Error Domain=http Code=7 \"refused\""},
-      {"file:///nowhere", {}, client, "Failed to fetch plist data from URL 'file:///nowhere'"},
-      {7, {}, client, "Failed to fetch plist data from URL '7'"},
+       "Incorrect format in response detected" + from + ". Response: (2). Aborting without retry."},
+      {url, {"<html>"}, client, "Error serializing plist file" + from},
+      {url, {}, client, failed + from + " with error: Error Domain=http Code=7 \"refused\""},
+      {"file:///nowhere", {}, client, failed + " from URL 'file:///nowhere'"},
+      {7, {}, client, failed + " from URL '7'"},
   };
-  for (const auto& test : cases) {
-    SCOPED_TRACE(test.lastError);
+  for (const auto& [address, responses, cacheAfter, lastError] : cases) {
+    SCOPED_TRACE(lastError);
     Client world;
-    world.preferences.setObject(test.url, preference::kServerVersionURL);
-    for (const auto& response : test.responses) world.http.respond(200, response);
-    if (test.responses.empty()) world.http.fail(Error{"http", 7, "refused"});
+    world.preferences.setObject(address, preference::kServerVersionURL);
+    for (const auto& response : responses) world.http.respond(200, response);
+    if (responses.empty()) world.http.fail(Error{"http", 7, "refused"});
     EXPECT_TRUE(world.supported());
-    EXPECT_THAT(world.log.texts(LogLevel::Error).back(), ::testing::StartsWith(test.lastError));
-    EXPECT_EQ(world.cache(), test.cacheAfter);
+    EXPECT_THAT(world.log.texts(LogLevel::Error).back(), ::testing::StartsWith(lastError));
+    EXPECT_EQ(world.cache(), cacheAfter);
     const auto& sent = world.http.requests();
     for (std::size_t i = 0; i < sent.size(); ++i) EXPECT_EQ(sent[i].uncached, i > 0);
     EXPECT_LE(sent.size(), 2U);

@@ -8,22 +8,13 @@
 namespace kvr {
 namespace {
 
-using ::testing::ElementsAre;
-using ::testing::HasSubstr;
-using ::testing::IsEmpty;
-
 struct Answer {
   bool success;
   KVRWarrantyRef warranty;
 };
 
-class ADownload : public ::testing::Test {
+class ADownload : public CoverageTest {
  protected:
-  void TearDown() override {
-    world.queues.run();
-    EXPECT_THAT(world.faults(), IsEmpty());
-  }
-
   Answer download(const std::optional<std::string>& serialNumber) {
     std::vector<Answer> answers;
     const auto downloader = std::make_shared<KVRWarrantyDownloader>(world.platform, "com.example.client");
@@ -40,8 +31,6 @@ class ADownload : public ::testing::Test {
     return "/home/user/Library/Application Support/com.tarsil.Kavrel/" + sha256Hash(serialNumber) +
            "_Warranty.plist";
   }
-
-  CoverageWorld world;
 };
 
 TEST_F(ADownload, GoesOnceToTheEndpointOfItsDeviceForItsClient) {
@@ -61,6 +50,7 @@ TEST_F(ADownload, GoesOnceToTheEndpointOfItsDeviceForItsClient) {
 TEST_F(ADownload, LogsEachStepInItsOrder) {
   EXPECT_TRUE(download("WATCH").success);
   const auto path = cachedFile("WATCH");
+  EXPECT_THAT(*world.files.get(path), ::testing::StartsWith("<?xml"));
   std::vector<std::string> lines;
   for (const auto& line : world.log.lines()) {
     if (line.level == LogLevel::Default && !line.text.starts_with("default device"))
@@ -82,16 +72,12 @@ TEST_F(ADownload, LogsEachStepInItsOrder) {
 }
 
 TEST_F(ADownload, TriesAgainAfter401OnlyAndRenewsTheTokenThen) {
-  const struct {
-    std::vector<int> statuses;
-    bool success;
-    std::size_t renewals;
-  } cases[] = {
+  const std::tuple<std::vector<int>, bool, std::size_t> cases[] = {
       {{200}, true, 0},  {{401, 200}, true, 1},  {{401, 401, 200}, true, 2}, {{401, 401, 401}, false, 2},
       {{500}, false, 0}, {{401, 503}, false, 1}, {{302}, false, 0},          {{204}, false, 0},
   };
-  for (const auto& test : cases) {
-    std::vector<int> left = test.statuses;
+  for (const auto& [statuses, success, renewals] : cases) {
+    std::vector<int> left = statuses;
     world.coverage = [&](const HTTPRequest&) {
       const HTTPResponse response{left.front(), "{}", {}};
       left.erase(left.begin());
@@ -99,13 +85,13 @@ TEST_F(ADownload, TriesAgainAfter401OnlyAndRenewsTheTokenThen) {
     };
     world.accounts.renewals.clear();
     world.log.clear();
-    EXPECT_EQ(download("WATCH").success, test.success) << test.statuses.front();
-    EXPECT_THAT(left, IsEmpty()) << test.statuses.front();
-    EXPECT_EQ(world.accounts.renewals.size(), test.renewals);
-    for (std::size_t attempt = 0; attempt < test.statuses.size(); ++attempt) {
+    EXPECT_EQ(download("WATCH").success, success) << statuses.front();
+    EXPECT_THAT(left, IsEmpty()) << statuses.front();
+    EXPECT_EQ(world.accounts.renewals.size(), renewals);
+    for (std::size_t attempt = 0; attempt < statuses.size(); ++attempt) {
       EXPECT_EQ(world.log.count(format("WATCH : warranty download attempt (%d/2)", attempt)), 1U);
     }
-    EXPECT_EQ(world.log.count("kvragent failed to load warranty"), test.success ? 0U : 1U);
+    EXPECT_EQ(world.log.count("kvragent failed to load warranty"), success ? 0U : 1U);
   }
 }
 
@@ -128,7 +114,7 @@ TEST_F(ADownload, LeavesTheCacheAloneWhenItFails) {
   };
   const std::string failed = "kvragent failed to load warranty";
   expectFailure("Warranty download skipped server due to server version", [&] {
-    world.preferences.setObject(Value::Dictionary{{"LowServerVersion", 8}, {"HighServerVersion", 9}},
+    world.preferences.setObject(Dictionary{{"LowServerVersion", 8}, {"HighServerVersion", 9}},
                                 preference::kServerVersionOverride);
   });
   expectFailure("Unable to load sign request, failing warranty download",
@@ -143,6 +129,20 @@ TEST_F(ADownload, LeavesTheCacheAloneWhenItFails) {
   }
   for (const Value& url : {Value("gopher://x"), Value(7), Value("file:///none")}) {
     expectFailure(failed, [&] { world.preferences.setObject(url, preference::kWearablesWarrantyURL); });
+  }
+}
+
+TEST_F(ADownload, AnswersWhatTheCacheCannotHoldAndLeavesTheOldFile) {
+  ASSERT_TRUE(download("WATCH").success);
+  const auto fileBefore = world.files.get(cachedFile("WATCH"));
+  const auto dateKey = CacheMetadata("WATCH").lastUpdatedDateKey;
+  for (const char* unwritable : {R"({"x":null})", R"({"x":"\u0000"})", R"({"x":"\uffff"})"}) {
+    const auto dateBefore = world.preferences.objectForKey(dateKey);
+    world.queues.advance(10);
+    world.coverage = [&](auto&) { return HTTPResponse{200, unwritable, {}}; };
+    EXPECT_EQ(download("WATCH").warranty->dictionaryRepresentation(), *readJSON(unwritable));
+    EXPECT_EQ(world.files.get(cachedFile("WATCH")), fileBefore);
+    EXPECT_NE(world.preferences.objectForKey(dateKey), dateBefore) << "the date moves on";
   }
 }
 

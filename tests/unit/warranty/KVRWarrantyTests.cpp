@@ -7,16 +7,15 @@ namespace {
 
 class AWarranty : public SimulatedTest {
  protected:
-  AWarranty() { simulated.clock.set(Date{1'800'000'000}); }
+  AWarranty() { world.clock.set(Date{1'800'000'000}); }
 
   std::shared_ptr<KVRWarranty> from(const Value& dictionary) {
-    return KVRWarranty::initWithDictionary(simulated.platform, dictionary);
+    return KVRWarranty::initWithDictionary(world.platform, dictionary);
   }
   /// A warranty whose eligibility ends in so many seconds, with both forms of both offer texts.
   std::shared_ptr<KVRWarranty> eligibleFor(double seconds) {
-    return from(Value::Dictionary{
-        {"zubOfferEligibleUntil",
-         static_cast<std::int64_t>((simulated.clock.now() + seconds).secondsSince1970)},
+    return from(Dictionary{
+        {"zubOfferEligibleUntil", static_cast<std::int64_t>((world.clock.now() + seconds).secondsSince1970)},
         {"zubLocalizedOfferPluralDescFormat", "%@ days left"},
         {"zubLocalizedOfferSingularDesc", "last day"},
         {"zubLocalizedOfferDetailsPluralEligibilityFormat", "within %@ days"},
@@ -27,13 +26,13 @@ class AWarranty : public SimulatedTest {
 
 TEST_F(AWarranty, IsNullOnlyWithoutADictionary) {
   EXPECT_EQ(from({}), nullptr);
-  EXPECT_EQ(from(Value::Array{}), nullptr);
-  EXPECT_EQ(KVRWarranty::warrantyWithDictionary(simulated.platform, {}), nullptr);
-  EXPECT_EQ(simulated.log.texts().back(), "+[KVRWarranty warrantyWithDictionary:serialNumber:] : 0");
+  EXPECT_EQ(from(Array{}), nullptr);
+  EXPECT_EQ(KVRWarranty::warrantyWithDictionary(world.platform, {}), nullptr);
+  EXPECT_EQ(world.log.texts().back(), "+[KVRWarranty warrantyWithDictionary:serialNumber:] : 0");
 
-  const auto empty = KVRWarranty::warrantyWithDictionary(simulated.platform, Value::Dictionary{});
+  const auto empty = KVRWarranty::warrantyWithDictionary(world.platform, Dictionary{});
   ASSERT_NE(empty, nullptr);
-  EXPECT_EQ(simulated.log.texts().back(), "+[KVRWarranty warrantyWithDictionary:serialNumber:] : 1");
+  EXPECT_EQ(world.log.texts().back(), "+[KVRWarranty warrantyWithDictionary:serialNumber:] : 1");
   EXPECT_FALSE(empty->covered());
 }
 
@@ -52,31 +51,29 @@ TEST_F(AWarranty, ReadsNumbersAsDatesByTheEpochRule) {
       {Date{5}, std::nullopt},
   };
   for (const auto& [number, seconds] : cases) {
-    const auto date = from(Value::Dictionary{{"coverageEndDate", number}})->coverageEndDate();
+    const auto date = from(Dictionary{{"coverageEndDate", number}})->coverageEndDate();
     EXPECT_EQ(date ? std::optional(date->secondsSince1970) : std::nullopt, seconds) << describe(number);
   }
 }
 
 TEST_F(AWarranty, FindsEachKeyAtItsPlaceOnly) {
-  const auto warranty = from(Value::Dictionary{
-      {"featureToggleParameters", Value::Dictionary{{"zubOfferDisplay", true},
-                                                    {"zubOfferBadgeBeforeEndDate", 5},
-                                                    {"zubOfferDurationDaysBeforeEndDate", "1.5"},
-                                                    {"zubOfferToggle", Value::Array{"00101"}}}},
+  const auto warranty = from(Dictionary{
+      {"featureToggleParameters", Dictionary{{"zubOfferDisplay", true},
+                                             {"zubOfferBadgeBeforeEndDate", 5},
+                                             {"zubOfferDurationDaysBeforeEndDate", "1.5"},
+                                             {"zubOfferToggle", Array{"00101"}}}},
       {"zubOfferDisplay", false},
-      {"coverage",
-       Value::Dictionary{{"localizedCoverageTitle", 7},
-                         {"benefitsCard", Value::Dictionary{{"localizedBenefitsCardTitle", "Card"}}}}},
+      {"coverage", Dictionary{{"localizedCoverageTitle", 7},
+                              {"benefitsCard", Dictionary{{"localizedBenefitsCardTitle", "Card"}}}}},
   });
   EXPECT_TRUE(warranty->zubOfferDisplay());
   EXPECT_EQ(warranty->zubOfferBadgeDurationBeforeEndDate(), 0);
   EXPECT_EQ(warranty->zubOfferDurationBeforeEndDate(), 1.5 * 86400);
-  EXPECT_EQ(warranty->zubOfferToggle(), Value(Value::Array{"00101"}));
+  EXPECT_EQ(warranty->zubOfferToggle(), Value(Array{"00101"}));
   EXPECT_EQ(warranty->localizedCoverageDetailsTitle(), Value(7)) << "other kinds pass through";
   EXPECT_EQ(warranty->localizedBenefitsCardTitle(), Value("Card"));
 
-  const auto broken =
-      from(Value::Dictionary{{"coverage", "text"}, {"featureToggleParameters", Value::Array{}}});
+  const auto broken = from(Dictionary{{"coverage", "text"}, {"featureToggleParameters", Array{}}});
   EXPECT_EQ(broken->coverageDetailsDictionary(), Value("text"));
   EXPECT_EQ(broken->localizedBenefitsCardTitle(), Value());
   EXPECT_FALSE(broken->zubOfferDisplay());
@@ -84,11 +81,7 @@ TEST_F(AWarranty, FindsEachKeyAtItsPlaceOnly) {
 
 TEST_F(AWarranty, TakesItsConversionDateFromTheFirstSourceThatHasOne) {
   const Value end = 1'700'000'000;
-  const struct {
-    Value override;
-    Value::Dictionary dictionary;
-    std::optional<Date> date;
-  } cases[] = {
+  const std::tuple<Value, Dictionary, std::optional<Date>> cases[] = {
       {1'600'000'000, {{"zubOfferConversionDate", 1'650'000'000}}, Date{1'600'000'000}},
       {"1600000000", {{"zubOfferConversionDate", 1'650'000'000}}, Date{1'650'000'000}},
       {{}, {{"zubOfferConversionDate", 0}, {"coverageEndDate", end}}, std::nullopt},
@@ -97,22 +90,16 @@ TEST_F(AWarranty, TakesItsConversionDateFromTheFirstSourceThatHasOne) {
       {{}, {{"coverageEndDate", end}}, Date{1'700'000'000 + 3600}},
       {{}, {}, std::nullopt},
   };
-  simulated.preferences.setObject(3600, preference::kOneDayInterval);
-  for (const auto& test : cases) {
-    simulated.preferences.setObject(test.override, preference::kConversionDate);
-    EXPECT_EQ(from(test.dictionary)->zubOfferConversionDate(), test.date) << describe(Value(test.dictionary));
+  world.preferences.setObject(3600, preference::kOneDayInterval);
+  for (const auto& [override, dictionary, date] : cases) {
+    world.preferences.setObject(override, preference::kConversionDate);
+    EXPECT_EQ(from(dictionary)->zubOfferConversionDate(), date) << describe(Value(dictionary));
   }
 }
 
 TEST_F(AWarranty, CountsTheDaysLeftAndChoosesTheOfferTextByThem) {
   constexpr double kDay = 86400;
-  const struct {
-    double secondsLeft;
-    Value dayLength;
-    std::uint32_t days;
-    const char* offer;
-    const char* eligibility;
-  } cases[] = {
+  const std::tuple<double, Value, std::uint32_t, const char*, const char*> cases[] = {
       {2 * kDay + 1, {}, 3, "3 days left", "within 3 days"},
       {1.5 * kDay, {}, 2, "2 days left", "within 2 days"},
       {1, {}, 1, "last day", "today"},
@@ -122,14 +109,14 @@ TEST_F(AWarranty, CountsTheDaysLeftAndChoosesTheOfferTextByThem) {
       {1234 * kDay, {}, 1234, "1,234 days left", "within 1,234 days"},
       {1e9, 1e-9, 4294967295, "4,294,967,295 days left", "within 4,294,967,295 days"},
   };
-  for (const auto& test : cases) {
-    simulated.preferences.setObject(test.dayLength, preference::kOneDayInterval);
-    const auto warranty = eligibleFor(test.secondsLeft);
-    EXPECT_EQ(warranty->daysEligible(), test.days) << test.secondsLeft;
-    EXPECT_EQ(warranty->zubLocalizedOfferDesc(), Value(test.offer)) << test.secondsLeft;
-    EXPECT_EQ(warranty->zubLocalizedOfferDetailsEligibility(), Value(test.eligibility)) << test.secondsLeft;
+  for (const auto& [secondsLeft, dayLength, days, offer, eligibility] : cases) {
+    world.preferences.setObject(dayLength, preference::kOneDayInterval);
+    const auto warranty = eligibleFor(secondsLeft);
+    EXPECT_EQ(warranty->daysEligible(), days) << secondsLeft;
+    EXPECT_EQ(warranty->zubLocalizedOfferDesc(), Value(offer)) << secondsLeft;
+    EXPECT_EQ(warranty->zubLocalizedOfferDetailsEligibility(), Value(eligibility)) << secondsLeft;
   }
-  EXPECT_EQ(from(Value::Dictionary{})->daysEligible(), 0U);
+  EXPECT_EQ(from(Dictionary{})->daysEligible(), 0U);
 }
 
 TEST_F(AWarranty, FillsOnlyItsOwnPlaceholderInTextsFromTheService) {
@@ -147,28 +134,25 @@ TEST_F(AWarranty, FillsOnlyItsOwnPlaceholderInTextsFromTheService) {
   }
   warranty->zubLocalizedOfferDetailsPluralEligibilityFormat = Value();
   EXPECT_EQ(warranty->zubLocalizedOfferDetailsEligibility(), Value());
-  EXPECT_THAT(
-      simulated.log.texts(LogLevel::Error),
-      ::testing::ElementsAre("zubLocalizedOfferDesc: zubLocalizedOfferPluralDescFormat is not a string",
-                             "zubLocalizedOfferDetailsEligibility: "
-                             "zubLocalizedOfferDetailsPluralEligibilityFormat is not a string"));
+  EXPECT_THAT(world.log.texts(LogLevel::Error),
+              ElementsAre("zubLocalizedOfferDesc: zubLocalizedOfferPluralDescFormat is not a string",
+                          "zubLocalizedOfferDetailsEligibility: "
+                          "zubLocalizedOfferDetailsPluralEligibilityFormat is not a string"));
 }
 
 TEST_F(AWarranty, IsItsDictionaryForEqualityAndCoding) {
-  const Value dictionary =
-      Value::Dictionary{{"covered", true}, {"unknown", Value::Array{1, 2.5, "x", Value()}}};
+  const Value dictionary = Dictionary{{"covered", true}, {"unknown", Array{1, 2.5, "x", Value()}}};
   const auto warranty = from(dictionary);
   warranty->covered = false;
   EXPECT_TRUE(warranty->isEqual(*from(dictionary)));
-  EXPECT_FALSE(warranty->isEqual(*from(Value::Dictionary{{"covered", true}})));
+  EXPECT_FALSE(warranty->isEqual(*from(Dictionary{{"covered", true}})));
 
-  const auto decoded = KVRWarranty::initWithCoder(simulated.platform, warranty->encodeWithCoder());
+  const auto decoded = KVRWarranty::initWithCoder(world.platform, warranty->encodeWithCoder());
   EXPECT_TRUE(decoded->isEqual(*warranty));
   EXPECT_TRUE(decoded->covered()) << "properties are read from the dictionary again";
 
-  const Value data = Value::Dictionary{{"x", Value::Bytes{1}}};
-  EXPECT_FALSE(
-      KVRWarranty::initWithCoder(simulated.platform, Value::Dictionary{{"DictionaryRepresentation", data}}));
+  const Value data = Dictionary{{"x", Value::Bytes{1}}};
+  EXPECT_FALSE(KVRWarranty::initWithCoder(world.platform, Dictionary{{"DictionaryRepresentation", data}}));
 }
 
 }  // namespace

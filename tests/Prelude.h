@@ -1,0 +1,41 @@
+#pragma once
+
+// Before the names below, which some of its enumerators have too.
+#include "platform/PropertyListFiles.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <functional>
+#include <map>
+#include <string>
+#include <string_view>
+#include <tuple>
+#include <vector>
+
+namespace kvr {
+
+// The words that most tests speak in.
+using Array = Value::Array;
+using Dictionary = Value::Dictionary;
+using ::testing::AllOf;
+using ::testing::Contains;
+using ::testing::Each;
+using ::testing::ElementsAre;
+using ::testing::HasSubstr;
+using ::testing::IsEmpty;
+using ::testing::Key;
+using ::testing::Not;
+using ::testing::Optional;
+using ::testing::Pair;
+using ::testing::SizeIs;
+using ::testing::UnorderedElementsAre;
+
+/// How often a text holds another.
+inline std::size_t countOf(std::string_view part, std::string_view text) {
+  std::size_t count = 0;
+  for (auto at = text.find(part); at != std::string_view::npos; at = text.find(part, at + 1)) ++count;
+  return count;
+}
+
+}  // namespace kvr

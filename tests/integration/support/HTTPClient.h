@@ -1,0 +1,38 @@
+#pragma once
+
+#include "integration/support/RecordingLog.h"
+#include "platform/local/EventLoop.h"
+#include "platform/local/LocalHTTP.h"
+#include "platform/local/LocalWorkQueues.h"
+
+#include <future>
+#include <memory>
+#include <utility>
+
+namespace kvr::testing {
+
+/// The agent's HTTP with all it needs, and its answers to wait for.
+class HTTPClient {
+ public:
+  std::future<HTTPResponse> start(HTTPRequest request) {
+    return start(http_->sharedSession(), std::move(request));
+  }
+  static std::future<HTTPResponse> start(HTTPSession& session, HTTPRequest request) {
+    auto promise = std::make_shared<std::promise<HTTPResponse>>();
+    auto future = promise->get_future();
+    // A second reply would throw.
+    session.send(std::move(request), [promise](HTTPResponse reply) { promise->set_value(std::move(reply)); });
+    return future;
+  }
+  HTTPResponse exchange(HTTPRequest request) { return start(std::move(request)).get(); }
+  LocalHTTP& http() { return *http_; }
+  void end() { http_.reset(); }
+
+ private:
+  RecordingLog log_;
+  EventLoop loop_;
+  LocalWorkQueues queues_{loop_, log_};
+  std::unique_ptr<LocalHTTP> http_ = std::make_unique<LocalHTTP>(queues_, log_);
+};
+
+}  // namespace kvr::testing
