@@ -15,6 +15,7 @@ namespace kvr::testing {
 namespace {
 
 constexpr std::size_t kMebibyte = std::size_t{1} << 20;
+constexpr int kConnections = 64;  // to a host
 constexpr int kCouldNotConnect = 7;
 constexpr int kTimedOut = 28;
 constexpr int kAborted = 42;
@@ -71,7 +72,7 @@ class ScriptedServer {
     address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
     socklen_t size = sizeof address;
     EXPECT_EQ(bind(listener_.get(), reinterpret_cast<sockaddr*>(&address), size), 0);
-    EXPECT_EQ(listen(listener_.get(), 64), 0);
+    EXPECT_EQ(listen(listener_.get(), 256), 0);
     getsockname(listener_.get(), reinterpret_cast<sockaddr*>(&address), &size);
     host_ = "127.0.0.1:" + std::to_string(ntohs(address.sin_port));
     acceptor_ = std::thread([this] { accept(); });
@@ -282,26 +283,43 @@ TEST_F(OverHTTP, WhatMustNotBeSentFailsWithoutAConnection) {
   EXPECT_EQ(server.connections(), 0);
 }
 
-TEST_F(OverHTTP, FiftyRequestsAtOnceShareSixConnections) {
-  std::latch sixAtOnce(6);
-  std::atomic<int> waiting{0};
+TEST_F(OverHTTP, TwoHundredRequestsAtOnceShareSixtyFourConnectionsThatCloseAfterwards) {
+  std::latch allAtOnce(kConnections);
+  std::latch allClosed(kConnections);
   const ScriptedServer server([&](Peer& peer) {
-    if (waiting++ < 6) sixAtOnce.arrive_and_wait();
+    allAtOnce.arrive_and_wait();
     echo(peer);
+    allClosed.count_down();
   });
   std::map<std::string, std::future<HTTPResponse>> replies;
-  for (int i = 0; i < 50; ++i) {
+  for (int i = 0; i < 200; ++i) {
     const std::string path = "/" + std::to_string(i);
     replies[path] = start(get(server.url(path)));
   }
   for (auto& [path, reply] : replies) EXPECT_THAT(*reply.get().body, HasSubstr("GET " + path + " "));
-  EXPECT_EQ(server.mostConnectionsAtOnce(), 6);
+  EXPECT_EQ(server.mostConnectionsAtOnce(), kConnections);
+  allClosed.wait();
+}
+
+TEST_F(OverHTTP, AServiceThatTurnsConnectionsAwayIsAskedOverFewer) {
+  constexpr int kTaken = 8;
+  std::latch allCame(50);
+  std::atomic<int> came{0};
+  const ScriptedServer server([&](Peer& peer) {
+    const int number = ++came;
+    if (number <= 50) allCame.arrive_and_wait();
+    if (number <= kTaken || number > 50) echo(peer);
+  });
+  std::vector<std::future<HTTPResponse>> replies;
+  for (int i = 0; i < 50; ++i) replies.push_back(start(get(server.url())));
+  for (auto& reply : replies) EXPECT_EQ(reply.get().status, 200);
+  EXPECT_EQ(server.connections(), 50);
 }
 
 TEST_F(OverHTTP, TheTimeSpentWaitingForAConnectionCounts) {
   const ScriptedServer server(keepSilent);
   std::vector<std::future<HTTPResponse>> pending;
-  for (int i = 0; i < 6; ++i) pending.push_back(start(get(server.url())));
+  for (int i = 0; i < kConnections; ++i) pending.push_back(start(get(server.url())));
   HTTPRequest brief = get(server.url());
   brief.timeout = 0.05;
   EXPECT_EQ(codeOf(exchange(brief)), kTimedOut);

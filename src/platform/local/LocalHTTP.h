@@ -10,9 +10,10 @@ namespace kvr {
 
 /// HTTP/1.1 over the network, by a library that is loaded at the first request.
 ///
-/// Connections are kept alive, at most 6 to a host; requests beyond them wait. Plain http is for loopback
-/// addresses only. The proxies that the environment names are used, except towards a loopback address.
-/// Replies arrive on the concurrent queue of default priority. Errors bear libcurl's codes.
+/// At most 64 connections to a host, or 6 while the service turns others away; requests beyond them wait.
+/// Connections are kept alive, and closed after 5 s without a request. Plain http is for loopback addresses
+/// only. The proxies that the environment names are used, except towards a loopback address. Replies arrive
+/// on the concurrent queue of default priority. Errors bear libcurl's codes.
 class LocalHTTP : public HTTP {
  public:
   LocalHTTP(WorkQueues& queues, Log& log);

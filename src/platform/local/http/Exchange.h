@@ -58,6 +58,13 @@ inline bool isLoopback(const sockaddr& address) {
   return false;
 }
 
+/// Whether a hop that ended so may have been turned away: by who has too many connections already, or by this
+/// process, which has no descriptor left for another one.
+inline bool mayBeTurnedAway(CURLcode code) {
+  return code == CURLE_COULDNT_CONNECT || code == CURLE_SSL_CONNECT_ERROR || code == CURLE_GOT_NOTHING ||
+         code == CURLE_SEND_ERROR || code == CURLE_RECV_ERROR;
+}
+
 inline bool isRedirect(long status) {
   return status == 301 || status == 302 || status == 303 || status == 307 || status == 308;
 }
@@ -84,6 +91,9 @@ class Exchange {
   void prepare();
   /// Takes in how a hop went. True when there is to be another one; otherwise the exchange has been answered.
   bool goOn(CURLcode code);
+  /// Whether a hop that was turned away may be made again, which is so once: when the service has not had the
+  /// request, or it makes no difference how often it gets it.
+  bool takeSecondTry(CURLcode code);
   void fail(CURLcode code, std::string message) {
     answer({0, std::nullopt, failure(code, std::move(message))});
   }
@@ -117,6 +127,7 @@ class Exchange {
   HeaderList headers_;
   URL url_;
   int redirects_ = 0;
+  bool hadSecondTry_ = false;
   std::string body_;
   std::size_t sent_ = 0;  ///< of the request's body
   std::size_t headerBytes_ = 0;
@@ -273,6 +284,12 @@ inline bool Exchange::goOn(CURLcode code) {
   }
   answer({static_cast<int>(status), std::move(body_), std::nullopt});
   return false;
+}
+
+inline bool Exchange::takeSecondTry(CURLcode code) {
+  const bool isUnsent = code == CURLE_COULDNT_CONNECT || code == CURLE_SSL_CONNECT_ERROR;
+  const bool isHarmless = request_.method == "GET" && request_.body.empty();
+  return !refusal_ && (isUnsent || isHarmless) && !std::exchange(hadSecondTry_, true);
 }
 
 inline void Exchange::follow(long status, const char* location) {

@@ -17,8 +17,12 @@ namespace {
 
 using std::chrono::milliseconds;
 
-constexpr long kConnectionsPerHost = 6;
-constexpr long kIdleConnections = 12;
+constexpr long kConnectionsPerHost = 64;
+/// To a host, once a service has turned connections away.
+constexpr long kFewConnections = 6;
+constexpr long kIdleConnections = kConnectionsPerHost;
+/// Without a transfer for so long, connections are closed.
+constexpr std::chrono::seconds kIdleTime{5};
 /// While a transfer is under way; should libcurl forget one, it is found again after this time.
 constexpr milliseconds kLongestWait{1000};
 constexpr char kEnding[] = "the process is ending";
@@ -37,6 +41,8 @@ class CurlTransfers : public HTTPTransfers {
  private:
   using ExchangeRef = std::unique_ptr<Exchange>;
 
+  /// Null when memory is short.
+  static MultiHandle newMultiHandle();
   void run() noexcept;
   /// The exchanges handed over meanwhile, after a wait for one if none is under way; nothing at the end.
   std::optional<std::vector<ExchangeRef>> nextExchanges();
@@ -44,11 +50,12 @@ class CurlTransfers : public HTTPTransfers {
   /// Moves everything as far as it goes, then waits until there is more to do.
   void step();
   void collectFinished();
+  bool yields(Exchange& exchange, CURLcode code);
   void expire();
   ExchangeRef take(Exchange& exchange);
   void failAll(CURLcode code, const char* text);
 
-  const MultiHandle multi_;
+  MultiHandle multi_ = newMultiHandle();  ///< replaced by the thread, with the mutex held
 
   std::mutex mutex_;  ///< guards what follows
   std::condition_variable changed_;
@@ -62,11 +69,17 @@ class CurlTransfers : public HTTPTransfers {
   std::thread thread_;
 };
 
-CurlTransfers::CurlTransfers() : multi_(curl_multi_init()) {
+MultiHandle CurlTransfers::newMultiHandle() {
+  MultiHandle multi(curl_multi_init());
+  if (!multi) return nullptr;
+  curl_multi_setopt(multi.get(), CURLMOPT_MAX_HOST_CONNECTIONS, kConnectionsPerHost);
+  curl_multi_setopt(multi.get(), CURLMOPT_MAXCONNECTS, kIdleConnections);
+  curl_multi_setopt(multi.get(), CURLMOPT_PIPELINING, static_cast<long>(CURLPIPE_NOTHING));
+  return multi;
+}
+
+CurlTransfers::CurlTransfers() {
   if (!multi_) throw std::bad_alloc();
-  curl_multi_setopt(multi_.get(), CURLMOPT_MAX_HOST_CONNECTIONS, kConnectionsPerHost);
-  curl_multi_setopt(multi_.get(), CURLMOPT_MAXCONNECTS, kIdleConnections);
-  curl_multi_setopt(multi_.get(), CURLMOPT_PIPELINING, static_cast<long>(CURLPIPE_NOTHING));
   // The thread, and those it starts to resolve names, inherit the mask: signals are for the main thread, and
   // a connection that breaks raises none.
   sigset_t all;
@@ -95,16 +108,14 @@ void CurlTransfers::start(HTTPRequest request, Done done) {
     return exchange->fail(CURLE_ABORTED_BY_CALLBACK, kEnding);
   }
   incoming_.push_back(std::move(exchange));
+  curl_multi_wakeup(multi_.get());
   lock.unlock();
   changed_.notify_one();
-  curl_multi_wakeup(multi_.get());
 }
 
 void CurlTransfers::beginEnding() {
-  {
-    const std::lock_guard lock(mutex_);
-    ending_ = true;
-  }
+  const std::lock_guard lock(mutex_);
+  ending_ = true;
   changed_.notify_one();
   curl_multi_wakeup(multi_.get());
 }
@@ -127,7 +138,12 @@ void CurlTransfers::run() noexcept {
 
 std::optional<std::vector<CurlTransfers::ExchangeRef>> CurlTransfers::nextExchanges() {
   std::unique_lock lock(mutex_);
-  if (underWay_.empty()) changed_.wait(lock, [this] { return ending_ || !incoming_.empty(); });
+  const auto isCalled = [this] { return ending_ || !incoming_.empty(); };
+  if (underWay_.empty() && !changed_.wait_for(lock, kIdleTime, isCalled)) {
+    // The connections are the handle's.
+    if (auto fresh = newMultiHandle()) multi_ = std::move(fresh);
+    changed_.wait(lock, isCalled);
+  }
   if (ending_) return std::nullopt;
   return std::exchange(incoming_, {});
 }
@@ -177,8 +193,15 @@ void CurlTransfers::collectFinished() {
     char* finished = nullptr;
     curl_easy_getinfo(message->easy_handle, CURLINFO_PRIVATE, &finished);
     auto exchange = take(*reinterpret_cast<Exchange*>(finished));
-    if (exchange->goOn(code)) begin(std::move(exchange));
+    if (yields(*exchange, code) || exchange->goOn(code)) begin(std::move(exchange));
   }
+}
+
+/// When a service takes no more of many connections, the rest is left to fewer of them: until all is quiet.
+bool CurlTransfers::yields(Exchange& exchange, CURLcode code) {
+  if (!mayBeTurnedAway(code) || underWay_.size() < kFewConnections) return false;
+  curl_multi_setopt(multi_.get(), CURLMOPT_MAX_HOST_CONNECTIONS, kFewConnections);
+  return exchange.takeSecondTry(code);
 }
 
 void CurlTransfers::expire() {
