@@ -26,11 +26,17 @@ bool fails() { return ++allocations == failing; }
 
 extern "C" {
 void* __libc_malloc(std::size_t size);
+void* __libc_memalign(std::size_t alignment, std::size_t size);
 void* __libc_realloc(void* memory, std::size_t size);
 void __libc_free(void* memory);
 
 void* malloc(std::size_t size) noexcept {
   void* const memory = fails() ? nullptr : __libc_malloc(size);
+  if (memory != nullptr) ++held;
+  return memory;
+}
+void* aligned_alloc(std::size_t alignment, std::size_t size) noexcept {
+  void* const memory = fails() ? nullptr : __libc_memalign(alignment, size);
   if (memory != nullptr) ++held;
   return memory;
 }

@@ -5,7 +5,9 @@
 
 #include <algorithm>
 #include <bit>
-#include <limits>
+#include <memory_resource>
+#include <span>
+#include <string_view>
 #include <unordered_map>
 #include <vector>
 
@@ -66,10 +68,11 @@ class Writer {
 
  private:
   using Reference = std::uint32_t;
+  static constexpr std::size_t kFirstBlock = 16384;
 
   struct Object {
-    std::string bytes;                  ///< all of a leaf; of a container what comes before its references
-    std::vector<Reference> references;  ///< of a container
+    std::string_view bytes;           ///< all of a leaf; of a container what comes before its references
+    std::span<Reference> references;  ///< of a container
   };
 
   bool refuse(const char* problem) {
@@ -80,16 +83,20 @@ class Writer {
   // Each of them leaves the number of the object in `added_`.
   bool addValue(const Value& value);
   bool addString(const std::string& text);
-  void addLeaf(std::string bytes);
+  void addLeaf();
   bool addArray(const Value::Array& array);
   bool addDictionary(const Value::Dictionary& dictionary);
 
   /// Numbers a container before what is in it, so that the tree's root is the first object.
-  Reference addContainer(Kind kind, std::size_t count);
+  Object addContainer(Kind kind, std::size_t count, std::size_t references);
+  std::string_view kept(std::string_view bytes);
   std::string writeObjects() const;
 
+  /// Holds what the objects are views of, and the table of leaves, until all is written.
+  std::pmr::monotonic_buffer_resource memory_{kFirstBlock};
   std::vector<Object> objects_;
-  std::unordered_map<std::string, Reference> leaves_;
+  std::pmr::unordered_map<std::string_view, Reference> leaves_{&memory_};
+  std::string leaf_;  ///< the bytes of the one that is added
   Reference added_ = 0;
   std::size_t sharedBytes_ = 0;
   std::size_t depth_ = 0;
@@ -99,29 +106,29 @@ class Writer {
 
 bool Writer::addValue(const Value& value) {
   if (++values_ > kMaximumValues) return refuse("too many values");
-  std::string bytes;
+  leaf_.clear();
   switch (value.kind()) {
     case Value::Kind::Null:
-      appendMarker(bytes, Kind::Singleton, kNull);
+      appendMarker(leaf_, Kind::Singleton, kNull);
       break;
     case Value::Kind::Bool:
-      appendMarker(bytes, Kind::Singleton, value.boolean() ? kTrue : kFalse);
+      appendMarker(leaf_, Kind::Singleton, value.boolean() ? kTrue : kFalse);
       break;
     case Value::Kind::Int:
-      appendInteger(bytes, static_cast<std::uint64_t>(value.integer()));
+      appendInteger(leaf_, static_cast<std::uint64_t>(value.integer()));
       break;
     case Value::Kind::UInt:
-      appendLargeInteger(bytes, value.unsignedInteger());
+      appendLargeInteger(leaf_, value.unsignedInteger());
       break;
     case Value::Kind::Real:
-      appendReal(bytes, Kind::Real, value.real());
+      appendReal(leaf_, Kind::Real, value.real());
       break;
     case Value::Kind::Date:
-      appendReal(bytes, Kind::Date, value.date().secondsSince1970 - kReferenceDate);
+      appendReal(leaf_, Kind::Date, value.date().secondsSince1970 - kReferenceDate);
       break;
     case Value::Kind::Data:
-      appendLength(bytes, Kind::Data, value.data().size());
-      bytes.append(value.data().begin(), value.data().end());
+      appendLength(leaf_, Kind::Data, value.data().size());
+      leaf_.append(value.data().begin(), value.data().end());
       break;
     case Value::Kind::String:
       return addString(value.string());
@@ -130,55 +137,61 @@ bool Writer::addValue(const Value& value) {
     case Value::Kind::Dictionary:
       return addDictionary(value.dictionary());
   }
-  addLeaf(std::move(bytes));
+  addLeaf();
   return true;
 }
 
 bool Writer::addString(const std::string& text) {
-  std::string bytes;
+  leaf_.clear();
   if (std::all_of(text.begin(), text.end(), [](char c) { return static_cast<unsigned char>(c) < 0x80; })) {
-    appendLength(bytes, Kind::ASCIIString, text.size());
-    bytes += text;
+    appendLength(leaf_, Kind::ASCIIString, text.size());
+    leaf_ += text;
   } else {
     const auto units = utf16FromUTF8(text);
     if (!units) return refuse("text that is not UTF-8");
-    appendLength(bytes, Kind::UTF16String, units->size() / 2);
-    bytes += *units;
+    appendLength(leaf_, Kind::UTF16String, units->size() / 2);
+    leaf_ += *units;
   }
-  addLeaf(std::move(bytes));
+  addLeaf();
   return true;
 }
 
-void Writer::addLeaf(std::string bytes) {
-  const auto [leaf, isNew] = leaves_.try_emplace(bytes, static_cast<Reference>(objects_.size()));
-  if (!isNew && sharedBytes_ + bytes.size() <= kMaximumSharedBytes) {
-    sharedBytes_ += bytes.size();
-    added_ = leaf->second;
+void Writer::addLeaf() {
+  const auto equal = leaves_.find(leaf_);
+  if (equal != leaves_.end() && sharedBytes_ + leaf_.size() <= kMaximumSharedBytes) {
+    sharedBytes_ += leaf_.size();
+    added_ = equal->second;
     return;
   }
   added_ = static_cast<Reference>(objects_.size());
-  objects_.push_back({std::move(bytes), {}});
+  const auto bytes = kept(leaf_);
+  objects_.push_back({bytes, {}});
+  leaves_.try_emplace(bytes, added_);
 }
 
-Writer::Reference Writer::addContainer(Kind kind, std::size_t count) {
-  Object object;
-  appendLength(object.bytes, kind, count);
-  objects_.push_back(std::move(object));
-  return static_cast<Reference>(objects_.size() - 1);
+std::string_view Writer::kept(std::string_view bytes) {
+  auto* const copy = static_cast<char*>(memory_.allocate(bytes.size(), 1));
+  bytes.copy(copy, bytes.size());
+  return {copy, bytes.size()};
+}
+
+Writer::Object Writer::addContainer(Kind kind, std::size_t count, std::size_t references) {
+  leaf_.clear();
+  appendLength(leaf_, kind, count);
+  std::pmr::polymorphic_allocator<Reference> allocator(&memory_);
+  return objects_.emplace_back(Object{kept(leaf_), {allocator.allocate(references), references}});
 }
 
 bool Writer::addArray(const Value::Array& array) {
   if (depth_ == kMaximumDepth) return refuse("nested too deep");
   ++depth_;
-  const auto container = addContainer(Kind::Array, array.size());
-  std::vector<Reference> references;
-  references.reserve(array.size());
-  for (const auto& element : array) {
-    if (!addValue(element)) return false;
-    references.push_back(added_);
+  const auto number = static_cast<Reference>(objects_.size());
+  const auto references = addContainer(Kind::Array, array.size(), array.size()).references;
+  for (std::size_t i = 0; i < array.size(); ++i) {
+    if (!addValue(array[i])) return false;
+    references[i] = added_;
   }
-  objects_[container].references = std::move(references);
-  added_ = container;
+  added_ = number;
   --depth_;
   return true;
 }
@@ -186,19 +199,18 @@ bool Writer::addArray(const Value::Array& array) {
 bool Writer::addDictionary(const Value::Dictionary& dictionary) {
   if (depth_ == kMaximumDepth) return refuse("nested too deep");
   ++depth_;
-  const auto container = addContainer(Kind::Dictionary, dictionary.size());
-  std::vector<Reference> references;
-  references.reserve(2 * dictionary.size());
+  const auto number = static_cast<Reference>(objects_.size());
+  const auto references = addContainer(Kind::Dictionary, dictionary.size(), 2 * dictionary.size()).references;
+  auto next = references.begin();
   for (const auto& [key, element] : dictionary) {
     if (!addString(key)) return false;
-    references.push_back(added_);
+    *next++ = added_;
   }
   for (const auto& [key, element] : dictionary) {
     if (!addValue(element)) return false;
-    references.push_back(added_);
+    *next++ = added_;
   }
-  objects_[container].references = std::move(references);
-  added_ = container;
+  added_ = number;
   --depth_;
   return true;
 }

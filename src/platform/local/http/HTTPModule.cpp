@@ -66,6 +66,7 @@ class CurlTransfers : public HTTPTransfers {
   std::map<Exchange*, ExchangeRef> underWay_;
   std::set<std::pair<Clock::time_point, Exchange*>> deadlines_;
   bool hasChanged_ = false;  ///< since the last pass, some transfer began or ended
+  bool wereMany_ = false;    ///< under way at once, more than go over few connections: since all was quiet
   std::thread thread_;
 };
 
@@ -142,6 +143,7 @@ std::optional<std::vector<CurlTransfers::ExchangeRef>> CurlTransfers::nextExchan
   if (underWay_.empty() && !changed_.wait_for(lock, kIdleTime, isCalled)) {
     // The connections are the handle's.
     if (auto fresh = newMultiHandle()) multi_ = std::move(fresh);
+    wereMany_ = false;
     changed_.wait(lock, isCalled);
   }
   if (ending_) return std::nullopt;
@@ -154,6 +156,7 @@ void CurlTransfers::begin(ExchangeRef exchange) {
     started.prepare();
     deadlines_.emplace(started.deadline(), &started);
     underWay_.emplace(&started, std::move(exchange));
+    wereMany_ = wereMany_ || underWay_.size() > kFewConnections;
     hasChanged_ = true;
   } catch (const std::exception& error) {
     deadlines_.erase({started.deadline(), &started});
@@ -199,7 +202,7 @@ void CurlTransfers::collectFinished() {
 
 /// When a service takes no more of many connections, the rest is left to fewer of them: until all is quiet.
 bool CurlTransfers::yields(Exchange& exchange, CURLcode code) {
-  if (!mayBeTurnedAway(code) || underWay_.size() < kFewConnections) return false;
+  if (!mayBeTurnedAway(code) || !wereMany_) return false;
   curl_multi_setopt(multi_.get(), CURLMOPT_MAX_HOST_CONNECTIONS, kFewConnections);
   return exchange.takeSecondTry(code);
 }
