@@ -68,7 +68,7 @@ class Writer {
 
  private:
   using Reference = std::uint32_t;
-  static constexpr std::size_t kFirstBlock = 16384;
+  static constexpr std::size_t kFirstBlock = 16384;  ///< bytes: enough for the answer about one device
 
   struct Object {
     std::string_view bytes;           ///< all of a leaf; of a container what comes before its references
@@ -89,6 +89,7 @@ class Writer {
 
   /// Numbers a container before what is in it, so that the tree's root is the first object.
   Object addContainer(Kind kind, std::size_t count, std::size_t references);
+  /// A copy of the bytes in `memory_`.
   std::string_view kept(std::string_view bytes);
   std::string writeObjects() const;
 

@@ -314,6 +314,11 @@ TEST_F(OverHTTP, AServiceThatTurnsConnectionsAwayIsAskedOverFewer) {
   for (int i = 0; i < 50; ++i) replies.push_back(start(get(server.url())));
   for (auto& reply : replies) EXPECT_EQ(reply.get().status, 200);
   EXPECT_EQ(server.connections(), 50);
+  const ScriptedServer rude([](Peer& peer) { peer.request(); });
+  EXPECT_EQ(exchange(get(rude.url())).status, 0);
+  EXPECT_EQ(rude.connections(), 2);
+  EXPECT_EQ(exchange(post(rude.url(), "{}")).status, 0);
+  EXPECT_EQ(rude.connections(), 3);  // what was sent and may count is not sent again
 }
 
 TEST_F(OverHTTP, TheTimeSpentWaitingForAConnectionCounts) {
