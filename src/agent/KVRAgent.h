@@ -61,6 +61,8 @@ class KVRAgent : public KVRAgentProtocol, public std::enable_shared_from_this<KV
   AtomicProperty<std::shared_ptr<KVRAgentDeviceProvider>> deviceProvider;
 
  private:
+  std::pair<LookupDecision, KVRWarrantyRef> decide(std::uint64_t policy, KVRAgentWarrantyProvider& provider,
+                                                   const std::string& serialNumber);
   bool isCacheValid(KVRAgentWarrantyProvider& provider, const std::string& serialNumber,
                     const KVRWarrantyRef& cached);
   std::optional<double> secondsFresh(KVRAgentWarrantyProvider& provider, const std::string& serialNumber);

@@ -75,6 +75,27 @@ std::optional<double> KVRAgent::secondsFresh(KVRAgentWarrantyProvider& provider,
   return seconds;
 }
 
+/// What is made of the cache, from files as they are at one moment; and the warranty that may be answered
+/// when no download yields one.
+std::pair<LookupDecision, KVRWarrantyRef> KVRAgent::decide(std::uint64_t policy,
+                                                           KVRAgentWarrantyProvider& provider,
+                                                           const std::string& serialNumber) {
+  auto& log = platform_.log;
+  const PropertyListFiles::Look look(platform_.propertyLists);
+  const auto cached = provider.cachedWarrantyForSerialNumber(serialNumber);
+  const bool cacheValid = isCacheValid(provider, serialNumber, cached);
+  std::optional<double> fresh;
+  if (policy == LookupPolicy::kDefault) {
+    if (cacheValid) {
+      fresh = secondsFresh(provider, serialNumber);
+    } else {
+      log.standard("Default policy query: cached warranty is invalid, refresh it");
+    }
+  }
+  const auto decision = lookupDecision(policy, cacheValid, fresh);
+  return {decision, decision.cacheMayAnswer ? cached : nullptr};
+}
+
 void KVRAgent::getWarrantyUsingPolicy(std::uint64_t policy, const std::optional<std::string>& serialNumber,
                                       const WarrantyReply& withReply) {
   auto& log = platform_.log;
@@ -86,21 +107,10 @@ void KVRAgent::getWarrantyUsingPolicy(std::uint64_t policy, const std::optional<
   const auto provider = warrantyProvider();
   const auto& serial = *serialNumber;
   log.standard("getting warranty using policy %@: %lu", serial, policy);
-  const auto cached = provider->cachedWarrantyForSerialNumber(serial);
-  const bool cacheValid = isCacheValid(*provider, serial, cached);
-  std::optional<double> fresh;
-  if (policy == LookupPolicy::kDefault) {
-    if (cacheValid) {
-      fresh = secondsFresh(*provider, serial);
-    } else {
-      log.standard("Default policy query: cached warranty is invalid, refresh it");
-    }
-  }
-  const auto decision = lookupDecision(policy, cacheValid, fresh);
+  const auto [decision, fallback] = decide(policy, *provider, serial);
   log.standard("%s: shouldDownloadWarranty: %d", kOperation, decision.downloads);
 
-  const auto fallback = decision.cacheMayAnswer ? cached : nullptr;
-  const auto complete = [self = shared_from_this(), serial, fallback,
+  const auto complete = [self = shared_from_this(), serial, fallback = fallback,
                          withReply](const KVRWarrantyRef& downloaded) {
     self->platform_.log.standard("getWarrantyUsingPolicy completionBlock %{private}@ : %d", serial,
                                  downloaded != nullptr);

@@ -21,6 +21,7 @@ std::shared_ptr<KVRDevicesManager> KVRDevicesManager::sharedManager(Platform& pl
 }
 
 KVRDeviceRef KVRDevicesManager::defaultDevice() {
+  const PropertyListFiles::Look look(platform_.propertyLists);
   const auto serialNumber = localSerialNumber();
   return KVRDevice::deviceWithName(
       platform_.deviceProperties.answer(DeviceProperties::kUserAssignedDeviceName), serialNumber,

@@ -235,11 +235,11 @@ void FileActivityScheduler::end(const std::string& identifier, std::uint64_t num
 /// Without the mutex: a damaged file is set aside under the file's lock, and writing takes that one first.
 void FileActivityScheduler::load() {
   std::call_once(loaded_, [this] {
-    const bool isThere = lists_.files().stamp(path_).has_value();
+    const auto stamp = lists_.files().stamp(path_);
     const auto tree = lists_.read(path_, kDictionary, kSetAside, ActivityTable::complaintAbout);
     const std::lock_guard lock(mutex_);
     unreadable_ = !tree;
-    registrationsLost_ = unreadable_ || (isThere && tree->isNull());
+    registrationsLost_ = unreadable_ || (stamp && *stamp && tree->isNull());
     if (tree) table_.adopt(*tree);
   });
 }
@@ -256,7 +256,7 @@ void FileActivityScheduler::save() {
 /// With the file to itself; whether registrations have come to light that could not be read before.
 bool FileActivityScheduler::write() {
   bool adopted = false;
-  const auto fileLock = lists_.files().lock(directory_);
+  const auto fileLock = lists_.lock(directory_);
   Value tree;
   {
     const std::lock_guard lock(mutex_);

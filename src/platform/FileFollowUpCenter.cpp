@@ -168,7 +168,7 @@ class FileFollowUpCenter::Client : public FollowUpCenterClient {
     // A change of nothing, such as clearing what is not there, needs no lock.
     auto changed = changedBy(apply);
     if (changed && changed->isNull()) return std::nullopt;
-    const auto lock = lists_.files().lock(directory_);
+    const auto lock = lists_.lock(directory_);
     changed = changedBy(apply);
     if (!changed) return changed.error();
     if (changed->isNull()) return std::nullopt;

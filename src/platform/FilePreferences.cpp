@@ -58,7 +58,7 @@ void FilePreferences::setObject(const Value& value, std::string_view key) {
 }
 
 void FilePreferences::setObjects(const Value::Dictionary& values) {
-  const auto lock = lists_.files().lock(directory_);
+  const auto lock = lists_.lock(directory_);
   const auto stored = lists_.read(standardPath_, kDictionary, kSetAside);
   if (!stored) {
     reportUnchanged(keysOf(values), stored.error());
@@ -90,7 +90,7 @@ std::vector<std::string> FilePreferences::allKeys() const {
 }
 
 void FilePreferences::update(std::string_view key, const std::function<Value(const Value&)>& change) {
-  const auto lock = lists_.files().lock(directory_);
+  const auto lock = lists_.lock(directory_);
   const auto stored = lists_.read(standardPath_, kDictionary, kSetAside);
   if (!stored) {
     reportUnchanged(key, stored.error());

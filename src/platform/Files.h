@@ -46,8 +46,8 @@ class Files {
   virtual std::string homeDirectory() const = 0;
   /// The whole content; nothing when there is no such file. More than `limit` bytes is an error.
   virtual Result<std::optional<FileContents>> read(const std::string& path, std::size_t limit) = 0;
-  /// The stamp of the file as it is now; nothing when it is missing or cannot be reached.
-  virtual std::optional<FileStamp> stamp(const std::string& path) = 0;
+  /// The stamp of the file as it is now; nothing when there is no such file.
+  virtual Result<std::optional<FileStamp>> stamp(const std::string& path) = 0;
   /// Puts a new content in a file's place, atomically and durably, mode 0600. On failure the old file stays
   /// and nothing else is left behind.
   virtual std::optional<Error> replace(const std::string& path, const std::string& bytes) = 0;

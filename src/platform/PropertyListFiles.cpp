@@ -49,13 +49,23 @@ std::string compactTime(Date date) {
 
 }  // namespace
 
+thread_local PropertyListFiles::Look* PropertyListFiles::Look::current = nullptr;
+
+PropertyListFiles::Look::Look(const PropertyListFiles& lists) : lists_(lists) {
+  if (current == nullptr) current = this;
+}
+
+PropertyListFiles::Look::~Look() {
+  if (current == this) current = nullptr;
+}
+
 PropertyListFiles::PropertyListFiles(Files& files, const Clock& clock, Log& log)
     : files_(files), clock_(clock), log_(log) {}
 
 Result<Value> PropertyListFiles::read(const std::string& path, Expected expected, WhenDamaged whenDamaged,
                                       const Complaint& complaintOfReader) {
   for (int attempt = 0; attempt < kAttempts; ++attempt) {
-    const auto parsed = parse(path);
+    const auto parsed = attempt == 0 ? parseOnce(path) : parse(path);
     if (!parsed) return reportUnreadable(path, parsed.error());
     if (!*parsed) {
       forget(path);
@@ -91,10 +101,27 @@ std::optional<Error> PropertyListFiles::write(const std::string& path, const Val
   return std::nullopt;
 }
 
+std::unique_ptr<FileLock> PropertyListFiles::lock(const std::string& directory) {
+  Look::current = nullptr;
+  return files_.lock(directory);
+}
+
+/// The file as it is now, or as this thread saw it before at the same look.
+Result<std::optional<PropertyListFiles::Parsed>> PropertyListFiles::parseOnce(const std::string& path) {
+  auto* const look = Look::current;
+  if (look == nullptr || &look->lists_ != this) return parse(path);
+  const auto seen = look->seen_.find(path);
+  if (seen != look->seen_.end()) return seen->second;
+  auto parsed = parse(path);
+  if (parsed) look->seen_.emplace(path, *parsed);
+  return parsed;
+}
+
 /// The file as it is now, or nothing when there is none.
 Result<std::optional<PropertyListFiles::Parsed>> PropertyListFiles::parse(const std::string& path) {
   if (const auto stamp = files_.stamp(path)) {
-    if (auto parsed = remembered(path, *stamp)) return parsed;
+    if (!*stamp) return std::optional<Parsed>();
+    if (auto parsed = remembered(path, **stamp)) return parsed;
   }
   const auto contents = files_.read(path, kLimit);
   if (!contents) {
@@ -148,7 +175,7 @@ std::optional<Result<Value>> PropertyListFiles::setAside(const std::string& path
                                                          const FileStamp& stamp) {
   const auto lock = files_.lock(directoryOf(path));
   const auto now = files_.stamp(path);
-  if (!now || !sameContent(*now, stamp)) return std::nullopt;
+  if (!now || !*now || !sameContent(**now, stamp)) return std::nullopt;
   const std::string base = path + ".damaged-" + compactTime(clock_.now());
   std::string name = base;
   std::optional<Error> error = files_.renameToUnused(path, name);

@@ -43,7 +43,12 @@ class PropertyListFiles {
   /// Replaces the file, creating its directory as needed. On failure the old file stays.
   std::optional<Error> write(const std::string& path, const Value& tree, PropertyListEncoding encoding);
 
+  /// As `Files::lock`, for a change that depends on what is read under it.
+  std::unique_ptr<FileLock> lock(const std::string& directory);
+
   Files& files() { return files_; }
+
+  class Look;
 
  private:
   /// What was made of a file: its tree, or why it is no property list.
@@ -61,6 +66,7 @@ class PropertyListFiles {
   };
 
   Result<std::optional<Parsed>> parse(const std::string& path);
+  Result<std::optional<Parsed>> parseOnce(const std::string& path);
   std::optional<Parsed> remembered(const std::string& path, const FileStamp& stamp);
   void remember(const std::string& path, const Parsed& parsed);
   void forget(const std::string& path);
@@ -78,6 +84,26 @@ class PropertyListFiles {
   std::list<std::string> byAge_;  ///< paths of `remembered_`, the longest unused first
   std::uint64_t rememberedBytes_ = 0;
   std::map<std::string, Report> reported_;  ///< the last complaint about each file that is not sound
+};
+
+/// Makes what its thread reads be of one moment, for facts that are weighed together: a file that was read
+/// once is not looked at again, and later readings give what the first one found. It ends with its scope, or
+/// when its thread takes a lock to change something. To be held while nothing is waited for; within another
+/// one it does nothing.
+class PropertyListFiles::Look {
+ public:
+  explicit Look(const PropertyListFiles& lists);
+  ~Look();
+  Look(const Look&) = delete;
+  Look& operator=(const Look&) = delete;
+
+ private:
+  friend class PropertyListFiles;
+
+  static thread_local Look* current;  ///< the one that counts on this thread
+
+  const PropertyListFiles& lists_;
+  std::map<std::string, std::optional<Parsed>> seen_;
 };
 
 }  // namespace kvr

@@ -55,13 +55,14 @@ class OldFiles : public LocalFiles {
  public:
   using LocalFiles::LocalFiles;
 
-  std::optional<FileStamp> stamp(const std::string& path) override {
-    if (!LocalFiles::stamp(path)) return std::nullopt;
+  Result<std::optional<FileStamp>> stamp(const std::string& path) override {
+    const auto found = LocalFiles::stamp(path);
+    if (!found || !*found) return found;
     const auto content = contentOfFile(path);
     FileStamp stamp;
     stamp.size = std::hash<std::string>()(*content);
     stamp.settled = true;
-    return stamp;
+    return std::optional(stamp);
   }
   Result<std::optional<FileContents>> read(const std::string& path, std::size_t limit) override {
     if (path.find("/Keys/") != std::string::npos) ++readings;

@@ -28,7 +28,7 @@ class APreference : public InBothWorlds {
     return bytes ? *readPropertyList(*bytes) : Value();
   }
   /// A new one at every writing.
-  std::uint64_t inodeOfDomain() { return world.files().stamp(pathOf(kDomain)).value_or(FileStamp{}).inode; }
+  std::uint64_t inodeOfDomain() { return (*world.files().stamp(pathOf(kDomain))).value_or(FileStamp{}).inode; }
   void put(const std::string& domain, const Value& tree) {
     world.put(pathOf(domain), *writePropertyList(tree, PropertyListEncoding::XML));
   }

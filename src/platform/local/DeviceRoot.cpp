@@ -42,8 +42,9 @@ std::optional<std::string> distrustOf(const std::string& path) {
 bool isSameFile(const std::string& given, const std::string& resolved) {
   struct stat one {};
   struct stat other {};
-  return ::stat(given.c_str(), &one) == 0 && ::lstat(resolved.c_str(), &other) == 0 &&
-         one.st_dev == other.st_dev && one.st_ino == other.st_ino;
+  if (::lstat(resolved.c_str(), &other) != 0 || S_ISLNK(other.st_mode)) return false;
+  if (given == resolved) return true;
+  return ::stat(given.c_str(), &one) == 0 && one.st_dev == other.st_dev && one.st_ino == other.st_ino;
 }
 
 }  // namespace

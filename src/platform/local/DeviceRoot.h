@@ -31,7 +31,10 @@ class DeviceRoot {
 
   std::string pathOf(std::string_view file) const { return directory_ + "/" + std::string(file); }
   /// The stamp of a file as it is now, or nothing when it cannot be had.
-  std::optional<FileStamp> stamp(std::string_view file) const { return lists_.files().stamp(pathOf(file)); }
+  std::optional<FileStamp> stamp(std::string_view file) const {
+    const auto stamp = lists_.files().stamp(pathOf(file));
+    return stamp ? *stamp : std::nullopt;
+  }
   PropertyListFiles& lists() const { return lists_; }
 
  private:

@@ -39,6 +39,16 @@ std::optional<Error> objectionTo(const std::string& path) {
   return Error{"files", EINVAL, "not an absolute path: " + path.substr(0, path.find('\0'))};
 }
 
+/// Only regular files are read or replaced.
+std::optional<Error> objectionToKind(const struct stat& status, const std::string& path) {
+  if (S_ISREG(status.st_mode)) return std::nullopt;
+  return S_ISDIR(status.st_mode) ? failure(EISDIR, path)
+                                 : Error{"files", EINVAL, path + ": not a regular file"};
+}
+
+/// Whether a failed look at a path says that there is no such file.
+bool isMissing(int code) { return code == ENOENT || code == ENOTDIR; }
+
 std::string directoryOf(const std::string& path) {
   const auto slash = path.rfind('/');
   return slash == 0 ? "/" : path.substr(0, slash);
@@ -150,9 +160,7 @@ std::optional<Error> objectionToReplacing(const std::string& path) {
   if (::stat(path.c_str(), &status) != 0) {
     return errno == ENOENT ? std::nullopt : std::optional(failure(path));
   }
-  if (S_ISREG(status.st_mode)) return std::nullopt;
-  return S_ISDIR(status.st_mode) ? failure(EISDIR, path)
-                                 : Error{"files", EINVAL, path + ": not a regular file"};
+  return objectionToKind(status, path);
 }
 
 class Replacement : public ReplaceSteps {
@@ -229,14 +237,13 @@ Result<std::optional<FileContents>> LocalFiles::read(const std::string& path, st
   if (auto error = objectionTo(path)) return *std::move(error);
   const auto descriptor = openExisting(path, O_RDONLY);
   if (!descriptor) {
-    if (errno == ENOENT || errno == ENOTDIR) return std::optional<FileContents>();
+    if (isMissing(errno)) return std::optional<FileContents>();
     return failure(path);
   }
   const auto asked = fileTimeNow();
   struct stat before {};
   if (::fstat(descriptor.get(), &before) != 0) return failure(path);
-  if (S_ISDIR(before.st_mode)) return failure(EISDIR, path);
-  if (!S_ISREG(before.st_mode)) return Error{"files", EINVAL, path + ": not a regular file"};
+  if (auto error = objectionToKind(before, path)) return *std::move(error);
   const auto size = static_cast<std::uint64_t>(before.st_size);
   if (size > limit) return failure(EFBIG, path);
   FileContents contents{{}, stampOf(before, asked)};
@@ -252,13 +259,16 @@ Result<std::optional<FileContents>> LocalFiles::read(const std::string& path, st
   return std::optional(std::move(contents));
 }
 
-std::optional<FileStamp> LocalFiles::stamp(const std::string& path) {
+Result<std::optional<FileStamp>> LocalFiles::stamp(const std::string& path) {
+  if (auto error = objectionTo(path)) return *std::move(error);
   const auto asked = fileTimeNow();
   struct stat status {};
-  if (objectionTo(path) || ::stat(path.c_str(), &status) != 0 || !S_ISREG(status.st_mode)) {
-    return std::nullopt;
+  if (::stat(path.c_str(), &status) != 0) {
+    if (isMissing(errno)) return std::optional<FileStamp>();
+    return failure(path);
   }
-  return stampOf(status, asked);
+  if (auto error = objectionToKind(status, path)) return *std::move(error);
+  return std::optional(stampOf(status, asked));
 }
 
 std::optional<Error> LocalFiles::replace(const std::string& path, const std::string& bytes) {

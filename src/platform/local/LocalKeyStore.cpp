@@ -95,8 +95,8 @@ std::optional<std::vector<FileStamp>> LocalKeyStore::stampsOf(const std::string&
   for (const auto& pair : {directory + "/authority", base}) {
     for (const auto& path : {keyPath(pair), certificatePath(pair)}) {
       const auto stamp = files_.stamp(path);
-      if (!stamp || !stamp->settled) return std::nullopt;
-      stamps.push_back(*stamp);
+      if (!stamp || !*stamp || !(*stamp)->settled) return std::nullopt;
+      stamps.push_back(**stamp);
     }
   }
   return stamps;
@@ -196,7 +196,8 @@ Result<std::optional<std::string>> LocalKeyStore::contentOf(const std::string& p
 }
 
 void LocalKeyStore::reportDamage(const std::string& path, const char* what) {
-  const auto stamp = files_.stamp(path);
+  const auto found = files_.stamp(path);
+  const auto stamp = found ? *found : std::nullopt;
   {
     const std::lock_guard lock(mutex_);
     auto& reported = reported_[path];

@@ -66,13 +66,14 @@ Result<std::optional<FileContents>> SimulatedFiles::read(const std::string& path
   return std::optional(FileContents{found->second.bytes, found->second.stamp});
 }
 
-std::optional<FileStamp> SimulatedFiles::stamp(const std::string& path) {
+Result<std::optional<FileStamp>> SimulatedFiles::stamp(const std::string& path) {
   const std::lock_guard lock(mutex_);
   // A file that cannot be read must not be taken for an unchanged one.
-  if (readFaults_.of(path)) return std::nullopt;
+  if (auto fault = readFaults_.of(path)) return *std::move(fault);
+  if (directories_.contains(path)) return failure(EISDIR, path);
   const auto found = files_.find(path);
-  if (found == files_.end()) return std::nullopt;
-  return found->second.stamp;
+  if (found == files_.end()) return std::optional<FileStamp>();
+  return std::optional(found->second.stamp);
 }
 
 class SimulatedFiles::Replacement : public ReplaceSteps {

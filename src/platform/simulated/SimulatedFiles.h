@@ -26,7 +26,7 @@ class SimulatedFiles : public Files {
 
   std::string homeDirectory() const override { return kHomeDirectory; }
   Result<std::optional<FileContents>> read(const std::string& path, std::size_t limit) override;
-  std::optional<FileStamp> stamp(const std::string& path) override;
+  Result<std::optional<FileStamp>> stamp(const std::string& path) override;
   std::optional<Error> replace(const std::string& path, const std::string& bytes) override;
   std::optional<Error> createDirectory(const std::string& path) override;
   std::optional<Error> remove(const std::string& path) override;
