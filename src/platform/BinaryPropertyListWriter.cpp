@@ -158,16 +158,15 @@ bool Writer::addString(const std::string& text) {
 }
 
 void Writer::addLeaf() {
-  const auto equal = leaves_.find(leaf_);
-  if (equal != leaves_.end() && sharedBytes_ + leaf_.size() <= kMaximumSharedBytes) {
-    sharedBytes_ += leaf_.size();
+  const auto bytes = kept(leaf_);
+  added_ = static_cast<Reference>(objects_.size());
+  const auto [equal, isNew] = leaves_.try_emplace(bytes, added_);
+  if (!isNew && sharedBytes_ + bytes.size() <= kMaximumSharedBytes) {
+    sharedBytes_ += bytes.size();
     added_ = equal->second;
     return;
   }
-  added_ = static_cast<Reference>(objects_.size());
-  const auto bytes = kept(leaf_);
   objects_.push_back({bytes, {}});
-  leaves_.try_emplace(bytes, added_);
 }
 
 std::string_view Writer::kept(std::string_view bytes) {

@@ -58,9 +58,9 @@ void TreeBuilder::place(Value&& value) {
     container.array.push_back(std::move(value));
     return;
   }
-  // Keys mostly come sorted, as every writer here leaves them.
-  container.dictionary.insert_or_assign(container.dictionary.end(), *std::move(container.key),
-                                        std::move(value));
+  // Keys mostly come sorted, as every writer here leaves them; of equal ones the last counts.
+  auto& dictionary = container.dictionary;
+  dictionary.emplace_hint(dictionary.end(), *std::move(container.key), Value())->second = std::move(value);
   container.key.reset();
 }
 

@@ -18,7 +18,7 @@ namespace kvr {
 class TreeBuilder {
  public:
   /// The tree may hold so many values, containers included.
-  explicit TreeBuilder(std::size_t maximumValues) : maximumValues_(maximumValues) { open_.reserve(16); }
+  explicit TreeBuilder(std::size_t maximumValues) : maximumValues_(maximumValues) { open_.reserve(8); }
 
   bool openArray() { return open(false); }
   bool openDictionary() { return open(true); }
