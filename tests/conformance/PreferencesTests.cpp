@@ -28,7 +28,9 @@ class APreference : public InBothWorlds {
     return bytes ? *readPropertyList(*bytes) : Value();
   }
   /// A new one at every writing.
-  std::uint64_t inodeOfDomain() { return (*world.files().stamp(pathOf(kDomain))).value_or(FileStamp{}).inode; }
+  std::uint64_t inodeOfDomain() {
+    return (*world.files().stamp(pathOf(kDomain))).value_or(FileStamp{}).inode;
+  }
   void put(const std::string& domain, const Value& tree) {
     world.put(pathOf(domain), *writePropertyList(tree, PropertyListEncoding::XML));
   }
@@ -74,6 +76,23 @@ TEST_P(APreference, KeepsEveryKindOfValueAndSeesChangesFromOutside) {
   EXPECT_EQ(stored(), Value(Dictionary{{"key", 2}, {"other", 1}}));
   preferences.setObjects({{"key", 3}, {"more", 4}});
   EXPECT_EQ(stored(), Value(Dictionary{{"key", 3}, {"more", 4}, {"other", 1}}));
+}
+
+TEST_P(APreference, IsReadOnceAtOneLookWhichAChangeEnds) {
+  put(kDomain, Dictionary{{"a", 1}});
+  const PropertyListFiles::Look look(process.lists);
+  const auto both = [this] {
+    const PropertyListFiles::Look inner(process.lists);
+    return std::pair(preferences.integerForKey("a"), preferences.objectForKey("b", "com.tarsil.Widgetry"));
+  };
+  EXPECT_EQ(both(), std::pair(std::int64_t{1}, Value()));
+  put(kDomain, Dictionary{{"a", 2}, {"c", 3}});
+  put("com.tarsil.Widgetry", Dictionary{{"b", 4}});
+  EXPECT_EQ(both(), std::pair(std::int64_t{1}, Value()));
+  std::thread([&] { EXPECT_EQ(both(), std::pair(std::int64_t{2}, Value(4))); }).join();
+  preferences.update("a", [](const Value& a) { return Value(a.asInteger() + 10); });
+  EXPECT_EQ(stored(), Value(Dictionary{{"a", 12}, {"c", 3}}));
+  EXPECT_EQ(both(), std::pair(std::int64_t{12}, Value(4)));
 }
 
 TEST_P(APreference, IsWrittenOnlyWhenItChanges) {
