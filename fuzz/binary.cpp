@@ -1,4 +1,8 @@
 #include "Fuzz.h"
 #include "platform/BinaryPropertyList.h"
 
-void kvr::fuzz::run(std::string_view input) { readAndWriteBack(input, readBinaryPropertyList); }
+#include <cstdint>
+
+void kvr::fuzz::run(std::string_view input) {
+  readAndWriteBack(input, [](std::string_view bytes) { return readBinaryPropertyList(bytes, SIZE_MAX); });
+}

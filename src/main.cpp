@@ -55,7 +55,12 @@ void finish(kvr::LocalPlatform& local) {
 int run() {
   blockSignals();
   kvr::EventLoop loop;
-  kvr::LocalPlatform local(loop, [&loop] { loop.exit(EXIT_FAILURE); });
+  kvr::LocalPlatform local(loop, [&loop, &local] {
+    loop.post([&loop, &local] {
+      local.beginEnding();
+      loop.exit(EXIT_FAILURE);
+    });
+  });
   Ending ending{loop, local};
   ending.handleSignals();
   int status = EXIT_FAILURE;

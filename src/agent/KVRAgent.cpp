@@ -129,8 +129,13 @@ void KVRAgent::getDefaultDeviceInfoUsingPolicy(std::uint64_t policy, DeviceInfoR
                       const KVRDeviceInfoRef info = KVRDeviceInfo::deviceInfoWithDevice(device, warranty);
                       self->platform_.log.standard("getDefaultDeviceInfoUsingPolicy for device: '%@'", info);
                       withReply(info);
-                      self->warrantyProvider()->refreshFollowupWithDeviceInfo(info);
+                      self->refreshFollowUp(info);
                     }));
+}
+
+/// A look-up that failed because the process is ending says nothing about an offer: what is shown stays.
+void KVRAgent::refreshFollowUp(const KVRDeviceInfoRef& info) {
+  if (!platform_.cleanExit.isEnding()) warrantyProvider()->refreshFollowupWithDeviceInfo(info);
 }
 
 std::string KVRAgent::mappedSerialNumber(const std::string& serialNumber) {
@@ -171,7 +176,7 @@ void KVRAgent::getDeviceInfoForSerialNumber(const std::string& serialNumber, std
                           KVRDeviceInfo::deviceInfoWithDevice(self->deviceFor(mapped), warranty);
                       self->platform_.log.standard("getDeviceInfoForSerialNumber for device: '%@'", info);
                       withReply(info);
-                      self->warrantyProvider()->refreshFollowupWithDeviceInfo(info);
+                      self->refreshFollowUp(info);
                     }));
 }
 
@@ -202,7 +207,9 @@ void KVRAgent::getAllDeviceInfosUsingPolicy(std::uint64_t policy, bool updateFol
       list = results->list;
     }
     self->platform_.log.standard("getAllDeviceInfosUsingPolicy: '%@'", list);
-    if (updateFollowUps) self->warrantyProvider()->refreshFollowupWithDeviceInfos(list);
+    if (updateFollowUps && !self->platform_.cleanExit.isEnding()) {
+      self->warrantyProvider()->refreshFollowupWithDeviceInfos(list);
+    }
     withReply(std::move(list));
   });
 }

@@ -61,6 +61,7 @@ class KVRAgent : public KVRAgentProtocol, public std::enable_shared_from_this<KV
   AtomicProperty<std::shared_ptr<KVRAgentDeviceProvider>> deviceProvider;
 
  private:
+  void refreshFollowUp(const KVRDeviceInfoRef& info);
   std::pair<LookupDecision, KVRWarrantyRef> decide(std::uint64_t policy, KVRAgentWarrantyProvider& provider,
                                                    const std::string& serialNumber);
   bool isCacheValid(KVRAgentWarrantyProvider& provider, const std::string& serialNumber,

@@ -16,7 +16,7 @@ std::shared_ptr<KVRLocaleMonitor> KVRLocaleMonitor::initWithAgent(Platform& plat
 }
 
 KVRLocaleMonitor::KVRLocaleMonitor(Platform& platform, std::shared_ptr<KVRAgentProtocol> theAgent)
-    : agent(std::move(theAgent)), platform_(platform) {}
+    : agent(std::move(theAgent)), platform_(platform), refreshes_(platform.queues.mainQueue()) {}
 
 KVRLocaleMonitor::~KVRLocaleMonitor() { platform_.notifications.cancel(_languageNotifyToken); }
 
@@ -31,14 +31,19 @@ void KVRLocaleMonitor::start() {
 
 void KVRLocaleMonitor::localeDidChange() {
   if (KVRFollowUp(platform_).pendingFollowUpCount() == 0) return platform_.cleanExit.requestWhenIdle();
+  const auto turn = refreshes_.begin([monitor = weak_from_this()] {
+    if (const auto self = monitor.lock()) self->localeDidChange();
+  });
+  if (!turn) return;
   platform_.log.standard(
       "Locale changed and one or more followups are being displayed. Refresh warranty if needed.");
   agent()->getAllDeviceInfosUsingPolicy(
       LookupPolicy::kDefault, true,
-      DeviceInfosReply(platform_.log, "localeDidChange", [&platform = platform_](const KVRDeviceInfoList&) {
-        platform.log.standard("Device infos refreshed after locale change");
-        platform.cleanExit.requestWhenIdle();
-      }));
+      DeviceInfosReply(platform_.log, "localeDidChange",
+                       [&platform = platform_, turn](const KVRDeviceInfoList&) {
+                         platform.log.standard("Device infos refreshed after locale change");
+                         platform.cleanExit.requestWhenIdle();
+                       }));
 }
 
 }  // namespace kvr

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "agent/KVRAgentProtocol.h"
+#include "devices/RefreshLimit.h"
 #include "platform/AtomicProperty.h"
 #include "platform/Platform.h"
 
@@ -10,7 +11,8 @@ namespace kvr {
 
 /// Keeps the texts of follow-ups in the user's language: 5 seconds after every change of it, the warranties
 /// are looked up anew while a follow-up is shown. Then, or when none is, the process may end once it is idle,
-/// so that its next start is in the new language altogether. Every notification counts for itself.
+/// so that its next start is in the new language altogether. Every notification counts for itself, unless too
+/// many look-ups are under way already.
 class KVRLocaleMonitor : public std::enable_shared_from_this<KVRLocaleMonitor> {
  public:
   static std::shared_ptr<KVRLocaleMonitor> initWithAgent(Platform& platform,
@@ -30,6 +32,7 @@ class KVRLocaleMonitor : public std::enable_shared_from_this<KVRLocaleMonitor> {
 
  private:
   Platform& platform_;
+  RefreshLimit refreshes_;
   Notifications::Token _languageNotifyToken = 0;
 };
 

@@ -13,7 +13,7 @@ std::shared_ptr<KVRPairedDevicesMonitor> KVRPairedDevicesMonitor::initWithAgent(
 
 KVRPairedDevicesMonitor::KVRPairedDevicesMonitor(Platform& platform,
                                                  std::shared_ptr<KVRAgentProtocol> theAgent)
-    : agent(std::move(theAgent)), platform_(platform) {}
+    : agent(std::move(theAgent)), platform_(platform), refreshes_(platform.queues.mainQueue()) {}
 
 KVRPairedDevicesMonitor::~KVRPairedDevicesMonitor() {
   for (const auto token : {pairNotifyToken.load(), unpairNotifyToken.load()}) {
@@ -33,10 +33,12 @@ void KVRPairedDevicesMonitor::_pairedOrActiveDevicesDidChange() {
 }
 
 void KVRPairedDevicesMonitor::_updatePariedDevicesFollowUp() {
+  const auto turn = refreshes_.begin([self = shared_from_this()] { self->_updatePariedDevicesFollowUp(); });
+  if (!turn) return;
   agent()->getAllDeviceInfosUsingPolicy(
       LookupPolicy::kDefault, true,
       DeviceInfosReply(platform_.log, "_updatePariedDevicesFollowUp",
-                       [self = shared_from_this()](const KVRDeviceInfoList& deviceInfos) {
+                       [self = shared_from_this(), turn](const KVRDeviceInfoList& deviceInfos) {
                          self->platform_.log.standard(
                              "Devices followups to be posted, if required, after paired device change");
                          self->schedulePost(deviceInfos);

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "agent/KVRAgentProtocol.h"
+#include "devices/RefreshLimit.h"
 #include "platform/AtomicProperty.h"
 #include "platform/Platform.h"
 
@@ -11,7 +12,8 @@ namespace kvr {
 
 /// Keeps the follow-ups in step with the watches that are paired: whenever one is paired or unpaired, all
 /// devices are looked up and their follow-ups refreshed, and the follow-up post activity is scheduled when
-/// one of them is waiting for its follow-up. Every notification counts for itself.
+/// one of them is waiting for its follow-up. Every notification counts for itself, unless too many look-ups
+/// are under way already.
 ///
 /// Its registrations keep it alive until they are let go.
 class KVRPairedDevicesMonitor : public std::enable_shared_from_this<KVRPairedDevicesMonitor> {
@@ -38,6 +40,7 @@ class KVRPairedDevicesMonitor : public std::enable_shared_from_this<KVRPairedDev
   void schedulePost(const KVRDeviceInfoList& deviceInfos);
 
   Platform& platform_;
+  RefreshLimit refreshes_;
 };
 
 }  // namespace kvr

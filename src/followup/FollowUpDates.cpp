@@ -66,9 +66,14 @@ std::optional<Date> nextRefreshDate(const std::vector<FollowUpDateFacts>& device
   return next;
 }
 
-Date followingPostDate(Date next, Date now, double day) {
+Date followingPostDate(Date next, const std::vector<FollowUpDateFacts>& devices, Date now, double day) {
   if (next > now) return next;
-  return now + std::max(std::isfinite(day) ? day : 0, kLeastInterval);
+  const Date later = now + std::max(std::isfinite(day) ? day : 0, kLeastInterval);
+  auto offered = devices;
+  std::erase_if(offered, [now](const FollowUpDateFacts& device) {
+    return device.offer.eligibleUntil && *device.offer.eligibleUntil <= now;
+  });
+  return std::min(nextPostDate(offered, now).value_or(later), later);
 }
 
 Date followingRefreshDate(Date next, Date now) {

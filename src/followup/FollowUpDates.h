@@ -25,8 +25,9 @@ std::optional<Date> nextRefreshDate(const std::vector<FollowUpDateFacts>& device
                                     bool isInitialCall);
 
 /// The date for which an activity schedules itself again when `next` was computed at the end of a run: never
-/// one that would make it run back to back, whatever day length is stored.
-Date followingPostDate(Date next, Date now, double day);
+/// one that would make it run back to back, whatever day length is stored. When an offer's end has passed,
+/// the other devices' follow-ups are posted no later for it.
+Date followingPostDate(Date next, const std::vector<FollowUpDateFacts>& devices, Date now, double day);
 Date followingRefreshDate(Date next, Date now);
 
 }  // namespace kvr

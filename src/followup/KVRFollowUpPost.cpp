@@ -59,10 +59,13 @@ void KVRFollowUpPost::handle(const std::optional<KVRDeviceInfoList>& devicesInfo
 }
 
 void KVRFollowUpPost::postAndSchedule(const KVRDeviceInfoList& devicesInfo) {
+  // Taken before: what comes due while others are posted is still to come.
+  const auto now = platform_.clock.now();
   const bool hasPosted = KVRFollowUp(platform_).postFollowUpWithDevicesInfo(devicesInfo);
-  if (const auto next = nextFollowUpPostDateWithDevicesInfo(platform_, devicesInfo)) {
-    const auto date = followingPostDate(*next, platform_.clock.now(),
-                                        platform_.preferences.doubleForKey(preference::kOneDayInterval));
+  const auto facts = dateFactsOf(platform_, devicesInfo);
+  if (const auto next = nextPostDate(facts, now)) {
+    const auto date =
+        followingPostDate(*next, facts, now, platform_.preferences.doubleForKey(preference::kOneDayInterval));
     platform_.log.standard("%s: Re-schedule followUp post for: %@", kPerform, date);
     KVRScheduler::newSchedulerWithActivityDelegate(platform_, shared_from_this())
         ->scheduleActivityForDate(date);

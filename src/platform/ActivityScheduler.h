@@ -65,7 +65,8 @@ class Activity {
 
 /// The platform's scheduler of named background activities. It runs an activity once, no earlier than its
 /// delay, within its grace period where it can. A deferred run comes back by itself: within a second after
-/// the date it waits for, else after 10 s, doubling up to an hour. Activities never run twice at once.
+/// the date it waits for, else after 10 s, doubling up to an hour. Activities never run twice at once, and
+/// one that is registered anew again and again not more than six times in ten minutes.
 class ActivityScheduler {
  public:
   virtual ~ActivityScheduler() = default;

@@ -99,9 +99,16 @@ ActivityBlock ActivityTable::add(const std::string& identifier, const ActivityCr
   entry.registration = Registration{criteria, now.date, opens + seconds(criteria.gracePeriod) * draw};
   entry.registrationNumber = ++lastNumber_;
   entry.earliest.reset();
-  entry.notBefore = 0;
+  entry.notBefore = notBefore(identifier);
   entry.backOff = 0;
   return std::exchange(entry.block, std::move(block));
+}
+
+/// The uptime before which an activity is started too often.
+double ActivityTable::notBefore(const std::string& identifier) const {
+  const auto found = starts_.find(identifier);
+  if (found == starts_.end() || found->second.size() < kMostStarts) return 0;
+  return found->second.front() + kStartsPeriod;
 }
 
 ActivityBlock ActivityTable::checkIn(const std::string& identifier, ActivityBlock block) {
@@ -205,6 +212,9 @@ std::vector<ActivityTable::Run> ActivityTable::takeDue(const Now& now) {
     if (isInTurn(entry)) run.occasion = entry.occasion->order;
     run.started = now.uptime;
     entry.run = run;
+    auto& starts = starts_[identifier];
+    starts.push_back(now.uptime);
+    if (starts.size() > kMostStarts) starts.pop_front();
     runs.push_back({identifier, run.number, entry.block});
   }
   return runs;

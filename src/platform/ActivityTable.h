@@ -4,6 +4,7 @@
 #include "platform/Error.h"
 #include "platform/Value.h"
 
+#include <deque>
 #include <map>
 #include <string>
 #include <vector>
@@ -51,6 +52,11 @@ class ActivityTable {
   static constexpr double kLongestBackOff = 3600;  ///< seconds
   /// Between the starts of two runs that are one registration's, in seconds.
   static constexpr double kShortestCycle = 0.5;
+  /// An activity that was started so often within so many seconds waits when it is registered anew. Nobody
+  /// who can have it registered again and again (a service whose dates change with each answer, whoever posts
+  /// notifications) makes it run without a pause.
+  static constexpr std::size_t kMostStarts = 6;
+  static constexpr double kStartsPeriod = 600;
 
   // What is persisted: registrations, the boot and system version whose occasions were served, and how each
   // activity's last run ended.
@@ -126,6 +132,7 @@ class ActivityTable {
     double backOff = 0;    ///< seconds of the last wait
   };
 
+  double notBefore(const std::string& identifier) const;
   Entry* runningEntry(const std::string& identifier);
   void noticeOccasion(const std::string& identifier, std::string record, std::string fact);
   bool isInTurn(const Entry& entry) const;
@@ -138,7 +145,8 @@ class ActivityTable {
   void defer(Entry& entry, const UnderWay& run, const Now& now);
 
   std::map<std::string, Entry, std::less<>> entries_;
-  Value::Dictionary records_;  ///< the tree's top level, but for the registrations
+  std::map<std::string, std::deque<double>> starts_;  ///< the last ones of each activity, in uptime
+  Value::Dictionary records_;                         ///< the tree's top level, but for the registrations
   std::uint64_t lastNumber_ = 0;
 };
 

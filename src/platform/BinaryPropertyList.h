@@ -15,7 +15,8 @@ namespace kvr {
 // shared; all numbers are big-endian. An object starts with a marker: its kind in the high four bits, and in
 // the low four its length, where 15 means that an integer object with the length follows.
 
-Result<Value> readBinaryPropertyList(std::string_view bytes);
+/// `largest` bounds what the tree may unfold to, in values and in bytes of text and data.
+Result<Value> readBinaryPropertyList(std::string_view bytes, std::size_t largest);
 
 /// Equal leaves are written once, as far as a reader lets them be shared.
 Result<std::string> writeBinaryPropertyList(const Value& tree);

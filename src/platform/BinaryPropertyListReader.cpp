@@ -26,17 +26,18 @@ struct Extent {
 };
 
 /// A small input can unfold to any size by sharing, so what it may unfold to depends on its size.
-Extent largestExtentOf(std::size_t inputSize) {
+Extent largestExtentOf(std::size_t inputSize, std::uint64_t largest) {
   constexpr std::uint64_t kValuesOfAnyInput = 1U << 16U;
   constexpr std::uint64_t kValuesPerByte = 16;
-  return {std::min<std::uint64_t>(kMaximumValues, kValuesOfAnyInput + kValuesPerByte * inputSize),
-          std::uint64_t{kMaximumSharedBytes} + inputSize};
+  return {std::min({std::uint64_t{kMaximumValues}, kValuesOfAnyInput + kValuesPerByte * inputSize, largest}),
+          std::min(std::uint64_t{kMaximumSharedBytes} + inputSize, largest)};
 }
 
 /// Reads from the top object on, depth first, each object once, with a stack of its own.
 class Reader {
  public:
-  explicit Reader(std::string_view bytes) : bytes_(bytes), limit_(largestExtentOf(bytes.size())) {}
+  Reader(std::string_view bytes, std::size_t largest)
+      : bytes_(bytes), limit_(largestExtentOf(bytes.size(), largest)) {}
 
   Result<Value> read() {
     if (!readTrailer() || !enter(top_)) return plistError(problem_);
@@ -115,8 +116,8 @@ class Reader {
   std::size_t top_ = 0;
   std::vector<Object> objects_;
   std::vector<Container> open_;
-  /// Of all objects so far, each counted once, so no more than what the tree unfolds to.
-  Extent read_;
+  std::uint64_t values_ = 0;  ///< in all containers so far, no more than what the tree unfolds to
+  std::uint64_t copied_ = 0;  ///< bytes of text and data
   const char* problem_ = "";
 };
 
@@ -191,10 +192,11 @@ bool Reader::finish(Object& object, Value value) {
   return true;
 }
 
-/// Asked before so many bytes are copied.
+/// Asked before so many bytes are copied. A key is copied wherever it stands, and once more as the object
+/// that it is: beside what the tree unfolds to, that is no more than the input.
 bool Reader::mayCopy(std::uint64_t bytes) {
-  read_.bytes += bytes;
-  return read_.bytes <= limit_.bytes || refuse("unfolds to too much text");
+  copied_ += bytes;
+  return copied_ <= limit_.bytes + bytes_.size() || refuse("unfolds to too much text");
 }
 
 bool Reader::readSingleton(Object& object, unsigned which) {
@@ -265,8 +267,8 @@ bool Reader::openContainer(std::size_t object, bool isDictionary, Content conten
   if (count > content.left / referenceSize_ / (isDictionary ? 2 : 1))
     return refuse("a length beyond the objects");
   if (open_.size() == kMaximumDepth) return refuse("nested too deep");
-  read_.values += count;
-  if (read_.values > limit_.values) return refuse("unfolds to too many values");
+  values_ += count;
+  if (values_ > limit_.values) return refuse("unfolds to too many values");
   objects_[object].state = State::Open;
   open_.push_back({object, isDictionary, content.at, count});
   return true;
@@ -330,6 +332,8 @@ bool Reader::closeContainer(const Container& container) {
 
 }  // namespace
 
-Result<Value> readBinaryPropertyList(std::string_view bytes) { return Reader(bytes).read(); }
+Result<Value> readBinaryPropertyList(std::string_view bytes, std::size_t largest) {
+  return Reader(bytes, largest).read();
+}
 
 }  // namespace kvr

@@ -6,6 +6,8 @@
 #include "platform/XMLPropertyList.h"
 
 #include <algorithm>
+#include <limits>
+#include <string>
 
 namespace kvr {
 namespace {
@@ -54,7 +56,12 @@ std::optional<std::string_view> xmlDocument(std::string_view bytes) {
 }  // namespace
 
 Result<Value> readPropertyList(std::string_view bytes) {
-  if (bytes.starts_with("bplist")) return readBinaryPropertyList(bytes);
+  return readPropertyListWithin(std::numeric_limits<std::size_t>::max(), bytes);
+}
+
+Result<Value> readPropertyListWithin(std::size_t largest, std::string_view bytes) {
+  if (bytes.size() > largest) return plistError("larger than " + std::to_string(largest) + " bytes");
+  if (bytes.starts_with("bplist")) return readBinaryPropertyList(bytes, largest);
   if (const auto document = xmlDocument(bytes)) return readXMLPropertyList(*document);
   return readASCIIPropertyList(bytes);
 }

@@ -20,6 +20,11 @@ inline constexpr std::size_t kMaximumDepth = 512;
 /// std::bad_alloc, never an error. Thread-safe, no state.
 Result<Value> readPropertyList(std::string_view bytes);
 
+/// As above, for what a stranger has sent and is kept or logged: an error too are more than `largest` bytes,
+/// and a tree of more than `largest` values or bytes of text and data, where what a binary list shares counts
+/// wherever it stands.
+Result<Value> readPropertyListWithin(std::size_t largest, std::string_view bytes);
+
 /// Writes a tree. XML holds no null, no character that XML forbids and no date outside the calendar, and
 /// drops a date's fraction of a second; the binary encoding holds every tree (a date before 1985 to a tenth
 /// of a microsecond). A tree that does not fit, whose text is not UTF-8, or that `readPropertyList` would

@@ -9,7 +9,8 @@
 namespace kvr {
 namespace {
 
-constexpr std::size_t kLargestAsset = 1U << 20U;
+/// Many times what a version pair takes. It goes into the preferences and into several log lines.
+constexpr std::size_t kLargestAsset = 65536;
 
 /// A string's leading digits as a number; anything else as it is.
 Value asVersion(const Value& value) { return value.isString() ? Value(value.asInteger()) : value; }
@@ -205,7 +206,7 @@ void handleFetched(Platform& platform, const Value& url, bool shouldRetry, const
     completion({});
     return;
   }
-  const auto parsed = readPropertyList(*fetched);
+  const auto parsed = readPropertyListWithin(kLargestAsset, *fetched);
   if (!parsed) {
     platform.log.error("Error serializing plist file from URL '%@': %@", url, parsed.error());
     completion({});

@@ -286,6 +286,22 @@ TEST_F(ALogLine, NamesTimeLevelAndChannelAndStaysOneLine) {
   }
 }
 
+TEST_F(ALogLine, OfAnySizeWaitsForNoReaderThatHasStopped) {
+  int ends[2];
+  ASSERT_EQ(::pipe2(ends, O_CLOEXEC), 0);
+  const Descriptor reader(ends[0]), writer(ends[1]);
+  LocalLog log(LogLevel::Debug, false, LocalLog::Sink::Lines, writer.get());
+  log.standard("%s", std::string(1 << 20, 'x'));
+  log.standard("lost");
+  std::string taken(1 << 20, '\0');
+  taken.resize(static_cast<std::size_t>(::read(reader.get(), taken.data(), taken.size())));
+  log.standard("later");
+  char line[200];
+  const auto size = ::read(reader.get(), line, sizeof line);
+  EXPECT_TRUE(std::regex_match(std::string(line, static_cast<std::size_t>(size)),
+                               std::regex("\n\\S+ default com.tarsil.Kavrel:core later\n")));
+}
+
 TEST_F(ALogLine, IsWrittenAtTheLevelsAndInTheClearnessThatTheEnvironmentNames) {
   const Descriptor standardError(::dup(STDERR_FILENO));
   const auto linesWith = [&](const char* level, const char* isPrivate, const char* journal) {

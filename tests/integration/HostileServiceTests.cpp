@@ -1,6 +1,9 @@
 #include "integration/support/AgentWorld.h"
+#include "platform/PropertyList.h"
 
 #include <signal.h>
+
+#include <thread>
 
 namespace kvr::testing {
 namespace {
@@ -107,6 +110,24 @@ TEST_F(TheAgentOfAHostileService, AnswersFromTheCacheWhileTheServiceKeepsItWaiti
     expectCachedAnswer(client);
   }
   EXPECT_EQ(world.agent().terminate(), 0);
+}
+
+TEST_F(TheAgentOfAHostileService, AnswersWhoWaitsWhenItIsToldToEndAndLeavesWhatIsShown) {
+  const std::string path = "Library/FollowUps/com.tarsil.Kavrel.plist";
+  const Value shown = Dictionary{
+      {"items", Array{Dictionary{{"uniqueIdentifier", "shown"},
+                                 {"userInfo", Dictionary{{"FollowupSerialNumber", World::kSecondWatch}}}}}}};
+  world.directory.write("home/" + path, *writePropertyList(shown, PropertyListEncoding::Binary));
+  misbehave(R"("never":true)");
+  const auto requests = world.coverageRequests().size();
+  Value answer;
+  std::thread waiting([&] { answer = World::info(world.newClient(), World::kSecondWatch, World::Refresh); });
+  while (world.coverageRequests().size() == requests) expectCachedAnswer(client);
+  EXPECT_EQ(world.agent().terminate(), 0);
+  waiting.join();
+  EXPECT_TRUE(answer.isDictionary());
+  EXPECT_TRUE(World::warrantyIn(answer).isNull());
+  EXPECT_EQ(world.file(path), shown);
 }
 
 }  // namespace

@@ -20,18 +20,24 @@ std::chrono::steady_clock::time_point timeAfter(double delay) {
 
 }  // namespace
 
-DelayedAnswers::~DelayedAnswers() {
+void DelayedAnswers::end() {
+  std::thread thread;
   {
     const std::lock_guard lock(mutex_);
     ending_ = true;
+    thread.swap(thread_);
   }
   changed_.notify_one();
-  if (thread_.joinable()) thread_.join();
+  if (thread.joinable()) thread.join();
 }
 
 void DelayedAnswers::after(double delay, Answer answer) {
   const auto time = timeAfter(delay);
   std::unique_lock lock(mutex_);
+  if (ending_) {
+    lock.unlock();
+    return give(answer, true);
+  }
   if (!thread_.joinable()) {
     try {
       thread_ = std::thread([this] { run(); });

@@ -15,20 +15,22 @@ namespace kvr {
 ///
 /// The thread starts with the first answer and sleeps until the next one is due. Answers due at the same time
 /// are given in the order in which they were promised. An answer should be short: the others wait for it.
-/// Destruction gives every answer that is still owed, as `ending`, and returns once all are given.
+/// The end gives every answer that is still owed, as `ending`, and returns once all are given.
 class DelayedAnswers {
  public:
   /// Called exactly once. `ending`: the time was not waited for, because these answers come to their end.
   using Answer = std::function<void(bool ending)>;
 
   explicit DelayedAnswers(Log& log) : log_(log) {}
-  ~DelayedAnswers();
+  ~DelayedAnswers() { end(); }
   DelayedAnswers(const DelayedAnswers&) = delete;
   DelayedAnswers& operator=(const DelayedAnswers&) = delete;
 
   /// Gives `answer` after `delay` seconds. A negative or undefined delay is none; one of more than some
   /// thousand years lasts until the end. Any thread.
   void after(double delay, Answer answer);
+  /// Later answers are given at once. Not on the thread of the answers.
+  void end();
 
  private:
   using Time = std::chrono::steady_clock::time_point;

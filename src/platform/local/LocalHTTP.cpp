@@ -4,7 +4,8 @@
 #include "platform/local/http/HTTPTransfers.h"
 
 #include <algorithm>
-#include <atomic>
+#include <chrono>
+#include <condition_variable>
 #include <mutex>
 #include <utility>
 
@@ -54,6 +55,32 @@ std::optional<Error> faultOf(const HTTPRequest& request) {
 
 }  // namespace
 
+/// How many requests have no answer yet, or one that is being handled.
+class LocalHTTP::OpenRequests {
+ public:
+  void begin() {
+    const std::lock_guard lock(mutex_);
+    ++count_;
+  }
+  void end() {
+    const std::lock_guard lock(mutex_);
+    if (--count_ == 0) none_.notify_all();
+  }
+  std::size_t count() const {
+    const std::lock_guard lock(mutex_);
+    return count_;
+  }
+  bool waitForNone(double limit) {
+    std::unique_lock lock(mutex_);
+    return none_.wait_for(lock, std::chrono::duration<double>(limit), [this] { return count_ == 0; });
+  }
+
+ private:
+  mutable std::mutex mutex_;
+  std::condition_variable none_;
+  std::size_t count_ = 0;
+};
+
 /// What every session sends through; it lives as long as any of them.
 class LocalHTTP::Transport {
  public:
@@ -63,8 +90,8 @@ class LocalHTTP::Transport {
 
   void send(HTTPRequest request, HTTPSession::Reply reply) {
     // Counts for as long as the reply is there.
-    const std::shared_ptr<void> counted(nullptr, [open = openRequests_](void*) { --*open; });
-    ++*openRequests_;
+    openRequests_->begin();
+    const std::shared_ptr<void> counted(nullptr, [open = openRequests_](void*) { open->end(); });
     HTTPTransfers::Done done = [queue = queues_.concurrentQueue(Priority::Default), counted,
                                 reply = std::move(reply)](HTTPResponse response) mutable {
       queue->async([counted, reply = std::move(reply), response = std::move(response)]() mutable {
@@ -77,7 +104,7 @@ class LocalHTTP::Transport {
     (*transfers)->start(std::move(request), std::move(done));
   }
 
-  std::size_t openRequests() const { return *openRequests_; }
+  OpenRequests& openRequests() const { return *openRequests_; }
 
   void beginEnding() {
     Transfers transfers;
@@ -117,8 +144,7 @@ class LocalHTTP::Transport {
 
   WorkQueues& queues_;
   Log& log_;
-  const std::shared_ptr<std::atomic<std::size_t>> openRequests_ =
-      std::make_shared<std::atomic<std::size_t>>(0);
+  const std::shared_ptr<OpenRequests> openRequests_ = std::make_shared<OpenRequests>();
   std::mutex mutex_;  ///< guards what follows
   Transfers transfers_;
   std::optional<Error> fault_;  ///< why there are no transfers, once that is known
@@ -155,8 +181,10 @@ std::shared_ptr<HTTPSession> LocalHTTP::newUncachedSession() {
   return std::make_shared<Session>(transport_, true);
 }
 
-std::size_t LocalHTTP::openRequests() const { return transport_->openRequests(); }
+std::size_t LocalHTTP::openRequests() const { return transport_->openRequests().count(); }
 
 void LocalHTTP::beginEnding() { transport_->beginEnding(); }
+
+bool LocalHTTP::drain(double limit) { return transport_->openRequests().waitForNone(limit); }
 
 }  // namespace kvr

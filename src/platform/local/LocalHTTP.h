@@ -29,8 +29,12 @@ class LocalHTTP : public HTTP {
   std::size_t openRequests() const;
   /// Every request under way, and every later one, fails at once. Any thread.
   void beginEnding();
+  /// Waits until every request has been answered and its answer handled; false when that takes more than
+  /// `limit` seconds.
+  bool drain(double limit);
 
  private:
+  class OpenRequests;
   class Transport;
   class Session;
   std::shared_ptr<Transport> transport_;

@@ -12,6 +12,7 @@
 #include <array>
 #include <cerrno>
 #include <charconv>
+#include <climits>
 #include <cstdlib>
 #include <cstring>
 #include <ctime>
@@ -19,7 +20,11 @@
 namespace kvr {
 namespace {
 
-constexpr int kPatienceMilliseconds = 1000;
+using namespace std::chrono_literals;
+
+constexpr auto kPatience = 1s;
+/// What a pipe that is ready takes without waiting for its reader.
+constexpr std::size_t kMostAtOnce = PIPE_BUF;
 
 std::string_view environment(const char* name) {
   const char* value = std::getenv(name);
@@ -128,6 +133,17 @@ void appendEscaped(std::string& line, std::string_view message) {
   }
 }
 
+/// Whether all was written.
+bool writeAll(int descriptor, std::string_view text) {
+  while (!text.empty()) {
+    const auto count = ::write(descriptor, text.data(), text.size());
+    if (count < 0 && errno == EINTR) continue;
+    if (count < 0) return false;
+    text.remove_prefix(static_cast<std::size_t>(count));
+  }
+  return true;
+}
+
 bool sendToJournal(LogLevel level, const std::string& message) {
   const std::string text = "MESSAGE=" + message;
   const std::string subsystem = "SUBSYSTEM=" + std::string(Log::kSubsystem);
@@ -164,23 +180,28 @@ void LocalLog::writeLine(LogLevel level, const std::string& message) {
   line.append(kSubsystem).append(":").append(kCategory).append(" ");
   appendEscaped(line, message);
   line += '\n';
-  std::string_view rest = line;
-  while (!rest.empty() && isReady()) {
-    const auto count = ::write(descriptor_, rest.data(), rest.size());
-    if (count < 0 && errno == EINTR) continue;
-    if (count < 0) return;
-    rest.remove_prefix(static_cast<std::size_t>(count));
+  if (!mayBlock_) {
+    writeAll(descriptor_, line);
+    return;
   }
+  const std::lock_guard lock(mutex_);
+  if (torn_) line.insert(0, "\n");
+  const auto deadline = std::chrono::steady_clock::now() + (stuck_ ? 0s : kPatience);
+  std::string_view rest = line;
+  while (!rest.empty() && isReady(deadline) && writeAll(descriptor_, rest.substr(0, kMostAtOnce))) {
+    rest.remove_prefix(std::min(kMostAtOnce, rest.size()));
+  }
+  stuck_ = !rest.empty();
+  if (rest.size() < line.size()) torn_ = stuck_;
 }
 
-/// Whether the reader takes lines. One that takes none for a while costs lines, not the agent's time: it is
-/// waited for again only after it has taken one.
-bool LocalLog::isReady() {
-  if (!mayBlock_) return true;
+/// Whether the reader takes as much as is written at once. One that takes nothing for a while costs lines,
+/// not the agent's time: it is waited for again only after it has taken a whole one.
+bool LocalLog::isReady(std::chrono::steady_clock::time_point deadline) {
+  using std::chrono::milliseconds;
+  const auto left = std::chrono::ceil<milliseconds>(deadline - std::chrono::steady_clock::now()).count();
   pollfd state{descriptor_, POLLOUT, 0};
-  const bool ready = ::poll(&state, 1, stuck_ ? 0 : kPatienceMilliseconds) != 0;
-  stuck_ = !ready;
-  return ready;
+  return ::poll(&state, 1, static_cast<int>(std::max<milliseconds::rep>(left, 0))) != 0;
 }
 
 }  // namespace kvr

@@ -2,7 +2,9 @@
 
 #include "platform/Log.h"
 
+#include <chrono>
 #include <memory>
+#include <mutex>
 
 namespace kvr {
 
@@ -26,12 +28,14 @@ class LocalLog : public Log {
 
  private:
   void writeLine(LogLevel level, const std::string& message);
-  bool isReady();
+  bool isReady(std::chrono::steady_clock::time_point deadline);
 
   const Sink sink_;
   const int descriptor_;
   const bool mayBlock_;
-  std::atomic<bool> stuck_{false};  ///< nobody took the last line
+  std::mutex mutex_;    ///< guards what follows, and the order of lines whose writing may block
+  bool stuck_ = false;  ///< nobody took the last line, or all of it
+  bool torn_ = false;   ///< it has been begun
 };
 
 }  // namespace kvr

@@ -1,5 +1,7 @@
 #include "platform/local/LocalPlatform.h"
 
+#include <chrono>
+
 namespace kvr {
 
 LocalPlatform::LocalPlatform(EventLoop& mainLoop, std::function<void()> busLost)
@@ -11,17 +13,23 @@ LocalPlatform::LocalPlatform(EventLoop& mainLoop, std::function<void()> busLost)
       cleanExit(mainLoop, queues, activities, http, services, *log, kMainBundleIdentifier) {}
 
 void LocalPlatform::beginEnding() {
+  cleanExit.beginEnding();
   log->beginEnding();
   activities.beginEnding();
   notifications.beginEnding();
 }
 
 bool LocalPlatform::end(double limit) {
+  const auto start = std::chrono::steady_clock::now();
   beginEnding();
   services.beginEnding();
   http.beginEnding();
+  store.beginEnding();
   queues.beginEnding();
-  return queues.drain(limit);
+  // The last answers first: what they lead to is work of the queues.
+  if (!http.drain(limit)) return false;
+  return queues.drain(limit -
+                      std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count());
 }
 
 }  // namespace kvr

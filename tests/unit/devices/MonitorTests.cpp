@@ -47,6 +47,24 @@ TEST_F(Monitors, LookUpAllDevicesAndScheduleThePostWhenAWatchIsPairedOrUnpaired)
   EXPECT_THAT(pending(), IsEmpty()) << "of a watch that is tracked no more";
 }
 
+TEST_F(Monitors, MakeUpForNotificationsBeyondALimitWhileNobodyAnswers) {
+  const auto paired = KVRPairedDevicesMonitor::initWithAgent(world.platform, agent);
+  paired->start();
+  const auto locale = KVRLocaleMonitor::initWithAgent(world.platform, agent);
+  locale->start();
+  pend("shown", {{kFollowUpSerialNumberKey, "LOCAL"}});
+  world.coverage = nullptr;
+  const auto lookUps = [this] { return world.log.count("getting warranty using policy LOCAL: 0"); };
+  std::size_t expected = 0;
+  for (const auto* name : {PairedDeviceRegistry::kDeviceDidPair, UserLocale::kLanguageChanged}) {
+    for (int i = 0; i < 3 * RefreshLimit::kMost; ++i) world.notifications.post(name);
+    world.queues.advance(6);
+    EXPECT_EQ(lookUps(), expected += RefreshLimit::kMost) << name;
+    world.queues.advance(600);
+    EXPECT_EQ(lookUps(), ++expected) << name;
+  }
+}
+
 TEST_F(Monitors, CheckFiveSecondsAfterEveryChangeOfLanguageAndEndThen) {
   const auto monitor = KVRLocaleMonitor::initWithAgent(world.platform, agent);
   monitor->start();

@@ -92,6 +92,8 @@ TEST_F(AFollowUpActivity, PostsAndSchedulesWhatFollows) {
       {one(shownInDays(-2, 2.5)), {}, 0.5},
       {one(shownInDays(-2, 0.25)), {}, 0.25},
       {one(offer(-1), "B"), 1, {}},  // not back to back
+      {KVRDeviceInfoList{info("B", offer(-1), old), info("C", shownInDays(0.25, 30), old)}, 0.25, {}},
+      {KVRDeviceInfoList{info("B", offer(-1), old), info("C", shownInDays(4, 30), old)}, 1, {}},
   };
   for (const auto& [list, post, refresh] : cases) {
     KVRScheduler::clearScheduledActivities(world.platform);

@@ -138,6 +138,19 @@ TEST_F(AnActivityTable, KeepsARegistrationThatWasMadeDuringTheRun) {
   }
 }
 
+TEST_F(AnActivityTable, DoesNotRunWithoutAPauseHoweverOftenItIsRegisteredAnew) {
+  const double start = now.uptime;
+  for (int run = 0; run < 20; ++run) {
+    table.add("a", {}, kBlock, now, 0);
+    EXPECT_THAT(next(), ElementsAre("a"));
+    table.add("a", {}, kBlock, now, 0);  // by the run itself, and once more by somebody else
+    pass(1);
+    EXPECT_THAT(started(), IsEmpty());
+    end("a", kFinished);
+  }
+  EXPECT_NEAR(now.uptime - start, 3 * ActivityTable::kStartsPeriod, 30);
+}
+
 TEST_F(AnActivityTable, TakesUpItsTreeAgainAndKeepsWhatNobodyChecksInFor) {
   table.add("a", {3600, 360, true}, kBlock, now, 0.5);
   table.add("b", {60, 0}, kBlock, now, 0);

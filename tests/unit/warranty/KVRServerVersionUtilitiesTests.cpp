@@ -98,6 +98,11 @@ TEST(TheVersionNegotiation, GoesOnAfterAnyFailedFetchAndAsksOnceMoreForAnAssetTh
   const std::string url = "https://assets.example/kvrV2.plist";
   const std::string from = " from URL '" + url + "'", failed = "Failed to fetch plist data";
   const Value client = pairOf(2, 3);
+  // Small, but nothing to keep or to log.
+  const auto unfolding = *writePropertyList(
+      Dictionary{
+          {"LowServerVersion", 3}, {"HighServerVersion", 3}, {"x", Array(1000, std::string(100, 'x'))}},
+      PropertyListEncoding::Binary);
   const std::tuple<Value, std::vector<std::string>, Value, std::string> cases[] = {
       {url, {"(1)", asset(pairOf(3, 3))}, pairOf(3, 3), "Incorrect format in response detected. retrying..."},
       {url,
@@ -105,6 +110,7 @@ TEST(TheVersionNegotiation, GoesOnAfterAnyFailedFetchAndAsksOnceMoreForAnAssetTh
        client,
        "Incorrect format in response detected" + from + ". Response: (2). Aborting without retry."},
       {url, {"<html>"}, client, "Error serializing plist file" + from},
+      {url, {unfolding}, client, "Error serializing plist file" + from},
       {url, {}, client, failed + from + " with error: Error Domain=http Code=7 \"refused\""},
       {"file:///nowhere", {}, client, failed + " from URL 'file:///nowhere'"},
       {7, {}, client, failed + " from URL '7'"},
