@@ -1,3 +1,4 @@
+#include "followup/KVRFollowUp.h"
 #include "integration/support/AgentWorld.h"
 #include "platform/PropertyList.h"
 
@@ -115,8 +116,9 @@ TEST_F(TheAgentOfAHostileService, AnswersFromTheCacheWhileTheServiceKeepsItWaiti
 TEST_F(TheAgentOfAHostileService, AnswersWhoWaitsWhenItIsToldToEndAndLeavesWhatIsShown) {
   const std::string path = "Library/FollowUps/com.tarsil.Kavrel.plist";
   const Value shown = Dictionary{
-      {"items", Array{Dictionary{{"uniqueIdentifier", "shown"},
-                                 {"userInfo", Dictionary{{"FollowupSerialNumber", World::kSecondWatch}}}}}}};
+      {"items", Array{Dictionary{
+                    {"uniqueIdentifier", KVRFollowUp::uniqueIdentfierForSerialNumber(World::kSecondWatch)},
+                    {"userInfo", Dictionary{{"FollowupSerialNumber", World::kSecondWatch}}}}}}};
   world.directory.write("home/" + path, *writePropertyList(shown, PropertyListEncoding::Binary));
   misbehave(R"("never":true)");
   const auto requests = world.coverageRequests().size();
