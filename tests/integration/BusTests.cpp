@@ -51,7 +51,7 @@ TEST_F(AService, LetsGoOfTheObjectWithItsConnectionEvenInTheMiddleOfACall) {
   ASSERT_EQ(gone.get_future().wait_for(kLimit), std::future_status::ready);
   EXPECT_EQ(listeners->openCalls(), 0U);
   late(Value("too late"));
-  EXPECT_THAT(log.errorsWith(""), ElementsAre());
+  EXPECT_THAT(log.texts(LogLevel::Error), IsEmpty());
 }
 
 TEST_F(AService, AnswersWithAnErrorWhatItCannotServe) {
@@ -102,7 +102,7 @@ TEST_F(AService, IsLostWithoutItsName) {
   ASSERT_GE(sd_bus_request_name(other.bus(), RawBusClient::kName, 0), 0);
   listener->resume({RawBusClient::kInterface, {}});
   EXPECT_TRUE(waitUntilLost());
-  EXPECT_EQ(log.errorsWith("somebody else has it").size(), 1U);
+  EXPECT_THAT(log.texts(LogLevel::Error), Contains(HasSubstr("somebody else has it")).Times(1));
 }
 
 TEST_F(AService, EndsByGivingItsNameUpAndAnsweringWhatItHasTaken) {

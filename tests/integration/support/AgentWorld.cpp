@@ -4,7 +4,6 @@
 #include "signing/SHA256Hash.h"
 
 #include <httplib.h>
-#include <systemd/sd-bus.h>
 
 #include <algorithm>
 #include <iterator>
@@ -13,9 +12,7 @@
 namespace kvr::testing {
 namespace {
 
-constexpr std::uint64_t kLimitMicroseconds = 60'000'000;  // only ever spent on a failure
 constexpr const char* kAuthority = "home/Library/Keys/com.tarsil.kvragent.kestCertificates/authority.pem";
-
 constexpr const char* kActivities = "Library/Activities/com.tarsil.kvragent.plist";
 
 Value watch(const std::string& serialNumber) {
@@ -88,19 +85,8 @@ void AgentWorld::letTheBusStartIt() {
 }
 
 void AgentWorld::waitForName(bool isOwned) const {
-  const RawBusClient watcher = newClient();
-  const auto handler = [](sd_bus_message*, void*, sd_bus_error*) { return 0; };
-  sd_bus_match_signal(watcher.bus(), nullptr, "org.freedesktop.DBus", nullptr, "org.freedesktop.DBus",
-                      "NameOwnerChanged", handler, nullptr);
-  // Every arrival and departure wakes the watcher up, its own included; it is the agent's name that counts.
-  while ((sd_bus_get_name_creds(watcher.bus(), RawBusClient::kName, 0, nullptr) >= 0) != isOwned) {
-    const int processed = sd_bus_process(watcher.bus(), nullptr);
-    if (processed < 0) throw std::runtime_error("the bus is gone");
-    if (processed == 0 && sd_bus_wait(watcher.bus(), kLimitMicroseconds) == 0) {
-      throw std::runtime_error("nothing happened to the agent's name: " +
-                               (agent_ ? agent_->errorOutput() : ""));
-    }
-  }
+  if (newClient().waitForName(isOwned)) return;
+  throw std::runtime_error("nothing happened to the agent's name: " + (agent_ ? agent_->errorOutput() : ""));
 }
 
 void AgentWorld::writeDeviceFile(const std::string& name, const Value& tree) const {
