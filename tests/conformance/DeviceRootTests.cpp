@@ -12,10 +12,8 @@
 #include <unistd.h>
 
 #include <array>
-#include <cmath>
 #include <csignal>
 #include <future>
-#include <limits>
 
 namespace kvr {
 namespace {
@@ -24,21 +22,17 @@ namespace fs = std::filesystem;
 
 class ADevice : public ::testing::Test {
  protected:
-  ADevice() { fs::permissions(directory.path().string(), fs::perms::owner_all); }
+  ADevice() { fs::permissions(pathOf(""), fs::perms::owner_all); }
 
-  std::string pathOf(const std::string& file) const { return directory.path().string() + "/" + file; }
-  void put(const std::string& file, const Value& tree) const {
-    writeFile(pathOf(file), *writePropertyList(tree, PropertyListEncoding::Binary));
+  std::string pathOf(const std::string& file) { return world.path(file); }
+  void put(const std::string& file, const Value& tree) {
+    world.putTree(pathOf(file), tree, PropertyListEncoding::Binary);
     fs::permissions(pathOf(file), fs::perms::owner_read | fs::perms::owner_write);
   }
-  std::vector<std::string> errors() const { return log.texts(LogLevel::Error); }
 
-  TemporaryDirectory directory;
-  SimulatedClock clock;
-  SimulatedLog log;
-  LocalFiles files{log, directory.path().string()};
-  PropertyListFiles lists{files, clock, log};
-  DeviceRoot root{lists, log, directory.path().string()};
+  FileWorld world{true};
+  SimulatedLog& log = world.log;
+  DeviceRoot root{world.lists, log, world.files().homeDirectory()};
 };
 
 TEST_F(ADevice, IsTrustedOnlyWhereNobodyElseCanWrite) {
@@ -63,14 +57,14 @@ TEST_F(ADevice, IsTrustedOnlyWhereNobodyElseCanWrite) {
     ASSERT_EQ(::chmod(pathOf(changed).c_str(), mode), 0);
     for (int round = 0; round < 2; ++round)
       EXPECT_EQ(root.trustedDictionary(asked).isNull(), reason != nullptr);
-    EXPECT_THAT(errors(), SizeIs(reason != nullptr ? 1 : 0));
-    EXPECT_THAT(errors(), Each(HasSubstr(reason != nullptr ? reason : "")));
+    EXPECT_THAT(world.errors(), SizeIs(reason != nullptr ? 1 : 0));
+    EXPECT_THAT(world.errors(), Each(HasSubstr(reason != nullptr ? reason : "")));
   }
   EXPECT_TRUE(root.trustedDictionary("missing.plist").isNull());
 }
 
 TEST_F(ADevice, HasThePropertiesStatedElseThoseOfItsHost) {
-  const std::string host = directory.path().string() + "/host";
+  const std::string host = pathOf("host");
   const LocalDeviceProperties properties(root, host);
   const auto answers = [&] {
     return describe(properties.answer(DeviceProperties::kSerialNumber)) + ", " +
@@ -93,7 +87,7 @@ TEST_F(ADevice, HasThePropertiesStatedElseThoseOfItsHost) {
   EXPECT_TRUE(properties.isInternalInstall());
   EXPECT_EQ(properties.answer("UserAssignedDeviceName"), "Ann's");
   EXPECT_EQ(properties.answer("InternalInstall"), std::nullopt);
-  EXPECT_THAT(errors(), IsEmpty());
+  EXPECT_THAT(world.errors(), IsEmpty());
 }
 
 TEST_F(ADevice, EntitlesTheFilesThatThePathsLeadTo) {
@@ -114,7 +108,7 @@ TEST_F(ADevice, EntitlesTheFilesThatThePathsLeadTo) {
 }
 
 TEST_F(ADevice, KnowsProgramsAndTheBundlesAroundThem) {
-  const LocalProcesses processes(lists);
+  const LocalProcesses processes(world.lists);
   std::array<char, 4096> buffer{};
   const auto length = processes.executablePath(::getpid(), buffer);
   ASSERT_GT(length, 0);
@@ -135,7 +129,7 @@ TEST_F(ADevice, KnowsProgramsAndTheBundlesAroundThem) {
 }
 
 TEST_F(ADevice, GivesNoPathForAProgramThatIsNoLongerThere) {
-  const LocalProcesses processes(lists);
+  const LocalProcesses processes(world.lists);
   std::string program = pathOf("program (deleted)");
   fs::copy_file("/bin/sleep", program);
   std::string forever = "infinity";
@@ -180,7 +174,7 @@ TEST_F(ADevice, SpeaksTheLanguageStatedElseThatOfTheEnvironment) {
     EXPECT_EQ(locale.decimalString(std::numeric_limits<std::uint64_t>::max()), text);
   }
   for (const auto* name : {"LC_ALL", "LC_MESSAGES", "LANG"}) ::unsetenv(name);
-  EXPECT_THAT(errors(), IsEmpty());
+  EXPECT_THAT(world.errors(), IsEmpty());
 }
 
 class AnAccount : public ADevice {
@@ -223,10 +217,10 @@ TEST_F(AnAccount, IsTheOneThatTheFileHolds) {
   EXPECT_EQ(store.primaryAccount()->altDSID, std::nullopt);
   EXPECT_FALSE(store.authenticationAccountFor({}));
   EXPECT_FALSE(store.storeAccountFor({}));
-  EXPECT_THAT(errors(), IsEmpty());
+  EXPECT_THAT(world.errors(), IsEmpty());
   fs::permissions(pathOf("Accounts.plist"), fs::perms::group_write, fs::perm_options::add);
   EXPECT_FALSE(store.primaryAccount());
-  EXPECT_THAT(errors(), SizeIs(1));
+  EXPECT_THAT(world.errors(), SizeIs(1));
 }
 
 TEST_F(AnAccount, IsRenewedAsScriptedUntilTheFileChanges) {

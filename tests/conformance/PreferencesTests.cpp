@@ -1,9 +1,6 @@
 #include "conformance/FileWorld.h"
 #include "platform/FilePreferences.h"
 
-#include <cerrno>
-#include <cmath>
-#include <limits>
 #include <thread>
 
 namespace kvr {
@@ -23,15 +20,9 @@ struct Process {
 class APreference : public InBothWorlds {
  protected:
   std::string pathOf(const std::string& domain) { return folder + "/" + domain + ".plist"; }
-  Value stored() {
-    const auto bytes = world.get(pathOf(kDomain));
-    return bytes ? *readPropertyList(*bytes) : Value();
-  }
+  Value stored() { return world.tree(pathOf(kDomain)); }
   /// A new one at every writing.
   std::uint64_t inodeOfDomain() { return world.files().stamp(pathOf(kDomain)).value_or(FileStamp{}).inode; }
-  void put(const std::string& domain, const Value& tree) {
-    world.put(pathOf(domain), *writePropertyList(tree, PropertyListEncoding::XML));
-  }
 
   const std::string folder = world.path("Library/Preferences");
   Process process{world.files(), world};
@@ -68,7 +59,7 @@ TEST_P(APreference, KeepsEveryKindOfValueAndSeesChangesFromOutside) {
                             Dictionary{{"k", "v"}}};
   preferences.setObject(value, "key");
   EXPECT_EQ(preferences.objectForKey("key"), value);
-  put(kDomain, Dictionary{{"key", "from outside"}, {"other", 1}});
+  world.putTree(pathOf(kDomain), Dictionary{{"key", "from outside"}, {"other", 1}});
   EXPECT_EQ(preferences.objectForKey("key"), Value("from outside"));
   preferences.setObject(2, "key");
   EXPECT_EQ(stored(), Value(Dictionary{{"key", 2}, {"other", 1}}));
@@ -94,9 +85,8 @@ TEST_P(APreference, IsWrittenOnlyWhenItChanges) {
 }
 
 TEST_P(APreference, OfAnotherDomainIsReadWhereTheNameLeadsNowhereElse) {
-  put("com.tarsil.Widgetry", Dictionary{{"size", "L"}});
-  world.put(world.path("Library/outside.plist"),
-            *writePropertyList(Dictionary{{"size", "X"}}, PropertyListEncoding::XML));
+  world.putTree(pathOf("com.tarsil.Widgetry"), Dictionary{{"size", "L"}});
+  world.putTree(world.path("Library/outside.plist"), Dictionary{{"size", "X"}});
   EXPECT_EQ(preferences.objectForKey("size", "com.tarsil.Widgetry"), Value("L"));
   preferences.registerDefaults({{"size", "default"}});
   const std::string domains[] = {
@@ -116,7 +106,7 @@ TEST_P(APreference, OfADomainThatCannotBeReadIsNeverOverwritten) {
   preferences.setObjects({{"b", 2}, {"c", 3}});
   EXPECT_EQ(world.get(pathOf(kDomain)), large);
   EXPECT_THAT(
-      world.log.texts(LogLevel::Error),
+      world.errors(),
       ElementsAre(HasSubstr("cannot be read"), HasSubstr("preference a is not changed"),
                   HasSubstr("preference a is not changed"), HasSubstr("preference b, c is not changed")));
 }

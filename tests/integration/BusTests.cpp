@@ -3,8 +3,6 @@
 #include "unit/platform/Trees.h"
 
 #include <atomic>
-#include <cmath>
-#include <limits>
 #include <numeric>
 
 namespace kvr::testing {

@@ -7,9 +7,7 @@
 #include <sys/mman.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cstring>
-#include <limits>
 
 namespace kvr::testing {
 namespace {

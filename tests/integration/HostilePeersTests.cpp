@@ -1,6 +1,5 @@
 #include "integration/support/AgentWorld.h"
 
-#include <algorithm>
 #include <chrono>
 #include <fstream>
 

@@ -5,7 +5,6 @@
 
 #include <httplib.h>
 
-#include <algorithm>
 #include <iterator>
 #include <stdexcept>
 

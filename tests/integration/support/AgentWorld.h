@@ -6,8 +6,6 @@
 #include "integration/support/RawBusClient.h"
 #include "integration/support/TemporaryDirectory.h"
 
-#include <memory>
-
 namespace kvr::testing {
 
 /// A phone with two watches, its coverage service and its agent: the real programs on a bus of their own. The

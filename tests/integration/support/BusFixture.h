@@ -14,7 +14,6 @@
 #include <stdlib.h>
 
 #include <future>
-#include <memory>
 #include <mutex>
 
 namespace kvr::testing {

@@ -3,8 +3,6 @@
 #include "scheduling/KVRScheduler.h"
 #include "unit/followup/OfferWorld.h"
 
-#include <cmath>
-
 namespace kvr {
 namespace {
 

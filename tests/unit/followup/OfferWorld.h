@@ -5,8 +5,6 @@
 #include "platform/FollowUpCenter.h"
 #include "unit/CoverageWorld.h"
 
-#include <algorithm>
-
 namespace kvr {
 
 /// A world with offers, whose dates are given in days from now.

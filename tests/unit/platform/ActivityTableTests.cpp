@@ -1,8 +1,6 @@
 #include "Prelude.h"
 #include "platform/ActivityTable.h"
 
-#include <limits>
-
 namespace kvr {
 namespace {
 

@@ -1,8 +1,6 @@
 #include "platform/BinaryPropertyList.h"
 #include "unit/platform/Trees.h"
 
-#include <cmath>
-
 namespace kvr {
 namespace {
 

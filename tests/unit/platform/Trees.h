@@ -4,8 +4,6 @@
 #include "platform/JSON.h"
 #include "platform/UTF8.h"
 
-#include <limits>
-
 namespace kvr {
 
 /// Every kind of leaf that JSON, XML and the binary encoding all hold, where they are hardest to hold.

@@ -1,9 +1,6 @@
 #include "Prelude.h"
 #include "platform/Value.h"
 
-#include <cmath>
-#include <limits>
-
 namespace kvr {
 namespace {
 

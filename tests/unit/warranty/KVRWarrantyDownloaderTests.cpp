@@ -3,8 +3,6 @@
 #include "warranty/CacheMetadata.h"
 #include "warranty/KVRWarrantyDownloader.h"
 
-#include <cerrno>
-
 namespace kvr {
 namespace {
 
