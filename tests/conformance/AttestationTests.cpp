@@ -51,8 +51,7 @@ bool isSignatureOf(const std::string& signature, const std::string& message, con
 }
 
 /// Files that look as old as they can be, and differ from one another by their content alone.
-class OldFiles : public LocalFiles {
- public:
+struct OldFiles : LocalFiles {
   using LocalFiles::LocalFiles;
 
   std::optional<FileStamp> stamp(const std::string& path) override {
@@ -71,8 +70,7 @@ class OldFiles : public LocalFiles {
   int readings = 0;  ///< of keys and certificates
 };
 
-class AnAttestation : public ::testing::Test {
- protected:
+struct AnAttestation : ::testing::Test {
   AnAttestation() {
     properties_.answers["SerialNumber"] = "C39SERIAL";
     properties_.answers["ProductType"] = "Phone14,2";

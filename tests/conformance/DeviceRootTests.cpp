@@ -20,8 +20,7 @@ namespace {
 
 namespace fs = std::filesystem;
 
-class ADevice : public ::testing::Test {
- protected:
+struct ADevice : ::testing::Test {
   ADevice() { fs::permissions(pathOf(""), fs::perms::owner_all); }
 
   std::string pathOf(const std::string& file) { return world.path(file); }
@@ -177,8 +176,7 @@ TEST_F(ADevice, SpeaksTheLanguageStatedElseThatOfTheEnvironment) {
   EXPECT_THAT(world.errors(), IsEmpty());
 }
 
-class AnAccount : public ADevice {
- protected:
+struct AnAccount : ADevice {
   using Outcome = std::pair<std::int64_t, std::string>;
 
   static Value tree(const Value& renewal, const std::string& altDSID = "alt") {

@@ -77,13 +77,11 @@ class FileWorld {
 };
 
 /// A test that runs in both worlds.
-class InBothWorlds : public ::testing::TestWithParam<bool> {
- public:
+struct InBothWorlds : ::testing::TestWithParam<bool> {
   static std::string nameOf(const ::testing::TestParamInfo<bool>& info) {
     return info.param ? "Local" : "Simulated";
   }
 
- protected:
   FileWorld world{GetParam()};
 };
 

@@ -77,8 +77,7 @@ TEST_P(AFile, IsRenamedOverAnotherOnlyWhereThatIsAsked) {
   EXPECT_THAT(world.names(), IsEmpty());
 }
 
-class APropertyListFile : public InBothWorlds {
- protected:
+struct APropertyListFile : InBothWorlds {
   Value read(WhenDamaged whenDamaged = WhenDamaged::SetAside, Expected expected = Expected::Dictionary) {
     const auto tree = lists.read(path, expected, whenDamaged);
     EXPECT_TRUE(tree) << describe(tree.error());
@@ -152,8 +151,7 @@ TEST_P(APropertyListFile, KeepsItsContentWhenANewOneCannotBeWritten) {
   EXPECT_EQ(read()["a"], Value(1));
 }
 
-class ASimulatedPropertyListFile : public ::testing::Test {
- protected:
+struct ASimulatedPropertyListFile : ::testing::Test {
   SimulatedClock clock;
   SimulatedLog log;
   SimulatedFiles files{clock};
@@ -186,8 +184,7 @@ TEST_F(ASimulatedPropertyListFile, IsNotOverwrittenWhenItIsDamagedAndCannotBeSet
   EXPECT_EQ(files.get("/a"), "garbage {");
 }
 
-class LocalFilesOf : public ::testing::Test {
- protected:
+struct LocalFilesOf : ::testing::Test {
   TemporaryDirectory directory;
   const std::string home = directory.path().string();
   SimulatedLog log;
@@ -248,8 +245,7 @@ TEST_F(LocalFilesOf, ADirectoryAreLockedAgainstOtherProcessesWhileThatIsPossible
   EXPECT_TRUE(isLocked());
 }
 
-class ALogLine : public ::testing::Test {
- protected:
+struct ALogLine : ::testing::Test {
   std::string written() const { return contentOfFile(path).value_or(""); }
 
   TemporaryDirectory directory;

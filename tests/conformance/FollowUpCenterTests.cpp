@@ -14,8 +14,7 @@ FollowUpItem itemNamed(const std::string& identifier) {
   return item;
 }
 
-class AFollowUpCenter : public InBothWorlds {
- protected:
+struct AFollowUpCenter : InBothWorlds {
   std::vector<std::string> pending() {
     std::vector<std::string> names;
     const auto items = client->pendingItems();

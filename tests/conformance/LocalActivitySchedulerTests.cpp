@@ -67,8 +67,7 @@ struct Start {
   LocalActivityScheduler scheduler;
 };
 
-class ALocalScheduler : public ::testing::Test {
- protected:
+struct ALocalScheduler : ::testing::Test {
   ALocalScheduler() { writeFile(device + "/boot_id", "one\n"); }
   std::unique_ptr<Start> start() { return std::make_unique<Start>(world, properties, world.clock); }
   Value stored() { return world.tree(path); }

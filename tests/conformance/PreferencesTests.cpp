@@ -17,8 +17,7 @@ struct Process {
   FilePreferences preferences;
 };
 
-class APreference : public InBothWorlds {
- protected:
+struct APreference : InBothWorlds {
   std::string pathOf(const std::string& domain) { return folder + "/" + domain + ".plist"; }
   Value stored() { return world.tree(pathOf(kDomain)); }
   /// A new one at every writing.

@@ -25,8 +25,7 @@ struct QueuesWorld {
 };
 
 /// The main event loop has a thread of its own here, so that the test's thread may wait.
-class LocalQueuesWorld : public QueuesWorld {
- public:
+struct LocalQueuesWorld : QueuesWorld {
   LocalQueuesWorld() {
     std::promise<void> ready;
     thread_ = std::thread([this, &ready] {
@@ -57,8 +56,7 @@ class LocalQueuesWorld : public QueuesWorld {
   std::thread thread_;
 };
 
-class SimulatedQueuesWorld : public QueuesWorld {
- public:
+struct SimulatedQueuesWorld : QueuesWorld {
   WorkQueues& queues() override { return queues_; }
   void beginEnding() override { queues_.beginEnding(); }
   std::vector<std::string> failures() const override { return queues_.faults(); }
@@ -68,8 +66,7 @@ class SimulatedQueuesWorld : public QueuesWorld {
   SimulatedWorkQueues queues_{clock_, 1};
 };
 
-class WorkQueuesTest : public ::testing::TestWithParam<bool> {
- protected:
+struct WorkQueuesTest : ::testing::TestWithParam<bool> {
   WorkQueues& queues() { return world->queues(); }
   std::shared_ptr<Signal> newSignal() { return queues().newSignal(); }
   WorkQueueRef serial() { return queues().newSerialQueue("test"); }

@@ -11,8 +11,7 @@ using World = AgentWorld;
 constexpr double kDay = 86400;
 
 /// A device on which the agent has never run, whose every warranty carries an offer that is due.
-class ANewDevice : public ::testing::Test {
- protected:
+struct ANewDevice : ::testing::Test {
   ANewDevice() {
     using Seconds = std::chrono::duration<double>;
     const auto now = std::chrono::duration_cast<Seconds>(std::chrono::system_clock::now().time_since_epoch());

@@ -7,8 +7,7 @@ namespace {
 
 using World = AgentWorld;
 
-class TheAgent : public ::testing::Test {
- protected:
+struct TheAgent : ::testing::Test {
   Value label(const Value& info) const { return World::warrantyIn(info)["coverageLocalizedLabel"]; }
 
   AgentWorld world;

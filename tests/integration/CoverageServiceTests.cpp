@@ -48,8 +48,7 @@ struct Identity {
   }
 };
 
-class ACoverageService : public ::testing::Test {
- protected:
+struct ACoverageService : ::testing::Test {
   ACoverageService() {
     directory_.write("coverage/default.json", R"({"from":"default"})");
     directory_.write("Accounts.plist",

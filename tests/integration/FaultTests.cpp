@@ -70,8 +70,7 @@ std::vector<Store> allStores() {
           {"Keys", 4, 1, nothing, refresh(World::kPhone)}};
 }
 
-class TheAgentsStores : public ::testing::Test {
- protected:
+struct TheAgentsStores : ::testing::Test {
   /// What the files of a store hold, by their names.
   using State = Dictionary;
 

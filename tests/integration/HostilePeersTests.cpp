@@ -15,8 +15,7 @@ constexpr const char* kNoObject = "org.freedesktop.DBus.Error.UnknownObject";
 
 /// The agent, beside whose hostile peers a polite one is always served, and whose memory and descriptors stay
 /// where they were.
-class TheAgentAmongHostilePeers : public ::testing::Test {
- protected:
+struct TheAgentAmongHostilePeers : ::testing::Test {
   void begin() {
     world.startAgent();
     polite = std::make_unique<RawBusClient>(world.newClient());

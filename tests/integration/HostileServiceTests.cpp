@@ -17,8 +17,7 @@ std::string endless(const std::string& bytes, const std::string& repeated) {
   return raw(bytes, R"("repeat":")" + repeated + "\"");
 }
 
-class TheAgentOfAHostileService : public ::testing::Test {
- protected:
+struct TheAgentOfAHostileService : ::testing::Test {
   TheAgentOfAHostileService() {
     world.startAgent();
     EXPECT_EQ(World::warrantyIn(World::info(client, World::kFirstWatch, World::Refresh))["covered"],

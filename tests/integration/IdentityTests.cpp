@@ -23,8 +23,7 @@ struct Launch {
   std::function<void()> beforeItCalls{};  ///< it has connected, and waits
 };
 
-class TheAgentsPeer : public ::testing::Test {
- protected:
+struct TheAgentsPeer : ::testing::Test {
   TheAgentsPeer() {
     // Another user can get at the bus and the programs. What a member does is done at once.
     fs::permissions(busDirectory(), fs::perms(0711));

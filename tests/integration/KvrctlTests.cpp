@@ -10,8 +10,7 @@ namespace kvr::testing {
 namespace {
 
 /// The command-line client on a bus where this process plays the agent.
-class Kvrctl : public BusFixture {
- protected:
+struct Kvrctl : BusFixture {
   struct Outcome {
     int status;
     std::string output;

@@ -20,8 +20,7 @@ namespace kvr::testing {
 
 /// A service on a bus of its own, in this process, that does what a test tells it; its clients, too, are this
 /// program.
-class BusFixture : public ::testing::Test, public ServiceListenerDelegate {
- protected:
+struct BusFixture : ::testing::Test, ServiceListenerDelegate {
   static constexpr std::string_view kEntitlement = "com.example.entitlement";
   /// Long enough for the slowest machine under a sanitizer; only ever spent on a failure.
   static constexpr std::chrono::seconds kLimit{60};

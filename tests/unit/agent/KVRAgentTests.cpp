@@ -5,8 +5,7 @@
 namespace kvr {
 namespace {
 
-class AnAgent : public CoverageTest {
- protected:
+struct AnAgent : CoverageTest {
   AnAgent() : agent(KVRAgent::initWithCallingProcessBundleID(world.platform, "com.example.client")) {
     world.featureFlags.enabled.insert({"Kavrel", "Bravik_3_0"});
   }

@@ -6,8 +6,7 @@ namespace kvr {
 namespace {
 
 /// A warranty provider whose facts are plain fields.
-class FakeWarrantyProvider : public KVRAgentWarrantyProvider {
- public:
+struct FakeWarrantyProvider : KVRAgentWarrantyProvider {
   KVRWarrantyRef cached;
   KVRWarrantyRef downloaded;
   std::optional<Date> lastUpdated;
@@ -43,8 +42,7 @@ class FakeWarrantyProvider : public KVRAgentWarrantyProvider {
   void setMigrationVersion(std::int32_t) override {}
 };
 
-class ALookup : public SimulatedTest {
- protected:
+struct ALookup : SimulatedTest {
   ALookup()
       : provider(std::make_shared<FakeWarrantyProvider>()),
         agent(std::make_shared<KVRAgent>(world.platform, provider, nullptr)),

@@ -7,8 +7,7 @@ namespace {
 
 constexpr const char* kLegacyFile = "/home/user/Library/Application Support/com.tarsil.Kavrel/Warranty.plist";
 
-class Migration : public AnOfferTest {
- protected:
+struct Migration : AnOfferTest {
   std::vector<std::string> pendingIdentifiers() {
     std::vector<std::string> identifiers;
     for (const auto& item : pending()) identifiers.push_back(*item.uniqueIdentifier);

@@ -6,8 +6,7 @@
 namespace kvr {
 namespace {
 
-class TheService : public SimulatedTest {
- protected:
+struct TheService : SimulatedTest {
   auto connect(Dictionary entitlements) {
     auto client = world.services.connect(kServiceName, {std::move(entitlements), 1234});
     world.queues.run();

@@ -20,8 +20,7 @@ TEST(ADevice, KeepsItsPropertiesThroughItsCodedForm) {
   EXPECT_EQ(wrong->description(), bare.description()) << "a wrong kind is an absent property";
 }
 
-class ADeviceInfo : public SimulatedTest {
- protected:
+struct ADeviceInfo : SimulatedTest {
   KVRWarrantyRef warranty(bool display) {
     return KVRWarranty::initWithDictionary(
         world.platform, Dictionary{{"zubOfferEligibleUntil", 86400},
@@ -42,8 +41,7 @@ TEST_F(ADeviceInfo, TellsItsOfferAndDecodesPartByPart) {
   EXPECT_NE(half->warranty(), nullptr);
 }
 
-class TheDevicesManager : public CoverageTest {
- protected:
+struct TheDevicesManager : CoverageTest {
   TheDevicesManager() {
     world.featureFlags.enabled.insert({"Kavrel", "Bravik_3_0"});
     world.pairedDevices.devices = {

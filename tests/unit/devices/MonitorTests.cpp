@@ -9,8 +9,7 @@
 namespace kvr {
 namespace {
 
-class Monitors : public AnOfferTest {
- protected:
+struct Monitors : AnOfferTest {
   Monitors() {
     world.featureFlags.enabled.insert({"Kavrel", "Bravik_3_0"});
     world.coverage = [this](const HTTPRequest&) { return HTTPResponse{200, *writeJSON(coverage), {}}; };

@@ -6,8 +6,7 @@
 namespace kvr {
 namespace {
 
-class AFollowUpActivity : public AnOfferTest {
- protected:
+struct AFollowUpActivity : AnOfferTest {
   /// The date in days from now, to a thousandth.
   std::optional<double> days(std::optional<Date> date) const {
     if (!date) return std::nullopt;

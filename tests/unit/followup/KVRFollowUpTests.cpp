@@ -15,8 +15,7 @@ FollowUpItem item(const char* identifier, std::uint64_t displayStyle = 0) {
 }
 
 /// Refuses what it is told to, and remembers the calls.
-class RecordingProvider : public KVRFollowUpProvider {
- public:
+struct RecordingProvider : KVRFollowUpProvider {
   std::vector<FollowUpItem> pending;
   std::optional<Error> postError, clearError, listError;
   std::vector<FollowUpItem> posts;
@@ -37,8 +36,7 @@ class RecordingProvider : public KVRFollowUpProvider {
   }
 };
 
-class AFollowUp : public AnOfferTest {
- protected:
+struct AFollowUp : AnOfferTest {
   KVRFollowUp followUp{world.platform};
   const std::shared_ptr<RecordingProvider> provider = std::make_shared<RecordingProvider>();
   KVRFollowUp recorded{world.platform, provider};

@@ -8,8 +8,7 @@
 namespace kvr {
 
 /// A world with offers, whose dates are given in days from now.
-class AnOfferTest : public CoverageTest {
- protected:
+struct AnOfferTest : CoverageTest {
   static constexpr double kDay = 86400;
 
   Date inDays(double days) const { return world.clock.now() + days * kDay; }

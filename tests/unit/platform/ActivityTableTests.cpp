@@ -8,8 +8,7 @@ constexpr auto kFinished = ActivityResult::Finished;
 constexpr auto kDeferred = ActivityResult::Deferred;
 const ActivityBlock kBlock = [](const ActivityHandler&) {};
 
-class AnActivityTable : public ::testing::Test {
- protected:
+struct AnActivityTable : ::testing::Test {
   /// What starts now, by name.
   std::vector<std::string> started() {
     std::vector<std::string> names;

@@ -12,8 +12,7 @@ namespace kvr {
 namespace {
 
 /// The agent's activities in a world whose coverage service answers from a table.
-class TheAgentsLife : public AnOfferTest {
- protected:
+struct TheAgentsLife : AnOfferTest {
   std::map<std::string, Value> warranties;  ///< by serial number; the others' downloads fail
 
   TheAgentsLife() {

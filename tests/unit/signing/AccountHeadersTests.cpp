@@ -7,8 +7,7 @@ namespace {
 
 constexpr const char* kService = "com.tarsil.vornic.supportapp.auth";
 
-class ACoverageRequest : public CoverageTest {
- protected:
+struct ACoverageRequest : CoverageTest {
   bool sign(bool force) { return kvr_signWithAccountHeaders(world.platform, request, force, true); }
 
   HTTPRequest request;

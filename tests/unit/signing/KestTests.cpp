@@ -26,8 +26,7 @@ std::string certificate(unsigned seed) {
   return bytes;
 }
 
-class DeviceAttestationHeaders : public SimulatedTest {
- protected:
+struct DeviceAttestationHeaders : SimulatedTest {
   DeviceAttestationHeaders() {
     world.attestation.preferred.chain = chain;
     world.attestation.fallback.chain = chain;

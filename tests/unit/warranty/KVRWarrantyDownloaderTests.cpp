@@ -11,8 +11,7 @@ struct Answer {
   KVRWarrantyRef warranty;
 };
 
-class ADownload : public CoverageTest {
- protected:
+struct ADownload : CoverageTest {
   Answer download(const std::optional<std::string>& serialNumber) {
     std::vector<Answer> answers;
     const auto downloader = std::make_shared<KVRWarrantyDownloader>(world.platform, "com.example.client");

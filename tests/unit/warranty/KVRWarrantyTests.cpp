@@ -5,8 +5,7 @@
 namespace kvr {
 namespace {
 
-class AWarranty : public SimulatedTest {
- protected:
+struct AWarranty : SimulatedTest {
   AWarranty() { world.clock.set(Date{1'800'000'000}); }
 
   std::shared_ptr<KVRWarranty> from(const Value& dictionary) {
