@@ -1,6 +1,5 @@
 #include "followup/KVRFollowUpPost.h"
 #include "followup/KVRFollowUpRefresh.h"
-#include "scheduling/KVRScheduler.h"
 #include "unit/followup/OfferWorld.h"
 
 namespace kvr {
@@ -12,23 +11,17 @@ struct AFollowUpActivity : AnOfferTest {
     if (!date) return std::nullopt;
     return std::round((*date - world.clock.now()) / kDay * 1000) / 1000;
   }
-  std::optional<double> targetDays(const char* identifier) {
-    return days(world.preferences.dateForKey(std::string(identifier) + ".TargetDate"));
-  }
+  std::optional<double> targetDays(const char* identifier) { return days(target(identifier)); }
   /// Runs an activity whose devices are `list`; its result.
   template <class Activity>
-  std::optional<ActivityResult> run(std::optional<KVRDeviceInfoList> list, std::uint64_t* policy = nullptr) {
-    std::optional<ActivityResult> result;
-    const auto activity =
-        std::make_shared<Activity>(world.platform, [&](std::uint64_t asked, const DeviceInfosAnswer& answer) {
-          if (policy != nullptr) *policy = asked;
-          answer(list);
-        });
-    activity->performActivityForScheduler(
-        KVRScheduler::newSchedulerWithActivityDelegate(world.platform, activity),
-        ActivityHandler(world.log, "test", [&](ActivityResult it) { result = it; }));
-    return result;
+  std::optional<ActivityResult> runWith(const std::optional<KVRDeviceInfoList>& list) {
+    return run<Activity>([this, list](std::uint64_t asked, const DeviceInfosAnswer& answer) {
+      policy = asked;
+      answer(list);
+    });
   }
+
+  std::uint64_t policy = 0;  ///< that the last one asked for
 };
 
 TEST_F(AFollowUpActivity, FindsTheNextPostDate) {
@@ -93,9 +86,7 @@ TEST_F(AFollowUpActivity, PostsAndSchedulesWhatFollows) {
   for (const auto& [list, post, refresh] : cases) {
     KVRScheduler::clearScheduledActivities(world.platform);
     world.log.clear();
-    std::uint64_t policy = 0;
-    EXPECT_EQ(run<KVRFollowUpPost>(list, &policy),
-              list ? ActivityResult::Finished : ActivityResult::Deferred);
+    EXPECT_EQ(runWith<KVRFollowUpPost>(list), list ? ActivityResult::Finished : ActivityResult::Deferred);
     EXPECT_EQ(policy, 2U);
     EXPECT_EQ(targetDays(activity::kFollowUpPost), post);
     EXPECT_EQ(targetDays(activity::kFollowUpRefresh), refresh);
@@ -120,26 +111,24 @@ TEST_F(AFollowUpActivity, DropsTheAnswerOfAPostRunThatWasDeferredMeanwhile) {
   held[0](KVRDeviceInfoList{info("A", due(5), inDays(-9))});
   EXPECT_THAT(pendingSerials(), ElementsAre("A")) << "the work is done all the same";
   EXPECT_EQ(world.log.count("activity run was answered already, result 1 dropped"), 1U);
-  EXPECT_TRUE(world.preferences.dateForKey("com.tarsil.kvragent.followuppost.TargetDate").has_value());
+  EXPECT_TRUE(target(activity::kFollowUpPost).has_value());
 }
 
 TEST_F(AFollowUpActivity, RefreshesForAsLongAsAnythingIsShown) {
-  const auto ended = run<KVRFollowUpRefresh>(KVRDeviceInfoList{info("A", due(2.5))});
-  EXPECT_EQ(ended, ActivityResult::Finished);
+  EXPECT_EQ(runWith<KVRFollowUpRefresh>({{info("A", due(2.5))}}), ActivityResult::Finished);
   EXPECT_EQ(world.log.count("No followups present, don't schedule another refresh"), 1U);
   EXPECT_EQ(targetDays(activity::kFollowUpRefresh), std::nullopt);
 
-  run<KVRFollowUpPost>(KVRDeviceInfoList{info("A", due(2.5), inDays(-9))});
+  const KVRDeviceInfoList shown{info("A", due(2.5), inDays(-9))};
+  runWith<KVRFollowUpPost>(shown);
   for (const double day : {86400., 0., -5., 1e-3}) {
     world.preferences.setObject(day, preference::kOneDayInterval);
-    std::uint64_t policy = 0;
-    EXPECT_EQ(run<KVRFollowUpRefresh>(KVRDeviceInfoList{info("A", due(2.5), inDays(-9))}, &policy),
-              ActivityResult::Finished);
+    EXPECT_EQ(runWith<KVRFollowUpRefresh>(shown), ActivityResult::Finished);
     EXPECT_EQ(policy, 1U);
     EXPECT_GE(targetDays(activity::kFollowUpRefresh), day > 60 ? 0.5 : std::round(60 / kDay * 1000) / 1000);
   }
   EXPECT_TRUE(world.log.contains("Schedule next refresh for " + describe(inDays(0.5))));
-  EXPECT_EQ(run<KVRFollowUpRefresh>(std::nullopt), ActivityResult::Deferred);
+  EXPECT_EQ(runWith<KVRFollowUpRefresh>(std::nullopt), ActivityResult::Deferred);
   EXPECT_EQ(world.log.count("Unable to load device info for followup refresh, defer"), 1U);
 }
 

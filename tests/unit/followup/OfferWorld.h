@@ -3,6 +3,8 @@
 #include "devices/KVRDeviceInfo.h"
 #include "followup/FollowUpKeys.h"
 #include "platform/FollowUpCenter.h"
+#include "scheduling/KVRScheduler.h"
+#include "scheduling/SchedulingKeys.h"
 #include "unit/CoverageWorld.h"
 
 namespace kvr {
@@ -55,6 +57,20 @@ struct AnOfferTest : CoverageTest {
     }
     world.log.clear();
     return lines;
+  }
+  std::optional<Date> target(const std::string& identifier) {
+    return world.preferences.dateForKey(identifier + preference::kTargetDateSuffix);
+  }
+  /// Runs an activity by itself; its result.
+  template <class Activity, class... Means>
+  std::optional<ActivityResult> run(Means... means) {
+    std::optional<ActivityResult> result;
+    const auto activity = std::make_shared<Activity>(world.platform, means...);
+    activity->performActivityForScheduler(
+        KVRScheduler::newSchedulerWithActivityDelegate(world.platform, activity),
+        ActivityHandler(world.log, "test", [&](ActivityResult it) { result = it; }));
+    world.queues.runUntil([&] { return result.has_value(); });
+    return result;
   }
   Array hashes(const char* key) {
     const auto list = world.preferences.objectForKey(key);

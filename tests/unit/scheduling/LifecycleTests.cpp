@@ -5,7 +5,6 @@
 #include "scheduling/KVROutreachActivityUtilities.h"
 #include "scheduling/KVRPostBootActivity.h"
 #include "scheduling/KVRPostUpgradeActivity.h"
-#include "scheduling/SchedulingKeys.h"
 #include "unit/followup/OfferWorld.h"
 
 namespace kvr {
@@ -16,7 +15,6 @@ struct TheAgentsLife : AnOfferTest {
   std::map<std::string, Value> warranties;  ///< by serial number; the others' downloads fail
 
   TheAgentsLife() {
-    world.featureFlags.enabled.insert({"Kavrel", "Bravik_3_0"});
     world.preferences.setObject("https://assets.example/kvrV2.plist", preference::kServerVersionURL);
     world.coverage = [this](const HTTPRequest& request) {
       const auto found = warranties.find((*readJSON(request.body))["serialNumber"].string());
@@ -24,25 +22,13 @@ struct TheAgentsLife : AnOfferTest {
       return HTTPResponse{200, *writeJSON(found->second), {}};
     };
   }
-  void pair(const std::string& serialNumber, double daysAgo) {
-    world.pairedDevices.devices.push_back({"Watch", "Model", serialNumber, inDays(-daysAgo), true, false});
-  }
-  std::optional<Date> target(const char* identifier) {
-    return world.preferences.dateForKey(std::string(identifier) + ".TargetDate");
-  }
   void setTarget(const char* identifier, Date date) {
     world.preferences.setObject(date, std::string(identifier) + ".TargetDate");
   }
   template <class Activity>
   std::optional<ActivityResult> run() {
-    std::optional<ActivityResult> result;
-    const auto activity = std::make_shared<Activity>(world.platform);
     world.log.clear();
-    activity->performActivityForScheduler(
-        KVRScheduler::newSchedulerWithActivityDelegate(world.platform, activity),
-        ActivityHandler(world.log, "test", [&](ActivityResult it) { result = it; }));
-    world.queues.runUntil([&] { return result.has_value(); });
-    return result;
+    return AnOfferTest::run<Activity>();
   }
   void setOSVersions(const std::optional<std::string>& recorded, const std::optional<std::string>& current) {
     world.preferences.setObject(recorded, preference::kPostUpgradeOSVersion);
@@ -64,7 +50,7 @@ TEST_F(TheAgentsLife, SchedulesThePostAtTheEarliestDateOfAnOutreach) {
       {in10, in3, 3},   {in10, lasting, 5}, {excluded, in3, 3},  {off, before, -4},
       {none, in10, 10}, {none, none, {}},   {excluded, off, {}},
   };
-  pair("W", 100);
+  world.pair("W", inDays(-100));
   world.carriers.carriers = {{"1", {}}, {"2", {"001", "01"}}};
   for (const auto& [phone, watch, days] : cases) {
     for (const bool conversion : {false, true}) {

@@ -21,16 +21,16 @@ struct Client : SimulatedPlatform {
                                   {preference::kServerVersionURL, "https://assets.example/kvrV2.plist"}});
   }
   bool supported() {
-    std::optional<bool> answer;
-    Utilities::serverVersionSupported(
-        platform, Utilities::BoolCompletion(log, "test", [&](bool yes) { answer = yes; }));
-    queues.run();
-    return answer.value();
+    return answerTo([&](auto reply) { Utilities::serverVersionSupported(platform, std::move(reply)); });
   }
   bool highEnabled(std::uint64_t policy) {
+    return answerTo([&](auto reply) {
+      Utilities::isHighServerVersionFeaturesetEnabled(platform, policy, std::move(reply));
+    });
+  }
+  bool answerTo(const std::function<void(Utilities::BoolCompletion)>& ask) {
     std::optional<bool> answer;
-    Utilities::isHighServerVersionFeaturesetEnabled(
-        platform, policy, Utilities::BoolCompletion(log, "test", [&](bool yes) { answer = yes; }));
+    ask(Utilities::BoolCompletion(log, "test", [&](bool yes) { answer = yes; }));
     queues.run();
     return answer.value();
   }

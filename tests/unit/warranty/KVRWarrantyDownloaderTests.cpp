@@ -6,23 +6,21 @@
 namespace kvr {
 namespace {
 
-struct Answer {
-  bool success;
-  KVRWarrantyRef warranty;
-};
-
 struct ADownload : CoverageTest {
+  struct Answer {
+    bool success;
+    KVRWarrantyRef warranty;
+  };
   Answer download(const std::optional<std::string>& serialNumber) {
     std::vector<Answer> answers;
-    const auto downloader = std::make_shared<KVRWarrantyDownloader>(world.platform, "com.example.client");
-    downloader->downloadWarrantyForSerialNumber(
-        serialNumber,
-        DownloadCompletion(world.log, "test", [&](bool success, const KVRWarrantyRef& warranty) {
-          answers.push_back({success, warranty});
-        }));
+    const DownloadCompletion completion(world.log, "test", [&](bool success, const KVRWarrantyRef& warranty) {
+      answers.push_back({success, warranty});
+    });
+    std::make_shared<KVRWarrantyDownloader>(world.platform, "com.example.client")
+        ->downloadWarrantyForSerialNumber(serialNumber, completion);
     world.queues.runUntil([&] { return !answers.empty(); });
     EXPECT_EQ(answers.size(), 1U);
-    return answers.empty() ? Answer{} : answers[0];
+    return answers.at(0);
   }
   std::string cachedFile(const std::string& serialNumber) const {
     return "/home/user/Library/Application Support/com.tarsil.Kavrel/" + sha256Hash(serialNumber) +
