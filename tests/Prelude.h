@@ -37,6 +37,8 @@ using ::testing::Pair;
 using ::testing::SizeIs;
 using ::testing::UnorderedElementsAre;
 
+constexpr double kDay = 86400;
+
 /// How often a text holds another.
 inline std::size_t countOf(std::string_view part, std::string_view text) {
   std::size_t count = 0;

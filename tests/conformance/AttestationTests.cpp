@@ -12,7 +12,6 @@ namespace {
 
 namespace fs = std::filesystem;
 
-constexpr double kDay = 24 * 60 * 60;
 constexpr const char* kLabel = "com.tarsil.kvragent.kestCertificates";
 
 struct Answer {

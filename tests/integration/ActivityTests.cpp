@@ -6,10 +6,6 @@
 namespace kvr::testing {
 namespace {
 
-using World = AgentWorld;
-
-constexpr double kDay = 86400;
-
 /// A device on which the agent has never run, whose every warranty carries an offer that is due.
 struct ANewDevice : ::testing::Test {
   ANewDevice() {

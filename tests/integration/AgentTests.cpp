@@ -5,8 +5,6 @@
 namespace kvr::testing {
 namespace {
 
-using World = AgentWorld;
-
 struct TheAgent : ::testing::Test {
   Value label(const Value& info) const { return World::warrantyIn(info)["coverageLocalizedLabel"]; }
 

@@ -34,9 +34,7 @@ TEST_F(AService, DeliversTheCallsOfAConnectionInTheirOrderFromTheVeryFirst) {
 
 TEST_F(AService, LetsGoOfTheObjectWithItsConnectionEvenInTheMiddleOfACall) {
   std::promise<ServiceReply> begun;
-  newBehaviour = [&] {
-    return [&](const std::string&, const Array&, const ServiceReply& reply) { begun.set_value(reply); };
-  };
+  behave([&](const std::string&, const Array&, const ServiceReply& reply) { begun.set_value(reply); });
   std::promise<void> gone;
   onObjectGone = [&] { gone.set_value(); };
   const auto serving = serve();
@@ -54,15 +52,13 @@ TEST_F(AService, LetsGoOfTheObjectWithItsConnectionEvenInTheMiddleOfACall) {
 
 TEST_F(AService, AnswersWithAnErrorWhatItCannotServe) {
   std::atomic<int> served = 0;
-  newBehaviour = [&] {
-    return [&](const std::string&, const Array& arguments, const ServiceReply& reply) {
-      ++served;
-      if (arguments.at(0) == Value("throw")) throw std::runtime_error("a fault");
-      if (arguments.at(0) == Value("kind")) return reply(Value(7));
-      if (arguments.at(0) == Value("text")) return reply(Value(std::string("a\0b", 3)));
-      if (arguments.at(0) == Value("large")) return reply(Value(std::string(kMaximumBusValueSize + 1, 'x')));
-    };
-  };
+  behave([&](const std::string&, const Array& arguments, const ServiceReply& reply) {
+    ++served;
+    if (arguments.at(0) == Value("throw")) throw std::runtime_error("a fault");
+    if (arguments.at(0) == Value("kind")) return reply(Value(7));
+    if (arguments.at(0) == Value("text")) return reply(Value(std::string("a\0b", 3)));
+    if (arguments.at(0) == Value("large")) return reply(Value(std::string(kMaximumBusValueSize + 1, 'x')));
+  });
   const auto serving = serve();
   const RawBusClient client = newClient();
   const std::string failed = "org.freedesktop.DBus.Error.Failed";
@@ -75,12 +71,10 @@ TEST_F(AService, AnswersWithAnErrorWhatItCannotServe) {
 
 TEST_F(AService, TakesTheReplyFromAnyThreadAndSendsNoneThatIsNotExpected) {
   std::vector<std::string> served;
-  newBehaviour = [&] {
-    return [&](const std::string&, const Array& arguments, ServiceReply reply) {
-      served.push_back(arguments.at(0).string());
-      std::thread([reply = std::move(reply), value = arguments.at(0)] { reply(value); }).join();
-    };
-  };
+  behave([&](const std::string&, const Array& arguments, ServiceReply reply) {
+    served.push_back(arguments.at(0).string());
+    std::thread([reply = std::move(reply), value = arguments.at(0)] { reply(value); }).join();
+  });
   const auto serving = serve();
   const RawBusClient client = newClient();
   const BusMessageRef unanswered = client.newCall("EchoText", "s", {"unanswered"});
@@ -105,9 +99,7 @@ TEST_F(AService, IsLostWithoutItsName) {
 
 TEST_F(AService, EndsByGivingItsNameUpAndAnsweringWhatItHasTaken) {
   std::promise<ServiceReply> begun;
-  newBehaviour = [&] {
-    return [&](const std::string&, const Array&, const ServiceReply& reply) { begun.set_value(reply); };
-  };
+  behave([&](const std::string&, const Array&, const ServiceReply& reply) { begun.set_value(reply); });
   const auto serving = serve();
   const RawBusClient client = newClient();
   std::optional<std::string> answer;
@@ -134,15 +126,21 @@ TEST_F(AService, EndsByGivingItsNameUpAndAnsweringWhatItHasTaken) {
   EXPECT_EQ(answer, "the last");
 }
 
-Value nested(int depth, bool inArrays, Value innermost) {
-  for (int i = 1; i < depth; ++i) {
-    innermost =
-        inArrays ? Value(Array{std::move(innermost)}) : Value(Dictionary{{"k", std::move(innermost)}});
-  }
-  return innermost;
+Value nested(int depth, bool inArrays, Value tree) {
+  for (int i = 1; i < depth; ++i) tree = inArrays ? Value(Array{tree}) : Value(Dictionary{{"k", tree}});
+  return tree;
 }
 
-using AValueOnTheBus = BusFixture;
+struct AValueOnTheBus : BusFixture {
+  /// A value that the service was sent and has sent back.
+  Value echo(const char* member, const char* type, const Value& value) {
+    return client.value(type, client.call(member, type, {value}));
+  }
+  Value echo(const Value& record) { return echo("EchoRecord", "a{sv}", record); }
+
+  const std::shared_ptr<void> serving = serve();
+  const RawBusClient client = newClient();
+};
 
 TEST_F(AValueOnTheBus, ComesBackAsItWasWherever) {
   const std::string startOfList = "bplist00 and more";
@@ -162,12 +160,6 @@ TEST_F(AValueOnTheBus, ComesBackAsItWasWherever) {
   };
   const Value others = treeForEveryEncoding();
   hard.insert(others.dictionary().begin(), others.dictionary().end());
-
-  const auto serving = serve();
-  const RawBusClient client = newClient();
-  const auto echo = [&](const Value& record) {
-    return client.value("a{sv}", client.call("EchoRecord", "a{sv}", {record}));
-  };
   for (const auto& [name, value] : hard) {
     const Value property = Dictionary{{"property", value}};
     const Value inRecord = Dictionary{{"record", property}};
@@ -179,26 +171,22 @@ TEST_F(AValueOnTheBus, ComesBackAsItWasWherever) {
   }
   EXPECT_TRUE(std::signbit(echo(Dictionary{{"zero", -0.0}})["zero"].real()));
   const Value records = Array{hard, Dictionary{}, Dictionary{{"record", hard}}};
-  EXPECT_EQ(client.value("aa{sv}", client.call("EchoRecords", "aa{sv}", {records})), records);
-  EXPECT_EQ(client.value("s", client.call("EchoText", "s", {"a\r\n\U0001F600"})), Value("a\r\n\U0001F600"));
-  EXPECT_EQ(client.value("d", client.call("EchoReal", "d", {0.1})), Value(0.1));
+  EXPECT_EQ(echo("EchoRecords", "aa{sv}", records), records);
+  EXPECT_EQ(echo("EchoText", "s", "a\r\n\U0001F600"), Value("a\r\n\U0001F600"));
+  EXPECT_EQ(echo("EchoReal", "d", 0.1), Value(0.1));
 }
 
 TEST_F(AValueOnTheBus, MayBeNestedToAnyDepthWithoutBreakingTheConnection) {
-  const auto serving = serve();
-  const RawBusClient client = newClient();
   for (int depth = 1; depth <= 70; ++depth) {
     for (const bool inArrays : {false, true}) {
       const Value innermost = depth % 2 ? Value(Date{1}) : Value(Value::Bytes{1});
       const Value tree = Dictionary{{"warranty", Dictionary{{"tree", nested(depth, inArrays, innermost)}}}};
       const Value records = Array{tree};
-      ASSERT_EQ(client.value("aa{sv}", client.call("EchoRecords", "aa{sv}", {records})), records) << depth;
+      ASSERT_EQ(echo("EchoRecords", "aa{sv}", records), records) << depth;
     }
   }
   const Value tooDeep = Dictionary{{"tree", nested(513, true, Array{})}};
-  newBehaviour = [&] {
-    return [&](const std::string&, const Array&, const ServiceReply& reply) { reply(tooDeep); };
-  };
+  behave([&](const std::string&, const Array&, const ServiceReply& reply) { reply(tooDeep); });
   const RawBusClient other = newClient();
   for (int i = 0; i < 2; ++i) {
     EXPECT_EQ(other.call("Record", "st", {"", 0}).error, "org.freedesktop.DBus.Error.Failed");
@@ -224,8 +212,6 @@ std::string signatureUnder(sd_bus_message* message, const std::vector<std::strin
 }
 
 TEST_F(AValueOnTheBus, HasTheTypesThatOtherClientsCountOn) {
-  const auto serving = serve();
-  const RawBusClient client = newClient();
   const auto signatureIn = [&](const Value& representation, const std::vector<std::string>& path) {
     const Value device = Dictionary{{"name", "a watch"}, {"activationDate", Date{1}}, {"deviceType", 1}};
     const Value warranty = Dictionary{{"DictionaryRepresentation", representation}};
@@ -252,8 +238,6 @@ TEST_F(AValueOnTheBus, HasTheTypesThatOtherClientsCountOn) {
 }
 
 TEST_F(AValueOnTheBus, ReadsAsNullWhereItsKindIsUnknown) {
-  const auto serving = serve();
-  const RawBusClient client = newClient();
   const BusMessageRef call = client.newCall("EchoRecord");
   ASSERT_GE(sd_bus_message_append(call.get(), "a{sv}", 6, "small", "y", 7, "path", "o", "/a", "list", "as", 1,
                                   "x", "struct", "(si)", "x", 1, "variant", "v", "s", "x", "last", "s", "x"),

@@ -13,9 +13,6 @@ namespace kvr::testing {
 namespace {
 
 namespace fs = std::filesystem;
-using World = AgentWorld;
-
-constexpr double kDay = 86400;
 /// Error lines that one failed call may lead to: what it broke, and the two of a download that came to
 /// nothing.
 constexpr std::size_t kMostComplaints = 3;

@@ -80,8 +80,8 @@ class ScriptedServer {
   ~ScriptedServer() {
     shutdown(listener_.get(), SHUT_RDWR);
     acceptor_.join();
-    for (const auto& connection : connections_) shutdown(connection.descriptor.get(), SHUT_RDWR);
-    for (auto& connection : connections_) connection.thread.join();
+    for (const auto& [descriptor, thread] : connections_) shutdown(descriptor.get(), SHUT_RDWR);
+    for (auto& [descriptor, thread] : connections_) thread.join();
   }
   ScriptedServer(const ScriptedServer&) = delete;
   ScriptedServer& operator=(const ScriptedServer&) = delete;
@@ -92,25 +92,18 @@ class ScriptedServer {
   int mostConnectionsAtOnce() const { return mostOpen_; }
 
  private:
-  struct Connection {
-    Descriptor descriptor;
-    std::thread thread;
-  };
-
   void accept() {
     while (true) {
       const int descriptor = ::accept(listener_.get(), nullptr, nullptr);
       if (descriptor < 0) return;
       ++accepted_;
       mostOpen_ = std::max<int>(mostOpen_, ++open_);
-      auto& connection = connections_.emplace_back();
-      connection.descriptor = Descriptor(descriptor);
-      connection.thread = std::thread([this, descriptor] {
-        Peer peer(descriptor);
-        script_(peer);
-        --open_;
-        shutdown(descriptor, SHUT_RDWR);
-      });
+      connections_.emplace_back(descriptor, std::thread([this, descriptor] {
+                                  Peer peer(descriptor);
+                                  script_(peer);
+                                  --open_;
+                                  shutdown(descriptor, SHUT_RDWR);
+                                }));
     }
   }
 
@@ -120,7 +113,7 @@ class ScriptedServer {
   std::atomic<int> accepted_{0};
   std::atomic<int> open_{0};
   std::atomic<int> mostOpen_{0};
-  std::list<Connection> connections_;
+  std::list<std::pair<Descriptor, std::thread>> connections_;
   std::thread acceptor_;
 };
 
@@ -180,11 +173,13 @@ TEST_F(OverHTTP, ARequestIsSentExactlyAsItWasGiven) {
   const std::string host = "Host: " + server.host() + "\r\n";
 
   HTTPRequest full = post(server.url("/a/../b?c=%20"), "{\"a\":1}");
-  full.headers.set("X-Second", "2");
-  full.headers.set("X-First", " padded\t");
-  full.headers.set("X-Empty", "");
-  full.headers.set("User-Agent", "<a/b/c>");
-  full.headers.set("Content-Type", "application/json");
+  for (const auto& [name, value] : {std::pair("X-Second", "2"),
+                                    {"X-First", " padded\t"},
+                                    {"X-Empty", ""},
+                                    {"User-Agent", "<a/b/c>"},
+                                    {"Content-Type", "application/json"}}) {
+    full.headers.set(name, value);
+  }
   HTTPRequest remove = get(server.url());
   remove.method = "DELETE";
   HTTPRequest getWithBody = get(server.url());

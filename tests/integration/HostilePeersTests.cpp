@@ -6,8 +6,6 @@
 namespace kvr::testing {
 namespace {
 
-using World = AgentWorld;
-
 constexpr const char* kLimits = "org.freedesktop.DBus.Error.LimitsExceeded";
 constexpr const char* kInvalid = "org.freedesktop.DBus.Error.InvalidArgs";
 constexpr const char* kUnknown = "org.freedesktop.DBus.Error.UnknownMethod";

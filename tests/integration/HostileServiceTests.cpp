@@ -5,8 +5,6 @@
 namespace kvr::testing {
 namespace {
 
-using World = AgentWorld;
-
 constexpr const char* kFailure = "kvragent failed to load warranty";
 
 /// A rule that has these bytes sent in an answer's place, and then others again and again.

@@ -26,21 +26,15 @@ struct Launch {
 struct TheAgentsPeer : ::testing::Test {
   TheAgentsPeer() {
     // Another user can get at the bus and the programs. What a member does is done at once.
-    fs::permissions(busDirectory(), fs::perms(0711));
+    fs::permissions(world.bus.directory(), fs::perms(0711));
     fs::permissions(world.directory.path(), fs::perms(0711));
     Dictionary preferences = world.preferences().dictionary();
     preferences["PostUpgradeOutreachDelay"] = 0;
-    world.directory.write("home/Library/Preferences/com.tarsil.kvragent.plist",
-                          *writePropertyList(preferences, PropertyListEncoding::Binary));
+    world.setPreferences(preferences);
     world.misbehave(R"([{"status":500}])");
     world.startAgent();
   }
 
-  fs::path busDirectory() const {
-    const auto& address = world.bus.address();
-    const auto from = address.find("path=") + 5;
-    return fs::path(address.substr(from, address.find(',') - from)).parent_path();
-  }
   fs::path device() const { return world.directory / "device"; }
   void grant(const fs::path& program, const Value& value = true) const {
     const Value entitlements = Dictionary{{"com.tarsil.private.kvragent", value}};

@@ -19,18 +19,13 @@ struct Kvrctl : BusFixture {
 
   Kvrctl() {
     entitle(true, kProgram);
-    newBehaviour = [this] {
-      return [this](const std::string& member, const Array& arguments, const ServiceReply& reply) {
-        const std::lock_guard lock(mutex_);
-        asked_ = member + describe(Value(arguments));
-        if (member == heldMember_) {
-          held_.push_back(reply);
-          isHeld_.set_value();
-        } else {
-          reply(answers_[member]);
-        }
-      };
-    };
+    behave([this](const std::string& member, const Array& arguments, const ServiceReply& reply) {
+      const std::lock_guard lock(mutex_);
+      asked_ = member + describe(Value(arguments));
+      if (member != heldMember_) return reply(answers_[member]);
+      held_.push_back(reply);
+      isHeld_.set_value();
+    });
   }
 
   ChildProcess start(std::vector<std::string> arguments) {

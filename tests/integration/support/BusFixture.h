@@ -63,16 +63,18 @@ struct BusFixture : ::testing::Test, ServiceListenerDelegate {
   RawBusClient newClient() const { return RawBusClient(bus.address()); }
   bool waitUntilLost() { return lost_.get_future().wait_for(kLimit) == std::future_status::ready; }
 
-  static const ServiceInterface& echoInterface() {
-    static const ServiceInterface kInterface{
-        RawBusClient::kInterface,
-        {{"EchoRecord", {{"record", "a{sv}"}}, {"record", "a{sv}"}},
-         {"EchoRecords", {{"records", "aa{sv}"}}, {"records", "aa{sv}"}},
-         {"EchoText", {{"text", "s"}}, {"text", "s"}},
-         {"EchoNumber", {{"number", "t"}}, {"number", "t"}},
-         {"EchoReal", {{"real", "d"}}, {"real", "d"}},
-         {"Record", {{"text", "s"}, {"number", "t"}}, {"record", "a{sv}"}}}};
-    return kInterface;
+  /// Has every object made from now on do this.
+  void behave(const Behaviour& behaviour) {
+    newBehaviour = [behaviour] { return behaviour; };
+  }
+  static ServiceInterface echoInterface() {
+    return {RawBusClient::kInterface,
+            {{"EchoRecord", {{"record", "a{sv}"}}, {"record", "a{sv}"}},
+             {"EchoRecords", {{"records", "aa{sv}"}}, {"records", "aa{sv}"}},
+             {"EchoText", {{"text", "s"}}, {"text", "s"}},
+             {"EchoNumber", {{"number", "t"}}, {"number", "t"}},
+             {"EchoReal", {{"real", "d"}}, {"real", "d"}},
+             {"Record", {{"text", "s"}, {"number", "t"}}, {"record", "a{sv}"}}}};
   }
   bool shouldAcceptNewConnection(ServiceConnection& connection) override {
     decisions.push_back(connection.valueForEntitlement(kEntitlement));
@@ -85,7 +87,7 @@ struct BusFixture : ::testing::Test, ServiceListenerDelegate {
 
   PrivateBus bus;
   SimulatedLog log;
-  /// What objects made from now on do. By default they reply what they were given.
+  /// What each object does. By default they reply what they were given.
   std::function<Behaviour()> newBehaviour = [] {
     return [](auto&, const Array& arguments, const ServiceReply& reply) { reply(arguments.at(0)); };
   };

@@ -17,6 +17,7 @@ class PrivateBus {
   /// The bus itself; what the programs it starts print as errors is printed there.
   ChildProcess& daemon() { return daemon_; }
   const std::string& address() const { return address_; }
+  const std::filesystem::path& directory() const { return directory_.path(); }
   /// Ends the bus the hard way; every connection is lost.
   void kill() { daemon_.kill(); }
 

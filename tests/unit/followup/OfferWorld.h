@@ -11,8 +11,6 @@ namespace kvr {
 
 /// A world with offers, whose dates are given in days from now.
 struct AnOfferTest : CoverageTest {
-  static constexpr double kDay = 86400;
-
   Date inDays(double days) const { return world.clock.now() + days * kDay; }
 
   /// The dictionary of an offer with all its texts; `more` goes over it.

@@ -97,7 +97,6 @@ TEST_F(AWarranty, TakesItsConversionDateFromTheFirstSourceThatHasOne) {
 }
 
 TEST_F(AWarranty, CountsTheDaysLeftAndChoosesTheOfferTextByThem) {
-  constexpr double kDay = 86400;
   const std::tuple<double, Value, std::uint32_t, const char*, const char*> cases[] = {
       {2 * kDay + 1, {}, 3, "3 days left", "within 3 days"},
       {1.5 * kDay, {}, 2, "2 days left", "within 2 days"},
