@@ -29,8 +29,6 @@ struct Start {
     queues.beginEnding();
     queues.drain(30);
   }
-  Start(const Start&) = delete;
-  Start& operator=(const Start&) = delete;
 
   ActivityBlock recorder(const std::string& name) {
     return [this, name](const ActivityHandler& handler) {

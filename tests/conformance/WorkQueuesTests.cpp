@@ -42,8 +42,6 @@ struct LocalQueuesWorld : QueuesWorld {
     loop_->exit(0);
     thread_.join();
   }
-  LocalQueuesWorld(const LocalQueuesWorld&) = delete;
-  LocalQueuesWorld& operator=(const LocalQueuesWorld&) = delete;
 
   LocalWorkQueues& queues() override { return *queues_; }
   void beginEnding() override { queues_->beginEnding(); }

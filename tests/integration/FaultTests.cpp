@@ -70,7 +70,6 @@ std::vector<Store> allStores() {
 struct TheAgentsStores : ::testing::Test {
   /// What the files of a store hold, by their names.
   using State = Dictionary;
-
   void SetUp() override {
     if (KVR_SANITIZED) GTEST_SKIP() << "a sanitizer's runtime stands before the injector's calls";
     const auto file = world.directory.write("injection", std::string(sizeof(Injection), '\0'));
@@ -175,8 +174,7 @@ struct TheAgentsStores : ::testing::Test {
     const auto mark = "MARK" + std::to_string(++marks);
     world.newClient().call("GetDeviceInfoForSerialNumber", "st", {mark, World::CacheOnly});
     world.agent().waitForErrorOutput(mark);
-    const auto log = world.agent().errorOutput();
-    return countOf(" error com.", log);
+    return countOf(" error com.", world.agent().errorOutput());
   }
 
   mutable AgentWorld world;

@@ -83,8 +83,6 @@ class ScriptedServer {
     for (const auto& [descriptor, thread] : connections_) shutdown(descriptor.get(), SHUT_RDWR);
     for (auto& [descriptor, thread] : connections_) thread.join();
   }
-  ScriptedServer(const ScriptedServer&) = delete;
-  ScriptedServer& operator=(const ScriptedServer&) = delete;
 
   const std::string& host() const { return host_; }
   std::string url(const std::string& path = "/") const { return "http://" + host_ + path; }

@@ -80,7 +80,7 @@ struct BusFixture : ::testing::Test, ServiceListenerDelegate {
     decisions.push_back(connection.valueForEntitlement(kEntitlement));
     if (!(decisions.back() == Value(true))) return false;
     connection.setExportedInterface(interface_);
-    connection.setExportedObject(std::make_shared<Object>(interface_, newBehaviour(), onObjectGone));
+    connection.setExportedObject(std::make_shared<Object>(*this));
     connection.resume();
     return true;
   }
@@ -99,12 +99,9 @@ struct BusFixture : ::testing::Test, ServiceListenerDelegate {
 
  private:
   struct Object : ServiceObject {
-    Object(ServiceInterface served, Behaviour does, std::function<void()> end)
-        : interface(std::move(served)), behaviour(std::move(does)), gone(std::move(end)) {}
+    explicit Object(const BusFixture& test)
+        : interface(test.interface_), behaviour(test.newBehaviour()), gone(test.onObjectGone) {}
     ~Object() override { gone(); }
-    Object(const Object&) = delete;
-    Object& operator=(const Object&) = delete;
-
     void invoke(std::size_t method, const Array& arguments, ServiceReply reply) override {
       behaviour(interface.methods[method].member, arguments, std::move(reply));
     }

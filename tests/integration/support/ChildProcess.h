@@ -69,8 +69,6 @@ class ChildProcess {
     if (::write(stop_.get(), &one, sizeof one) != sizeof one) std::terminate();
     reader_.join();
   }
-  ChildProcess(const ChildProcess&) = delete;
-  ChildProcess& operator=(const ChildProcess&) = delete;
 
   pid_t pid() const { return pid_; }
   /// What was printed so far.
