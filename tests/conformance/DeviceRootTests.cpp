@@ -54,8 +54,7 @@ TEST_F(ADevice, IsTrustedOnlyWhereNobodyElseCanWrite) {
     SCOPED_TRACE(std::string(changed) + " " + std::to_string(mode));
     log.clear();
     ASSERT_EQ(::chmod(pathOf(changed).c_str(), mode), 0);
-    for (int round = 0; round < 2; ++round)
-      EXPECT_EQ(root.trustedDictionary(asked).isNull(), reason != nullptr);
+    for (int i = 0; i < 2; ++i) EXPECT_EQ(root.trustedDictionary(asked).isNull(), reason != nullptr);
     EXPECT_THAT(world.errors(), SizeIs(reason != nullptr ? 1 : 0));
     EXPECT_THAT(world.errors(), Each(HasSubstr(reason != nullptr ? reason : "")));
   }

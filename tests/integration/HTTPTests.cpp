@@ -257,8 +257,8 @@ TEST_F(OverHTTP, WhatMustNotBeSentFailsWithoutAConnection) {
   using namespace std::string_literals;
   std::vector<HTTPRequest> refused;
   const auto add = [&](const std::string& url) -> HTTPRequest& { return refused.emplace_back(get(url)); };
-  for (const auto& value : {"a\r\nX-B: b"s, "a\nb"s, "a\rb"s, "a\0b"s})
-    add(server.url()).headers.set("X-A", value);
+  for (const auto& bad : {"a\r\nX-B: b"s, "a\nb"s, "a\rb"s, "a\0b"s})
+    add(server.url()).headers.set("X-A", bad);
   for (const auto& name : {""s, "X A"s, "X-A:"s, "X-A\r\nX-B"s, "X-A\0"s, "X-\xC3\xA4"s, "Content-Length"s,
                            "transfer-encoding"s}) {
     add(server.url()).headers.set(name, "0");

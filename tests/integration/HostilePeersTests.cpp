@@ -141,8 +141,7 @@ TEST_F(TheAgentAmongHostilePeers, BoundsWhatOneConnectionLeavesWaiting) {
   const std::tuple<std::size_t, int, int> floods[] = {{16, 1500, 1024}, {1U << 20U, 12, 4}};
   for (const auto& [textSize, calls, served] : floods) {
     RawBusClient client = world.newClient();
-    for (int i = 0; i < calls; ++i)
-      client.send(client.newCall("AppSupportAvailability", "s", {std::string(textSize, 'x')}));
+    for (int i = 0; i < calls; ++i) client.send("AppSupportAvailability", "s", {std::string(textSize, 'x')});
     const auto found = answers(client, calls - served);
     EXPECT_EQ(found, (std::map<std::string, int>{{kLimits, calls - served}})) << textSize;
     expectPoliteService("beside a flood of calls");
@@ -180,11 +179,11 @@ TEST_F(TheAgentAmongHostilePeers, ServesAThousandConnectionsAtOnceAndLetsGoOfTho
   begin();
   std::vector<RawBusClient> clients;
   for (int i = 0; i < 1000; ++i) clients.push_back(world.newClient());
-  for (const auto& client : clients) client.send(client.newCall("DefaultDevice"));
+  for (const auto& client : clients) client.send("DefaultDevice");
   for (const auto& client : clients) EXPECT_EQ(answers(client, 1), (std::map<std::string, int>{{"", 1}}));
   clients.erase(clients.begin() + 50, clients.end());
   for (auto& client : clients) {
-    client.send(client.newCall("GetAllDeviceInfosUsingPolicy", "tb", {World::Refresh, true}));
+    client.send("GetAllDeviceInfosUsingPolicy", "tb", {World::Refresh, true});
     client.leave();
   }
   world.misbehave("[]");

@@ -25,8 +25,7 @@ struct BusFixture : ::testing::Test, ServiceListenerDelegate {
   /// Long enough for the slowest machine under a sanitizer; only ever spent on a failure.
   static constexpr std::chrono::seconds kLimit{60};
 
-  using Behaviour =
-      std::function<void(const std::string& member, const Array& arguments, ServiceReply reply)>;
+  using Behaviour = std::function<void(const std::string& member, const Array&, ServiceReply reply)>;
 
   BusFixture() {
     ::setenv("DBUS_SESSION_BUS_ADDRESS", bus.address().c_str(), 1);

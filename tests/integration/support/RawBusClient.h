@@ -63,6 +63,9 @@ class RawBusClient {
     require(sd_bus_send(bus(), message.get(), &number), "sd_bus_send");
     require(sd_bus_flush(bus()), "sd_bus_flush");
   }
+  void send(const char* member, std::string_view signature = "", const Array& arguments = {}) const {
+    send(newCall(member, signature, arguments));
+  }
   /// The value that a call replied; throws when it was an error.
   Value value(const char* type, const Reply& reply) const {
     if (!reply.message) throw std::runtime_error(reply.error + ": " + reply.errorText);

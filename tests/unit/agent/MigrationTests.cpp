@@ -5,7 +5,8 @@
 namespace kvr {
 namespace {
 
-constexpr const char* kLegacyFile = "/home/user/Library/Application Support/com.tarsil.Kavrel/Warranty.plist";
+const std::string kFolder = "/home/user/Library/Application Support";
+const std::string kLegacyFile = kFolder + "/com.tarsil.Kavrel/Warranty.plist";
 
 using Migration = AnOfferTest;
 
@@ -21,8 +22,7 @@ TEST_F(Migration, BringsWhatThereIsOfTheOldLayoutToTheNewOneOnce) {
     SCOPED_TRACE(bits);
     for (const auto& key : preferences.allKeys()) preferences.removeObject(key);
     world.files.erase("/home/user/Library/FollowUps/com.tarsil.Kavrel.plist");
-    for (const auto& path : world.files.list("/home/user/Library/Application Support"))
-      world.files.erase(path);
+    for (const auto& path : world.files.list(kFolder)) world.files.erase(path);
     world.deviceProperties.answers["SerialNumber"] = "LOCAL";
     if (!hasSerial) world.deviceProperties.answers.erase("SerialNumber");
     if (hasFile) world.files.putPropertyList(kLegacyFile, offer(10));
@@ -41,7 +41,7 @@ TEST_F(Migration, BringsWhatThereIsOfTheOldLayoutToTheNewOneOnce) {
     EXPECT_EQ(world.files.get(kLegacyFile).has_value(), hasFile && !moves);
     EXPECT_EQ(KVRWarranty::cachedWarrantyForSerialNumber(world.platform, "LOCAL") != nullptr, moves);
     EXPECT_EQ(KVRWarranty::cachedWarrantyForSerialNumber(world.platform, {}) != nullptr, hasFile && !moves);
-    EXPECT_EQ(world.files.list("/home/user/Library/Application Support").size(), hasFile ? 1U : 0U);
+    EXPECT_EQ(world.files.list(kFolder).size(), hasFile ? 1U : 0U);
     EXPECT_EQ(preferences.dateForKey(metadata.lastUpdatedDateKey), dateWhere(moves && hasDate));
     EXPECT_EQ(preferences.dateForKey("CachedWarrantyLastUpdatedDate"), dateWhere(hasDate && !moves));
     const bool pairMoves = moves && hasLocale;  // a version goes with its locale

@@ -4,14 +4,12 @@
 namespace kvr {
 namespace {
 
-using AnItem = AnOfferTest;
-
-Dictionary badged(Dictionary offer, Value durationInDays) {
-  offer["featureToggleParameters"] =
-      Dictionary{{"zubOfferDisplay", true}, {"zubOfferSettingsRowBadge", true}};
-  offer["zubOfferBadgeBeforeEndDate"] = std::move(durationInDays);
-  return offer;
-}
+struct AnItem : AnOfferTest {
+  static Dictionary badged(Dictionary offer, int durationInDays) {
+    offer["zubOfferBadgeBeforeEndDate"] = durationInDays;
+    return with({{"zubOfferSettingsRowBadge", true}}, std::move(offer));
+  }
+};
 
 TEST_F(AnItem, IsIdentifiedByTheHashOfItsSerialNumber) {
   EXPECT_EQ(KVRFollowUp::uniqueIdentfierForSerialNumber("SN0000000001"),

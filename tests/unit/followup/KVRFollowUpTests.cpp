@@ -50,10 +50,7 @@ struct AFollowUp : AnOfferTest {
 TEST_F(AFollowUp, IsPostedByTheFirstRuleThatApplies) {
   const Value off = Dictionary{{"zubOfferEligibleUntil", inDays(5).secondsSince1970}};
   const auto lasting = [&](int days) {
-    auto warranty = offer(10);
-    warranty["featureToggleParameters"] =
-        Dictionary{{"zubOfferDisplay", true}, {"zubOfferDurationDaysBeforeEndDate", days}};
-    return warranty;
+    return with({{"zubOfferDurationDaysBeforeEndDate", days}}, offer(10));
   };
   const auto device = [](const char* activation) { return format("D (SN) (%@) - Default", activation); };
   const auto plain = device("(null)");

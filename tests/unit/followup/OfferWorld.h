@@ -26,6 +26,12 @@ struct AnOfferTest : CoverageTest {
     });
     return dictionary;
   }
+  /// The offer with more parameters beside the one that displays it.
+  static Dictionary with(Dictionary parameters, Dictionary offer) {
+    parameters["zubOfferDisplay"] = true;
+    offer["featureToggleParameters"] = std::move(parameters);
+    return offer;
+  }
   Dictionary shownInDays(double displayInDays, double endsInDays) const {
     return offer(endsInDays, {{"zubOfferFollowupDisplayDate", inDays(displayInDays).secondsSince1970}});
   }

@@ -38,12 +38,8 @@ struct TheAgentsLife : AnOfferTest {
 };
 
 TEST_F(TheAgentsLife, SchedulesThePostAtTheEarliestDateOfAnOutreach) {
-  auto excluded = shownInDays(1, 20);
-  excluded["featureToggleParameters"] =
-      Dictionary{{"zubOfferDisplay", true}, {"zubOfferToggle", Array{"00101"}}};
-  auto lasting = offer(20);
-  lasting["featureToggleParameters"] =
-      Dictionary{{"zubOfferDisplay", true}, {"zubOfferDurationDaysBeforeEndDate", 15}};
+  const auto excluded = with({{"zubOfferToggle", Array{"00101"}}}, shownInDays(1, 20));
+  const auto lasting = with({{"zubOfferDurationDaysBeforeEndDate", 15}}, offer(20));
   const Value off = Dictionary{}, none;
   const Value in3 = shownInDays(3, 20), in10 = shownInDays(10, 20), before = shownInDays(-4, 20);
   const std::tuple<Value, Value, std::optional<double>> cases[] = {
