@@ -13,9 +13,6 @@
 namespace kvr::testing {
 namespace {
 
-constexpr char kLocal[] = "/api/v3/coverage/summary";
-constexpr char kOther[] = "/api/v2/coverage/summary";
-
 std::string deflated(std::string text, int windowBits, int level = Z_BEST_COMPRESSION) {
   z_stream stream{};
   EXPECT_EQ(deflateInit2(&stream, level, Z_DEFLATED, windowBits, 8, Z_DEFAULT_STRATEGY), Z_OK);
@@ -67,7 +64,7 @@ struct ACoverageService : ::testing::Test {
   HTTPRequest goodRequest() const {
     HTTPRequest request;
     request.method = "POST";
-    request.url = url_ + kLocal;
+    request.url = url_ + "/api/v3/coverage/summary";
     for (const auto& [name, value] : {std::pair("X-Tarsil-Vornic-Token", "token"),
                                       {"X-Client", "client"},
                                       {"altDSID", "000-1"},
@@ -130,7 +127,7 @@ TEST_F(ACoverageService, RefusesEveryBrokenRuleWithAReason) {
       {"locale is not a text", replace("en_US", "")},
   };
   const Case unsignedCases[] = {
-      {"attested", [&](auto& request) { request.url = url_ + kOther; }},
+      {"attested", [&](auto& request) { request.url = url_ + "/api/v2/coverage/summary"; }},
       {"there is no X-Tarsil-Kest-S", set("X-Tarsil-Kest-S", std::nullopt)},
       {"not the leaf's over the body", replace("S1", "S2")},
       {"the chain is not base64", set("X-Tarsil-Kest", "!")},

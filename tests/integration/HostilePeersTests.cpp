@@ -45,19 +45,13 @@ struct TheAgentAmongHostilePeers : ::testing::Test {
     return std::distance(all, std::filesystem::directory_iterator());
   }
 
-  /// Reads what has come and what comes until `count` calls have been answered: by error, "" for none.
+  /// How often calls were answered with each error, "" for none, once that were `count`.
   static std::map<std::string, int> answers(const RawBusClient& client, int count) {
     std::map<std::string, int> found;
-    while (count > 0) {
-      sd_bus_message* message = nullptr;
-      const int r = sd_bus_process(client.bus(), &message);
-      const BusMessageRef held(message);
-      if (r < 0 || (r == 0 && sd_bus_wait(client.bus(), 60'000'000) <= 0)) break;
-      if (!message) continue;
-      const bool isError = sd_bus_message_is_method_error(message, nullptr) > 0;
-      if (!isError && sd_bus_message_is_signal(message, nullptr, nullptr)) continue;
-      ++found[isError ? sd_bus_message_get_error(message)->name : ""];
-      --count;
+    for (; count > 0; --count) {
+      const auto answer = client.next();
+      if (!answer) break;
+      ++found[answer->error];
     }
     return found;
   }

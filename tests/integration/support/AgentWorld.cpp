@@ -105,11 +105,10 @@ void AgentWorld::misbehave(const std::string& rules) const {
 }
 
 std::vector<Value> AgentWorld::requests() const {
-  std::vector<std::filesystem::path> paths;
+  std::set<std::filesystem::path> paths;
   for (const auto& entry : std::filesystem::directory_iterator(directory / "service/requests")) {
-    if (entry.path().extension() == ".json") paths.push_back(entry.path());
+    if (entry.path().extension() == ".json") paths.insert(entry.path());
   }
-  std::ranges::sort(paths);
   std::vector<Value> requests;
   for (const auto& path : paths) requests.push_back(*readJSON(*contentOfFile(path)));
   return requests;

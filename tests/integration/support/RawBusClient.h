@@ -66,6 +66,18 @@ class RawBusClient {
   void send(const char* member, std::string_view signature = "", const Array& arguments = {}) const {
     send(newCall(member, signature, arguments));
   }
+  /// The next answer to a call that was only sent; nothing when none comes.
+  std::optional<Reply> next() const {
+    while (true) {
+      sd_bus_message* message = nullptr;
+      const int r = sd_bus_process(bus(), &message);
+      BusMessageRef held(message);
+      if (r < 0 || (r == 0 && sd_bus_wait(bus(), kLimit) <= 0)) return std::nullopt;
+      if (!message || sd_bus_message_is_signal(message, nullptr, nullptr) > 0) continue;
+      if (const auto* error = sd_bus_message_get_error(message)) return Reply{nullptr, error->name, ""};
+      return Reply{std::move(held), "", ""};
+    }
+  }
   /// The value that a call replied; throws when it was an error.
   Value value(const char* type, const Reply& reply) const {
     if (!reply.message) throw std::runtime_error(reply.error + ": " + reply.errorText);
@@ -75,7 +87,6 @@ class RawBusClient {
   }
   /// Waits until somebody on the bus has the service's name, or nobody has; false when nothing happens to it.
   bool waitForName(bool isOwned) const {
-    constexpr std::uint64_t kLimitMicroseconds = 60'000'000;  // only ever spent on a failure
     const auto handler = [](sd_bus_message*, void*, sd_bus_error*) { return 0; };
     require(sd_bus_match_signal(bus(), nullptr, kBusName, nullptr, kBusName, "NameOwnerChanged", handler,
                                 nullptr),
@@ -84,7 +95,7 @@ class RawBusClient {
     while ((sd_bus_get_name_creds(bus(), kName, 0, nullptr) >= 0) != isOwned) {
       const int processed = sd_bus_process(bus(), nullptr);
       require(processed, "sd_bus_process");
-      if (processed == 0 && sd_bus_wait(bus(), kLimitMicroseconds) == 0) return false;
+      if (processed == 0 && sd_bus_wait(bus(), kLimit) == 0) return false;
     }
     return true;
   }
@@ -92,6 +103,8 @@ class RawBusClient {
   void leave() { bus_.reset(); }
 
  private:
+  static constexpr std::uint64_t kLimit = 60'000'000;  ///< in microseconds, only ever spent on a failure
+
   static void require(int result, const char* what) {
     if (result < 0) throw std::runtime_error(describe(busError(result, what)));
   }

@@ -30,11 +30,6 @@ struct TheAgentsLife : AnOfferTest {
     world.log.clear();
     return AnOfferTest::run<Activity>();
   }
-  void setOSVersions(const std::optional<std::string>& recorded, const std::optional<std::string>& current) {
-    world.preferences.setObject(recorded, preference::kPostUpgradeOSVersion);
-    world.deviceProperties.answers.erase("ProductVersion");
-    if (current) world.deviceProperties.answers["ProductVersion"] = *current;
-  }
 };
 
 TEST_F(TheAgentsLife, SchedulesThePostAtTheEarliestDateOfAnOutreach) {
@@ -109,7 +104,9 @@ TEST_F(TheAgentsLife, ForcesAConversionOutreachWhenTheOSVersionHasGoneUp) {
   world.preferences.setObject(true, preference::kPostUpgradeActivityCompleted);
   for (const auto& [recorded, current, outreachPending, forces] : cases) {
     KVRScheduler::clearScheduledActivities(world.platform);
-    setOSVersions(recorded, current);
+    world.preferences.setObject(recorded, preference::kPostUpgradeOSVersion);
+    world.deviceProperties.answers.erase("ProductVersion");
+    if (current) world.deviceProperties.answers["ProductVersion"] = *current;
     if (outreachPending) setTarget(activity::kOutreach, inDays(1));
     EXPECT_EQ(run<KVRPostUpgradeActivity>(), ActivityResult::Finished);
     EXPECT_EQ(target(activity::kConversionOutreach).has_value(), forces);
