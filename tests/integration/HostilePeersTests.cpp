@@ -91,40 +91,33 @@ TEST_F(TheAgentAmongHostilePeers, AnswersWithAnErrorWhateverIsNoCallOfItsInterfa
   };
   const Fill descriptor = [](sd_bus_message* call) { sd_bus_message_append(call, "h", 0); };
   const Fill nothing = [](sd_bus_message*) {};
-  const char* const path = RawBusClient::kPath;
-  const char* const own = RawBusClient::kInterface;
-  const char* const text1 = "DismissFollowUpForSerialNumber";
-  const std::string longName(255, 'M');
-  const std::tuple<const char*, const char*, const char*, Fill, const char*> calls[] = {
-      {path, own, "Nothing", nothing, kUnknown},
-      {path, own, "defaultDevice", nothing, kUnknown},
-      {path, own, longName.c_str(), nothing, kUnknown},
-      {path, "com.example.Other", "DefaultDevice", nothing, kUnknown},
-      {path, "org.freedesktop.DBus.Properties", "GetAll", text(8),
-       "org.freedesktop.DBus.Error.UnknownInterface"},
-      {"/", own, "DefaultDevice", nothing, kNoObject},
-      {"/com/tarsil/kvragent/x", own, "DefaultDevice", nothing, kNoObject},
-      {path, own, "DefaultDevice", text(1), kInvalid},
-      {path, own, text1, nothing, kInvalid},
-      {path, own, text1, text((1U << 20U) + 1), kInvalid},
-      {path, own, text1, text(10U << 20U), kInvalid},
-      {path, own, text1, bytes, kInvalid},
-      {path, own, text1, entries, kInvalid},
-      {path, own, text1, descriptor, "org.freedesktop.DBus.Error.NotSupported"},
-      {path, own, text1, nested('v', 32), kInvalid},
-      {path, own, text1, nested('v', 62), kInvalid},
-      {path, own, text1, nested('v', 64), kInvalid},
-      {path, own, text1, nested('a', 32), kInvalid},
-  };
   const RawBusClient client = world.newClient();
-  for (const auto& [at, interface, member, fill, error] : calls) {
+  const auto expect = [&](const char* error, const char* path, const char* interface,
+                          const std::string& member, const Fill& fill) {
     sd_bus_message* made = nullptr;
-    sd_bus_message_new_method_call(client.bus(), &made, RawBusClient::kName, at, interface, member);
+    sd_bus_message_new_method_call(client.bus(), &made, RawBusClient::kName, path, interface, member.c_str());
     const BusMessageRef message(made);
     fill(made);
     EXPECT_EQ(client.call(message).error, error)
-        << at << " " << interface << "." << member << " " << sd_bus_message_get_signature(made, 1);
+        << path << " " << interface << "." << member << " " << sd_bus_message_get_signature(made, 1);
+  };
+  const char* const path = RawBusClient::kPath;
+  const char* const own = RawBusClient::kInterface;
+  for (const auto& member : {std::string("Nothing"), std::string("defaultDevice"), std::string(255, 'M')}) {
+    expect(kUnknown, path, own, member, nothing);
   }
+  expect(kUnknown, path, "com.example.Other", "DefaultDevice", nothing);
+  expect("org.freedesktop.DBus.Error.UnknownInterface", path, "org.freedesktop.DBus.Properties", "GetAll",
+         text(8));
+  for (const auto* other : {"/", "/com/tarsil/kvragent/x"}) {
+    expect(kNoObject, other, own, "DefaultDevice", nothing);
+  }
+  expect(kInvalid, path, own, "DefaultDevice", text(1));
+  for (const auto& fill : {nothing, text((1U << 20U) + 1), text(10U << 20U), bytes, entries, nested('v', 32),
+                           nested('v', 62), nested('v', 64), nested('a', 32)}) {
+    expect(kInvalid, path, own, "DismissFollowUpForSerialNumber", fill);
+  }
+  expect("org.freedesktop.DBus.Error.NotSupported", path, own, "DismissFollowUpForSerialNumber", descriptor);
   expectNothingIsLeft("after calls that are none");
 }
 

@@ -7,13 +7,6 @@ namespace {
 constexpr const char* kPosted = preference::kFollowUpPostedHashes;
 constexpr const char* kDismissed = preference::kFollowUpDismissedHashes;
 
-FollowUpItem item(const char* identifier, std::uint64_t displayStyle = 0) {
-  FollowUpItem made;
-  made.uniqueIdentifier = identifier;
-  made.displayStyle = displayStyle;
-  return made;
-}
-
 /// Refuses what it is told to, and remembers the calls.
 struct RecordingProvider : KVRFollowUpProvider {
   std::vector<FollowUpItem> pending;
@@ -166,10 +159,7 @@ TEST_F(AFollowUp, RefreshesByTheFirstRuleThatApplies) {
   };
   for (const auto& [warranty, pending, force, shown, lines] : cases) {
     provider->pending.clear();
-    if (pending) {
-      provider->pending = {item("own", 2)};
-      provider->pending[0].userInfo = {{"FollowupSerialNumber", "SN"}};
-    }
+    if (pending) provider->pending = {item("own", 2, {{"FollowupSerialNumber", "SN"}})};
     recordDismissal("SN", inDays(-1));  // counts for nothing here
     newLines();
     EXPECT_THAT(recorded.refreshFollowupWithDeviceInfo(info("SN", warranty), force), SizeIs(shown ? 1 : 0));
@@ -187,7 +177,7 @@ TEST_F(AFollowUp, ClearsUntrackedDevicesInOneCallWhenTheListIsWhole) {
   followUp.refreshFollowupWithDeviceInfo(info("C", {}), false);
   EXPECT_THAT(pendingSerials(), ElementsAre("B", "A")) << "never another device's";
   provider->pending = pending();
-  provider->pending.push_back(item("not the agent's"));
+  provider->pending.push_back(item("not the agent's", 0));
   newLines();
   EXPECT_THAT(recorded.refreshFollowupWithDeviceInfos({}), IsEmpty());
   EXPECT_THAT(provider->clears, ElementsAre(ElementsAre(KVRFollowUp::uniqueIdentfierForSerialNumber("A"),
@@ -211,7 +201,7 @@ TEST_F(AFollowUp, TakesAListThatCannotBeReadAsEmpty) {
 TEST_F(AFollowUp, OfAnEarlierVersionBecomesTheLocalDevicesOrGoes) {
   auto legacy = item("com.tarsil.Kavrel", 1);
   legacy.groupIdentifier = "old";
-  const auto other = item("com.tarsil.Kavrel.x");
+  const auto other = item("com.tarsil.Kavrel.x", 0);
   const Error refused{"centre", 7, "no"};
   const std::string migrating = "Migrating legacy followup..";
   const std::string clearing = "Clearing legacy followup, no legacy warranty was found..";

@@ -80,13 +80,18 @@ struct AnOfferTest : CoverageTest {
     const auto list = world.preferences.objectForKey(key);
     return list.isArray() ? list.array() : Array{};
   }
-  /// Has an item pending that is not the agent's doing.
-  void pend(const std::string& uniqueIdentifier, const Dictionary& userInfo = {}) {
+  static FollowUpItem item(const std::string& uniqueIdentifier, std::uint64_t displayStyle,
+                           const Dictionary& userInfo = {}) {
     FollowUpItem item;
     item.uniqueIdentifier = uniqueIdentifier;
-    item.displayStyle = 2;
+    item.displayStyle = displayStyle;
     item.userInfo = userInfo;
-    EXPECT_FALSE(world.followUps.newClient(kFollowUpClientIdentifier)->postItem(item));
+    return item;
+  }
+  /// Has an item pending that is not the agent's doing.
+  void pend(const std::string& uniqueIdentifier, const Dictionary& userInfo = {}) {
+    const auto client = world.followUps.newClient(kFollowUpClientIdentifier);
+    EXPECT_FALSE(client->postItem(item(uniqueIdentifier, 2, userInfo)));
   }
 };
 

@@ -15,8 +15,6 @@ constexpr const char* kSupported = "-[KVRKestManager generateKestCertficate:]: i
 constexpr const char* kUnsupported = "-[KVRKestManager generateKestCertficate:]: isSupported: 0";
 constexpr const char* kGenerated = "Kest certificate generation success: 1";
 constexpr const char* kNotGenerated = "Kest certificate generation success: 0";
-constexpr const char* kTimedOut =
-    "-[KVRKestManager generateKestCertficate:]: Installation timed out after 60 seconds";
 
 /// Bytes like those of a certificate: the same every time, and without any pattern to compress.
 std::string certificate(unsigned seed) {
@@ -100,11 +98,12 @@ TEST_F(DeviceAttestationHeaders, AreLeftOutAndTheReasonLoggedWhenTheyCannotBeMad
     EXPECT_THAT(fresh.faults(), IsEmpty());
   };
   const Lines ungenerated = {kSupported, kNotGenerated};
-  const Lines timedOut = {kSupported, kTimedOut, kNotGenerated};
+  const std::string generate = "-[KVRKestManager generateKestCertficate:]: ";
+  const Lines timedOut = {kSupported, generate + "Installation timed out after 60 seconds", kNotGenerated};
   const Lines generated = {kSupported, kGenerated};
   const Error locked{"keys", 5, "locked"};
   const std::string unableToSign = "Unable to sign data and encode with error: " + describe(locked);
-  const auto missing = "-[KVRKestManager generateKestCertficate:]: Failed to get reference key or cert!";
+  const auto missing = generate + "Failed to get reference key or cert!";
   const auto nullData = "-[KVRKestManager serializeCertificateChain:]: Found NULL attestation data!!";
   const std::string tooLong =
       "Error Domain=zlib Code=0 \"the compressed form is longer than what it is made of\"";
