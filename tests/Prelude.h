@@ -38,6 +38,7 @@ using ::testing::SizeIs;
 using ::testing::UnorderedElementsAre;
 
 constexpr double kDay = 86400;
+constexpr double kInfinity = std::numeric_limits<double>::infinity();
 
 /// How often a text holds another.
 inline std::size_t countOf(std::string_view part, std::string_view text) {

@@ -154,12 +154,7 @@ TEST_F(AnAttestation, IsIssuedOnceAndAnsweredFromThereWhileItIsValid) {
 
 TEST_F(AnAttestation, IsIssuedAnewWhenWhatIsKeptIsNoGoodAndSaysSoOnceWhenItIsDamaged) {
   const auto fill = [&](const char* file, const std::string& content) { writeFile(keys() / file, content); };
-  struct Spoiling {
-    std::string name;
-    std::function<void()> spoil;
-    bool isDamage;
-  };
-  std::vector<Spoiling> cases = {
+  std::vector<std::tuple<std::string, std::function<void()>, bool>> cases = {
       {"another key", [&] { fill("preferred.key", kept("fallback.key")); }, true},
       {"another chain", [&] { fill("preferred.pem", kept("fallback.pem")); }, true},
       {"no chain but its own authority", [&] { fill("preferred.pem", kept("authority.pem")); }, true},
@@ -177,13 +172,14 @@ TEST_F(AnAttestation, IsIssuedAnewWhenWhatIsKeptIsNoGoodAndSaysSoOnceWhenItIsDam
       {"another device's", [&] { properties_.answers["SerialNumber"] = "C39OTHER"; }, false},
   };
   for (const char* file : {"authority.key", "authority.pem", "preferred.key", "preferred.pem"}) {
-    cases.push_back({file, [=, this] { fs::remove(keys() / file); }, false});
+    cases.emplace_back(
+        file, [=, this] { fs::remove(keys() / file); }, false);
   }
 
   Process process(*this);
   const auto ask = [&] { return process.ask(options()).get(); };
-  for (const auto& spoiling : cases) {
-    SCOPED_TRACE(spoiling.name);
+  for (const auto& [name, spoil, isDamage] : cases) {
+    SCOPED_TRACE(name);
     ASSERT_FALSE(issued(true).error);
     const auto before = ask();
     EXPECT_EQ(ask().chain, before.chain);
@@ -191,12 +187,12 @@ TEST_F(AnAttestation, IsIssuedAnewWhenWhatIsKeptIsNoGoodAndSaysSoOnceWhenItIsDam
     EXPECT_EQ(ask().chain, before.chain);
     EXPECT_EQ(process.files.readings, readings);
     log_.clear();
-    spoiling.spoil();
+    spoil();
     const auto after = ask();
     expectGood(after);
     EXPECT_NE(after.chain, before.chain);
     EXPECT_EQ(issued().chain, after.chain);
-    EXPECT_THAT(log_.texts(LogLevel::Error), SizeIs(spoiling.isDamage ? 1 : 0));
+    EXPECT_THAT(log_.texts(LogLevel::Error), SizeIs(isDamage ? 1 : 0));
   }
 }
 

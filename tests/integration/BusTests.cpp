@@ -132,7 +132,7 @@ TEST_F(AValueOnTheBus, ComesBackAsItWasWherever) {
   const std::string startOfList = "bplist00 and more";
   Dictionary hard = {
       {"not a number", std::nan("")},
-      {"infinite", -std::numeric_limits<double>::infinity()},
+      {"infinite", -kInfinity},
       {"dates", Array{Date{-0.25}, Date{64092211200.5}}},
       {"no characters", "\uFFFE \uFDD0 \U0010FFFF\x7F\x01"},
       {"NUL", std::string("a\0b", 3)},

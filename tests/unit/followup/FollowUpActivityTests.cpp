@@ -22,12 +22,12 @@ struct AFollowUpActivity : AnOfferTest {
   }
 
   std::uint64_t policy = 0;  ///< that the last one asked for
+  const Date old = inDays(-100);
 };
 
 TEST_F(AFollowUpActivity, FindsTheNextPostDate) {
   const auto off = Dictionary{{"zubOfferEligibleUntil", inDays(-1).secondsSince1970}};
   world.preferences.setObject(Array{sha256Hash("posted")}, preference::kFollowUpPostedHashes);
-  const auto old = inDays(-100);
   const std::tuple<KVRDeviceInfoList, std::optional<double>> cases[] = {
       {{}, {}},
       {{info("A", shownInDays(5, 30), old), info("B", shownInDays(3, 30), old)}, 3},
@@ -47,7 +47,6 @@ TEST_F(AFollowUpActivity, FindsTheNextPostDate) {
 }
 
 TEST_F(AFollowUpActivity, FindsTheNextRefreshDate) {
-  const auto old = inDays(-100);
   const std::tuple<KVRDeviceInfoList, std::optional<double>, double> cases[] = {
       {{}, {}, 1},
       {{info("A", shownInDays(-1, 2.5), old)}, 0.5, 0.5},
@@ -70,7 +69,6 @@ TEST_F(AFollowUpActivity, FindsTheNextRefreshDate) {
 
 TEST_F(AFollowUpActivity, PostsAndSchedulesWhatFollows) {
   const std::string perform = "-[KVRFollowUpPost performActivityForScheduler:withCompletionHandler:]";
-  const auto old = inDays(-100);
   const auto one = [&](const Dictionary& warranty, const char* serialNumber = "A") {
     return KVRDeviceInfoList{info(serialNumber, warranty, old)};
   };

@@ -34,6 +34,13 @@ struct AFollowUp : AnOfferTest {
   const std::shared_ptr<RecordingProvider> provider = std::make_shared<RecordingProvider>();
   KVRFollowUp recorded{world.platform, provider};
 
+  const std::string plain = "D (SN) ((null)) - Default";  ///< the device of most cases
+  const Value off = Dictionary{{"zubOfferEligibleUntil", inDays(5).secondsSince1970}};
+
+  std::string future(const std::string& device, double days) {
+    return format("Device eligible with future post date. Cannot post followup for %@ on: %@", device,
+                  inDays(days));
+  }
   void recordDismissal(const std::string& serialNumber, Date date) {
     world.preferences.setObject(Array{sha256Hash(serialNumber)}, kDismissed);
     world.preferences.setObject(date, sha256Hash(serialNumber) + ".dismissed");
@@ -41,19 +48,12 @@ struct AFollowUp : AnOfferTest {
 };
 
 TEST_F(AFollowUp, IsPostedByTheFirstRuleThatApplies) {
-  const Value off = Dictionary{{"zubOfferEligibleUntil", inDays(5).secondsSince1970}};
   const auto lasting = [&](int days) {
     return with({{"zubOfferDurationDaysBeforeEndDate", days}}, offer(10));
   };
-  const auto device = [](const char* activation) { return format("D (SN) (%@) - Default", activation); };
-  const auto plain = device("(null)");
   const std::string posted = "Posted follow-up: serialNumber:SN -> success";
   const auto due = "Device eligible. Post new  followup for " + plain;
-  const auto future = [&](const std::string& it, double days) {
-    return format("Device eligible with future post date. Cannot post followup for %@ on: %@", it,
-                  inDays(days));
-  };
-  const auto tomorrow = device(describe(inDays(1)).c_str());
+  const auto tomorrow = format("D (SN) (%@) - Default", inDays(1));
   const auto dismissed = "Followup already dismissed for " + plain + ", leaving unposted";
   const auto boundary =
       format("Device not eligible for conversion. %@, followup dismissed date: %@, fup display date: %@",
@@ -135,26 +135,22 @@ TEST_F(AFollowUp, IsNotDismissedForWhatIsNoSerialNumber) {
 }
 
 TEST_F(AFollowUp, RefreshesByTheFirstRuleThatApplies) {
-  const Value off = Dictionary{{"zubOfferEligibleUntil", inDays(5).secondsSince1970}};
-  const std::string device = "D (SN) ((null)) - Default";
   const std::string cleared = "Cleared follow-up: success", updated = "Updated follow-up: success";
-  const auto repost = "Device eligible for re-post. Re-post the followup for " + device;
-  const auto future =
-      format("Device eligible with future post date. Cannot post followup for %@ on: %@", device, inDays(1));
-  const std::vector<std::string> posted = {repost, "Device eligible. Post new  followup for " + device,
+  const auto repost = "Device eligible for re-post. Re-post the followup for " + plain;
+  const std::vector<std::string> posted = {repost, "Device eligible. Post new  followup for " + plain,
                                            "Posted follow-up: serialNumber:SN -> success",
                                            "Reposted follow-up: success"};
   const auto removed = [&](const char* why) {
-    return std::vector{why + std::string(". Remove the followup for ") + device, cleared};
+    return std::vector{why + std::string(". Remove the followup for ") + plain, cleared};
   };
-  const auto absent = "Followup already dismissed/not present for " + device + ", leaving unposted";
+  const auto absent = "Followup already dismissed/not present for " + plain + ", leaving unposted";
   const std::tuple<Value, bool, bool, bool, std::vector<std::string>> cases[] = {
       {{}, true, true, false, removed("No warranty downloaded for device")},
       {off, true, true, false, removed("Device NOT eligible")},
       {offer(0), false, true, false, removed("Device no longer eligible")},
-      {due(5), true, true, true, {"Device eligible. Update the followup for " + device, updated}},
+      {due(5), true, true, true, {"Device eligible. Update the followup for " + plain, updated}},
       {due(5), false, true, true, posted},
-      {shownInDays(1, 5), false, true, false, {repost, future, "Reposted follow-up: NO"}},
+      {shownInDays(1, 5), false, true, false, {repost, future(plain, 1), "Reposted follow-up: NO"}},
       {due(5), false, false, false, {absent}},
   };
   for (const auto& [warranty, pending, force, shown, lines] : cases) {

@@ -160,9 +160,8 @@ TEST_F(AnActivityTable, ComplainsOfATreeThatIsNotItsOwn) {
   };
   EXPECT_EQ(ActivityTable::complaintAbout(table.tree()), std::nullopt);
   EXPECT_EQ(ActivityTable::complaintAbout(Dictionary{}), std::nullopt);
-  for (const auto& tree :
-       {Value(Dictionary{{"activities", 1}}), with("delay", "x"), with("dueDate", Value()),
-        with("registeredDate", Date{std::numeric_limits<double>::infinity()}), with("requiresNetwork", 7)}) {
+  for (const auto& tree : {Value(Dictionary{{"activities", 1}}), with("delay", "x"), with("dueDate", Value()),
+                           with("registeredDate", Date{kInfinity}), with("requiresNetwork", 7)}) {
     EXPECT_TRUE(ActivityTable::complaintAbout(tree)) << describe(tree);
   }
 }

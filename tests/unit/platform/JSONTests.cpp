@@ -4,8 +4,6 @@
 namespace kvr {
 namespace {
 
-constexpr auto kInfinity = std::numeric_limits<double>::infinity();
-
 std::string written(const Value& tree) {
   const auto text = writeJSON(tree);
   return text ? *text : "refused: " + text.error().message;

@@ -6,7 +6,6 @@ namespace {
 
 constexpr auto kXML = PropertyListEncoding::XML;
 constexpr auto kBinary = PropertyListEncoding::Binary;
-constexpr auto kInfinity = std::numeric_limits<double>::infinity();
 
 /// ASCII text as UTF-16 with a byte order mark.
 std::string utf16(std::string_view text, bool bigEndian) {

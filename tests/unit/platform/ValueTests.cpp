@@ -6,7 +6,6 @@ namespace {
 
 constexpr auto kLowest = std::numeric_limits<std::int64_t>::min();
 constexpr auto kHighest = std::numeric_limits<std::int64_t>::max();
-constexpr auto kInfinity = std::numeric_limits<double>::infinity();
 constexpr auto kLargest = std::numeric_limits<double>::max();
 
 TEST(AValue, EqualsWhatHasTheSameContent) {
