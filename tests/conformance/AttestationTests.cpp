@@ -169,8 +169,7 @@ TEST_F(AnAttestation, IsIssuedAnewWhenWhatIsKeptIsNoGoodAndSaysSoOnceWhenItIsDam
       {"far too large", [&] { fill("preferred.pem", std::string(1 << 20, '\n')); }, true},
       {"an expired one", [&] { clock_.moveBy(30 * kDay); }, false},
       {"one of the future", [&] { clock_.moveBy(-kDay); }, false},
-      {"another device's", [&] { properties_.answers["SerialNumber"] = "C39OTHER"; }, false},
-  };
+      {"another device's", [&] { properties_.answers["SerialNumber"] = "C39OTHER"; }, false}};
   for (const char* file : {"authority.key", "authority.pem", "preferred.key", "preferred.pem"}) {
     cases.emplace_back(
         file, [=, this] { fs::remove(keys() / file); }, false);
@@ -203,8 +202,7 @@ TEST_F(AnAttestation, DoesWhatTheDevicesFileSays) {
       {{{"PreferredError", -11}}, true, 0, true},
       {{{"PreferredError", -4}, {"FallbackError", 9}}, true, 9, false},
       {{{"OmitChain", true}}, false, 0, false},
-      {{}, false, 0, true},
-  };
+      {{}, false, 0, true}};
   for (const auto& [behaviour, usesFallbackKind, code, hasChain] : cases) {
     writeFile(home() + "/device/Attestation.plist", *writePropertyList(behaviour, PropertyListEncoding::XML));
     EXPECT_EQ(Process(*this).attestation.isSupported(), !behaviour.contains("Supported"));

@@ -48,8 +48,7 @@ TEST_F(ADevice, IsTrustedOnlyWhereNobodyElseCanWrite) {
       {"", 0755, "F.plist", nullptr},
       {"open", 0777, "linked.plist", "by everyone"},
       {"open", 0700, "linked.plist", nullptr},
-      {"open/F.plist", 0666, "linked.plist", "by everyone"},
-  };
+      {"open/F.plist", 0666, "linked.plist", "by everyone"}};
   for (const auto& [changed, mode, asked, reason] : cases) {
     SCOPED_TRACE(std::string(changed) + " " + std::to_string(mode));
     log.clear();
@@ -151,8 +150,7 @@ TEST_F(ADevice, SpeaksTheLanguageStatedElseThatOfTheEnvironment) {
       {{"", "fr_FR@euro", "de_DE"}, "fr_FR"},
       {{"ja_JP.eucJP@x", "fr_FR", "de_DE"}, "ja_JP"},
       {{"C", "fr_FR", "de_DE"}, "en_US"},
-      {{"../../etc", "", ""}, "en_US"},
-  };
+      {{"../../etc", "", ""}, "en_US"}};
   for (const auto& [values, identifier] : cases) {
     ::setenv("LC_ALL", values[0], 1);
     ::setenv("LC_MESSAGES", values[1], 1);
@@ -226,8 +224,7 @@ TEST_F(AnAccount, IsRenewedAsScriptedUntilTheFileChanges) {
       {{}, {1, "there is no renewal service for the account"}, "held"},
       {Dictionary{{"resultCode", 0}, {"tokens", tokens}, {"delay", -1}}, {0, ""}, "new"},
       {Dictionary{{"tokens", tokens}, {"delay", NAN}, {"error", "still"}}, {0, "still"}, "new"},
-      {Dictionary{{"resultCode", -7}, {"tokens", tokens}, {"error", "no"}}, {-7, "no"}, "held"},
-  };
+      {Dictionary{{"resultCode", -7}, {"tokens", tokens}, {"error", "no"}}, {-7, "no"}, "held"}};
   LocalAccountStore store(root, log);
   for (const auto& [renewal, outcome, token] : cases) {
     put("Accounts.plist", tree(renewal));

@@ -261,8 +261,7 @@ TEST_F(ALogLine, NamesTimeLevelAndChannelAndStaysOneLine) {
       {"two\nlines\r\nand\rmore", "two\\nlines\\r\\nand\\rmore"},
       {"\x1b[2J\x7f\v" + std::string(1, '\0'), "\\x1b[2J\\x7f\\x0b\\x00"},
       {"\u0085\u2028\u2029\u2027\xe2\x80", "\\xc2\\x85\\xe2\\x80\\xa8\\xe2\\x80\\xa9\u2027\xe2\x80"},
-      {std::string(100000, 'x'), std::string(100000, 'x')},
-  };
+      {std::string(100000, 'x'), std::string(100000, 'x')}};
   for (const auto& [message, text] : cases) {
     ASSERT_EQ(::ftruncate(descriptor.get(), 0), 0);
     log.standard("%s", message);

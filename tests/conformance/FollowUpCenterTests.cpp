@@ -1,8 +1,6 @@
 #include "conformance/FileWorld.h"
 #include "platform/FileFollowUpCenter.h"
 
-#include <thread>
-
 namespace kvr {
 namespace {
 

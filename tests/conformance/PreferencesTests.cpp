@@ -48,14 +48,8 @@ TEST_P(APreference, IsTheStoredValueElseTheRegisteredOne) {
 }
 
 TEST_P(APreference, KeepsEveryKindOfValueAndSeesChangesFromOutside) {
-  const Value value = Array{true,
-                            -1,
-                            ~std::uint64_t{0},
-                            0.5,
-                            "t\u00e9xt",
-                            Date{1795536283.25},
-                            Value::Bytes{0, 255},
-                            Dictionary{{"k", "v"}}};
+  const Value value = Array{Array{true, -1, ~std::uint64_t{0}, 0.5, "t\u00e9xt", Date{1795536283.25}},
+                            Value::Bytes{0, 255}, Dictionary{{"k", "v"}}};
   preferences.setObject(value, "key");
   EXPECT_EQ(preferences.objectForKey("key"), value);
   world.putTree(pathOf(kDomain), Dictionary{{"key", "from outside"}, {"other", 1}});

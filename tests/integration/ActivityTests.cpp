@@ -1,7 +1,7 @@
 #include "integration/support/AgentWorld.h"
 #include "platform/JSON.h"
 
-#include <chrono>
+#include <ctime>
 
 namespace kvr::testing {
 namespace {
@@ -9,10 +9,9 @@ namespace {
 /// A device on which the agent has never run, whose every warranty carries an offer that is due.
 struct ANewDevice : ::testing::Test {
   ANewDevice() {
-    using Seconds = std::chrono::duration<double>;
-    const auto now = std::chrono::duration_cast<Seconds>(std::chrono::system_clock::now().time_since_epoch());
-    const Value offer = Dictionary{{"zubOfferEligibleUntil", now.count() + 10 * kDay},
-                                   {"zubOfferFollowupDisplayDate", now.count() - kDay},
+    const auto now = static_cast<double>(std::time(nullptr));
+    const Value offer = Dictionary{{"zubOfferEligibleUntil", now + 10 * kDay},
+                                   {"zubOfferFollowupDisplayDate", now - kDay},
                                    {"zubLocalizedOfferLabel", "Zub"},
                                    {"zubLocalizedOfferDesc", "Add it"},
                                    {"zubLocalizedOfferSingularDesc", "One day left"},

@@ -1,7 +1,5 @@
 #include "integration/support/AgentWorld.h"
 
-#include <signal.h>
-
 namespace kvr::testing {
 namespace {
 

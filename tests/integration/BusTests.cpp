@@ -215,8 +215,7 @@ TEST_F(AValueOnTheBus, HasTheTypesThatOtherClientsCountOn) {
       {{"warranty", "DictionaryRepresentation", "covered"}, "b"},
       {{"warranty", "DictionaryRepresentation", "n"}, "x"},
       {{"warranty", "DictionaryRepresentation", "big"}, "t"},
-      {{"warranty", "DictionaryRepresentation", "r"}, "d"},
-  };
+      {{"warranty", "DictionaryRepresentation", "r"}, "d"}};
   for (const auto& [path, signature] : cases) EXPECT_EQ(signatureIn(plain, path), signature) << path.back();
   const Value unusual = Dictionary{{"covered", Value()}};
   EXPECT_EQ(signatureIn(unusual, {"warranty"}), "a{sv}");

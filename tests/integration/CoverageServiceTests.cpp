@@ -124,8 +124,7 @@ TEST_F(ACoverageService, RefusesEveryBrokenRuleWithAReason) {
       {"requestTimestamp is not an unsigned", replace("123,", "123.5,")},
       {"requestTimezone is not in whole hours", replace("-3", "-10800")},
       {"serialNumber", replace("\"S1\"", "1")},
-      {"locale is not a text", replace("en_US", "")},
-  };
+      {"locale is not a text", replace("en_US", "")}};
   const Case unsignedCases[] = {
       {"attested", [&](auto& request) { request.url = url_ + "/api/v2/coverage/summary"; }},
       {"there is no X-Tarsil-Kest-S", set("X-Tarsil-Kest-S", std::nullopt)},
@@ -135,8 +134,7 @@ TEST_F(ACoverageService, RefusesEveryBrokenRuleWithAReason) {
       {"not become smaller", chain(deflated(identity.chain(), -MAX_WBITS, Z_NO_COMPRESSION))},
       {"not compact with each", chain(deflated(identity.chain(JSONSlashes::Plain), -MAX_WBITS))},
       {"not the leaf's over the body", chain(deflated(stranger.chain(), -MAX_WBITS))},
-      {"does not lead to the authority", [&](auto& request) { stranger.attest(request); }},
-  };
+      {"does not lead to the authority", [&](auto& request) { stranger.attest(request); }}};
   const auto expectRefusal = [this](const HTTPRequest& request, const char* reason) {
     EXPECT_THAT(ask(request), AllOf(::testing::StartsWith("400 "), HasSubstr(reason)));
   };

@@ -218,8 +218,7 @@ TEST_F(OverHTTP, AResponseIsTakenOnlyWhole) {
       {"redirect to a file", movedTo("file:///etc/hosts"), 301, none, 1},
       {"redirect to https", movedTo("https://127.0.0.1:1/"), 0, none, kCouldNotConnect},
       {"another answer with a location",
-       "HTTP/1.1 201 Created\r\nLocation: https://127.0.0.1:1/\r\nContent-Length: 1\r\n\r\nc", 201, "c", 0},
-  };
+       "HTTP/1.1 201 Created\r\nLocation: https://127.0.0.1:1/\r\nContent-Length: 1\r\n\r\nc", 201, "c", 0}};
   for (const auto& [name, sent, status, body, code] : cases) {
     SCOPED_TRACE(name);
     const ScriptedServer server(sends(sent));

@@ -1,7 +1,5 @@
 #include "integration/support/AgentWorld.h"
 
-#include <signal.h>
-
 namespace kvr::testing {
 namespace {
 
@@ -66,8 +64,7 @@ TEST_F(TheAgentOfAHostileService, MakesTheAttemptsItMayAndFailsOnce) {
       {"a deep body", raw(ok + R"(\r\n)" + std::string(600, '[') + std::string(600, ']'))},
       {"401 for ever", R"("status":401)"},
       {"401 with an endless body", endless(R"(HTTP/1.1 401 No\r\n\r\n)", kilobyte)},
-      {"half of a 401", raw(R"(HTTP/1.1 401 No\r\nContent-Length: 5\r\n\r\n)")},
-  };
+      {"half of a 401", raw(R"(HTTP/1.1 401 No\r\nContent-Length: 5\r\n\r\n)")}};
   for (const auto& [name, rule] : all) {
     misbehave(rule);
     const auto requests = world.coverageRequests().size();

@@ -99,8 +99,7 @@ TEST_F(TheAgentsPeer, IsServedOnlyWhenItIsAGrantedProgramOfTheAgentsUser) {
       {true, {true, 1, 2.5}},
       {false, {0, 0.0, false, "true", Date{1}, Value::Bytes{1}, Array{true}, Dictionary{{"a", true}}}}};
   for (const auto& [isServed, granted] : values) {
-    const std::string reason =
-        isServed ? "connection added from" : "Rejecting connection to kvragent: missing";
+    const auto reason = isServed ? "connection added from" : "Rejecting connection to kvragent: missing";
     for (const auto& value : granted) {
       expect(isServed, "granted " + describe(value), {{grantedProgram(value)}}, reason);
     }

@@ -110,8 +110,7 @@ TEST_F(Kvrctl, AsksWhatItIsTold) {
       {"web-url", "ReadWebURLOverride()", 2},
       {"info", "GetDefaultDeviceInfoUsingPolicy(0)", 2},
       {"info S1 --policy refresh", "GetDeviceInfoForSerialNumber(S1, 2)", 0},
-      {"info --all --policy cache", "GetAllDeviceInfosUsingPolicy(1, 0)", 0},
-  };
+      {"info --all --policy cache", "GetAllDeviceInfosUsingPolicy(1, 0)", 0}};
   for (const auto& [arguments, call, status] : cases) {
     const Outcome outcome = run(wordsOf(arguments));
     EXPECT_EQ(outcome.status, status) << outcome.errors;

@@ -32,16 +32,15 @@ class RawBusClient {
 
   sd_bus* bus() const { return bus_.get(); }
   /// A call of the service's interface with arguments of the bus's basic types and records.
-  BusMessageRef newCall(const char* member, std::string_view signature = "",
-                        const Array& arguments = {}) const {
+  BusMessageRef newCall(const char* member, std::string_view types = "", const Array& arguments = {}) const {
     sd_bus_message* message = nullptr;
     require(sd_bus_message_new_method_call(bus(), &message, kName, kPath, kInterface, member), member);
     BusMessageRef held(message);
-    for (std::size_t i = 0; !signature.empty(); ++i) {
-      const std::size_t length = signature.starts_with("a{sv}") ? 5 : signature.starts_with("aa{sv}") ? 6 : 1;
-      const auto error = appendBusValue(message, std::string(signature.substr(0, length)), arguments.at(i));
+    for (std::size_t i = 0; !types.empty(); ++i) {
+      const std::size_t length = types.starts_with("a{sv}") ? 5 : types.starts_with("aa{sv}") ? 6 : 1;
+      const auto error = appendBusValue(message, std::string(types.substr(0, length)), arguments.at(i));
       if (error) throw std::runtime_error(describe(*error));
-      signature.remove_prefix(length);
+      types.remove_prefix(length);
     }
     return held;
   }
@@ -54,8 +53,8 @@ class RawBusClient {
     if (r < 0 && result.error.empty()) require(r, "sd_bus_call");
     return result;
   }
-  Reply call(const char* member, std::string_view signature = "", const Array& arguments = {}) const {
-    return call(newCall(member, signature, arguments));
+  Reply call(const char* member, std::string_view types = "", const Array& arguments = {}) const {
+    return call(newCall(member, types, arguments));
   }
   /// Sends a call and waits for nothing; an answer is expected all the same.
   void send(const BusMessageRef& message) const {
@@ -63,8 +62,8 @@ class RawBusClient {
     require(sd_bus_send(bus(), message.get(), &number), "sd_bus_send");
     require(sd_bus_flush(bus()), "sd_bus_flush");
   }
-  void send(const char* member, std::string_view signature = "", const Array& arguments = {}) const {
-    send(newCall(member, signature, arguments));
+  void send(const char* member, std::string_view types = "", const Array& arguments = {}) const {
+    send(newCall(member, types, arguments));
   }
   /// The next answer to a call that was only sent; nothing when none comes.
   std::optional<Reply> next() const {

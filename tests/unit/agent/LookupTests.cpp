@@ -67,8 +67,7 @@ TEST_F(ALookup, DecidesBetweenCacheAndDownload) {
       {0, Cache::Missing, true, fromDownload, nothing},   {1, Cache::Stale, false, fromCache, fromCache},
       {1, Cache::Invalid, false, nothing, nothing},       {1, Cache::Missing, false, nothing, nothing},
       {7, Cache::Stale, false, fromCache, fromCache},     {7, Cache::Missing, false, nothing, nothing},
-      {2, Cache::Fresh, true, fromDownload, nothing},     {2, Cache::Missing, true, fromDownload, nothing},
-  };
+      {2, Cache::Fresh, true, fromDownload, nothing},     {2, Cache::Missing, true, fromDownload, nothing}};
   for (const auto& [policy, cache, downloads, whenItYields, otherwise] : cases) {
     facts.cached = cache == Cache::Missing ? nullptr : fromCache;
     facts.version = cache == Cache::Invalid ? "1" : "2";

@@ -55,8 +55,7 @@ TEST_F(TheService, ServesEachMemberWithTheOperationBehindIt) {
       {"GetDefaultDeviceInfoUsingPolicy", {1}, info(device)},
       {"GetDeviceInfoForSerialNumber", {"X", 0xFFFFFFFFFFFFFFFF}, info(unknown)},
       {"GetAllDeviceInfosUsingPolicy", {1, false}, Array{info(device)}},
-      {"DismissFollowUpForSerialNumber", {"X"}, true},
-  };
+      {"DismissFollowUpForSerialNumber", {"X"}, true}};
   const auto client = connect();
   const auto& methods = client->exportedInterface()->methods;
   ASSERT_EQ(methods.size(), std::size(cases));

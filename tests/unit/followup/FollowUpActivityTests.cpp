@@ -38,8 +38,7 @@ TEST_F(AFollowUpActivity, FindsTheNextPostDate) {
       {{info("A", shownInDays(-3, 30))}, {}},  // activated now
       {{info("A", shownInDays(3, 30))}, 3},
       {{info("A", offer(30), inDays(7))}, 7},  // never the end less its duration
-      {{info("A", offer(30), old)}, {}},
-  };
+      {{info("A", offer(30), old)}, {}}};
   for (const auto& [list, next] : cases) {
     const auto found = KVRFollowUpPost::nextFollowUpPostDateWithDevicesInfo(world.platform, list);
     EXPECT_EQ(days(found), next) << describe(list);

@@ -72,8 +72,7 @@ TEST_F(AFollowUp, IsPostedByTheFirstRuleThatApplies) {
       {shownInDays(-1, 5), 1, {}, false, {activated, future(tomorrow, 1)}},
       {shownInDays(0, 5), {}, {}, false, {due, posted}},
       {lasting(14), {}, {}, false, {due, posted}},
-      {lasting(7), {}, {}, false, {future(plain, 3)}},
-  };
+      {lasting(7), {}, {}, false, {future(plain, 3)}}};
   for (const auto& [offered, activatedIn, dismissedIn, repost, lines] : cases) {
     for (const char* key : {kDismissed, kPosted}) world.preferences.removeObject(key);
     if (dismissedIn) recordDismissal("SN", inDays(*dismissedIn));
@@ -114,8 +113,7 @@ TEST_F(AFollowUp, IsNotPostedWithoutWhatItNeeds) {
       {info({}, {}), "Failed to post follow-up:<Missing warranty><Missing serial number>"},
       {info({}, due(5)), "Failed to post follow-up:<Missing serial number>"},
       {info("SN", {}), "Failed to post follow-up:<Missing warranty>"},
-      {info("SN", Dictionary{}), "Failed to post follow-up:"},
-  };
+      {info("SN", Dictionary{}), "Failed to post follow-up:"}};
   for (const auto& [device, line] : cases) {
     world.log.clear();
     recorded.postFollowUpWithDeviceInfo(*device);
@@ -151,8 +149,7 @@ TEST_F(AFollowUp, RefreshesByTheFirstRuleThatApplies) {
       {due(5), true, true, true, {"Device eligible. Update the followup for " + plain, updated}},
       {due(5), false, true, true, posted},
       {shownInDays(1, 5), false, true, false, {repost, future(plain, 1), "Reposted follow-up: NO"}},
-      {due(5), false, false, false, {absent}},
-  };
+      {due(5), false, false, false, {absent}}};
   for (const auto& [warranty, pending, force, shown, lines] : cases) {
     provider->pending.clear();
     if (pending) provider->pending = {item("own", 2, {{"FollowupSerialNumber", "SN"}})};

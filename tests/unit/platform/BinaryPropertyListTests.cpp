@@ -71,8 +71,7 @@ TEST(ABinaryObject, IsReadAsItsKind) {
       {"\x50", ""},
       {"\x61\x20\x28", "\u2028"},
       {"\x62\xD8\x3D\xDE\x00"s, "\U0001F600"},
-      {"\xD0", Dictionary{}},
-  };
+      {"\xD0", Dictionary{}}};
   expectTrees([](std::string_view object) { return readPropertyList(listOf({std::string(object)})); }, cases);
 }
 
@@ -101,8 +100,7 @@ TEST(ABinaryPropertyList, IsRefusedForAnyFault) {
       {listOf({"\xD1\x00\x01\x00\x01"s, kOne}), "a key that is not a string"},
       {listOf(doublingArrays(20, kOne)), "unfolds to too much"},
       {listOf(doublingArrays(12, "\x5F\x12" + bigEndian(100'000, 4) + std::string(100'000, 'x'))),
-       "unfolds to too much"},
-  };
+       "unfolds to too much"}};
   expectFaults(readPropertyList, "plist", cases);
 }
 
@@ -137,8 +135,7 @@ TEST(ABinaryPropertyList, CannotClaimTheSameBytesWithoutEnd) {
   const std::string dictionary = "\xD1\x00\x01\x00\x01"s;
   for (const bool asKeys : {false, true}) {
     std::string table = bigEndian(8, 4) + bigEndian(start.size() + dictionary.size(), 4);
-    for (unsigned i = 0; i < kMany; ++i)
-      table += bigEndian(start.size() + (asKeys ? 0 : dictionary.size()), 4);
+    table += repeated(bigEndian(start.size() + (asKeys ? 0 : dictionary.size()), 4), kMany);
     const auto body = start + dictionary + string;
     const auto read = readPropertyList(body + table + bytesOf({.count = kMany + 2, .table = body.size()}));
     ASSERT_FALSE(read);

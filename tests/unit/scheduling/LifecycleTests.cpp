@@ -102,9 +102,9 @@ TEST_F(TheAgentsLife, ForcesAConversionOutreachWhenTheOSVersionHasGoneUp) {
       {"17.10", "17.9", false, false}, {"17.9", "17.09", false, false}, {{}, "17.9", false, true},
       {"17.9", {}, false, false},      {"17", "17.0.1", false, true}};
   world.preferences.setObject(true, preference::kPostUpgradeActivityCompleted);
-  for (const auto& [recorded, current, outreachPending, forces] : cases) {
+  for (const auto& [before, current, outreachPending, forces] : cases) {
     KVRScheduler::clearScheduledActivities(world.platform);
-    world.preferences.setObject(recorded, preference::kPostUpgradeOSVersion);
+    world.preferences.setObject(before, preference::kPostUpgradeOSVersion);
     world.deviceProperties.answers.erase("ProductVersion");
     if (current) world.deviceProperties.answers["ProductVersion"] = *current;
     if (outreachPending) setTarget(activity::kOutreach, inDays(1));
@@ -113,8 +113,7 @@ TEST_F(TheAgentsLife, ForcesAConversionOutreachWhenTheOSVersionHasGoneUp) {
     EXPECT_EQ(world.log.count(forces ? "Forcing conversion outreach on upgrade"
                                      : "post upgrade activity already performed"),
               1U);
-    EXPECT_EQ(world.preferences.stringForKey(preference::kPostUpgradeOSVersion),
-              current ? current : recorded);
+    EXPECT_EQ(world.preferences.stringForKey(preference::kPostUpgradeOSVersion), current ? current : before);
     EXPECT_EQ(world.log.count("Unable to get OS version"), current ? 0U : 1U);
   }
 }

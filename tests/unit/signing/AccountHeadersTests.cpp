@@ -1,4 +1,3 @@
-#include "platform/JSON.h"
 #include "signing/AccountHeaders.h"
 #include "unit/CoverageWorld.h"
 

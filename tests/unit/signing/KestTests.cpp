@@ -105,8 +105,7 @@ TEST_F(DeviceAttestationHeaders, AreLeftOutAndTheReasonLoggedWhenTheyCannotBeMad
   const std::string unableToSign = "Unable to sign data and encode with error: " + describe(locked);
   const auto missing = generate + "Failed to get reference key or cert!";
   const auto nullData = "-[KVRKestManager serializeCertificateChain:]: Found NULL attestation data!!";
-  const std::string tooLong =
-      "Error Domain=zlib Code=0 \"the compressed form is longer than what it is made of\"";
+  const auto tooLong = "Error Domain=zlib Code=0 \"the compressed form is longer than what it is made of\"";
 
   expect({kUnsupported, kNotGenerated}, {}, kNone, [](auto& a) { a.supported = false; });
   expect(ungenerated, {"Failed to create access control: " + describe(locked)}, kNone,

@@ -46,11 +46,8 @@ TEST_F(ADownload, LogsEachStepInItsOrder) {
   EXPECT_TRUE(download("WATCH").success);
   const auto path = cachedFile("WATCH");
   EXPECT_THAT(*world.files.get(path), ::testing::StartsWith("<?xml"));
-  std::vector<std::string> lines;
-  for (const auto& line : world.log.lines()) {
-    if (line.level == LogLevel::Default && !line.text.starts_with("default device"))
-      lines.push_back(line.text);
-  }
+  auto lines = world.log.texts(LogLevel::Default);
+  std::erase_if(lines, [](const std::string& line) { return line.starts_with("default device"); });
   EXPECT_THAT(
       lines,
       ElementsAre(
@@ -69,8 +66,7 @@ TEST_F(ADownload, LogsEachStepInItsOrder) {
 TEST_F(ADownload, TriesAgainAfter401OnlyAndRenewsTheTokenThen) {
   const std::tuple<std::vector<int>, bool, std::size_t> cases[] = {
       {{200}, true, 0},  {{401, 200}, true, 1},  {{401, 401, 200}, true, 2}, {{401, 401, 401}, false, 2},
-      {{500}, false, 0}, {{401, 503}, false, 1}, {{302}, false, 0},          {{204}, false, 0},
-  };
+      {{500}, false, 0}, {{401, 503}, false, 1}, {{302}, false, 0},          {{204}, false, 0}};
   for (const auto& [statuses, success, renewals] : cases) {
     std::vector<int> left = statuses;
     world.coverage = [&](const HTTPRequest&) {
