@@ -1,10 +1,8 @@
 #pragma once
 
 #include "Prelude.h"
-#include "integration/support/ChildProcess.h"
 #include "integration/support/PrivateBus.h"
 #include "integration/support/RawBusClient.h"
-#include "integration/support/TemporaryDirectory.h"
 
 namespace kvr::testing {
 

@@ -3,7 +3,6 @@
 #include "Prelude.h"
 #include "integration/support/PrivateBus.h"
 #include "integration/support/RawBusClient.h"
-#include "integration/support/TemporaryDirectory.h"
 #include "platform/local/EventLoop.h"
 #include "platform/local/LocalClock.h"
 #include "platform/local/LocalFiles.h"

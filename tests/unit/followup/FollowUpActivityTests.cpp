@@ -15,10 +15,14 @@ struct AFollowUpActivity : AnOfferTest {
   /// Runs an activity whose devices are `list`; its result.
   template <class Activity>
   std::optional<ActivityResult> runWith(const std::optional<KVRDeviceInfoList>& list) {
-    return run<Activity>([this, list](std::uint64_t asked, const DeviceInfosAnswer& answer) {
+    policy = 0;
+    const auto start = world.clock.now();
+    const auto result = run<Activity>([this, list](std::uint64_t asked, const DeviceInfosAnswer& answer) {
       policy = asked;
       answer(list);
     });
+    EXPECT_EQ(world.clock.now(), start) << "an answer is not waited for";
+    return result;
   }
 
   std::uint64_t policy = 0;  ///< that the last one asked for

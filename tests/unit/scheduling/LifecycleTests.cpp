@@ -2,7 +2,6 @@
 #include "platform/JSON.h"
 #include "scheduling/KVRConversionOutreachActivity.h"
 #include "scheduling/KVROutreachActivity.h"
-#include "scheduling/KVROutreachActivityUtilities.h"
 #include "scheduling/KVRPostBootActivity.h"
 #include "scheduling/KVRPostUpgradeActivity.h"
 #include "unit/followup/OfferWorld.h"
