@@ -6,8 +6,14 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <algorithm>
+#include <cerrno>
+#include <cmath>
 #include <functional>
+#include <limits>
 #include <map>
+#include <memory>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <tuple>
@@ -30,6 +36,9 @@ using ::testing::Optional;
 using ::testing::Pair;
 using ::testing::SizeIs;
 using ::testing::UnorderedElementsAre;
+
+constexpr double kDay = 86400;
+constexpr double kInfinity = std::numeric_limits<double>::infinity();
 
 /// How often a text holds another.
 inline std::size_t countOf(std::string_view part, std::string_view text) {

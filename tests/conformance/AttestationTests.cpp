@@ -12,7 +12,6 @@ namespace {
 
 namespace fs = std::filesystem;
 
-constexpr double kDay = 24 * 60 * 60;
 constexpr const char* kLabel = "com.tarsil.kvragent.kestCertificates";
 
 struct Answer {
@@ -51,8 +50,7 @@ bool isSignatureOf(const std::string& signature, const std::string& message, con
 }
 
 /// Files that look as old as they can be, and differ from one another by their content alone.
-class OldFiles : public LocalFiles {
- public:
+struct OldFiles : LocalFiles {
   using LocalFiles::LocalFiles;
 
   Result<std::optional<FileStamp>> stamp(const std::string& path) override {
@@ -72,8 +70,7 @@ class OldFiles : public LocalFiles {
   int readings = 0;  ///< of keys and certificates
 };
 
-class AnAttestation : public ::testing::Test {
- protected:
+struct AnAttestation : ::testing::Test {
   AnAttestation() {
     properties_.answers["SerialNumber"] = "C39SERIAL";
     properties_.answers["ProductType"] = "Phone14,2";
@@ -158,12 +155,7 @@ TEST_F(AnAttestation, IsIssuedOnceAndAnsweredFromThereWhileItIsValid) {
 
 TEST_F(AnAttestation, IsIssuedAnewWhenWhatIsKeptIsNoGoodAndSaysSoOnceWhenItIsDamaged) {
   const auto fill = [&](const char* file, const std::string& content) { writeFile(keys() / file, content); };
-  struct Spoiling {
-    std::string name;
-    std::function<void()> spoil;
-    bool isDamage;
-  };
-  std::vector<Spoiling> cases = {
+  std::vector<std::tuple<std::string, std::function<void()>, bool>> cases = {
       {"another key", [&] { fill("preferred.key", kept("fallback.key")); }, true},
       {"another chain", [&] { fill("preferred.pem", kept("fallback.pem")); }, true},
       {"no chain but its own authority", [&] { fill("preferred.pem", kept("authority.pem")); }, true},
@@ -178,16 +170,16 @@ TEST_F(AnAttestation, IsIssuedAnewWhenWhatIsKeptIsNoGoodAndSaysSoOnceWhenItIsDam
       {"far too large", [&] { fill("preferred.pem", std::string(1 << 20, '\n')); }, true},
       {"an expired one", [&] { clock_.moveBy(30 * kDay); }, false},
       {"one of the future", [&] { clock_.moveBy(-kDay); }, false},
-      {"another device's", [&] { properties_.answers["SerialNumber"] = "C39OTHER"; }, false},
-  };
+      {"another device's", [&] { properties_.answers["SerialNumber"] = "C39OTHER"; }, false}};
   for (const char* file : {"authority.key", "authority.pem", "preferred.key", "preferred.pem"}) {
-    cases.push_back({file, [=, this] { fs::remove(keys() / file); }, false});
+    cases.emplace_back(
+        file, [=, this] { fs::remove(keys() / file); }, false);
   }
 
   Process process(*this);
   const auto ask = [&] { return process.ask(options()).get(); };
-  for (const auto& spoiling : cases) {
-    SCOPED_TRACE(spoiling.name);
+  for (const auto& [name, spoil, isDamage] : cases) {
+    SCOPED_TRACE(name);
     ASSERT_FALSE(issued(true).error);
     const auto before = ask();
     EXPECT_EQ(ask().chain, before.chain);
@@ -195,12 +187,12 @@ TEST_F(AnAttestation, IsIssuedAnewWhenWhatIsKeptIsNoGoodAndSaysSoOnceWhenItIsDam
     EXPECT_EQ(ask().chain, before.chain);
     EXPECT_EQ(process.files.readings, readings);
     log_.clear();
-    spoiling.spoil();
+    spoil();
     const auto after = ask();
     expectGood(after);
     EXPECT_NE(after.chain, before.chain);
     EXPECT_EQ(issued().chain, after.chain);
-    EXPECT_THAT(log_.texts(LogLevel::Error), SizeIs(spoiling.isDamage ? 1 : 0));
+    EXPECT_THAT(log_.texts(LogLevel::Error), SizeIs(isDamage ? 1 : 0));
   }
 }
 
@@ -211,8 +203,7 @@ TEST_F(AnAttestation, DoesWhatTheDevicesFileSays) {
       {{{"PreferredError", -11}}, true, 0, true},
       {{{"PreferredError", -4}, {"FallbackError", 9}}, true, 9, false},
       {{{"OmitChain", true}}, false, 0, false},
-      {{}, false, 0, true},
-  };
+      {{}, false, 0, true}};
   for (const auto& [behaviour, usesFallbackKind, code, hasChain] : cases) {
     writeFile(home() + "/device/Attestation.plist", *writePropertyList(behaviour, PropertyListEncoding::XML));
     EXPECT_EQ(Process(*this).attestation.isSupported(), !behaviour.contains("Supported"));

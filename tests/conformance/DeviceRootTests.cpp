@@ -12,33 +12,26 @@
 #include <unistd.h>
 
 #include <array>
-#include <cmath>
 #include <csignal>
 #include <future>
-#include <limits>
 
 namespace kvr {
 namespace {
 
 namespace fs = std::filesystem;
 
-class ADevice : public ::testing::Test {
- protected:
-  ADevice() { fs::permissions(directory.path().string(), fs::perms::owner_all); }
+struct ADevice : ::testing::Test {
+  ADevice() { fs::permissions(pathOf(""), fs::perms::owner_all); }
 
-  std::string pathOf(const std::string& file) const { return directory.path().string() + "/" + file; }
-  void put(const std::string& file, const Value& tree) const {
-    writeFile(pathOf(file), *writePropertyList(tree, PropertyListEncoding::Binary));
+  std::string pathOf(const std::string& file) { return world.path(file); }
+  void put(const std::string& file, const Value& tree) {
+    world.putTree(pathOf(file), tree, PropertyListEncoding::Binary);
     fs::permissions(pathOf(file), fs::perms::owner_read | fs::perms::owner_write);
   }
-  std::vector<std::string> errors() const { return log.texts(LogLevel::Error); }
 
-  TemporaryDirectory directory;
-  SimulatedClock clock;
-  SimulatedLog log;
-  LocalFiles files{log, directory.path().string()};
-  PropertyListFiles lists{files, clock, log};
-  DeviceRoot root{lists, log, directory.path().string()};
+  FileWorld world{true};
+  SimulatedLog& log = world.log;
+  DeviceRoot root{world.lists, log, world.files().homeDirectory()};
 };
 
 TEST_F(ADevice, IsTrustedOnlyWhereNobodyElseCanWrite) {
@@ -55,22 +48,20 @@ TEST_F(ADevice, IsTrustedOnlyWhereNobodyElseCanWrite) {
       {"", 0755, "F.plist", nullptr},
       {"open", 0777, "linked.plist", "by everyone"},
       {"open", 0700, "linked.plist", nullptr},
-      {"open/F.plist", 0666, "linked.plist", "by everyone"},
-  };
+      {"open/F.plist", 0666, "linked.plist", "by everyone"}};
   for (const auto& [changed, mode, asked, reason] : cases) {
     SCOPED_TRACE(std::string(changed) + " " + std::to_string(mode));
     log.clear();
     ASSERT_EQ(::chmod(pathOf(changed).c_str(), mode), 0);
-    for (int round = 0; round < 2; ++round)
-      EXPECT_EQ(root.trustedDictionary(asked).isNull(), reason != nullptr);
-    EXPECT_THAT(errors(), SizeIs(reason != nullptr ? 1 : 0));
-    EXPECT_THAT(errors(), Each(HasSubstr(reason != nullptr ? reason : "")));
+    for (int i = 0; i < 2; ++i) EXPECT_EQ(root.trustedDictionary(asked).isNull(), reason != nullptr);
+    EXPECT_THAT(world.errors(), SizeIs(reason != nullptr ? 1 : 0));
+    EXPECT_THAT(world.errors(), Each(HasSubstr(reason != nullptr ? reason : "")));
   }
   EXPECT_TRUE(root.trustedDictionary("missing.plist").isNull());
 }
 
 TEST_F(ADevice, HasThePropertiesStatedElseThoseOfItsHost) {
-  const std::string host = directory.path().string() + "/host";
+  const std::string host = pathOf("host");
   const LocalDeviceProperties properties(root, host);
   const auto answers = [&] {
     return describe(properties.answer(DeviceProperties::kSerialNumber)) + ", " +
@@ -93,7 +84,7 @@ TEST_F(ADevice, HasThePropertiesStatedElseThoseOfItsHost) {
   EXPECT_TRUE(properties.isInternalInstall());
   EXPECT_EQ(properties.answer("UserAssignedDeviceName"), "Ann's");
   EXPECT_EQ(properties.answer("InternalInstall"), std::nullopt);
-  EXPECT_THAT(errors(), IsEmpty());
+  EXPECT_THAT(world.errors(), IsEmpty());
 }
 
 TEST_F(ADevice, EntitlesTheFilesThatThePathsLeadTo) {
@@ -114,7 +105,7 @@ TEST_F(ADevice, EntitlesTheFilesThatThePathsLeadTo) {
 }
 
 TEST_F(ADevice, KnowsProgramsAndTheBundlesAroundThem) {
-  const LocalProcesses processes(lists);
+  const LocalProcesses processes(world.lists);
   std::array<char, 4096> buffer{};
   const auto length = processes.executablePath(::getpid(), buffer);
   ASSERT_GT(length, 0);
@@ -135,7 +126,7 @@ TEST_F(ADevice, KnowsProgramsAndTheBundlesAroundThem) {
 }
 
 TEST_F(ADevice, GivesNoPathForAProgramThatIsNoLongerThere) {
-  const LocalProcesses processes(lists);
+  const LocalProcesses processes(world.lists);
   std::string program = pathOf("program (deleted)");
   fs::copy_file("/bin/sleep", program);
   std::string forever = "infinity";
@@ -159,8 +150,7 @@ TEST_F(ADevice, SpeaksTheLanguageStatedElseThatOfTheEnvironment) {
       {{"", "fr_FR@euro", "de_DE"}, "fr_FR"},
       {{"ja_JP.eucJP@x", "fr_FR", "de_DE"}, "ja_JP"},
       {{"C", "fr_FR", "de_DE"}, "en_US"},
-      {{"../../etc", "", ""}, "en_US"},
-  };
+      {{"../../etc", "", ""}, "en_US"}};
   for (const auto& [values, identifier] : cases) {
     ::setenv("LC_ALL", values[0], 1);
     ::setenv("LC_MESSAGES", values[1], 1);
@@ -180,11 +170,10 @@ TEST_F(ADevice, SpeaksTheLanguageStatedElseThatOfTheEnvironment) {
     EXPECT_EQ(locale.decimalString(std::numeric_limits<std::uint64_t>::max()), text);
   }
   for (const auto* name : {"LC_ALL", "LC_MESSAGES", "LANG"}) ::unsetenv(name);
-  EXPECT_THAT(errors(), IsEmpty());
+  EXPECT_THAT(world.errors(), IsEmpty());
 }
 
-class AnAccount : public ADevice {
- protected:
+struct AnAccount : ADevice {
   using Outcome = std::pair<std::int64_t, std::string>;
 
   static Value tree(const Value& renewal, const std::string& altDSID = "alt") {
@@ -223,10 +212,10 @@ TEST_F(AnAccount, IsTheOneThatTheFileHolds) {
   EXPECT_EQ(store.primaryAccount()->altDSID, std::nullopt);
   EXPECT_FALSE(store.authenticationAccountFor({}));
   EXPECT_FALSE(store.storeAccountFor({}));
-  EXPECT_THAT(errors(), IsEmpty());
+  EXPECT_THAT(world.errors(), IsEmpty());
   fs::permissions(pathOf("Accounts.plist"), fs::perms::group_write, fs::perm_options::add);
   EXPECT_FALSE(store.primaryAccount());
-  EXPECT_THAT(errors(), SizeIs(1));
+  EXPECT_THAT(world.errors(), SizeIs(1));
 }
 
 TEST_F(AnAccount, IsRenewedAsScriptedUntilTheFileChanges) {
@@ -235,8 +224,7 @@ TEST_F(AnAccount, IsRenewedAsScriptedUntilTheFileChanges) {
       {{}, {1, "there is no renewal service for the account"}, "held"},
       {Dictionary{{"resultCode", 0}, {"tokens", tokens}, {"delay", -1}}, {0, ""}, "new"},
       {Dictionary{{"tokens", tokens}, {"delay", NAN}, {"error", "still"}}, {0, "still"}, "new"},
-      {Dictionary{{"resultCode", -7}, {"tokens", tokens}, {"error", "no"}}, {-7, "no"}, "held"},
-  };
+      {Dictionary{{"resultCode", -7}, {"tokens", tokens}, {"error", "no"}}, {-7, "no"}, "held"}};
   LocalAccountStore store(root, log);
   for (const auto& [renewal, outcome, token] : cases) {
     put("Accounts.plist", tree(renewal));

@@ -7,79 +7,81 @@
 #include "platform/simulated/SimulatedFiles.h"
 #include "platform/simulated/SimulatedLog.h"
 
-#include <algorithm>
-#include <filesystem>
-#include <fstream>
-
 namespace kvr {
 
 using testing::contentOfFile;
 using testing::TemporaryDirectory;
+using testing::writeFile;
 
-inline void writeFile(const std::string& path, const std::string& bytes) {
-  std::filesystem::create_directories(std::filesystem::path(path).parent_path());
-  std::ofstream(path, std::ios::binary | std::ios::trunc) << bytes;
+inline std::vector<std::string> namesIn(const std::string& directory) {
+  std::vector<std::string> names;
+  for (const auto& entry : std::filesystem::directory_iterator(directory)) {
+    names.push_back(entry.path().filename().string());
+  }
+  std::ranges::sort(names);
+  return names;
 }
 
 /// One user's files, of this machine or simulated, as they are seen from outside.
 class FileWorld {
  public:
-  explicit FileWorld(bool isLocal) {
-    if (isLocal) {
-      directory_ = std::make_unique<TemporaryDirectory>();
-      local_ = std::make_unique<LocalFiles>(log, directory_->path().string());
-    } else {
-      simulated_ = std::make_unique<SimulatedFiles>(clock);
-    }
-  }
+  explicit FileWorld(bool isLocal)
+      : directory_(isLocal ? std::make_unique<TemporaryDirectory>() : nullptr),
+        local_(filesOfAnotherProcess()) {}
 
-  Files& files() { return local_ ? static_cast<Files&>(*local_) : *simulated_; }
-  /// The same files as another process has them.
+  Files& files() { return local_ ? *local_ : simulated_; }
+  /// The same files as another process has them; null for simulated ones.
   std::unique_ptr<Files> filesOfAnotherProcess() {
-    return local_ ? std::make_unique<LocalFiles>(log, directory_->path().string()) : nullptr;
+    return directory_ ? std::make_unique<LocalFiles>(log, directory_->path().string()) : nullptr;
   }
   std::string path(const std::string& name) { return files().homeDirectory() + "/" + name; }
 
   void put(const std::string& path, const std::string& bytes) {
-    simulated_ ? simulated_->put(path, bytes) : writeFile(path, bytes);
+    local_ ? writeFile(path, bytes) : simulated_.put(path, bytes);
+  }
+  void putTree(const std::string& path, const Value& tree,
+               PropertyListEncoding encoding = PropertyListEncoding::XML) {
+    put(path, *writePropertyList(tree, encoding));
   }
   std::optional<std::string> get(const std::string& path) {
-    return simulated_ ? simulated_->get(path) : contentOfFile(path);
+    return local_ ? contentOfFile(path) : simulated_.get(path);
+  }
+  /// Null where there is no file.
+  Value tree(const std::string& path) {
+    const auto bytes = get(path);
+    return bytes ? *readPropertyList(*bytes) : Value();
   }
   void erase(const std::string& path) {
-    simulated_ ? simulated_->erase(path) : static_cast<void>(std::filesystem::remove(path));
+    local_ ? static_cast<void>(std::filesystem::remove(path)) : simulated_.erase(path);
   }
-  /// The names in the home directory's own level, of files only.
-  std::vector<std::string> names(const std::string& directory) {
-    std::vector<std::string> names;
-    if (simulated_) {
-      for (const auto& path : simulated_->list(directory)) names.push_back(path.substr(directory.size() + 1));
-    } else {
-      for (const auto& entry : std::filesystem::directory_iterator(directory)) {
-        names.push_back(entry.path().filename().string());
-      }
-    }
-    std::ranges::sort(names);
-    return names;
+  /// The names in a directory's own level, by default the home directory's.
+  std::vector<std::string> names(const std::string& folder = "") {
+    const auto directory = folder.empty() ? files().homeDirectory() : folder;
+    if (local_) return namesIn(directory);
+    auto paths = simulated_.list(directory);
+    for (auto& path : paths) path.erase(0, directory.size() + 1);
+    return paths;
   }
+  std::vector<std::string> errors() const { return log.texts(LogLevel::Error); }
 
   SimulatedClock clock{Date{1795536283}};  // 2026-11-24 16:04:43 UTC
   SimulatedLog log;
 
  private:
-  std::unique_ptr<TemporaryDirectory> directory_;
-  std::unique_ptr<LocalFiles> local_;
-  std::unique_ptr<SimulatedFiles> simulated_;
+  const std::unique_ptr<TemporaryDirectory> directory_;
+  SimulatedFiles simulated_{clock};
+  const std::unique_ptr<Files> local_;
+
+ public:
+  PropertyListFiles lists{files(), clock, log};
 };
 
 /// A test that runs in both worlds.
-class InBothWorlds : public ::testing::TestWithParam<bool> {
- public:
+struct InBothWorlds : ::testing::TestWithParam<bool> {
   static std::string nameOf(const ::testing::TestParamInfo<bool>& info) {
     return info.param ? "Local" : "Simulated";
   }
 
- protected:
   FileWorld world{GetParam()};
 };
 

@@ -6,13 +6,11 @@
 #include <sys/file.h>
 #include <sys/stat.h>
 
-#include <cerrno>
 #include <regex>
 
 namespace kvr {
 namespace {
 
-namespace fs = std::filesystem;
 using Expected = PropertyListFiles::Expected;
 using WhenDamaged = PropertyListFiles::WhenDamaged;
 
@@ -30,22 +28,23 @@ INSTANTIATE_TEST_SUITE_P(, AFile, ::testing::Bool(), AFile::nameOf);
 
 TEST_P(AFile, IsReplacedAsAWholeAndReadWithinALimit) {
   const auto path = world.path("file");
-  const auto missing = world.files().read(path, 10);
+  auto& files = world.files();
+  const auto missing = files.read(path, 10);
   ASSERT_TRUE(missing);
   EXPECT_FALSE(*missing);
-  EXPECT_EQ(*world.files().stamp(path), std::nullopt);
+  EXPECT_EQ(*files.stamp(path), std::nullopt);
   std::optional<FileStamp> last;
   for (const auto& bytes : {std::string(), std::string("a\0b", 3), std::string(10, 'x')}) {
-    ASSERT_EQ(codeOf(world.files().replace(path, bytes)), 0);
-    const auto contents = world.files().read(path, 10);
+    ASSERT_EQ(codeOf(files.replace(path, bytes)), 0);
+    const auto contents = files.read(path, 10);
     ASSERT_TRUE(contents && *contents);
     EXPECT_EQ((*contents)->bytes, bytes);
     EXPECT_EQ((*contents)->stamp.size, bytes.size());
     EXPECT_NE((*contents)->stamp, last);
     last = (*contents)->stamp;
   }
-  EXPECT_EQ(codeOf(world.files().read(path, 9)), EFBIG);
-  EXPECT_THAT(world.names(world.files().homeDirectory()), ElementsAre("file"));
+  EXPECT_EQ(codeOf(files.read(path, 9)), EFBIG);
+  EXPECT_THAT(world.names(), ElementsAre("file"));
 }
 
 TEST_P(AFile, IsNotMadeOfWhatIsNoPlainFile) {
@@ -75,11 +74,10 @@ TEST_P(AFile, IsRenamedOverAnotherOnlyWhereThatIsAsked) {
   EXPECT_EQ(codeOf(files.renameToUnused(b, a)), 0);
   EXPECT_EQ(codeOf(files.remove(a)), 0);
   EXPECT_EQ(codeOf(files.remove(a)), ENOENT);
-  EXPECT_THAT(world.names(files.homeDirectory()), IsEmpty());
+  EXPECT_THAT(world.names(), IsEmpty());
 }
 
-class APropertyListFile : public InBothWorlds {
- protected:
+struct APropertyListFile : InBothWorlds {
   Value read(WhenDamaged whenDamaged = WhenDamaged::SetAside, Expected expected = Expected::Dictionary) {
     const auto tree = lists.read(path, expected, whenDamaged);
     EXPECT_TRUE(tree) << describe(tree.error());
@@ -87,7 +85,7 @@ class APropertyListFile : public InBothWorlds {
   }
 
   const std::string path = world.path("list.plist");
-  PropertyListFiles lists{world.files(), world.clock, world.log};
+  PropertyListFiles& lists = world.lists;
 };
 INSTANTIATE_TEST_SUITE_P(, APropertyListFile, ::testing::Bool(), APropertyListFile::nameOf);
 
@@ -112,10 +110,9 @@ TEST_P(APropertyListFile, IsSetAsideUnderANameOfItsOwnWhenItIsDamaged) {
     EXPECT_TRUE(read().isNull());
   }
   const std::string name = "list.plist.damaged-20261124T160443Z";
-  EXPECT_THAT(world.names(world.files().homeDirectory()),
-              ElementsAre(name, name + "-2", name + "-3", name + "-4"));
+  EXPECT_THAT(world.names(), ElementsAre(name, name + "-2", name + "-3", name + "-4"));
   EXPECT_EQ(world.get(world.path(name + "-2")), damaged[1]);
-  const auto errors = world.log.texts(LogLevel::Error);
+  const auto errors = world.errors();
   ASSERT_THAT(errors, SizeIs(4));
   EXPECT_THAT(errors[2], HasSubstr(path + " is damaged (the top level is not a dictionary): set aside as "));
 }
@@ -124,13 +121,13 @@ TEST_P(APropertyListFile, IsLeftAndReportedOnceAStateWhereItIsNotOurs) {
   const auto complaintsAfter = [&](const std::string& bytes) {
     world.put(path, bytes);
     for (int round = 0; round < 2; ++round) EXPECT_TRUE(read(WhenDamaged::Leave).isNull());
-    return world.log.texts(LogLevel::Error).size();
+    return world.errors().size();
   };
   EXPECT_EQ(complaintsAfter("garbage {"), 1U);
   EXPECT_EQ(complaintsAfter(bytesOf(Array{1})), 2U);
   EXPECT_EQ(read(WhenDamaged::Leave, Expected::Array), Value(Array{1}));
   EXPECT_EQ(complaintsAfter("garbage {"), 3U);
-  EXPECT_THAT(world.names(world.files().homeDirectory()), ElementsAre("list.plist"));
+  EXPECT_THAT(world.names(), ElementsAre("list.plist"));
 }
 
 TEST_P(APropertyListFile, IsAnErrorReportedOnceWhileItCannotBeRead) {
@@ -139,11 +136,11 @@ TEST_P(APropertyListFile, IsAnErrorReportedOnceWhileItCannotBeRead) {
     for (int round = 0; round < 2; ++round) {
       EXPECT_EQ(codeOf(lists.read(path, Expected::Dictionary, WhenDamaged::SetAside)), EFBIG);
     }
-    EXPECT_THAT(world.log.texts(LogLevel::Error), SizeIs(complaints));
+    EXPECT_THAT(world.errors(), SizeIs(complaints));
     world.put(path, bytesOf(Dictionary{{"a", 1}}));
     EXPECT_EQ(read()["a"], Value(1));
   }
-  EXPECT_THAT(world.names(world.files().homeDirectory()), ElementsAre("list.plist"));
+  EXPECT_THAT(world.names(), ElementsAre("list.plist"));
 }
 
 TEST_P(APropertyListFile, KeepsItsContentWhenANewOneCannotBeWritten) {
@@ -154,8 +151,7 @@ TEST_P(APropertyListFile, KeepsItsContentWhenANewOneCannotBeWritten) {
   EXPECT_EQ(read()["a"], Value(1));
 }
 
-class ASimulatedPropertyListFile : public ::testing::Test {
- protected:
+struct ASimulatedPropertyListFile : ::testing::Test {
   SimulatedClock clock;
   SimulatedLog log;
   SimulatedFiles files{clock};
@@ -188,14 +184,7 @@ TEST_F(ASimulatedPropertyListFile, IsNotOverwrittenWhenItIsDamagedAndCannotBeSet
   EXPECT_EQ(files.get("/a"), "garbage {");
 }
 
-class LocalFilesOf : public ::testing::Test {
- protected:
-  std::vector<std::string> names() const {
-    std::vector<std::string> names;
-    for (const auto& entry : fs::directory_iterator(home)) names.push_back(entry.path().filename().string());
-    return names;
-  }
-
+struct LocalFilesOf : ::testing::Test {
   TemporaryDirectory directory;
   const std::string home = directory.path().string();
   SimulatedLog log;
@@ -212,7 +201,7 @@ TEST_F(LocalFilesOf, OtherKindsThanPlainOnesAreRefusedWithoutWaiting) {
   EXPECT_EQ(codeOf(files.replace(home + std::string("/a\0b", 4), "x")), EINVAL);
   // Files of the kernel have no size before they are read.
   EXPECT_TRUE(*files.read("/proc/self/status", 65536));
-  EXPECT_THAT(names(), ElementsAre("fifo"));
+  EXPECT_THAT(namesIn(home), ElementsAre("fifo"));
 }
 
 TEST_F(LocalFilesOf, AStampSettlesOnlyWhenItsTimeHasPassed) {
@@ -231,7 +220,7 @@ TEST_F(LocalFilesOf, AKilledProcessGoWhileALivingOnesStay) {
   const Descriptor writer(::open((home + "/.list.plist.kvr-ghijkl").c_str(), O_RDWR | O_CLOEXEC));
   ASSERT_EQ(::flock(writer.get(), LOCK_EX), 0);
   ASSERT_EQ(codeOf(files.replace(home + "/list.plist", "x")), 0);
-  EXPECT_THAT(names(), UnorderedElementsAre("list.plist", ".list.plist.abcdef", ".list.plist.kvr-ghijkl"));
+  EXPECT_THAT(namesIn(home), ElementsAre(".list.plist.abcdef", ".list.plist.kvr-ghijkl", "list.plist"));
 }
 
 TEST_F(LocalFilesOf, ADirectoryAreLockedAgainstOtherProcessesWhileThatIsPossible) {
@@ -256,8 +245,7 @@ TEST_F(LocalFilesOf, ADirectoryAreLockedAgainstOtherProcessesWhileThatIsPossible
   EXPECT_TRUE(isLocked());
 }
 
-class ALogLine : public ::testing::Test {
- protected:
+struct ALogLine : ::testing::Test {
   std::string written() const { return contentOfFile(path).value_or(""); }
 
   TemporaryDirectory directory;
@@ -273,8 +261,7 @@ TEST_F(ALogLine, NamesTimeLevelAndChannelAndStaysOneLine) {
       {"two\nlines\r\nand\rmore", "two\\nlines\\r\\nand\\rmore"},
       {"\x1b[2J\x7f\v" + std::string(1, '\0'), "\\x1b[2J\\x7f\\x0b\\x00"},
       {"\u0085\u2028\u2029\u2027\xe2\x80", "\\xc2\\x85\\xe2\\x80\\xa8\\xe2\\x80\\xa9\u2027\xe2\x80"},
-      {std::string(100000, 'x'), std::string(100000, 'x')},
-  };
+      {std::string(100000, 'x'), std::string(100000, 'x')}};
   for (const auto& [message, text] : cases) {
     ASSERT_EQ(::ftruncate(descriptor.get(), 0), 0);
     log.standard("%s", message);

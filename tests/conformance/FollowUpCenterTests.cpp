@@ -1,9 +1,6 @@
 #include "conformance/FileWorld.h"
 #include "platform/FileFollowUpCenter.h"
 
-#include <cerrno>
-#include <thread>
-
 namespace kvr {
 namespace {
 
@@ -15,20 +12,17 @@ FollowUpItem itemNamed(const std::string& identifier) {
   return item;
 }
 
-class AFollowUpCenter : public InBothWorlds {
- protected:
+struct AFollowUpCenter : InBothWorlds {
   std::vector<std::string> pending() {
     std::vector<std::string> names;
     const auto items = client->pendingItems();
     for (const auto& item : *items) names.push_back(*item.uniqueIdentifier);
     return names;
   }
-  void put(const Value& tree) { world.put(path, *writePropertyList(tree, PropertyListEncoding::XML)); }
 
   const std::string folder = world.path("Library/FollowUps");
   const std::string path = folder + "/" + kClient + ".plist";
-  PropertyListFiles lists{world.files(), world.clock, world.log};
-  FileFollowUpCenter center{lists, world.clock};
+  FileFollowUpCenter center{world.lists, world.clock};
   const std::unique_ptr<FollowUpCenterClient> client = center.newClient(kClient);
 };
 INSTANTIATE_TEST_SUITE_P(, AFollowUpCenter, ::testing::Bool(), AFollowUpCenter::nameOf);
@@ -62,7 +56,7 @@ TEST_P(AFollowUpCenter, ReplacesClearsAndDropsItems) {
   world.clock.moveBy(10);
   EXPECT_THAT(pending(), ElementsAre("c"));
   EXPECT_FALSE(client->postItem(itemNamed("d")));
-  EXPECT_THAT((*readPropertyList(*world.get(path)))["items"].array(), SizeIs(2));
+  EXPECT_THAT(world.tree(path)["items"].array(), SizeIs(2));
 }
 
 TEST_P(AFollowUpCenter, RefusesWhatItCannotKeep) {
@@ -76,14 +70,14 @@ TEST_P(AFollowUpCenter, RefusesWhatItCannotKeep) {
 TEST_P(AFollowUpCenter, SetsADamagedListAsideAndGoesOn) {
   const Value damaged[] = {Dictionary{{"items", "x"}}, Dictionary{{"items", Array{1}}}};
   for (const auto& tree : damaged) {
-    put(tree);
+    world.putTree(path, tree);
     EXPECT_THAT(pending(), IsEmpty());
     EXPECT_FALSE(client->postItem(itemNamed("a")));
     EXPECT_THAT(pending(), ElementsAre("a"));
     world.clock.moveBy(60);
   }
   EXPECT_THAT(world.names(folder), Contains(HasSubstr(".damaged-")).Times(2));
-  EXPECT_THAT(world.log.texts(LogLevel::Error), SizeIs(2));
+  EXPECT_THAT(world.errors(), SizeIs(2));
 }
 
 }  // namespace

@@ -17,9 +17,9 @@ constexpr const char* kBoot = "com.tarsil.kvragent.boot";
 
 /// One start of the process, on a device that outlives it. The test's thread is the main one.
 struct Start {
-  Start(Files& files, FileWorld& world, const std::string& device, DeviceProperties& properties,
-        const Clock& clock)
-      : lists(files, world.clock, world.log),
+  Start(FileWorld& world, DeviceProperties& properties, const Clock& clock)
+      : device(world.path("device")),
+        lists(world.files(), world.clock, world.log),
         root(lists, world.log, device),
         queues(loop, world.log),
         scheduler(loop, root, clock, queues, random, properties, world.log, "com.tarsil.kvragent",
@@ -29,15 +29,11 @@ struct Start {
     queues.beginEnding();
     queues.drain(30);
   }
-  Start(const Start&) = delete;
-  Start& operator=(const Start&) = delete;
 
   ActivityBlock recorder(const std::string& name) {
     return [this, name](const ActivityHandler& handler) {
-      {
-        const std::lock_guard lock(mutex);
-        runs.push_back(name);
-      }
+      const std::lock_guard lock(mutex);
+      runs.push_back(name);
       handler(ActivityResult::Finished);
       loop.exit(0);
     };
@@ -58,6 +54,7 @@ struct Start {
     return runs;
   }
 
+  const std::string device;
   EventLoop loop;
   PropertyListFiles lists;
   DeviceRoot root;
@@ -68,13 +65,10 @@ struct Start {
   LocalActivityScheduler scheduler;
 };
 
-class ALocalScheduler : public ::testing::Test {
- protected:
+struct ALocalScheduler : ::testing::Test {
   ALocalScheduler() { writeFile(device + "/boot_id", "one\n"); }
-  std::unique_ptr<Start> start() {
-    return std::make_unique<Start>(world.files(), world, device, properties, world.clock);
-  }
-  Value stored() { return *readPropertyList(*world.get(path)); }
+  std::unique_ptr<Start> start() { return std::make_unique<Start>(world, properties, world.clock); }
+  Value stored() { return world.tree(path); }
 
   FileWorld world{true};
   const std::string device = world.path("device");
@@ -102,7 +96,7 @@ TEST_F(ALocalScheduler, TakesARegistrationUpAgainAndRunsItOnce) {
 
 TEST_F(ALocalScheduler, RunsWhatBecomesDueByItsTimer) {
   const LocalClock clock;
-  Start local(world.files(), world, device, properties, clock);
+  Start local(world, properties, clock);
   local.add("a", {1, 0});
   local.loop.run();
   EXPECT_THAT(local.finish(), ElementsAre("a"));
@@ -110,8 +104,7 @@ TEST_F(ALocalScheduler, RunsWhatBecomesDueByItsTimer) {
 
 TEST_F(ALocalScheduler, WaitsForTheNetworkWithoutAskingAgain) {
   const auto setNetwork = [&](bool isReachable) {
-    world.put(device + "/Network.plist",
-              *writePropertyList(Dictionary{{"reachable", isReachable}}, PropertyListEncoding::XML));
+    world.putTree(device + "/Network.plist", Dictionary{{"reachable", isReachable}});
   };
   // The device says so, goes away, or does not say and the host's network service is believed.
   const std::pair<std::function<void()>, std::function<void()>> cases[] = {
@@ -148,22 +141,21 @@ TEST_F(ALocalScheduler, RunsOccasionsAfterUpgradeBootAndDamage) {
   EXPECT_THAT(runsOfAStart(), IsEmpty());
   properties.answers["ProductVersion"] = "17.2";
   EXPECT_THAT(runsOfAStart(), IsEmpty());
-  EXPECT_THAT(world.log.texts(LogLevel::Error), IsEmpty());
+  EXPECT_THAT(world.errors(), IsEmpty());
   world.put(path, "damaged");
   EXPECT_THAT(runsOfAStart(), ElementsAre(kUpgrade, kBoot));
-  EXPECT_THAT(world.log.texts(LogLevel::Error), SizeIs(1));
+  EXPECT_THAT(world.errors(), SizeIs(1));
   EXPECT_EQ(stored()["bootIdentifier"], Value("two"));
 }
 
 TEST(LocalCarriers, AreNamedByTheirIndex) {
   FileWorld world(true);
-  PropertyListFiles lists(world.files(), world.clock, world.log);
-  const DeviceRoot root(lists, world.log, world.path("device"));
+  const DeviceRoot root(world.lists, world.log, world.path("device"));
   const LocalCarrierInfo carriers(root);
   EXPECT_THAT(carriers.subscriptions(), IsEmpty());
   const Value list = Array{Dictionary{{"mobileCountryCode", "001"}, {"mobileNetworkCode", "01"}}, 7,
                            Dictionary{{"mobileNetworkCode", 5}}};
-  world.put(root.pathOf("Carriers.plist"), *writePropertyList(list, PropertyListEncoding::XML));
+  world.putTree(root.pathOf("Carriers.plist"), list);
   const auto subscriptions = carriers.subscriptions();
   ASSERT_THAT(subscriptions, SizeIs(2));
   EXPECT_EQ(describe(subscriptions.at("0")), "001/01");

@@ -1,9 +1,6 @@
 #include "conformance/FileWorld.h"
 #include "platform/FilePreferences.h"
 
-#include <cerrno>
-#include <cmath>
-#include <limits>
 #include <thread>
 
 namespace kvr {
@@ -20,19 +17,12 @@ struct Process {
   FilePreferences preferences;
 };
 
-class APreference : public InBothWorlds {
- protected:
+struct APreference : InBothWorlds {
   std::string pathOf(const std::string& domain) { return folder + "/" + domain + ".plist"; }
-  Value stored() {
-    const auto bytes = world.get(pathOf(kDomain));
-    return bytes ? *readPropertyList(*bytes) : Value();
-  }
+  Value stored() { return world.tree(pathOf(kDomain)); }
   /// A new one at every writing.
   std::uint64_t inodeOfDomain() {
     return (*world.files().stamp(pathOf(kDomain))).value_or(FileStamp{}).inode;
-  }
-  void put(const std::string& domain, const Value& tree) {
-    world.put(pathOf(domain), *writePropertyList(tree, PropertyListEncoding::XML));
   }
 
   const std::string folder = world.path("Library/Preferences");
@@ -60,17 +50,11 @@ TEST_P(APreference, IsTheStoredValueElseTheRegisteredOne) {
 }
 
 TEST_P(APreference, KeepsEveryKindOfValueAndSeesChangesFromOutside) {
-  const Value value = Array{true,
-                            -1,
-                            ~std::uint64_t{0},
-                            0.5,
-                            "t\u00e9xt",
-                            Date{1795536283.25},
-                            Value::Bytes{0, 255},
-                            Dictionary{{"k", "v"}}};
+  const Value value = Array{Array{true, -1, ~std::uint64_t{0}, 0.5, "t\u00e9xt", Date{1795536283.25}},
+                            Value::Bytes{0, 255}, Dictionary{{"k", "v"}}};
   preferences.setObject(value, "key");
   EXPECT_EQ(preferences.objectForKey("key"), value);
-  put(kDomain, Dictionary{{"key", "from outside"}, {"other", 1}});
+  world.putTree(pathOf(kDomain), Dictionary{{"key", "from outside"}, {"other", 1}});
   EXPECT_EQ(preferences.objectForKey("key"), Value("from outside"));
   preferences.setObject(2, "key");
   EXPECT_EQ(stored(), Value(Dictionary{{"key", 2}, {"other", 1}}));
@@ -79,15 +63,15 @@ TEST_P(APreference, KeepsEveryKindOfValueAndSeesChangesFromOutside) {
 }
 
 TEST_P(APreference, IsReadOnceAtOneLookWhichAChangeEnds) {
-  put(kDomain, Dictionary{{"a", 1}});
+  world.putTree(pathOf(kDomain), Dictionary{{"a", 1}});
   const PropertyListFiles::Look look(process.lists);
   const auto both = [this] {
     const PropertyListFiles::Look inner(process.lists);
     return std::pair(preferences.integerForKey("a"), preferences.objectForKey("b", "com.tarsil.Widgetry"));
   };
   EXPECT_EQ(both(), std::pair(std::int64_t{1}, Value()));
-  put(kDomain, Dictionary{{"a", 2}, {"c", 3}});
-  put("com.tarsil.Widgetry", Dictionary{{"b", 4}});
+  world.putTree(pathOf(kDomain), Dictionary{{"a", 2}, {"c", 3}});
+  world.putTree(pathOf("com.tarsil.Widgetry"), Dictionary{{"b", 4}});
   EXPECT_EQ(both(), std::pair(std::int64_t{1}, Value()));
   std::thread([&] { EXPECT_EQ(both(), std::pair(std::int64_t{2}, Value(4))); }).join();
   preferences.update("a", [](const Value& a) { return Value(a.asInteger() + 10); });
@@ -113,9 +97,8 @@ TEST_P(APreference, IsWrittenOnlyWhenItChanges) {
 }
 
 TEST_P(APreference, OfAnotherDomainIsReadWhereTheNameLeadsNowhereElse) {
-  put("com.tarsil.Widgetry", Dictionary{{"size", "L"}});
-  world.put(world.path("Library/outside.plist"),
-            *writePropertyList(Dictionary{{"size", "X"}}, PropertyListEncoding::XML));
+  world.putTree(pathOf("com.tarsil.Widgetry"), Dictionary{{"size", "L"}});
+  world.putTree(world.path("Library/outside.plist"), Dictionary{{"size", "X"}});
   EXPECT_EQ(preferences.objectForKey("size", "com.tarsil.Widgetry"), Value("L"));
   preferences.registerDefaults({{"size", "default"}});
   const std::string domains[] = {
@@ -135,7 +118,7 @@ TEST_P(APreference, OfADomainThatCannotBeReadIsNeverOverwritten) {
   preferences.setObjects({{"b", 2}, {"c", 3}});
   EXPECT_EQ(world.get(pathOf(kDomain)), large);
   EXPECT_THAT(
-      world.log.texts(LogLevel::Error),
+      world.errors(),
       ElementsAre(HasSubstr("cannot be read"), HasSubstr("preference a is not changed"),
                   HasSubstr("preference a is not changed"), HasSubstr("preference b, c is not changed")));
 }

@@ -1,23 +1,17 @@
 #include "integration/support/AgentWorld.h"
 #include "platform/JSON.h"
 
-#include <chrono>
+#include <ctime>
 
 namespace kvr::testing {
 namespace {
 
-using World = AgentWorld;
-
-constexpr double kDay = 86400;
-
 /// A device on which the agent has never run, whose every warranty carries an offer that is due.
-class ANewDevice : public ::testing::Test {
- protected:
+struct ANewDevice : ::testing::Test {
   ANewDevice() {
-    using Seconds = std::chrono::duration<double>;
-    const auto now = std::chrono::duration_cast<Seconds>(std::chrono::system_clock::now().time_since_epoch());
-    const Value offer = Dictionary{{"zubOfferEligibleUntil", now.count() + 10 * kDay},
-                                   {"zubOfferFollowupDisplayDate", now.count() - kDay},
+    const auto now = static_cast<double>(std::time(nullptr));
+    const Value offer = Dictionary{{"zubOfferEligibleUntil", now + 10 * kDay},
+                                   {"zubOfferFollowupDisplayDate", now - kDay},
                                    {"zubLocalizedOfferLabel", "Zub"},
                                    {"zubLocalizedOfferDesc", "Add it"},
                                    {"zubLocalizedOfferSingularDesc", "One day left"},

@@ -1,14 +1,9 @@
 #include "integration/support/AgentWorld.h"
 
-#include <signal.h>
-
 namespace kvr::testing {
 namespace {
 
-using World = AgentWorld;
-
-class TheAgent : public ::testing::Test {
- protected:
+struct TheAgent : ::testing::Test {
   Value label(const Value& info) const { return World::warrantyIn(info)["coverageLocalizedLabel"]; }
 
   AgentWorld world;
@@ -58,17 +53,14 @@ TEST_F(TheAgent, ServesOthersWhileSomeWaitForRenewalsAndAttestations) {
   for (int i = 0; i < 64; ++i) {
     waiting.push_back(world.newClient());
     const auto* serialNumber = i % 2 == 0 ? World::kPhone : World::kSecondWatch;
-    const auto call =
-        waiting.back().newCall("GetDeviceInfoForSerialNumber", "st", {serialNumber, World::Refresh});
-    waiting.back().send(call);
+    waiting.back().send("GetDeviceInfoForSerialNumber", "st", {serialNumber, World::Refresh});
   }
   world.agent().waitForErrorOutput("Initiating device authentication");
   world.agent().waitForErrorOutput("Reprovision Vornic tokens");
   for (int i = 0; i < 20; ++i) {
     EXPECT_EQ(label(World::info(polite, World::kFirstWatch, World::CacheOnly)), Value("Warranty"));
   }
-  EXPECT_EQ(world.agent().terminate(), 0) << "the end does not wait for remote answers\n"
-                                          << world.agent().errorOutput();
+  EXPECT_EQ(world.agent().terminate(), 0) << "it waits for remote answers: " << world.agent().errorOutput();
 }
 
 TEST_F(TheAgent, EndsWithAnErrorWhenItLosesTheBus) {
@@ -109,17 +101,15 @@ TEST_F(TheAgent, KnowsTheSupportApplicationInTheUsersLanguage) {
   world.startAgent();
   const auto waiting = world.newClient();
   // For the store, which holds up nobody else.
-  waiting.send(waiting.newCall("AppSupportAvailability", "s", {"not there"}));
+  waiting.send("AppSupportAvailability", "s", {"not there"});
   const auto client = world.newClient();
-  for (const auto& [locale, text] : std::map<std::string, std::string>{{"en_GB", "Installed"},
-                                                                       {"de_AT", "Installiert"},
-                                                                       {"fr", "Installée"},
-                                                                       {"ja_JP", "インストール済み"},
-                                                                       {"nl_NL", "Aanwezig"},
-                                                                       {"pt_BR", "Installed"}}) {
+  const std::pair<const char*, const char*> texts[] = {{"en_GB", "Installed"}, {"de_AT", "Installiert"},
+                                                       {"fr", "Installée"},    {"ja_JP", "インストール済み"},
+                                                       {"nl_NL", "Aanwezig"},  {"pt_BR", "Installed"}};
+  for (const auto& [locale, text] : texts) {
     world.setLocale(locale);
-    const auto answer =
-        client.value("a{sv}", client.call("AppSupportAvailability", "s", {"com.tarsil.support"}));
+    const auto reply = client.call("AppSupportAvailability", "s", {"com.tarsil.support"});
+    const auto answer = client.value("a{sv}", reply);
     EXPECT_EQ(answer["AppAvailablityText"], Value(text)) << locale;
     EXPECT_EQ(answer["AppVendorName"], Value(""));
   }

@@ -13,9 +13,6 @@
 namespace kvr::testing {
 namespace {
 
-constexpr char kLocal[] = "/api/v3/coverage/summary";
-constexpr char kOther[] = "/api/v2/coverage/summary";
-
 std::string deflated(std::string text, int windowBits, int level = Z_BEST_COMPRESSION) {
   z_stream stream{};
   EXPECT_EQ(deflateInit2(&stream, level, Z_DEFLATED, windowBits, 8, Z_DEFAULT_STRATEGY), Z_OK);
@@ -48,8 +45,7 @@ struct Identity {
   }
 };
 
-class ACoverageService : public ::testing::Test {
- protected:
+struct ACoverageService : ::testing::Test {
   ACoverageService() {
     directory_.write("coverage/default.json", R"({"from":"default"})");
     directory_.write("Accounts.plist",
@@ -68,7 +64,7 @@ class ACoverageService : public ::testing::Test {
   HTTPRequest goodRequest() const {
     HTTPRequest request;
     request.method = "POST";
-    request.url = url_ + kLocal;
+    request.url = url_ + "/api/v3/coverage/summary";
     for (const auto& [name, value] : {std::pair("X-Tarsil-Vornic-Token", "token"),
                                       {"X-Client", "client"},
                                       {"altDSID", "000-1"},
@@ -128,10 +124,9 @@ TEST_F(ACoverageService, RefusesEveryBrokenRuleWithAReason) {
       {"requestTimestamp is not an unsigned", replace("123,", "123.5,")},
       {"requestTimezone is not in whole hours", replace("-3", "-10800")},
       {"serialNumber", replace("\"S1\"", "1")},
-      {"locale is not a text", replace("en_US", "")},
-  };
+      {"locale is not a text", replace("en_US", "")}};
   const Case unsignedCases[] = {
-      {"attested", [&](auto& request) { request.url = url_ + kOther; }},
+      {"attested", [&](auto& request) { request.url = url_ + "/api/v2/coverage/summary"; }},
       {"there is no X-Tarsil-Kest-S", set("X-Tarsil-Kest-S", std::nullopt)},
       {"not the leaf's over the body", replace("S1", "S2")},
       {"the chain is not base64", set("X-Tarsil-Kest", "!")},
@@ -139,8 +134,7 @@ TEST_F(ACoverageService, RefusesEveryBrokenRuleWithAReason) {
       {"not become smaller", chain(deflated(identity.chain(), -MAX_WBITS, Z_NO_COMPRESSION))},
       {"not compact with each", chain(deflated(identity.chain(JSONSlashes::Plain), -MAX_WBITS))},
       {"not the leaf's over the body", chain(deflated(stranger.chain(), -MAX_WBITS))},
-      {"does not lead to the authority", [&](auto& request) { stranger.attest(request); }},
-  };
+      {"does not lead to the authority", [&](auto& request) { stranger.attest(request); }}};
   const auto expectRefusal = [this](const HTTPRequest& request, const char* reason) {
     EXPECT_THAT(ask(request), AllOf(::testing::StartsWith("400 "), HasSubstr(reason)));
   };

@@ -7,17 +7,12 @@
 #include <sys/mman.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cstring>
-#include <limits>
 
 namespace kvr::testing {
 namespace {
 
 namespace fs = std::filesystem;
-using World = AgentWorld;
-
-constexpr double kDay = 86400;
 /// Error lines that one failed call may lead to: what it broke, and the two of a download that came to
 /// nothing.
 constexpr std::size_t kMostComplaints = 3;
@@ -72,11 +67,9 @@ std::vector<Store> allStores() {
           {"Keys", 4, 1, nothing, refresh(World::kPhone)}};
 }
 
-class TheAgentsStores : public ::testing::Test {
- protected:
+struct TheAgentsStores : ::testing::Test {
   /// What the files of a store hold, by their names.
   using State = Dictionary;
-
   void SetUp() override {
     if (KVR_SANITIZED) GTEST_SKIP() << "a sanitizer's runtime stands before the injector's calls";
     const auto file = world.directory.write("injection", std::string(sizeof(Injection), '\0'));
@@ -181,8 +174,7 @@ class TheAgentsStores : public ::testing::Test {
     const auto mark = "MARK" + std::to_string(++marks);
     world.newClient().call("GetDeviceInfoForSerialNumber", "st", {mark, World::CacheOnly});
     world.agent().waitForErrorOutput(mark);
-    const auto log = world.agent().errorOutput();
-    return countOf(" error com.", log);
+    return countOf(" error com.", world.agent().errorOutput());
   }
 
   mutable AgentWorld world;

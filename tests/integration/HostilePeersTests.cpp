@@ -1,13 +1,10 @@
 #include "integration/support/AgentWorld.h"
 
-#include <algorithm>
 #include <chrono>
 #include <fstream>
 
 namespace kvr::testing {
 namespace {
-
-using World = AgentWorld;
 
 constexpr const char* kLimits = "org.freedesktop.DBus.Error.LimitsExceeded";
 constexpr const char* kInvalid = "org.freedesktop.DBus.Error.InvalidArgs";
@@ -16,8 +13,7 @@ constexpr const char* kNoObject = "org.freedesktop.DBus.Error.UnknownObject";
 
 /// The agent, beside whose hostile peers a polite one is always served, and whose memory and descriptors stay
 /// where they were.
-class TheAgentAmongHostilePeers : public ::testing::Test {
- protected:
+struct TheAgentAmongHostilePeers : ::testing::Test {
   void begin() {
     world.startAgent();
     polite = std::make_unique<RawBusClient>(world.newClient());
@@ -49,19 +45,13 @@ class TheAgentAmongHostilePeers : public ::testing::Test {
     return std::distance(all, std::filesystem::directory_iterator());
   }
 
-  /// Reads what has come and what comes until `count` calls have been answered: by error, "" for none.
+  /// How often calls were answered with each error, "" for none, once that were `count`.
   static std::map<std::string, int> answers(const RawBusClient& client, int count) {
     std::map<std::string, int> found;
-    while (count > 0) {
-      sd_bus_message* message = nullptr;
-      const int r = sd_bus_process(client.bus(), &message);
-      const BusMessageRef held(message);
-      if (r < 0 || (r == 0 && sd_bus_wait(client.bus(), 60'000'000) <= 0)) break;
-      if (!message) continue;
-      const bool isError = sd_bus_message_is_method_error(message, nullptr) > 0;
-      if (!isError && sd_bus_message_is_signal(message, nullptr, nullptr)) continue;
-      ++found[isError ? sd_bus_message_get_error(message)->name : ""];
-      --count;
+    for (; count > 0; --count) {
+      const auto answer = client.next();
+      if (!answer) break;
+      ++found[answer->error];
     }
     return found;
   }
@@ -101,40 +91,33 @@ TEST_F(TheAgentAmongHostilePeers, AnswersWithAnErrorWhateverIsNoCallOfItsInterfa
   };
   const Fill descriptor = [](sd_bus_message* call) { sd_bus_message_append(call, "h", 0); };
   const Fill nothing = [](sd_bus_message*) {};
-  const char* const path = RawBusClient::kPath;
-  const char* const own = RawBusClient::kInterface;
-  const char* const text1 = "DismissFollowUpForSerialNumber";
-  const std::string longName(255, 'M');
-  const std::tuple<const char*, const char*, const char*, Fill, const char*> calls[] = {
-      {path, own, "Nothing", nothing, kUnknown},
-      {path, own, "defaultDevice", nothing, kUnknown},
-      {path, own, longName.c_str(), nothing, kUnknown},
-      {path, "com.example.Other", "DefaultDevice", nothing, kUnknown},
-      {path, "org.freedesktop.DBus.Properties", "GetAll", text(8),
-       "org.freedesktop.DBus.Error.UnknownInterface"},
-      {"/", own, "DefaultDevice", nothing, kNoObject},
-      {"/com/tarsil/kvragent/x", own, "DefaultDevice", nothing, kNoObject},
-      {path, own, "DefaultDevice", text(1), kInvalid},
-      {path, own, text1, nothing, kInvalid},
-      {path, own, text1, text((1U << 20U) + 1), kInvalid},
-      {path, own, text1, text(10U << 20U), kInvalid},
-      {path, own, text1, bytes, kInvalid},
-      {path, own, text1, entries, kInvalid},
-      {path, own, text1, descriptor, "org.freedesktop.DBus.Error.NotSupported"},
-      {path, own, text1, nested('v', 32), kInvalid},
-      {path, own, text1, nested('v', 62), kInvalid},
-      {path, own, text1, nested('v', 64), kInvalid},
-      {path, own, text1, nested('a', 32), kInvalid},
-  };
   const RawBusClient client = world.newClient();
-  for (const auto& [at, interface, member, fill, error] : calls) {
+  const auto expect = [&](const char* error, const char* path, const char* interface,
+                          const std::string& member, const Fill& fill) {
     sd_bus_message* made = nullptr;
-    sd_bus_message_new_method_call(client.bus(), &made, RawBusClient::kName, at, interface, member);
+    sd_bus_message_new_method_call(client.bus(), &made, RawBusClient::kName, path, interface, member.c_str());
     const BusMessageRef message(made);
     fill(made);
     EXPECT_EQ(client.call(message).error, error)
-        << at << " " << interface << "." << member << " " << sd_bus_message_get_signature(made, 1);
+        << path << " " << interface << "." << member << " " << sd_bus_message_get_signature(made, 1);
+  };
+  const char* const path = RawBusClient::kPath;
+  const char* const own = RawBusClient::kInterface;
+  for (const auto& member : {std::string("Nothing"), std::string("defaultDevice"), std::string(255, 'M')}) {
+    expect(kUnknown, path, own, member, nothing);
   }
+  expect(kUnknown, path, "com.example.Other", "DefaultDevice", nothing);
+  expect("org.freedesktop.DBus.Error.UnknownInterface", path, "org.freedesktop.DBus.Properties", "GetAll",
+         text(8));
+  for (const auto* other : {"/", "/com/tarsil/kvragent/x"}) {
+    expect(kNoObject, other, own, "DefaultDevice", nothing);
+  }
+  expect(kInvalid, path, own, "DefaultDevice", text(1));
+  for (const auto& fill : {nothing, text((1U << 20U) + 1), text(10U << 20U), bytes, entries, nested('v', 32),
+                           nested('v', 62), nested('v', 64), nested('a', 32)}) {
+    expect(kInvalid, path, own, "DismissFollowUpForSerialNumber", fill);
+  }
+  expect("org.freedesktop.DBus.Error.NotSupported", path, own, "DismissFollowUpForSerialNumber", descriptor);
   expectNothingIsLeft("after calls that are none");
 }
 
@@ -145,8 +128,7 @@ TEST_F(TheAgentAmongHostilePeers, BoundsWhatOneConnectionLeavesWaiting) {
   const std::tuple<std::size_t, int, int> floods[] = {{16, 1500, 1024}, {1U << 20U, 12, 4}};
   for (const auto& [textSize, calls, served] : floods) {
     RawBusClient client = world.newClient();
-    for (int i = 0; i < calls; ++i)
-      client.send(client.newCall("AppSupportAvailability", "s", {std::string(textSize, 'x')}));
+    for (int i = 0; i < calls; ++i) client.send("AppSupportAvailability", "s", {std::string(textSize, 'x')});
     const auto found = answers(client, calls - served);
     EXPECT_EQ(found, (std::map<std::string, int>{{kLimits, calls - served}})) << textSize;
     expectPoliteService("beside a flood of calls");
@@ -184,11 +166,11 @@ TEST_F(TheAgentAmongHostilePeers, ServesAThousandConnectionsAtOnceAndLetsGoOfTho
   begin();
   std::vector<RawBusClient> clients;
   for (int i = 0; i < 1000; ++i) clients.push_back(world.newClient());
-  for (const auto& client : clients) client.send(client.newCall("DefaultDevice"));
+  for (const auto& client : clients) client.send("DefaultDevice");
   for (const auto& client : clients) EXPECT_EQ(answers(client, 1), (std::map<std::string, int>{{"", 1}}));
   clients.erase(clients.begin() + 50, clients.end());
   for (auto& client : clients) {
-    client.send(client.newCall("GetAllDeviceInfosUsingPolicy", "tb", {World::Refresh, true}));
+    client.send("GetAllDeviceInfosUsingPolicy", "tb", {World::Refresh, true});
     client.leave();
   }
   world.misbehave("[]");

@@ -23,25 +23,18 @@ struct Launch {
   std::function<void()> beforeItCalls{};  ///< it has connected, and waits
 };
 
-class TheAgentsPeer : public ::testing::Test {
- protected:
+struct TheAgentsPeer : ::testing::Test {
   TheAgentsPeer() {
     // Another user can get at the bus and the programs. What a member does is done at once.
-    fs::permissions(busDirectory(), fs::perms(0711));
+    fs::permissions(world.bus.directory(), fs::perms(0711));
     fs::permissions(world.directory.path(), fs::perms(0711));
     Dictionary preferences = world.preferences().dictionary();
     preferences["PostUpgradeOutreachDelay"] = 0;
-    world.directory.write("home/Library/Preferences/com.tarsil.kvragent.plist",
-                          *writePropertyList(preferences, PropertyListEncoding::Binary));
+    world.setPreferences(preferences);
     world.misbehave(R"([{"status":500}])");
     world.startAgent();
   }
 
-  fs::path busDirectory() const {
-    const auto& address = world.bus.address();
-    const auto from = address.find("path=") + 5;
-    return fs::path(address.substr(from, address.find(',') - from)).parent_path();
-  }
   fs::path device() const { return world.directory / "device"; }
   void grant(const fs::path& program, const Value& value = true) const {
     const Value entitlements = Dictionary{{"com.tarsil.private.kvragent", value}};
@@ -106,8 +99,7 @@ TEST_F(TheAgentsPeer, IsServedOnlyWhenItIsAGrantedProgramOfTheAgentsUser) {
       {true, {true, 1, 2.5}},
       {false, {0, 0.0, false, "true", Date{1}, Value::Bytes{1}, Array{true}, Dictionary{{"a", true}}}}};
   for (const auto& [isServed, granted] : values) {
-    const std::string reason =
-        isServed ? "connection added from" : "Rejecting connection to kvragent: missing";
+    const auto reason = isServed ? "connection added from" : "Rejecting connection to kvragent: missing";
     for (const auto& value : granted) {
       expect(isServed, "granted " + describe(value), {{grantedProgram(value)}}, reason);
     }

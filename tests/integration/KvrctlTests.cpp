@@ -10,8 +10,7 @@ namespace kvr::testing {
 namespace {
 
 /// The command-line client on a bus where this process plays the agent.
-class Kvrctl : public BusFixture {
- protected:
+struct Kvrctl : BusFixture {
   struct Outcome {
     int status;
     std::string output;
@@ -20,18 +19,13 @@ class Kvrctl : public BusFixture {
 
   Kvrctl() {
     entitle(true, kProgram);
-    newBehaviour = [this] {
-      return [this](const std::string& member, const Array& arguments, const ServiceReply& reply) {
-        const std::lock_guard lock(mutex_);
-        asked_ = member + describe(Value(arguments));
-        if (member == heldMember_) {
-          held_.push_back(reply);
-          isHeld_.set_value();
-        } else {
-          reply(answers_[member]);
-        }
-      };
-    };
+    behave([this](const std::string& member, const Array& arguments, const ServiceReply& reply) {
+      const std::lock_guard lock(mutex_);
+      asked_ = member + describe(Value(arguments));
+      if (member != heldMember_) return reply(answers_[member]);
+      held_.push_back(reply);
+      isHeld_.set_value();
+    });
   }
 
   ChildProcess start(std::vector<std::string> arguments) {
@@ -100,8 +94,7 @@ TEST_F(Kvrctl, AsksWhatItIsTold) {
   setAnswer("GetDeviceInfoForSerialNumber", info(Dictionary{{"covered", true}}));
   setAnswer("GetDefaultDeviceInfoUsingPolicy", info(Value()));
   setAnswer("GetAllDeviceInfosUsingPolicy", Array{info(Value()), info(Dictionary{})});
-  for (const auto* member : {"DismissFollowUpForSerialNumber", "ScheduleOutreachAfter"})
-    setAnswer(member, true);
+  for (const auto* it : {"DismissFollowUpForSerialNumber", "ScheduleOutreachAfter"}) setAnswer(it, true);
   setAnswer("TarsilAccountAdded", false);
   setAnswer("DefaultDevice", Dictionary{{"name", 7}, {"deviceType", "x"}});
   setAnswer("PairedDevices", Array{device("a watch")});
@@ -117,8 +110,7 @@ TEST_F(Kvrctl, AsksWhatItIsTold) {
       {"web-url", "ReadWebURLOverride()", 2},
       {"info", "GetDefaultDeviceInfoUsingPolicy(0)", 2},
       {"info S1 --policy refresh", "GetDeviceInfoForSerialNumber(S1, 2)", 0},
-      {"info --all --policy cache", "GetAllDeviceInfosUsingPolicy(1, 0)", 0},
-  };
+      {"info --all --policy cache", "GetAllDeviceInfosUsingPolicy(1, 0)", 0}};
   for (const auto& [arguments, call, status] : cases) {
     const Outcome outcome = run(wordsOf(arguments));
     EXPECT_EQ(outcome.status, status) << outcome.errors;

@@ -13,6 +13,7 @@ struct CoverageWorld : SimulatedPlatform {
 
   explicit CoverageWorld(std::uint64_t seed = 1) : SimulatedPlatform(seed) {
     clock.set(Date{1'800'000'000});
+    featureFlags.enabled.insert({"Kavrel", "Bravik_3_0"});
     attestation.preferred = SimulatedDeviceAttestation::issued(attestation.key, {std::string(600, 'c')});
     deviceProperties.answers = {{"SerialNumber", kLocal},
                                 {"UserAssignedDeviceName", "Phone"},
@@ -48,6 +49,10 @@ struct CoverageWorld : SimulatedPlatform {
          {preference::kServerVersionOverride, preference::kWarrantyURL, preference::kWearablesWarrantyURL}) {
       preferences.removeObject(key);
     }
+  }
+
+  void pair(const std::string& serialNumber, Date since = Date{1}) {
+    pairedDevices.devices.push_back({"Watch", "Model", serialNumber, since, true, false});
   }
 
   std::function<HTTPResponse(const HTTPRequest&)> coverage;

@@ -8,8 +8,7 @@ namespace kvr {
 /// A test in a simulated world of its own. What can still run without time passing runs at the end; a fault
 /// fails the test. A test that provokes faults takes them (`takeFaults`).
 template <class World>
-class TestIn : public ::testing::Test {
- protected:
+struct TestIn : ::testing::Test {
   void TearDown() override {
     world.queues.run();
     EXPECT_THAT(world.faults(), IsEmpty());

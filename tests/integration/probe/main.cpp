@@ -53,16 +53,10 @@ void leave() {
 }
 
 int append(sd_bus_message* call, char type) {
-  switch (type) {
-    case 's':
-      return sd_bus_message_append(call, "s", "SNPHONE00001");
-    case 't':
-      return sd_bus_message_append(call, "t", std::uint64_t{1});
-    case 'b':
-      return sd_bus_message_append(call, "b", 0);
-    default:
-      return sd_bus_message_append(call, "d", 0.0);
-  }
+  if (type == 's') return sd_bus_message_append(call, "s", "SNPHONE00001");
+  if (type == 't') return sd_bus_message_append(call, "t", std::uint64_t{1});
+  if (type == 'b') return sd_bus_message_append(call, "b", 0);
+  return sd_bus_message_append(call, "d", 0.0);
 }
 
 }  // namespace

@@ -4,33 +4,12 @@
 #include "signing/SHA256Hash.h"
 
 #include <httplib.h>
-#include <systemd/sd-bus.h>
 
-#include <algorithm>
-#include <iterator>
 #include <stdexcept>
 
 namespace kvr::testing {
-namespace {
-
-constexpr std::uint64_t kLimitMicroseconds = 60'000'000;  // only ever spent on a failure
-constexpr const char* kAuthority = "home/Library/Keys/com.tarsil.kvragent.kestCertificates/authority.pem";
-
-constexpr const char* kActivities = "Library/Activities/com.tarsil.kvragent.plist";
-
-Value watch(const std::string& serialNumber) {
-  return Dictionary{{"name", "Watch " + serialNumber},
-                    {"serialNumber", serialNumber},
-                    {"pairedDate", Date{1'750'000'000}},
-                    {"isPaired", true}};
-}
-
-}  // namespace
 
 AgentWorld::AgentWorld(Attestation attestation) {
-  const auto binary = [](const Value& tree) {
-    return *writePropertyList(tree, PropertyListEncoding::Binary);
-  };
   directory.write("service/kvrV2.plist", "{ LowServerVersion = 2; HighServerVersion = 3; }");
   setCoverage("default", R"({"covered":true,"coverageLocalizedLabel":"Warranty"})");
   for (const auto* serialNumber : {kPhone, kFirstWatch, kSecondWatch}) {
@@ -49,19 +28,18 @@ AgentWorld::AgentWorld(Attestation attestation) {
 
   std::vector<std::string> command{KVR_PROGRAMS "/kvr-coverage-service", "--root", directory / "service"};
   if (attestation == Attestation::Required) {
-    command.insert(command.end(), {"--authority", (directory / kAuthority).string()});
+    command.insert(command.end(),
+                   {"--authority",
+                    (home() / "Library/Keys/com.tarsil.kvragent.kestCertificates/authority.pem").string()});
   }
   service_ = std::make_unique<ChildProcess>(command);
   constexpr std::string_view kListening = "listening on ";
   serviceURL_ = service_->waitForOutput(kListening).substr(kListening.size());
   directory.write(std::string("home/") + kActivities, "{ OSVersion = \"17.9\"; activities = {}; }");
-  directory.write("home/Library/Preferences/com.tarsil.kvragent.plist",
-                  binary(Dictionary{{"ServerVersionURL", serviceURL_ + "/library/TARSIL/asset/kvrV2.plist"},
-                                    {"WarrantyURL", serviceURL_ + "/api/v3/coverage/summary"},
-                                    {"WearablesWarrantyURL", serviceURL_ + "/api/v2/coverage/summary"}}));
+  setPreferences(Dictionary{{"ServerVersionURL", serviceURL_ + "/library/TARSIL/asset/kvrV2.plist"},
+                            {"WarrantyURL", serviceURL_ + "/api/v3/coverage/summary"},
+                            {"WearablesWarrantyURL", serviceURL_ + "/api/v2/coverage/summary"}});
 }
-
-void AgentWorld::becomeNewDevice() const { std::filesystem::remove(home() / kActivities); }
 
 ChildProcess::Environment AgentWorld::environment() const {
   ChildProcess::Environment environment{
@@ -88,23 +66,8 @@ void AgentWorld::letTheBusStartIt() {
 }
 
 void AgentWorld::waitForName(bool isOwned) const {
-  const RawBusClient watcher = newClient();
-  const auto handler = [](sd_bus_message*, void*, sd_bus_error*) { return 0; };
-  sd_bus_match_signal(watcher.bus(), nullptr, "org.freedesktop.DBus", nullptr, "org.freedesktop.DBus",
-                      "NameOwnerChanged", handler, nullptr);
-  // Every arrival and departure wakes the watcher up, its own included; it is the agent's name that counts.
-  while ((sd_bus_get_name_creds(watcher.bus(), RawBusClient::kName, 0, nullptr) >= 0) != isOwned) {
-    const int processed = sd_bus_process(watcher.bus(), nullptr);
-    if (processed < 0) throw std::runtime_error("the bus is gone");
-    if (processed == 0 && sd_bus_wait(watcher.bus(), kLimitMicroseconds) == 0) {
-      throw std::runtime_error("nothing happened to the agent's name: " +
-                               (agent_ ? agent_->errorOutput() : ""));
-    }
-  }
-}
-
-void AgentWorld::writeDeviceFile(const std::string& name, const Value& tree) const {
-  directory.write("device/" + name, *writePropertyList(tree, PropertyListEncoding::XML));
+  if (newClient().waitForName(isOwned)) return;
+  throw std::runtime_error("nothing happened to the agent's name: " + (agent_ ? agent_->errorOutput() : ""));
 }
 
 void AgentWorld::entitle(const Value& value) const {
@@ -114,13 +77,14 @@ void AgentWorld::entitle(const Value& value) const {
                   Dictionary{{std::filesystem::read_symlink("/proc/self/exe").string(), granted}});
 }
 
-void AgentWorld::setLocale(const std::string& identifier) const {
-  writeDeviceFile("Locale.plist", Dictionary{{"identifier", identifier}});
-}
-
 void AgentWorld::pair(const std::vector<std::string>& serialNumbers) const {
   Array watches;
-  std::ranges::transform(serialNumbers, std::back_inserter(watches), watch);
+  for (const auto& serialNumber : serialNumbers) {
+    watches.push_back(Dictionary{{"name", "Watch " + serialNumber},
+                                 {"serialNumber", serialNumber},
+                                 {"pairedDate", Date{1'750'000'000}},
+                                 {"isPaired", true}});
+  }
   writeDeviceFile("PairedDevices.plist", watches);
 }
 
@@ -134,10 +98,6 @@ void AgentWorld::setAccount(const Value& renewal) const {
                                                            {"authenticationAccount", authentication}}}});
 }
 
-void AgentWorld::setCoverage(const std::string& name, const std::string& json) const {
-  directory.write("service/coverage/" + name + ".json", json);
-}
-
 void AgentWorld::misbehave(const std::string& rules) const {
   httplib::Client client(serviceURL_);
   const auto answer = client.Post("/control", "{\"coverage\":" + rules + "}", "application/json");
@@ -145,11 +105,10 @@ void AgentWorld::misbehave(const std::string& rules) const {
 }
 
 std::vector<Value> AgentWorld::requests() const {
-  std::vector<std::filesystem::path> paths;
+  std::set<std::filesystem::path> paths;
   for (const auto& entry : std::filesystem::directory_iterator(directory / "service/requests")) {
-    if (entry.path().extension() == ".json") paths.push_back(entry.path());
+    if (entry.path().extension() == ".json") paths.insert(entry.path());
   }
-  std::ranges::sort(paths);
   std::vector<Value> requests;
   for (const auto& path : paths) requests.push_back(*readJSON(*contentOfFile(path)));
   return requests;
@@ -161,26 +120,10 @@ std::vector<Value> AgentWorld::coverageRequests() const {
   return all;
 }
 
-Value AgentWorld::file(const std::string& path) const {
-  return *readPropertyList(*contentOfFile(home() / path));
-}
-
-Value AgentWorld::preferences() const { return file("Library/Preferences/com.tarsil.kvragent.plist"); }
-
 std::string AgentWorld::cacheFileOf(const std::string& serialNumber) const {
   return (home() / "Library/Application Support/com.tarsil.Kavrel" /
           (sha256Hash(serialNumber) + "_Warranty.plist"))
       .string();
 }
-
-Value AgentWorld::info(const RawBusClient& client, const std::string& serialNumber, std::uint64_t policy) {
-  return client.value("a{sv}", client.call("GetDeviceInfoForSerialNumber", "st", {serialNumber, policy}));
-}
-
-Array AgentWorld::allInfos(const RawBusClient& client, std::uint64_t policy) {
-  return client.value("aa{sv}", client.call("GetAllDeviceInfosUsingPolicy", "tb", {policy, false})).array();
-}
-
-Value AgentWorld::warrantyIn(const Value& info) { return info["warranty"]["DictionaryRepresentation"]; }
 
 }  // namespace kvr::testing

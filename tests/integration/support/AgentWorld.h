@@ -1,12 +1,8 @@
 #pragma once
 
 #include "Prelude.h"
-#include "integration/support/ChildProcess.h"
 #include "integration/support/PrivateBus.h"
 #include "integration/support/RawBusClient.h"
-#include "integration/support/TemporaryDirectory.h"
-
-#include <memory>
 
 namespace kvr::testing {
 
@@ -28,7 +24,7 @@ class AgentWorld {
   explicit AgentWorld(Attestation attestation = Attestation::Required);
 
   /// From here on it is the device's first start.
-  void becomeNewDevice() const;
+  void becomeNewDevice() const { std::filesystem::remove(home() / kActivities); }
   /// Starts the agent, after killing one that runs, and returns once it has its name on the bus.
   void startAgent();
   /// Instead: has the bus start it at the first call. It prints to the bus's error output, and its exit
@@ -39,14 +35,20 @@ class AgentWorld {
   ChildProcess& agent() { return *agent_; }
   RawBusClient newClient() const { return RawBusClient(bus.address()); }
 
-  void writeDeviceFile(const std::string& name, const Value& tree) const;
+  void writeDeviceFile(const std::string& name, const Value& tree) const {
+    directory.write("device/" + name, *writePropertyList(tree, PropertyListEncoding::XML));
+  }
   void entitle(const Value& value) const;
-  void setLocale(const std::string& identifier) const;
+  void setLocale(const std::string& identifier) const {
+    writeDeviceFile("Locale.plist", Dictionary{{"identifier", identifier}});
+  }
   void pair(const std::vector<std::string>& serialNumbers) const;
   /// The account of the device, with a script for renewals (null: none).
   void setAccount(const Value& renewal) const;
   /// What the service answers about a device (SERIAL), or about it in one locale (SERIAL.LOCALE).
-  void setCoverage(const std::string& name, const std::string& json) const;
+  void setCoverage(const std::string& name, const std::string& json) const {
+    directory.write("service/coverage/" + name + ".json", json);
+  }
   /// Tells the service how to answer coverage requests, in the rules that its control endpoint takes.
   void misbehave(const std::string& rules) const;
 
@@ -55,26 +57,38 @@ class AgentWorld {
   /// Those for coverage.
   std::vector<Value> coverageRequests() const;
   /// A property list below the home directory.
-  Value file(const std::string& path) const;
-  Value preferences() const;
+  Value file(const std::string& path) const { return *readPropertyList(*contentOfFile(home() / path)); }
+  void setPreferences(const Value& preferences) const {
+    writeFile(home() / kPreferences, *writePropertyList(preferences, PropertyListEncoding::Binary));
+  }
+  Value preferences() const { return file(kPreferences); }
   std::string cacheFileOf(const std::string& serialNumber) const;
   std::filesystem::path home() const { return directory / "home"; }
 
   // Calls by a client, and what they reply.
-  static Value info(const RawBusClient& client, const std::string& serialNumber, std::uint64_t policy);
-  static Array allInfos(const RawBusClient& client, std::uint64_t policy);
+  static Value info(const RawBusClient& client, const std::string& serialNumber, std::uint64_t policy) {
+    return client.value("a{sv}", client.call("GetDeviceInfoForSerialNumber", "st", {serialNumber, policy}));
+  }
+  static Array allInfos(const RawBusClient& client, std::uint64_t policy) {
+    return client.value("aa{sv}", client.call("GetAllDeviceInfosUsingPolicy", "tb", {policy, false})).array();
+  }
   /// The warranty's dictionary in a device info, null for none.
-  static Value warrantyIn(const Value& info);
+  static Value warrantyIn(const Value& info) { return info["warranty"]["DictionaryRepresentation"]; }
 
   PrivateBus bus;
   TemporaryDirectory directory;
   ChildProcess::Environment moreEnvironment;  ///< of the agent, besides what makes its world
 
  private:
+  static constexpr const char* kActivities = "Library/Activities/com.tarsil.kvragent.plist";
+  static constexpr const char* kPreferences = "Library/Preferences/com.tarsil.kvragent.plist";
+
   ChildProcess::Environment environment() const;
   std::unique_ptr<ChildProcess> service_;
   std::string serviceURL_;
   std::unique_ptr<ChildProcess> agent_;
 };
+
+using World = AgentWorld;
 
 }  // namespace kvr::testing

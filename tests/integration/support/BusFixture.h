@@ -3,50 +3,92 @@
 #include "Prelude.h"
 #include "integration/support/PrivateBus.h"
 #include "integration/support/RawBusClient.h"
-#include "integration/support/RecordingLog.h"
-#include "integration/support/TemporaryDirectory.h"
 #include "platform/local/EventLoop.h"
 #include "platform/local/LocalClock.h"
 #include "platform/local/LocalFiles.h"
 #include "platform/local/LocalServiceListeners.h"
 #include "platform/local/LocalWorkQueues.h"
+#include "platform/simulated/SimulatedLog.h"
+
+#include <stdlib.h>
 
 #include <future>
-#include <memory>
 #include <mutex>
 
 namespace kvr::testing {
 
 /// A service on a bus of its own, in this process, that does what a test tells it; its clients, too, are this
 /// program.
-class BusFixture : public ::testing::Test, public ServiceListenerDelegate {
- protected:
+struct BusFixture : ::testing::Test, ServiceListenerDelegate {
   static constexpr std::string_view kEntitlement = "com.example.entitlement";
   /// Long enough for the slowest machine under a sanitizer; only ever spent on a failure.
   static constexpr std::chrono::seconds kLimit{60};
 
-  using Behaviour =
-      std::function<void(const std::string& member, const Array& arguments, ServiceReply reply)>;
+  using Behaviour = std::function<void(const std::string& member, const Array&, ServiceReply reply)>;
 
-  BusFixture();
-  ~BusFixture() override;
+  BusFixture() {
+    ::setenv("DBUS_SESSION_BUS_ADDRESS", bus.address().c_str(), 1);
+    entitle(true);
+    listeners =
+        std::make_unique<LocalServiceListeners>(queues_, log, entitlements_, [this] { lost_.set_value(); });
+    listener = listeners->newListener(RawBusClient::kName);
+    listener->setDelegate(*this);
+  }
+  ~BusFixture() override { stop(); }
 
   /// States the entitlement's value for a program, by default this one, and for no other.
-  void entitle(const Value& value, const std::string& program = "/proc/self/exe");
+  void entitle(const Value& value, const std::string& program = "/proc/self/exe") {
+    const Dictionary granted{{std::string(kEntitlement), value}};
+    root_.write("Entitlements.plist",
+                *writePropertyList(Dictionary{{std::filesystem::canonical(program).string(), granted}},
+                                   PropertyListEncoding::XML));
+  }
   /// Serves the name on the bus until what is returned goes, by default with operations that echo every type.
   /// The name is there on return; after the end nothing of the test is touched any more.
-  [[nodiscard]] std::shared_ptr<void> serve(const ServiceInterface& interface = echoInterface());
-  void stop();
+  [[nodiscard]] std::shared_ptr<void> serve(const ServiceInterface& interface = echoInterface()) {
+    interface_ = interface;
+    listener->resume(interface);
+    if (!newClient().waitForName(true)) throw std::runtime_error("the name never came");
+    return {nullptr, [this](void*) { stop(); }};
+  }
+  void stop() {
+    log.beginEnding();
+    listener.reset();
+    listeners.reset();
+    queues_.beginEnding();
+    queues_.drain(static_cast<double>(kLimit.count()));
+  }
   RawBusClient newClient() const { return RawBusClient(bus.address()); }
   bool waitUntilLost() { return lost_.get_future().wait_for(kLimit) == std::future_status::ready; }
 
-  static const ServiceInterface& echoInterface();
-  bool shouldAcceptNewConnection(ServiceConnection& connection) override;
+  /// Has every object made from now on do this.
+  void behave(const Behaviour& behaviour) {
+    newBehaviour = [behaviour] { return behaviour; };
+  }
+  static ServiceInterface echoInterface() {
+    return {RawBusClient::kInterface,
+            {{"EchoRecord", {{"record", "a{sv}"}}, {"record", "a{sv}"}},
+             {"EchoRecords", {{"records", "aa{sv}"}}, {"records", "aa{sv}"}},
+             {"EchoText", {{"text", "s"}}, {"text", "s"}},
+             {"EchoNumber", {{"number", "t"}}, {"number", "t"}},
+             {"EchoReal", {{"real", "d"}}, {"real", "d"}},
+             {"Record", {{"text", "s"}, {"number", "t"}}, {"record", "a{sv}"}}}};
+  }
+  bool shouldAcceptNewConnection(ServiceConnection& connection) override {
+    decisions.push_back(connection.valueForEntitlement(kEntitlement));
+    if (!(decisions.back() == Value(true))) return false;
+    connection.setExportedInterface(interface_);
+    connection.setExportedObject(std::make_shared<Object>(*this));
+    connection.resume();
+    return true;
+  }
 
   PrivateBus bus;
-  RecordingLog log;
-  /// What objects made from now on do. By default they reply what they were given.
-  std::function<Behaviour()> newBehaviour;
+  SimulatedLog log;
+  /// What each object does. By default they reply what they were given.
+  std::function<Behaviour()> newBehaviour = [] {
+    return [](auto&, const Array& arguments, const ServiceReply& reply) { reply(arguments.at(0)); };
+  };
   std::function<void()> onObjectGone = [] {};
   std::vector<Value> decisions;  ///< the entitlement's value, at every decision
 
@@ -54,7 +96,18 @@ class BusFixture : public ::testing::Test, public ServiceListenerDelegate {
   std::unique_ptr<ServiceListener> listener;
 
  private:
-  class Object;
+  struct Object : ServiceObject {
+    explicit Object(const BusFixture& test)
+        : interface(test.interface_), behaviour(test.newBehaviour()), gone(test.onObjectGone) {}
+    ~Object() override { gone(); }
+    void invoke(std::size_t method, const Array& arguments, ServiceReply reply) override {
+      behaviour(interface.methods[method].member, arguments, std::move(reply));
+    }
+
+    const ServiceInterface interface;
+    const Behaviour behaviour;
+    const std::function<void()> gone;
+  };
 
   TemporaryDirectory root_;
   LocalClock clock_;

@@ -1,9 +1,9 @@
 #pragma once
 
-#include "integration/support/RecordingLog.h"
 #include "platform/local/EventLoop.h"
 #include "platform/local/LocalHTTP.h"
 #include "platform/local/LocalWorkQueues.h"
+#include "platform/simulated/SimulatedLog.h"
 
 #include <future>
 #include <memory>
@@ -29,7 +29,7 @@ class HTTPClient {
   void end() { http_.reset(); }
 
  private:
-  RecordingLog log_;
+  SimulatedLog log_;
   EventLoop loop_;
   LocalWorkQueues queues_{loop_, log_};
   std::unique_ptr<LocalHTTP> http_ = std::make_unique<LocalHTTP>(queues_, log_);

@@ -5,17 +5,7 @@
 namespace kvr {
 namespace {
 
-class AnAgent : public CoverageTest {
- protected:
-  AnAgent() : agent(KVRAgent::initWithCallingProcessBundleID(world.platform, "com.example.client")) {
-    world.featureFlags.enabled.insert({"Kavrel", "Bravik_3_0"});
-  }
-  void pair(int watches) {
-    for (int i = 0; i < watches; ++i) {
-      world.pairedDevices.devices.push_back(
-          {"Watch", "Model", "W" + std::to_string(i), Date{1}, true, false});
-    }
-  }
+struct AnAgent : CoverageTest {
   static std::string serialNumberIn(const HTTPRequest& request) {
     return (*readJSON(request.body))["serialNumber"].string();
   }
@@ -36,19 +26,19 @@ class AnAgent : public CoverageTest {
     return reply;
   }
   std::optional<bool> accountAdded() {
-    auto reply = std::make_shared<std::optional<bool>>();
-    agent->tarsilAccountAdded(BoolReply(world.log, "test", [reply](bool yes) { *reply = yes; }));
+    added.reset();
+    agent->tarsilAccountAdded(BoolReply(world.log, "test", [this](bool yes) { added = yes; }));
     world.queues.run();
-    pending = reply;
-    return *reply;
+    return added;
   }
 
-  std::shared_ptr<KVRAgent> agent;
-  std::shared_ptr<std::optional<bool>> pending;
+  std::shared_ptr<KVRAgent> agent =
+      KVRAgent::initWithCallingProcessBundleID(world.platform, "com.example.client");
+  std::optional<bool> added;  ///< what the last call replied
 };
 
 TEST_F(AnAgent, AnswersOverlappingCallsAfterTheLookupsOfBothWithOneRecordADevice) {
-  pair(50);
+  for (int i = 0; i < 50; ++i) world.pair("W" + std::to_string(i));
   std::vector<SimulatedHTTP::Answer> held;
   const auto plain = world.http.handler;
   world.http.handler = [&](const HTTPRequest& request, bool uncached, const SimulatedHTTP::Answer& answer) {
@@ -117,7 +107,7 @@ TEST_F(AnAgent, RefreshesAfterAnAccountWasAddedOnceTheFirstOutreachIsScheduled) 
   world.queues.advance(3599);
   EXPECT_THAT(world.http.requests(), IsEmpty());
   world.queues.advance(1);
-  EXPECT_EQ(*pending, true);
+  EXPECT_EQ(added, true);
   EXPECT_THAT(world.http.requests(), SizeIs(2));
 }
 

@@ -1,58 +1,44 @@
 #include "agent/KVRAgent.h"
-#include "unit/CoverageWorld.h"
-#include "warranty/CacheMetadata.h"
+#include "unit/SimulatedTest.h"
+#include "warranty/KVRAgentDefaultWarrantyProvider.h"
 
 namespace kvr {
 namespace {
 
 /// A warranty provider whose facts are plain fields.
-class FakeWarrantyProvider : public KVRAgentWarrantyProvider {
- public:
-  KVRWarrantyRef cached;
-  KVRWarrantyRef downloaded;
-  std::optional<Date> lastUpdated;
-  std::optional<std::string> version = "2";
-  std::optional<std::string> locale = "en_US";
-  bool signedIn = true;
-  std::size_t downloads = 0;
+struct FakeWarrantyProvider : KVRAgentDefaultWarrantyProvider {
+  using KVRAgentDefaultWarrantyProvider::KVRAgentDefaultWarrantyProvider;
 
   void downloadWarrantyForSerialNumber(const std::string&, DownloadCompletion handler) override {
-    ++downloads;
-    handler(downloaded != nullptr, downloaded);
+    ++facts.downloads;
+    handler(facts.downloaded != nullptr, facts.downloaded);
   }
-  KVRWarrantyRef cachedWarrantyForSerialNumber(const std::string&) override { return cached; }
-  std::optional<Date> lastUpdatedDateForSerialNumber(const std::string&) override { return lastUpdated; }
+  KVRWarrantyRef cachedWarrantyForSerialNumber(const std::string&) override { return facts.cached; }
+  std::optional<Date> lastUpdatedDateForSerialNumber(const std::string&) override {
+    return facts.lastUpdated;
+  }
   std::optional<std::string> cachedWarrantyVersionForSerialNumber(const std::string&) override {
-    return version;
+    return facts.version;
   }
   std::optional<std::string> cachedWarrantyLocaleForSerialNumber(const std::string&) override {
-    return locale;
+    return facts.locale;
   }
   double cachedWarrantyValidityDuration() override { return 86400; }
-  bool isSignedInToNimbra() override { return signedIn; }
+  bool isSignedInToNimbra() override { return facts.signedIn; }
 
-  // What no lookup asks for.
-  KVRDeviceInfoList refreshFollowupWithDeviceInfos(const KVRDeviceInfoList&) override { return {}; }
-  KVRDeviceInfoList refreshFollowupWithDeviceInfo(const KVRDeviceInfoRef&) override { return {}; }
-  void dismissFollowUpForSerialNumber(const std::string&) override {}
-  KVRWarrantyRef migrateLegacyCachedWarrantyIfNeededForSerialNumber(const std::string&) override {
-    return nullptr;
-  }
-  void migrateLegacyFollowUpIfNeededWithDeviceInfo(const KVRDeviceInfoRef&) override {}
-  std::int32_t migrationVersion() override { return 2; }
-  void setMigrationVersion(std::int32_t) override {}
+  struct Facts {
+    KVRWarrantyRef cached;
+    KVRWarrantyRef downloaded;
+    std::optional<Date> lastUpdated;
+    std::optional<std::string> version = "2";
+    std::optional<std::string> locale = "en_US";
+    bool signedIn = true;
+    std::size_t downloads = 0;
+  } facts;
 };
 
-class ALookup : public SimulatedTest {
- protected:
-  ALookup()
-      : provider(std::make_shared<FakeWarrantyProvider>()),
-        agent(std::make_shared<KVRAgent>(world.platform, provider, nullptr)),
-        fromCache(warranty("cache")),
-        fromDownload(warranty("download")) {
-    world.clock.set(Date{1'800'000'000});
-  }
-
+struct ALookup : SimulatedTest {
+  ALookup() { world.clock.set(Date{1'800'000'000}); }
   KVRWarrantyRef warranty(const char* mark) {
     return KVRWarranty::initWithDictionary(world.platform, Dictionary{{"quorURL", mark}});
   }
@@ -64,10 +50,12 @@ class ALookup : public SimulatedTest {
     return answer.value();
   }
 
-  std::shared_ptr<FakeWarrantyProvider> provider;
-  std::shared_ptr<KVRAgent> agent;
-  KVRWarrantyRef fromCache;
-  KVRWarrantyRef fromDownload;
+  const std::shared_ptr<FakeWarrantyProvider> provider =
+      std::make_shared<FakeWarrantyProvider>(world.platform, "client");
+  FakeWarrantyProvider::Facts& facts = provider->facts;
+  const std::shared_ptr<KVRAgent> agent = std::make_shared<KVRAgent>(world.platform, provider, nullptr);
+  const KVRWarrantyRef fromCache = warranty("cache");
+  const KVRWarrantyRef fromDownload = warranty("download");
 };
 
 TEST_F(ALookup, DecidesBetweenCacheAndDownload) {
@@ -79,30 +67,29 @@ TEST_F(ALookup, DecidesBetweenCacheAndDownload) {
       {0, Cache::Missing, true, fromDownload, nothing},   {1, Cache::Stale, false, fromCache, fromCache},
       {1, Cache::Invalid, false, nothing, nothing},       {1, Cache::Missing, false, nothing, nothing},
       {7, Cache::Stale, false, fromCache, fromCache},     {7, Cache::Missing, false, nothing, nothing},
-      {2, Cache::Fresh, true, fromDownload, nothing},     {2, Cache::Missing, true, fromDownload, nothing},
-  };
+      {2, Cache::Fresh, true, fromDownload, nothing},     {2, Cache::Missing, true, fromDownload, nothing}};
   for (const auto& [policy, cache, downloads, whenItYields, otherwise] : cases) {
-    provider->cached = cache == Cache::Missing ? nullptr : fromCache;
-    provider->version = cache == Cache::Invalid ? "1" : "2";
+    facts.cached = cache == Cache::Missing ? nullptr : fromCache;
+    facts.version = cache == Cache::Invalid ? "1" : "2";
     // A cache exactly at the end of its validity is stale.
     const double age = cache == Cache::Stale ? 86400 : 3600;
-    provider->lastUpdated = cache == Cache::Undated ? std::nullopt : std::optional(world.clock.now() - age);
+    facts.lastUpdated = cache == Cache::Undated ? std::nullopt : std::optional(world.clock.now() - age);
     for (const bool yields : {true, false}) {
-      provider->downloaded = yields ? fromDownload : nullptr;
-      provider->downloads = 0;
+      facts.downloaded = yields ? fromDownload : nullptr;
+      facts.downloads = 0;
       EXPECT_EQ(lookUp(policy), yields ? whenItYields : otherwise)
           << policy << " " << static_cast<int>(cache) << yields;
-      EXPECT_EQ(provider->downloads, downloads ? 1U : 0U);
+      EXPECT_EQ(facts.downloads, downloads ? 1U : 0U);
     }
   }
 }
 
 TEST_F(ALookup, SaysWhyItTrustsTheCacheOrNot) {
-  const auto expect = [&](std::uint64_t policy, const std::function<void(FakeWarrantyProvider&)>& change,
-                          bool downloads, std::vector<std::string> lines) {
-    *provider = FakeWarrantyProvider();
-    provider->cached = fromCache;
-    change(*provider);
+  const auto expect = [&](std::uint64_t policy, const std::function<void()>& change, bool downloads,
+                          std::vector<std::string> lines) {
+    facts = {};
+    facts.cached = fromCache;
+    change();
     world.log.clear();
     lookUp(policy);
     lines.insert(lines.begin(), format("getting warranty using policy SN: %lu", policy));
@@ -117,25 +104,25 @@ TEST_F(ALookup, SaysWhyItTrustsTheCacheOrNot) {
   const std::string examine = "Default policy query: cached warranty is valid, examine expiration date";
   const std::string invalid = "Default policy query: cached warranty is invalid, refresh it";
   const auto now = world.clock.now();
-  expect(1, [](auto& p) { p.cached = nullptr; }, false, {"no cached warranty : SN"});
-  expect(0, [](auto& p) { p.version.reset(); }, true,
+  expect(1, [&] { facts.cached = nullptr; }, false, {"no cached warranty : SN"});
+  expect(0, [&] { facts.version.reset(); }, true,
          {has, "cached warranty is of outdated version '(null)', current version is '2', consider it invalid",
           invalid});
-  expect(2, [](auto& p) { p.locale.reset(); }, true,
+  expect(2, [&] { facts.locale.reset(); }, true,
          {has, "cached warranty is for locale '(null)', system is now in 'en_US', consider it invalid"});
-  expect(0, [](auto& p) { p.signedIn = false; }, true,
+  expect(0, [&] { facts.signedIn = false; }, true,
          {has, "user is signed out of Nimbra, cached warranty not allowed", invalid});
-  expect(0, [&](auto& p) { p.lastUpdated = now - 3600; }, false,
+  expect(0, [&] { facts.lastUpdated = now - 3600; }, false,
          {has, valid, examine, "warranty valid for 82800.00 seconds"});
-  expect(0, [&](auto& p) { p.lastUpdated = now - 86400.5; }, true,
+  expect(0, [&] { facts.lastUpdated = now - 86400.5; }, true,
          {has, valid, examine, "warranty validity expired 0.50 seconds ago, refresh it"});
-  expect(0, [](auto&) {}, true, {has, valid, examine, "warranty validity expired, refresh it"});
-  expect(9, [](auto&) {}, false, {has, valid});
+  expect(0, [] {}, true, {has, valid, examine, "warranty validity expired, refresh it"});
+  expect(9, [] {}, false, {has, valid});
 }
 
 TEST_F(ALookup, RefusesWhatIsNoSerialNumber) {
-  provider->cached = fromCache;
-  provider->lastUpdated = world.clock.now();
+  facts.cached = fromCache;
+  facts.lastUpdated = world.clock.now();
   for (const auto& serialNumber :
        {std::optional<std::string>(), std::optional<std::string>(""),
         std::optional(std::string(100'000, 'x')), std::optional<std::string>("a/../b"),
@@ -145,7 +132,7 @@ TEST_F(ALookup, RefusesWhatIsNoSerialNumber) {
     EXPECT_EQ(world.log.texts(LogLevel::Error).size(), 1U);
     EXPECT_EQ(world.log.lines().size(), 1U);
   }
-  EXPECT_EQ(provider->downloads, 0U);
+  EXPECT_EQ(facts.downloads, 0U);
   EXPECT_EQ(lookUp(1, "Ünicode serial-1.2"), fromCache);
 }
 

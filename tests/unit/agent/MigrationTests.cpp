@@ -5,19 +5,10 @@
 namespace kvr {
 namespace {
 
-constexpr const char* kLegacyFile = "/home/user/Library/Application Support/com.tarsil.Kavrel/Warranty.plist";
+const std::string kFolder = "/home/user/Library/Application Support";
+const std::string kLegacyFile = kFolder + "/com.tarsil.Kavrel/Warranty.plist";
 
-class Migration : public AnOfferTest {
- protected:
-  std::vector<std::string> pendingIdentifiers() {
-    std::vector<std::string> identifiers;
-    for (const auto& item : pending()) identifiers.push_back(*item.uniqueIdentifier);
-    return identifiers;
-  }
-  void migrate() {
-    KVRAgent::initWithCallingProcessBundleID(world.platform, "client")->performMigrationIfNeeded();
-  }
-};
+using Migration = AnOfferTest;
 
 TEST_F(Migration, BringsWhatThereIsOfTheOldLayoutToTheNewOneOnce) {
   const std::string legacy = kFollowUpClientIdentifier;
@@ -31,8 +22,7 @@ TEST_F(Migration, BringsWhatThereIsOfTheOldLayoutToTheNewOneOnce) {
     SCOPED_TRACE(bits);
     for (const auto& key : preferences.allKeys()) preferences.removeObject(key);
     world.files.erase("/home/user/Library/FollowUps/com.tarsil.Kavrel.plist");
-    for (const auto& path : world.files.list("/home/user/Library/Application Support"))
-      world.files.erase(path);
+    for (const auto& path : world.files.list(kFolder)) world.files.erase(path);
     world.deviceProperties.answers["SerialNumber"] = "LOCAL";
     if (!hasSerial) world.deviceProperties.answers.erase("SerialNumber");
     if (hasFile) world.files.putPropertyList(kLegacyFile, offer(10));
@@ -42,7 +32,7 @@ TEST_F(Migration, BringsWhatThereIsOfTheOldLayoutToTheNewOneOnce) {
     if (hasVersion) preferences.setObject("1", "CachedWarrantyVersion");
     preferences.setObject("stale", metadata.versionKey);
     if (level > 0) preferences.setObject(level, preference::kMigrationVersion);
-    migrate();
+    KVRAgent::initWithCallingProcessBundleID(world.platform, "client")->performMigrationIfNeeded();
 
     const auto dateWhere = [&](bool it) { return it ? std::optional(inDays(-1)) : std::nullopt; };
     const bool runs = level < 2;
@@ -51,7 +41,7 @@ TEST_F(Migration, BringsWhatThereIsOfTheOldLayoutToTheNewOneOnce) {
     EXPECT_EQ(world.files.get(kLegacyFile).has_value(), hasFile && !moves);
     EXPECT_EQ(KVRWarranty::cachedWarrantyForSerialNumber(world.platform, "LOCAL") != nullptr, moves);
     EXPECT_EQ(KVRWarranty::cachedWarrantyForSerialNumber(world.platform, {}) != nullptr, hasFile && !moves);
-    EXPECT_EQ(world.files.list("/home/user/Library/Application Support").size(), hasFile ? 1U : 0U);
+    EXPECT_EQ(world.files.list(kFolder).size(), hasFile ? 1U : 0U);
     EXPECT_EQ(preferences.dateForKey(metadata.lastUpdatedDateKey), dateWhere(moves && hasDate));
     EXPECT_EQ(preferences.dateForKey("CachedWarrantyLastUpdatedDate"), dateWhere(hasDate && !moves));
     const bool pairMoves = moves && hasLocale;  // a version goes with its locale
@@ -60,9 +50,9 @@ TEST_F(Migration, BringsWhatThereIsOfTheOldLayoutToTheNewOneOnce) {
     EXPECT_EQ(preferences.objectForKey("CachedWarrantyLocale"), pairMoves ? Value() : locale);
     EXPECT_EQ(preferences.objectForKey(metadata.versionKey), pairMoves ? version : Value("stale"));
     EXPECT_EQ(preferences.objectForKey("CachedWarrantyVersion"), pairMoves ? Value() : version);
-    std::vector<std::string> expected;
-    if (hasItem && !(runs && !moves)) expected = {runs ? own : legacy};
-    EXPECT_EQ(pendingIdentifiers(), expected);
+    const auto items = pending();
+    ASSERT_THAT(items, SizeIs(hasItem && (moves || !runs) ? 1 : 0));
+    for (const auto& item : items) EXPECT_EQ(item.uniqueIdentifier, runs ? own : legacy);
   }
 }
 

@@ -6,35 +6,33 @@
 namespace kvr {
 namespace {
 
-class TheService : public SimulatedTest {
- protected:
-  auto connect(Dictionary entitlements) {
-    auto client = world.services.connect(kServiceName, {std::move(entitlements), 1234});
+struct TheService : SimulatedTest {
+  auto connect() {
+    auto client = world.services.connect(kServiceName, {{{kRequiredEntitlement, true}}, 1234});
     world.queues.run();
     return client;
   }
-  static Dictionary entitled() { return {{kRequiredEntitlement, true}}; }
 
   StartUp startUp{world.platform};
 };
 
 TEST_F(TheService, KnowsItsCallersBundleWhereThereIsOne) {
   const auto fallback = "callingProcessBundleID is nil. Falling back to Preferences Bundle ID";
-  connect(entitled());
+  connect();
   EXPECT_TRUE(world.log.contains("connection added from 1234 with calling process: (null)"));
   EXPECT_TRUE(world.log.contains(fallback));
 
   world.log.clear();
   world.processes.add(1234, "/Applications/Settings.app/settings",
                       {"/Applications/Settings.app", "com.example.app"});
-  connect(entitled());
+  connect();
   EXPECT_TRUE(world.log.contains("connection added from 1234 with calling process: com.example.app"));
   EXPECT_FALSE(world.log.contains(fallback));
 
   for (const auto& path : {std::string("/bad\xff/x"), std::string(5000, 'x')}) {
     world.log.clear();
     world.processes.add(1234, path, {"/b", "com.example.app"});
-    connect(entitled());
+    connect();
     EXPECT_TRUE(world.log.contains("with calling process: (null)"));
   }
 }
@@ -57,9 +55,8 @@ TEST_F(TheService, ServesEachMemberWithTheOperationBehindIt) {
       {"GetDefaultDeviceInfoUsingPolicy", {1}, info(device)},
       {"GetDeviceInfoForSerialNumber", {"X", 0xFFFFFFFFFFFFFFFF}, info(unknown)},
       {"GetAllDeviceInfosUsingPolicy", {1, false}, Array{info(device)}},
-      {"DismissFollowUpForSerialNumber", {"X"}, true},
-  };
-  const auto client = connect(entitled());
+      {"DismissFollowUpForSerialNumber", {"X"}, true}};
+  const auto client = connect();
   const auto& methods = client->exportedInterface()->methods;
   ASSERT_EQ(methods.size(), std::size(cases));
   for (std::size_t i = 0; i < methods.size(); ++i) {

@@ -20,8 +20,7 @@ TEST(ADevice, KeepsItsPropertiesThroughItsCodedForm) {
   EXPECT_EQ(wrong->description(), bare.description()) << "a wrong kind is an absent property";
 }
 
-class ADeviceInfo : public SimulatedTest {
- protected:
+struct ADeviceInfo : SimulatedTest {
   KVRWarrantyRef warranty(bool display) {
     return KVRWarranty::initWithDictionary(
         world.platform, Dictionary{{"zubOfferEligibleUntil", 86400},
@@ -42,10 +41,8 @@ TEST_F(ADeviceInfo, TellsItsOfferAndDecodesPartByPart) {
   EXPECT_NE(half->warranty(), nullptr);
 }
 
-class TheDevicesManager : public CoverageTest {
- protected:
+struct TheDevicesManager : CoverageTest {
   TheDevicesManager() {
-    world.featureFlags.enabled.insert({"Kavrel", "Bravik_3_0"});
     world.pairedDevices.devices = {
         {"Run", "Model", "W1", Date{1}, true, false},
         {std::nullopt, "Model", "W2", std::nullopt, true, std::nullopt},
@@ -66,8 +63,8 @@ TEST_F(TheDevicesManager, FindsTheWatchesThatArePairedNow) {
   EXPECT_EQ(devices.at("W1")->description(), "Run (W1) (1970-01-01 00:00:01 +0000) - Watch");
   EXPECT_EQ(devices.at("W2")->description(), "Model (W2) ((null)) - Watch");
 
-  world.pairedDevices.devices.push_back({"Twin", "Model", "LOCAL", Date{1}, true, false});
-  EXPECT_EQ(manager().allDevices().at("LOCAL")->name(), "Twin");
+  world.pair("LOCAL");
+  EXPECT_EQ(manager().allDevices().at("LOCAL")->name(), "Watch");
   world.deviceProperties.answers.erase("SerialNumber");
   world.pairedDevices.devices.pop_back();
   EXPECT_THAT(manager().allDevices(), ElementsAre(Key("W1"), Key("W2")));

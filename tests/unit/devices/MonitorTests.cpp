@@ -3,26 +3,16 @@
 #include "devices/KVRPairedDevicesMonitor.h"
 #include "followup/KVRFollowUp.h"
 #include "platform/JSON.h"
-#include "scheduling/SchedulingKeys.h"
 #include "unit/followup/OfferWorld.h"
 
 namespace kvr {
 namespace {
 
-class Monitors : public AnOfferTest {
- protected:
+struct Monitors : AnOfferTest {
   Monitors() {
-    world.featureFlags.enabled.insert({"Kavrel", "Bravik_3_0"});
     world.coverage = [this](const HTTPRequest&) { return HTTPResponse{200, *writeJSON(coverage), {}}; };
   }
   ~Monitors() override { world.notifications.end(); }
-
-  std::optional<Date> postDate() {
-    return world.preferences.dateForKey(std::string(activity::kFollowUpPost) + preference::kTargetDateSuffix);
-  }
-  void pair(const std::string& serialNumber) {
-    world.pairedDevices.devices.push_back({"W", {}, serialNumber, inDays(-30), true, false});
-  }
 
   Value coverage = shownInDays(2, 20);
   const std::shared_ptr<KVRAgent> agent = KVRAgent::initWithCallingProcessBundleID(world.platform, "client");
@@ -32,10 +22,10 @@ TEST_F(Monitors, LookUpAllDevicesAndScheduleThePostWhenAWatchIsPairedOrUnpaired)
   const auto monitor = KVRPairedDevicesMonitor::initWithAgent(world.platform, agent);
   monitor->start();
   EXPECT_NE(monitor->pairNotifyToken, monitor->unpairNotifyToken);
-  pair("W");
+  world.pair("W", inDays(-30));
   world.notifications.post(PairedDeviceRegistry::kDeviceDidPair);
   world.queues.run();
-  EXPECT_EQ(postDate(), inDays(2));
+  EXPECT_EQ(target(activity::kFollowUpPost), inDays(2));
   EXPECT_EQ(world.http.requests().size(), 4U) << "a version and a warranty for each of two devices";
   EXPECT_TRUE(world.log.contains(format(
       "Watch paired after phone's refreshActivity has already finished. Schedule followUp post for: %@",

@@ -1,43 +1,37 @@
 #include "followup/KVRFollowUpPost.h"
 #include "followup/KVRFollowUpRefresh.h"
-#include "scheduling/KVRScheduler.h"
 #include "unit/followup/OfferWorld.h"
-
-#include <cmath>
 
 namespace kvr {
 namespace {
 
-class AFollowUpActivity : public AnOfferTest {
- protected:
+struct AFollowUpActivity : AnOfferTest {
   /// The date in days from now, to a thousandth.
   std::optional<double> days(std::optional<Date> date) const {
     if (!date) return std::nullopt;
     return std::round((*date - world.clock.now()) / kDay * 1000) / 1000;
   }
-  std::optional<double> targetDays(const char* identifier) {
-    return days(world.preferences.dateForKey(std::string(identifier) + ".TargetDate"));
-  }
+  std::optional<double> targetDays(const char* identifier) { return days(target(identifier)); }
   /// Runs an activity whose devices are `list`; its result.
   template <class Activity>
-  std::optional<ActivityResult> run(std::optional<KVRDeviceInfoList> list, std::uint64_t* policy = nullptr) {
-    std::optional<ActivityResult> result;
-    const auto activity =
-        std::make_shared<Activity>(world.platform, [&](std::uint64_t asked, const DeviceInfosAnswer& answer) {
-          if (policy != nullptr) *policy = asked;
-          answer(list);
-        });
-    activity->performActivityForScheduler(
-        KVRScheduler::newSchedulerWithActivityDelegate(world.platform, activity),
-        ActivityHandler(world.log, "test", [&](ActivityResult it) { result = it; }));
+  std::optional<ActivityResult> runWith(const std::optional<KVRDeviceInfoList>& list) {
+    policy = 0;
+    const auto start = world.clock.now();
+    const auto result = run<Activity>([this, list](std::uint64_t asked, const DeviceInfosAnswer& answer) {
+      policy = asked;
+      answer(list);
+    });
+    EXPECT_EQ(world.clock.now(), start) << "an answer is not waited for";
     return result;
   }
+
+  std::uint64_t policy = 0;  ///< that the last one asked for
+  const Date old = inDays(-100);
 };
 
 TEST_F(AFollowUpActivity, FindsTheNextPostDate) {
   const auto off = Dictionary{{"zubOfferEligibleUntil", inDays(-1).secondsSince1970}};
   world.preferences.setObject(Array{sha256Hash("posted")}, preference::kFollowUpPostedHashes);
-  const auto old = inDays(-100);
   const std::tuple<KVRDeviceInfoList, std::optional<double>> cases[] = {
       {{}, {}},
       {{info("A", shownInDays(5, 30), old), info("B", shownInDays(3, 30), old)}, 3},
@@ -48,8 +42,7 @@ TEST_F(AFollowUpActivity, FindsTheNextPostDate) {
       {{info("A", shownInDays(-3, 30))}, {}},  // activated now
       {{info("A", shownInDays(3, 30))}, 3},
       {{info("A", offer(30), inDays(7))}, 7},  // never the end less its duration
-      {{info("A", offer(30), old)}, {}},
-  };
+      {{info("A", offer(30), old)}, {}}};
   for (const auto& [list, next] : cases) {
     const auto found = KVRFollowUpPost::nextFollowUpPostDateWithDevicesInfo(world.platform, list);
     EXPECT_EQ(days(found), next) << describe(list);
@@ -57,7 +50,6 @@ TEST_F(AFollowUpActivity, FindsTheNextPostDate) {
 }
 
 TEST_F(AFollowUpActivity, FindsTheNextRefreshDate) {
-  const auto old = inDays(-100);
   const std::tuple<KVRDeviceInfoList, std::optional<double>, double> cases[] = {
       {{}, {}, 1},
       {{info("A", shownInDays(-1, 2.5), old)}, 0.5, 0.5},
@@ -80,7 +72,6 @@ TEST_F(AFollowUpActivity, FindsTheNextRefreshDate) {
 
 TEST_F(AFollowUpActivity, PostsAndSchedulesWhatFollows) {
   const std::string perform = "-[KVRFollowUpPost performActivityForScheduler:withCompletionHandler:]";
-  const auto old = inDays(-100);
   const auto one = [&](const Dictionary& warranty, const char* serialNumber = "A") {
     return KVRDeviceInfoList{info(serialNumber, warranty, old)};
   };
@@ -98,9 +89,7 @@ TEST_F(AFollowUpActivity, PostsAndSchedulesWhatFollows) {
   for (const auto& [list, post, refresh] : cases) {
     KVRScheduler::clearScheduledActivities(world.platform);
     world.log.clear();
-    std::uint64_t policy = 0;
-    EXPECT_EQ(run<KVRFollowUpPost>(list, &policy),
-              list ? ActivityResult::Finished : ActivityResult::Deferred);
+    EXPECT_EQ(runWith<KVRFollowUpPost>(list), list ? ActivityResult::Finished : ActivityResult::Deferred);
     EXPECT_EQ(policy, 2U);
     EXPECT_EQ(targetDays(activity::kFollowUpPost), post);
     EXPECT_EQ(targetDays(activity::kFollowUpRefresh), refresh);
@@ -125,26 +114,24 @@ TEST_F(AFollowUpActivity, DropsTheAnswerOfAPostRunThatWasDeferredMeanwhile) {
   held[0](KVRDeviceInfoList{info("A", due(5), inDays(-9))});
   EXPECT_THAT(pendingSerials(), ElementsAre("A")) << "the work is done all the same";
   EXPECT_EQ(world.log.count("activity run was answered already, result 1 dropped"), 1U);
-  EXPECT_TRUE(world.preferences.dateForKey("com.tarsil.kvragent.followuppost.TargetDate").has_value());
+  EXPECT_TRUE(target(activity::kFollowUpPost).has_value());
 }
 
 TEST_F(AFollowUpActivity, RefreshesForAsLongAsAnythingIsShown) {
-  const auto ended = run<KVRFollowUpRefresh>(KVRDeviceInfoList{info("A", due(2.5))});
-  EXPECT_EQ(ended, ActivityResult::Finished);
+  EXPECT_EQ(runWith<KVRFollowUpRefresh>({{info("A", due(2.5))}}), ActivityResult::Finished);
   EXPECT_EQ(world.log.count("No followups present, don't schedule another refresh"), 1U);
   EXPECT_EQ(targetDays(activity::kFollowUpRefresh), std::nullopt);
 
-  run<KVRFollowUpPost>(KVRDeviceInfoList{info("A", due(2.5), inDays(-9))});
+  const KVRDeviceInfoList shown{info("A", due(2.5), inDays(-9))};
+  runWith<KVRFollowUpPost>(shown);
   for (const double day : {86400., 0., -5., 1e-3}) {
     world.preferences.setObject(day, preference::kOneDayInterval);
-    std::uint64_t policy = 0;
-    EXPECT_EQ(run<KVRFollowUpRefresh>(KVRDeviceInfoList{info("A", due(2.5), inDays(-9))}, &policy),
-              ActivityResult::Finished);
+    EXPECT_EQ(runWith<KVRFollowUpRefresh>(shown), ActivityResult::Finished);
     EXPECT_EQ(policy, 1U);
     EXPECT_GE(targetDays(activity::kFollowUpRefresh), day > 60 ? 0.5 : std::round(60 / kDay * 1000) / 1000);
   }
   EXPECT_TRUE(world.log.contains("Schedule next refresh for " + describe(inDays(0.5))));
-  EXPECT_EQ(run<KVRFollowUpRefresh>(std::nullopt), ActivityResult::Deferred);
+  EXPECT_EQ(runWith<KVRFollowUpRefresh>(std::nullopt), ActivityResult::Deferred);
   EXPECT_EQ(world.log.count("Unable to load device info for followup refresh, defer"), 1U);
 }
 

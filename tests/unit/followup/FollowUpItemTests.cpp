@@ -4,14 +4,12 @@
 namespace kvr {
 namespace {
 
-using AnItem = AnOfferTest;
-
-Dictionary badged(Dictionary offer, Value durationInDays) {
-  offer["featureToggleParameters"] =
-      Dictionary{{"zubOfferDisplay", true}, {"zubOfferSettingsRowBadge", true}};
-  offer["zubOfferBadgeBeforeEndDate"] = std::move(durationInDays);
-  return offer;
-}
+struct AnItem : AnOfferTest {
+  static Dictionary badged(Dictionary offer, int durationInDays) {
+    offer["zubOfferBadgeBeforeEndDate"] = durationInDays;
+    return with({{"zubOfferSettingsRowBadge", true}}, std::move(offer));
+  }
+};
 
 TEST_F(AnItem, IsIdentifiedByTheHashOfItsSerialNumber) {
   EXPECT_EQ(KVRFollowUp::uniqueIdentfierForSerialNumber("SN0000000001"),
@@ -50,17 +48,15 @@ TEST_F(AnItem, CarriesABadgeNearTheEndAndNeverLosesABit) {
       {badged(offer(3), 3), 2, false, 18}, {badged(offer(3), 0), 2, false, 18},
       {badged(offer(0), 5), 2, false, 18}, {unwanted, 2, false, 18},
       {badged(offer(3), 2), 3, false, 19}, {badged({}, 5), 2, false, 18},
-      {badged(offer(3), 5), 18, true, 19},
-  };
+      {badged(offer(3), 5), 18, true, 19}};
   for (const auto& [warranty, before, shows, after] : cases) {
     FollowUpItem item;
     item.displayStyle = before;
     world.log.clear();
     KVRFollowUp(world.platform)._setupFollowUpItem(item, *info("SN", warranty));
     EXPECT_EQ(item.displayStyle, after) << describe(warranty);
-    const auto line =
-        format("-[KVRFollowUp _setupFollowUpItem:withDeviceInfo:]: shouldShowRowBadge: %d", shows);
-    EXPECT_EQ(world.log.count(line), 1U);
+    const auto setup = "-[KVRFollowUp _setupFollowUpItem:withDeviceInfo:]: ";
+    EXPECT_EQ(world.log.count(format("%sshouldShowRowBadge: %d", setup, shows)), 1U);
   }
 }
 

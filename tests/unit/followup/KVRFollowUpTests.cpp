@@ -7,16 +7,8 @@ namespace {
 constexpr const char* kPosted = preference::kFollowUpPostedHashes;
 constexpr const char* kDismissed = preference::kFollowUpDismissedHashes;
 
-FollowUpItem item(const char* identifier, std::uint64_t displayStyle = 0) {
-  FollowUpItem made;
-  made.uniqueIdentifier = identifier;
-  made.displayStyle = displayStyle;
-  return made;
-}
-
 /// Refuses what it is told to, and remembers the calls.
-class RecordingProvider : public KVRFollowUpProvider {
- public:
+struct RecordingProvider : KVRFollowUpProvider {
   std::vector<FollowUpItem> pending;
   std::optional<Error> postError, clearError, listError;
   std::vector<FollowUpItem> posts;
@@ -37,12 +29,18 @@ class RecordingProvider : public KVRFollowUpProvider {
   }
 };
 
-class AFollowUp : public AnOfferTest {
- protected:
+struct AFollowUp : AnOfferTest {
   KVRFollowUp followUp{world.platform};
   const std::shared_ptr<RecordingProvider> provider = std::make_shared<RecordingProvider>();
   KVRFollowUp recorded{world.platform, provider};
 
+  const std::string plain = "D (SN) ((null)) - Default";  ///< the device of most cases
+  const Value off = Dictionary{{"zubOfferEligibleUntil", inDays(5).secondsSince1970}};
+
+  std::string future(const std::string& device, double days) {
+    return format("Device eligible with future post date. Cannot post followup for %@ on: %@", device,
+                  inDays(days));
+  }
   void recordDismissal(const std::string& serialNumber, Date date) {
     world.preferences.setObject(Array{sha256Hash(serialNumber)}, kDismissed);
     world.preferences.setObject(date, sha256Hash(serialNumber) + ".dismissed");
@@ -50,22 +48,12 @@ class AFollowUp : public AnOfferTest {
 };
 
 TEST_F(AFollowUp, IsPostedByTheFirstRuleThatApplies) {
-  const Value off = Dictionary{{"zubOfferEligibleUntil", inDays(5).secondsSince1970}};
   const auto lasting = [&](int days) {
-    auto warranty = offer(10);
-    warranty["featureToggleParameters"] =
-        Dictionary{{"zubOfferDisplay", true}, {"zubOfferDurationDaysBeforeEndDate", days}};
-    return warranty;
+    return with({{"zubOfferDurationDaysBeforeEndDate", days}}, offer(10));
   };
-  const auto device = [](const char* activation) { return format("D (SN) (%@) - Default", activation); };
-  const auto plain = device("(null)");
   const std::string posted = "Posted follow-up: serialNumber:SN -> success";
   const auto due = "Device eligible. Post new  followup for " + plain;
-  const auto future = [&](const std::string& it, double days) {
-    return format("Device eligible with future post date. Cannot post followup for %@ on: %@", it,
-                  inDays(days));
-  };
-  const auto tomorrow = device(describe(inDays(1)).c_str());
+  const auto tomorrow = format("D (SN) (%@) - Default", inDays(1));
   const auto dismissed = "Followup already dismissed for " + plain + ", leaving unposted";
   const auto boundary =
       format("Device not eligible for conversion. %@, followup dismissed date: %@, fup display date: %@",
@@ -84,8 +72,7 @@ TEST_F(AFollowUp, IsPostedByTheFirstRuleThatApplies) {
       {shownInDays(-1, 5), 1, {}, false, {activated, future(tomorrow, 1)}},
       {shownInDays(0, 5), {}, {}, false, {due, posted}},
       {lasting(14), {}, {}, false, {due, posted}},
-      {lasting(7), {}, {}, false, {future(plain, 3)}},
-  };
+      {lasting(7), {}, {}, false, {future(plain, 3)}}};
   for (const auto& [offered, activatedIn, dismissedIn, repost, lines] : cases) {
     for (const char* key : {kDismissed, kPosted}) world.preferences.removeObject(key);
     if (dismissedIn) recordDismissal("SN", inDays(*dismissedIn));
@@ -126,8 +113,7 @@ TEST_F(AFollowUp, IsNotPostedWithoutWhatItNeeds) {
       {info({}, {}), "Failed to post follow-up:<Missing warranty><Missing serial number>"},
       {info({}, due(5)), "Failed to post follow-up:<Missing serial number>"},
       {info("SN", {}), "Failed to post follow-up:<Missing warranty>"},
-      {info("SN", Dictionary{}), "Failed to post follow-up:"},
-  };
+      {info("SN", Dictionary{}), "Failed to post follow-up:"}};
   for (const auto& [device, line] : cases) {
     world.log.clear();
     recorded.postFollowUpWithDeviceInfo(*device);
@@ -147,34 +133,26 @@ TEST_F(AFollowUp, IsNotDismissedForWhatIsNoSerialNumber) {
 }
 
 TEST_F(AFollowUp, RefreshesByTheFirstRuleThatApplies) {
-  const Value off = Dictionary{{"zubOfferEligibleUntil", inDays(5).secondsSince1970}};
-  const std::string device = "D (SN) ((null)) - Default";
   const std::string cleared = "Cleared follow-up: success", updated = "Updated follow-up: success";
-  const auto repost = "Device eligible for re-post. Re-post the followup for " + device;
-  const auto future =
-      format("Device eligible with future post date. Cannot post followup for %@ on: %@", device, inDays(1));
-  const std::vector<std::string> posted = {repost, "Device eligible. Post new  followup for " + device,
+  const auto repost = "Device eligible for re-post. Re-post the followup for " + plain;
+  const std::vector<std::string> posted = {repost, "Device eligible. Post new  followup for " + plain,
                                            "Posted follow-up: serialNumber:SN -> success",
                                            "Reposted follow-up: success"};
   const auto removed = [&](const char* why) {
-    return std::vector{why + std::string(". Remove the followup for ") + device, cleared};
+    return std::vector{why + std::string(". Remove the followup for ") + plain, cleared};
   };
-  const auto absent = "Followup already dismissed/not present for " + device + ", leaving unposted";
+  const auto absent = "Followup already dismissed/not present for " + plain + ", leaving unposted";
   const std::tuple<Value, bool, bool, bool, std::vector<std::string>> cases[] = {
       {{}, true, true, false, removed("No warranty downloaded for device")},
       {off, true, true, false, removed("Device NOT eligible")},
       {offer(0), false, true, false, removed("Device no longer eligible")},
-      {due(5), true, true, true, {"Device eligible. Update the followup for " + device, updated}},
+      {due(5), true, true, true, {"Device eligible. Update the followup for " + plain, updated}},
       {due(5), false, true, true, posted},
-      {shownInDays(1, 5), false, true, false, {repost, future, "Reposted follow-up: NO"}},
-      {due(5), false, false, false, {absent}},
-  };
+      {shownInDays(1, 5), false, true, false, {repost, future(plain, 1), "Reposted follow-up: NO"}},
+      {due(5), false, false, false, {absent}}};
   for (const auto& [warranty, pending, force, shown, lines] : cases) {
     provider->pending.clear();
-    if (pending) {
-      provider->pending = {item("own", 2)};
-      provider->pending[0].userInfo = {{"FollowupSerialNumber", "SN"}};
-    }
+    if (pending) provider->pending = {item("own", 2, {{"FollowupSerialNumber", "SN"}})};
     recordDismissal("SN", inDays(-1));  // counts for nothing here
     newLines();
     EXPECT_THAT(recorded.refreshFollowupWithDeviceInfo(info("SN", warranty), force), SizeIs(shown ? 1 : 0));
@@ -192,7 +170,7 @@ TEST_F(AFollowUp, ClearsUntrackedDevicesInOneCallWhenTheListIsWhole) {
   followUp.refreshFollowupWithDeviceInfo(info("C", {}), false);
   EXPECT_THAT(pendingSerials(), ElementsAre("B", "A")) << "never another device's";
   provider->pending = pending();
-  provider->pending.push_back(item("not the agent's"));
+  provider->pending.push_back(item("not the agent's", 0));
   newLines();
   EXPECT_THAT(recorded.refreshFollowupWithDeviceInfos({}), IsEmpty());
   EXPECT_THAT(provider->clears, ElementsAre(ElementsAre(KVRFollowUp::uniqueIdentfierForSerialNumber("A"),
@@ -216,7 +194,7 @@ TEST_F(AFollowUp, TakesAListThatCannotBeReadAsEmpty) {
 TEST_F(AFollowUp, OfAnEarlierVersionBecomesTheLocalDevicesOrGoes) {
   auto legacy = item("com.tarsil.Kavrel", 1);
   legacy.groupIdentifier = "old";
-  const auto other = item("com.tarsil.Kavrel.x");
+  const auto other = item("com.tarsil.Kavrel.x", 0);
   const Error refused{"centre", 7, "no"};
   const std::string migrating = "Migrating legacy followup..";
   const std::string clearing = "Clearing legacy followup, no legacy warranty was found..";

@@ -3,17 +3,14 @@
 #include "devices/KVRDeviceInfo.h"
 #include "followup/FollowUpKeys.h"
 #include "platform/FollowUpCenter.h"
+#include "scheduling/KVRScheduler.h"
+#include "scheduling/SchedulingKeys.h"
 #include "unit/CoverageWorld.h"
-
-#include <algorithm>
 
 namespace kvr {
 
 /// A world with offers, whose dates are given in days from now.
-class AnOfferTest : public CoverageTest {
- protected:
-  static constexpr double kDay = 86400;
-
+struct AnOfferTest : CoverageTest {
   Date inDays(double days) const { return world.clock.now() + days * kDay; }
 
   /// The dictionary of an offer with all its texts; `more` goes over it.
@@ -28,6 +25,12 @@ class AnOfferTest : public CoverageTest {
         {"featureToggleParameters", Dictionary{{"zubOfferDisplay", true}}},
     });
     return dictionary;
+  }
+  /// The offer with more parameters beside the one that displays it.
+  static Dictionary with(Dictionary parameters, Dictionary offer) {
+    parameters["zubOfferDisplay"] = true;
+    offer["featureToggleParameters"] = std::move(parameters);
+    return offer;
   }
   Dictionary shownInDays(double displayInDays, double endsInDays) const {
     return offer(endsInDays, {{"zubOfferFollowupDisplayDate", inDays(displayInDays).secondsSince1970}});
@@ -59,17 +62,36 @@ class AnOfferTest : public CoverageTest {
     world.log.clear();
     return lines;
   }
+  std::optional<Date> target(const std::string& identifier) {
+    return world.preferences.dateForKey(identifier + preference::kTargetDateSuffix);
+  }
+  /// Runs an activity by itself; its result.
+  template <class Activity, class... Means>
+  std::optional<ActivityResult> run(Means... means) {
+    std::optional<ActivityResult> result;
+    const auto activity = std::make_shared<Activity>(world.platform, means...);
+    activity->performActivityForScheduler(
+        KVRScheduler::newSchedulerWithActivityDelegate(world.platform, activity),
+        ActivityHandler(world.log, "test", [&](ActivityResult it) { result = it; }));
+    world.queues.runUntil([&] { return result.has_value(); });
+    return result;
+  }
   Array hashes(const char* key) {
     const auto list = world.preferences.objectForKey(key);
     return list.isArray() ? list.array() : Array{};
   }
-  /// Has an item pending that is not the agent's doing.
-  void pend(const std::string& uniqueIdentifier, const Dictionary& userInfo = {}) {
+  static FollowUpItem item(const std::string& uniqueIdentifier, std::uint64_t displayStyle,
+                           const Dictionary& userInfo = {}) {
     FollowUpItem item;
     item.uniqueIdentifier = uniqueIdentifier;
-    item.displayStyle = 2;
+    item.displayStyle = displayStyle;
     item.userInfo = userInfo;
-    EXPECT_FALSE(world.followUps.newClient(kFollowUpClientIdentifier)->postItem(item));
+    return item;
+  }
+  /// Has an item pending that is not the agent's doing.
+  void pend(const std::string& uniqueIdentifier, const Dictionary& userInfo = {}) {
+    const auto client = world.followUps.newClient(kFollowUpClientIdentifier);
+    EXPECT_FALSE(client->postItem(item(uniqueIdentifier, 2, userInfo)));
   }
 };
 

@@ -1,8 +1,6 @@
 #include "Prelude.h"
 #include "platform/ActivityTable.h"
 
-#include <limits>
-
 namespace kvr {
 namespace {
 
@@ -10,8 +8,7 @@ constexpr auto kFinished = ActivityResult::Finished;
 constexpr auto kDeferred = ActivityResult::Deferred;
 const ActivityBlock kBlock = [](const ActivityHandler&) {};
 
-class AnActivityTable : public ::testing::Test {
- protected:
+struct AnActivityTable : ::testing::Test {
   /// What starts now, by name.
   std::vector<std::string> started() {
     std::vector<std::string> names;
@@ -176,9 +173,8 @@ TEST_F(AnActivityTable, ComplainsOfATreeThatIsNotItsOwn) {
   };
   EXPECT_EQ(ActivityTable::complaintAbout(table.tree()), std::nullopt);
   EXPECT_EQ(ActivityTable::complaintAbout(Dictionary{}), std::nullopt);
-  for (const auto& tree :
-       {Value(Dictionary{{"activities", 1}}), with("delay", "x"), with("dueDate", Value()),
-        with("registeredDate", Date{std::numeric_limits<double>::infinity()}), with("requiresNetwork", 7)}) {
+  for (const auto& tree : {Value(Dictionary{{"activities", 1}}), with("delay", "x"), with("dueDate", Value()),
+                           with("registeredDate", Date{kInfinity}), with("requiresNetwork", 7)}) {
     EXPECT_TRUE(ActivityTable::complaintAbout(tree)) << describe(tree);
   }
 }

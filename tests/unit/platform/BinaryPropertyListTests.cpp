@@ -71,8 +71,7 @@ TEST(ABinaryObject, IsReadAsItsKind) {
       {"\x50", ""},
       {"\x61\x20\x28", "\u2028"},
       {"\x62\xD8\x3D\xDE\x00"s, "\U0001F600"},
-      {"\xD0", Dictionary{}},
-  };
+      {"\xD0", Dictionary{}}};
   expectTrees([](std::string_view object) { return readPropertyList(listOf({std::string(object)})); }, cases);
 }
 
@@ -80,34 +79,29 @@ TEST(ABinaryPropertyList, IsRefusedForAnyFault) {
   const auto count = [](std::string_view marker, std::uint64_t length) {
     return std::string(marker) + "\x13" + bigEndian(length, 8);
   };
-  const std::pair<std::vector<std::string>, std::string> kCases[] = {
-      {{"\x0F"}, "an object of unknown kind"},
-      {{"\x12\x01\x02"}, "damaged integer"},
-      {{"\x15" + std::string(32, '\0')}, "damaged integer"},
-      {{"\x14" + bigEndian(1, 8) + bigEndian(0, 8)}, "integer too large"},
-      {{"\x14" + bigEndian(~0ULL, 8) + bigEndian(1, 8)}, "integer too large"},
-      {{"\x21\x01\x02"}, "damaged real"},
-      {{"\x32\x01\x02\x03\x04"}, "damaged date"},
-      {{"\x51\x80"}, "a string that is not ASCII as it says"},
-      {{"\x61\xD8\x3D"}, "a string with half a character"},
-      {{"\x62\xD8\x3D\x00\x41"s}, "a string with half a character"},
-      {{"\x5F\x23\x00"s}, "damaged length"},
-      {{"\x5F\x14" + std::string(16, '\0')}, "damaged length"},
-      {{count("\x5F", ~0ULL)}, "a length beyond the objects"},
-      {{count("\xDF", 1ULL << 62U)}, "a length beyond the objects"},
-      {{arrayOf({7}), kOne}, "a reference to no object"},
-      {{arrayOf({0})}, "a container inside itself"},
-      {{arrayOf({1}), "\xD1\x00\x02\x00\x00"s, kKey}, "a container inside itself"},
-      {{"\xD1\x00\x01\x00\x01"s, kOne}, "a key that is not a string"},
-      {doublingArrays(20, kOne), "unfolds to too much"},
-      {doublingArrays(12, "\x5F\x12" + bigEndian(100'000, 4) + std::string(100'000, 'x')),
-       "unfolds to too much"},
-  };
-  for (const auto& [objects, message] : kCases) {
-    const auto read = readPropertyList(listOf(objects));
-    ASSERT_FALSE(read) << message;
-    EXPECT_EQ(read.error(), (Error{"plist", 0, message}));
-  }
+  const FaultsByText cases = {
+      {listOf({"\x0F"}), "an object of unknown kind"},
+      {listOf({"\x12\x01\x02"}), "damaged integer"},
+      {listOf({"\x15" + std::string(32, '\0')}), "damaged integer"},
+      {listOf({"\x14" + bigEndian(1, 8) + bigEndian(0, 8)}), "integer too large"},
+      {listOf({"\x14" + bigEndian(~0ULL, 8) + bigEndian(1, 8)}), "integer too large"},
+      {listOf({"\x21\x01\x02"}), "damaged real"},
+      {listOf({"\x32\x01\x02\x03\x04"}), "damaged date"},
+      {listOf({"\x51\x80"}), "a string that is not ASCII as it says"},
+      {listOf({"\x61\xD8\x3D"}), "a string with half a character"},
+      {listOf({"\x62\xD8\x3D\x00\x41"s}), "a string with half a character"},
+      {listOf({"\x5F\x23\x00"s}), "damaged length"},
+      {listOf({"\x5F\x14" + std::string(16, '\0')}), "damaged length"},
+      {listOf({count("\x5F", ~0ULL)}), "a length beyond the objects"},
+      {listOf({count("\xDF", 1ULL << 62U)}), "a length beyond the objects"},
+      {listOf({arrayOf({7}), kOne}), "a reference to no object"},
+      {listOf({arrayOf({0})}), "a container inside itself"},
+      {listOf({arrayOf({1}), "\xD1\x00\x02\x00\x00"s, kKey}), "a container inside itself"},
+      {listOf({"\xD1\x00\x01\x00\x01"s, kOne}), "a key that is not a string"},
+      {listOf(doublingArrays(20, kOne)), "unfolds to too much"},
+      {listOf(doublingArrays(12, "\x5F\x12" + bigEndian(100'000, 4) + std::string(100'000, 'x'))),
+       "unfolds to too much"}};
+  expectFaults(readPropertyList, "plist", cases);
 }
 
 TEST(ABinaryPropertyList, IsRefusedForAnyFaultOfItsTrailer) {
@@ -141,8 +135,7 @@ TEST(ABinaryPropertyList, CannotClaimTheSameBytesWithoutEnd) {
   const std::string dictionary = "\xD1\x00\x01\x00\x01"s;
   for (const bool asKeys : {false, true}) {
     std::string table = bigEndian(8, 4) + bigEndian(start.size() + dictionary.size(), 4);
-    for (unsigned i = 0; i < kMany; ++i)
-      table += bigEndian(start.size() + (asKeys ? 0 : dictionary.size()), 4);
+    table += repeated(bigEndian(start.size() + (asKeys ? 0 : dictionary.size()), 4), kMany);
     const auto body = start + dictionary + string;
     const auto read = readPropertyList(body + table + bytesOf({.count = kMany + 2, .table = body.size()}));
     ASSERT_FALSE(read);

@@ -4,8 +4,6 @@
 namespace kvr {
 namespace {
 
-constexpr auto kInfinity = std::numeric_limits<double>::infinity();
-
 std::string written(const Value& tree) {
   const auto text = writeJSON(tree);
   return text ? *text : "refused: " + text.error().message;
@@ -20,8 +18,7 @@ TEST(AJSONText, IsReadExactly) {
       {"1e-400", 0.0},
       {R"("\u00e9\ud83d\ude00\u0000\/")", std::string("\u00e9\U0001F600\0/", 8)},
       {"\xEF\xBB\xBF[]", Array{}},
-      {R"({"b": 1, "a": [true, {}], "b": 2})", Dictionary{{"a", Array{true, Dictionary{}}}, {"b", 2}}},
-  };
+      {R"({"b": 1, "a": [true, {}], "b": 2})", Dictionary{{"a", Array{true, Dictionary{}}}, {"b", 2}}}};
   expectTrees(readJSON, cases);
 }
 
@@ -45,8 +42,7 @@ TEST(ATree, IsWrittenAsCompactJSON) {
        R"({"a":{},"b":[null,true,false]})"},
       {Array{Array{}, -5, std::numeric_limits<std::uint64_t>::max()}, "[[],-5,18446744073709551615]"},
       {Array{1.0, -0.0, 0.1, 1e300}, "[1.0,-0.0,0.1,1e+300]"},
-      {std::string("\0\x1f\x7f\b\f\n\r\t\"\\/", 11), "\"\\u0000\\u001f\x7f\\b\\f\\n\\r\\t\\\"\\\\/\""},
-  };
+      {std::string("\0\x1f\x7f\b\f\n\r\t\"\\/", 11), "\"\\u0000\\u001f\x7f\\b\\f\\n\\r\\t\\\"\\\\/\""}};
   for (const auto& [tree, text] : kCases) EXPECT_EQ(written(tree), text);
   EXPECT_EQ(*writeJSON(Dictionary{{"a/b", "//"}}, JSONSlashes::Escaped), R"({"a\/b":"\/\/"})");
 }
@@ -58,8 +54,7 @@ TEST(ATree, IsNotWrittenAsJSONWhenItDoesNotFit) {
       {Array{kInfinity}, "JSON holds no number that is not finite"},
       {"\xED\xA0\x80", "text that is not UTF-8"},
       {Dictionary{{"\xC0\x80", 1}}, "text that is not UTF-8"},
-      {nestedArrays(kMaximumDepth + 1), "nested too deep"},
-  };
+      {nestedArrays(kMaximumDepth + 1), "nested too deep"}};
   for (const auto& [tree, message] : kCases) EXPECT_EQ(written(tree), "refused: " + message);
   EXPECT_TRUE(writeJSON(nestedArrays(kMaximumDepth)));
 }

@@ -1,14 +1,11 @@
 #include "platform/BinaryPropertyList.h"
 #include "unit/platform/Trees.h"
 
-#include <cmath>
-
 namespace kvr {
 namespace {
 
 constexpr auto kXML = PropertyListEncoding::XML;
 constexpr auto kBinary = PropertyListEncoding::Binary;
-constexpr auto kInfinity = std::numeric_limits<double>::infinity();
 
 /// ASCII text as UTF-16 with a byte order mark.
 std::string utf16(std::string_view text, bool bigEndian) {
@@ -41,8 +38,7 @@ TEST(ATree, WithDatesDataAndSpecialRealsComesBackEqualFromPropertyLists) {
   const Value tree = Dictionary{
       {"data", Array{Value::Bytes{}, Value::Bytes{1}, Value::Bytes{1, 2}, Value::Bytes(256, 0xFF)}},
       {"dates", Array{Date{-1}, Date{1764000106}, Date{-62167219201}, Date{1e15}, Date{-1e15}}},
-      {"reals", Array{std::numeric_limits<double>::quiet_NaN(), kInfinity, -kInfinity}},
-  };
+      {"reals", Array{std::numeric_limits<double>::quiet_NaN(), kInfinity, -kInfinity}}};
   for (const auto encoding : {kXML, kBinary}) EXPECT_EQ(throughPropertyList(tree, encoding), tree);
 }
 
@@ -70,16 +66,14 @@ TEST(ATree, ThatXMLCannotHoldIsHeldByTheBinaryEncoding) {
 TEST(APropertyList, IsToldByItsStart) {
   const std::string document = "<plist version='1.0'><string>x</string></plist>";
   const std::string declared = "<?xml version='1.0'?>" + document;
-  const std::string typed =
-      "<!DOCTYPE plist PUBLIC \"-//X//DTD PLIST 1.0//EN\" \"http://localhost/\">" + document;
+  const auto typed = "<!DOCTYPE plist PUBLIC \"-//X//DTD PLIST 1.0//EN\" \"http://localhost/\">" + document;
   const std::vector<std::string> kGroups[] = {
       {document, declared, typed, "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n" + typed},
       {"<!-- comment -->" + document, "\xEF\xBB\xBF" + declared, " \t\r\n" + declared},
       {"\xEF\xBB\xBF\n" + declared, utf16(declared, true), utf16("\n " + declared, false)},
       {utf16(document, true).substr(2), utf16(document, false).substr(2)},
       {"x", "'x'", "\xEF\xBB\xBF\"x\"", utf16("\"x\"", true), utf16(" x // comment", false)},
-      {*writePropertyList("x", kBinary)},
-  };
+      {*writePropertyList("x", kBinary)}};
   for (const auto& samples : kGroups) {
     for (const auto& sample : samples) {
       const auto tree = readPropertyList(sample);
@@ -94,8 +88,7 @@ TEST(APropertyList, IsNoneWhenItIsSomethingElse) {
       {"", " \n", "// nothing", "\xEF\xBB", "\xFF\xFE", "\xFE\xFF\0"sv, "\0"sv},
       {"bplist", "bplist00", "<", "<?xml", "<plist", "{", "\xFF\xFE\0\xD8"sv},
       {"Not Found", "[]", R"({"a": 1})", "\x89PNG", "\x1F\x8B\b", "a b"},
-      {"<html><body>404</body></html>", "<!DOCTYPE html><html/>"},
-  };
+      {"<html><body>404</body></html>", "<!DOCTYPE html><html/>"}};
   for (const auto& samples : kGroups) {
     for (const auto sample : samples) {
       const auto tree = readPropertyList(sample);
@@ -115,8 +108,7 @@ TEST(AnASCIIPropertyList, IsReadAsStringsAndData) {
       {R"("\n\t\"\\\'\101\012\Ud83d\UDE00\U00e9\351\/")", "\n\t\"\\'A\n\U0001F600\u00e9\u00d8/"},
       {"/* a */ { // b\n k /* = */ = v; } // c", Dictionary{{"k", "v"}}},
       {"\"KEY\" = \"text\";\n/* c */ OTHER = { a = (b); };\n",
-       Dictionary{{"KEY", "text"}, {"OTHER", Dictionary{{"a", Array{"b"}}}}}},
-  };
+       Dictionary{{"KEY", "text"}, {"OTHER", Dictionary{{"a", Array{"b"}}}}}}};
   expectTrees(readPropertyList, cases);
 }
 
@@ -160,8 +152,7 @@ TEST(AnXMLElement, IsReadAsItsKind) {
       {"<data>\n\tAQID\r\n BA = =\n</data>", Value::Bytes{1, 2, 3, 4}},
       {"<array><dict/><array></array></array>", Array{Dictionary{}, Array{}}},
       {"<dict><key>a</key><integer>1</integer><key/><true/><key>a</key><integer>2</integer></dict>",
-       Dictionary{{"", true}, {"a", 2}}},
-  };
+       Dictionary{{"", true}, {"a", 2}}}};
   expectTrees([](std::string_view content) { return readPropertyList(document(content)); }, cases);
 }
 
@@ -177,8 +168,7 @@ TEST(AnXMLElement, IsRefusedForATextOfAnotherKind) {
       {"array", {"text", "<key>k</key>"}},
       {"true", {"x", "<true/>"}},
       {"dict", {"<true/>", "<key>k</key>", "<key>k</key><key>l</key><true/>", "<key>k</key><true/><true/>"}},
-      {"plist", {"", "text", "<true/><true/>", "<unknown/>", "<plist><true/></plist>", "<key>k</key>"}},
-  };
+      {"plist", {"", "text", "<true/><true/>", "<unknown/>", "<plist><true/></plist>", "<key>k</key>"}}};
   for (const auto& [name, texts] : kCases) {
     for (const auto& text : texts) {
       const auto element = "<" + name + ">" + text + "</" + name + ">";
@@ -244,15 +234,7 @@ TEST(ATreesText, MayBeNestedToTheLimitAndNoFurther) {
 }
 
 TEST(ATreesText, IsRefusedWhereverItIsCut) {
-  const Value tree = Array{1,
-                           -1,
-                           0.5,
-                           true,
-                           Value(),
-                           Date{0},
-                           Value::Bytes{1, 2},
-                           ~0ULL,
-                           65536,
+  const Value tree = Array{Array{1, -1, 0.5, true, Value(), Date{0}, Value::Bytes{1, 2}, ~0ULL, 65536},
                            Dictionary{{"\u00e9\U0001F600", "a string with a long length"}}};
   const std::pair<TreeReader, std::string> samples[] = {
       {readJSON, R"({"a": [1, -2.5e-3, 18446744073709551615, "\u00e9\n\ud83d\ude00é😀"], "b": {"": null}})"},
@@ -265,8 +247,7 @@ TEST(ATreesText, IsRefusedWhereverItIsCut) {
        *writePropertyList(tree, kBinary)}};
   for (const auto& [read, sample] : samples) {
     ASSERT_TRUE(read(sample));
-    for (std::size_t size = 0; size < sample.size(); ++size)
-      EXPECT_FALSE(read(sample.substr(0, size))) << size;
+    for (std::size_t i = 0; i < sample.size(); ++i) EXPECT_FALSE(read(sample.substr(0, i))) << i;
   }
 }
 

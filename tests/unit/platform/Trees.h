@@ -4,8 +4,6 @@
 #include "platform/JSON.h"
 #include "platform/UTF8.h"
 
-#include <limits>
-
 namespace kvr {
 
 /// Every kind of leaf that JSON, XML and the binary encoding all hold, where they are hardest to hold.
@@ -24,8 +22,7 @@ inline Value treeForEveryEncoding() {
       {"blanks", "  leading, trailing and \t tab \n"},
       {"markup", "<&>\"'/\\ ]]> &amp; %@ {} ();=//"},
       {std::string(300, 'k'), std::string(70000, 'v')},
-      {"\u00e9<&>\r\U0001F600", "key"},
-  };
+      {"\u00e9<&>\r\U0001F600", "key"}};
 }
 
 inline Value nestedArrays(std::size_t depth) {

@@ -22,8 +22,7 @@ TEST(AURL, IsTakenApart) {
       {"file:///a/b%20c.plist", "file", "", "/a/b c.plist", false},
       {"file://localhost/a?b", "file", "", "/a", false},
       {"file:/a/%C3%A9", "file", "", "/a/\xC3\xA9", false},
-      {"mailto:a@b", "mailto", "", "", false},
-  };
+      {"mailto:a@b", "mailto", "", "", false}};
   for (const auto& [text, scheme, host, filePath, isLoopback] : cases) {
     const auto url = URL::parse(text);
     ASSERT_TRUE(url) << text;
@@ -42,8 +41,7 @@ TEST(AURL, IsNothingWhenTheTextIsNone) {
       {"http://a:b/", "http://a:65536", "http://a:1:2", "http://a\\b/", "http://a%2eb/"},
       {"http://[::1", "http://[::1]a/", "http://[]/", "http://[a.example]/"},
       {"file:", "file:a", "file://", "file://a.example/b"},
-      {"file:///a%", "file:///a%4", "file:///a%zz", "file:///a%00b"},
-  };
+      {"file:///a%", "file:///a%4", "file:///a%zz", "file:///a%00b"}};
   for (const auto& texts : kGroups) {
     for (const auto text : texts) EXPECT_FALSE(URL::parse(text)) << text;
   }

@@ -7,8 +7,7 @@ namespace {
 constexpr const char* kKey = "test.TargetDate";
 
 /// Does what the test says.
-class FakeActivity : public KVRSchedulerActivityDelegate {
- public:
+struct FakeActivity : KVRSchedulerActivityDelegate {
   bool network = false;
   std::function<void(ActivityHandler)> work = [](const ActivityHandler& handler) {
     handler(ActivityResult::Finished);
@@ -20,8 +19,7 @@ class FakeActivity : public KVRSchedulerActivityDelegate {
   }
 };
 
-class AScheduler : public SimulatedTest {
- protected:
+struct AScheduler : SimulatedTest {
   const std::shared_ptr<FakeActivity> activity = std::make_shared<FakeActivity>();
   const std::shared_ptr<KVRScheduler> scheduler =
       KVRScheduler::newSchedulerWithActivityDelegate(world.platform, activity);

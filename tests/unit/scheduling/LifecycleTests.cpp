@@ -2,22 +2,18 @@
 #include "platform/JSON.h"
 #include "scheduling/KVRConversionOutreachActivity.h"
 #include "scheduling/KVROutreachActivity.h"
-#include "scheduling/KVROutreachActivityUtilities.h"
 #include "scheduling/KVRPostBootActivity.h"
 #include "scheduling/KVRPostUpgradeActivity.h"
-#include "scheduling/SchedulingKeys.h"
 #include "unit/followup/OfferWorld.h"
 
 namespace kvr {
 namespace {
 
 /// The agent's activities in a world whose coverage service answers from a table.
-class TheAgentsLife : public AnOfferTest {
- protected:
+struct TheAgentsLife : AnOfferTest {
   std::map<std::string, Value> warranties;  ///< by serial number; the others' downloads fail
 
   TheAgentsLife() {
-    world.featureFlags.enabled.insert({"Kavrel", "Bravik_3_0"});
     world.preferences.setObject("https://assets.example/kvrV2.plist", preference::kServerVersionURL);
     world.coverage = [this](const HTTPRequest& request) {
       const auto found = warranties.find((*readJSON(request.body))["serialNumber"].string());
@@ -25,47 +21,26 @@ class TheAgentsLife : public AnOfferTest {
       return HTTPResponse{200, *writeJSON(found->second), {}};
     };
   }
-  void pair(const std::string& serialNumber, double daysAgo) {
-    world.pairedDevices.devices.push_back({"Watch", "Model", serialNumber, inDays(-daysAgo), true, false});
-  }
-  std::optional<Date> target(const char* identifier) {
-    return world.preferences.dateForKey(std::string(identifier) + ".TargetDate");
-  }
   void setTarget(const char* identifier, Date date) {
     world.preferences.setObject(date, std::string(identifier) + ".TargetDate");
   }
   template <class Activity>
   std::optional<ActivityResult> run() {
-    std::optional<ActivityResult> result;
-    const auto activity = std::make_shared<Activity>(world.platform);
     world.log.clear();
-    activity->performActivityForScheduler(
-        KVRScheduler::newSchedulerWithActivityDelegate(world.platform, activity),
-        ActivityHandler(world.log, "test", [&](ActivityResult it) { result = it; }));
-    world.queues.runUntil([&] { return result.has_value(); });
-    return result;
-  }
-  void setOSVersions(const std::optional<std::string>& recorded, const std::optional<std::string>& current) {
-    world.preferences.setObject(recorded, preference::kPostUpgradeOSVersion);
-    world.deviceProperties.answers.erase("ProductVersion");
-    if (current) world.deviceProperties.answers["ProductVersion"] = *current;
+    return AnOfferTest::run<Activity>();
   }
 };
 
 TEST_F(TheAgentsLife, SchedulesThePostAtTheEarliestDateOfAnOutreach) {
-  auto excluded = shownInDays(1, 20);
-  excluded["featureToggleParameters"] =
-      Dictionary{{"zubOfferDisplay", true}, {"zubOfferToggle", Array{"00101"}}};
-  auto lasting = offer(20);
-  lasting["featureToggleParameters"] =
-      Dictionary{{"zubOfferDisplay", true}, {"zubOfferDurationDaysBeforeEndDate", 15}};
+  const auto excluded = with({{"zubOfferToggle", Array{"00101"}}}, shownInDays(1, 20));
+  const auto lasting = with({{"zubOfferDurationDaysBeforeEndDate", 15}}, offer(20));
   const Value off = Dictionary{}, none;
   const Value in3 = shownInDays(3, 20), in10 = shownInDays(10, 20), before = shownInDays(-4, 20);
   const std::tuple<Value, Value, std::optional<double>> cases[] = {
       {in10, in3, 3},   {in10, lasting, 5}, {excluded, in3, 3},  {off, before, -4},
       {none, in10, 10}, {none, none, {}},   {excluded, off, {}},
   };
-  pair("W", 100);
+  world.pair("W", inDays(-100));
   world.carriers.carriers = {{"1", {}}, {"2", {"001", "01"}}};
   for (const auto& [phone, watch, days] : cases) {
     for (const bool conversion : {false, true}) {
@@ -126,17 +101,18 @@ TEST_F(TheAgentsLife, ForcesAConversionOutreachWhenTheOSVersionHasGoneUp) {
       {"17.10", "17.9", false, false}, {"17.9", "17.09", false, false}, {{}, "17.9", false, true},
       {"17.9", {}, false, false},      {"17", "17.0.1", false, true}};
   world.preferences.setObject(true, preference::kPostUpgradeActivityCompleted);
-  for (const auto& [recorded, current, outreachPending, forces] : cases) {
+  for (const auto& [before, current, outreachPending, forces] : cases) {
     KVRScheduler::clearScheduledActivities(world.platform);
-    setOSVersions(recorded, current);
+    world.preferences.setObject(before, preference::kPostUpgradeOSVersion);
+    world.deviceProperties.answers.erase("ProductVersion");
+    if (current) world.deviceProperties.answers["ProductVersion"] = *current;
     if (outreachPending) setTarget(activity::kOutreach, inDays(1));
     EXPECT_EQ(run<KVRPostUpgradeActivity>(), ActivityResult::Finished);
     EXPECT_EQ(target(activity::kConversionOutreach).has_value(), forces);
     EXPECT_EQ(world.log.count(forces ? "Forcing conversion outreach on upgrade"
                                      : "post upgrade activity already performed"),
               1U);
-    EXPECT_EQ(world.preferences.stringForKey(preference::kPostUpgradeOSVersion),
-              current ? current : recorded);
+    EXPECT_EQ(world.preferences.stringForKey(preference::kPostUpgradeOSVersion), current ? current : before);
     EXPECT_EQ(world.log.count("Unable to get OS version"), current ? 0U : 1U);
   }
 }

@@ -1,4 +1,3 @@
-#include "platform/JSON.h"
 #include "signing/AccountHeaders.h"
 #include "unit/CoverageWorld.h"
 
@@ -7,8 +6,7 @@ namespace {
 
 constexpr const char* kService = "com.tarsil.vornic.supportapp.auth";
 
-class ACoverageRequest : public CoverageTest {
- protected:
+struct ACoverageRequest : CoverageTest {
   bool sign(bool force) { return kvr_signWithAccountHeaders(world.platform, request, force, true); }
 
   HTTPRequest request;

@@ -15,8 +15,6 @@ constexpr const char* kSupported = "-[KVRKestManager generateKestCertficate:]: i
 constexpr const char* kUnsupported = "-[KVRKestManager generateKestCertficate:]: isSupported: 0";
 constexpr const char* kGenerated = "Kest certificate generation success: 1";
 constexpr const char* kNotGenerated = "Kest certificate generation success: 0";
-constexpr const char* kTimedOut =
-    "-[KVRKestManager generateKestCertficate:]: Installation timed out after 60 seconds";
 
 /// Bytes like those of a certificate: the same every time, and without any pattern to compress.
 std::string certificate(unsigned seed) {
@@ -26,8 +24,7 @@ std::string certificate(unsigned seed) {
   return bytes;
 }
 
-class DeviceAttestationHeaders : public SimulatedTest {
- protected:
+struct DeviceAttestationHeaders : SimulatedTest {
   DeviceAttestationHeaders() {
     world.attestation.preferred.chain = chain;
     world.attestation.fallback.chain = chain;
@@ -35,7 +32,6 @@ class DeviceAttestationHeaders : public SimulatedTest {
 
   std::optional<std::string> signature() const { return request.headers.value("X-Tarsil-Kest-S"); }
   std::optional<std::string> chainHeader() const { return request.headers.value("X-Tarsil-Kest"); }
-  std::vector<std::string> standardLines() const { return world.log.texts(LogLevel::Default); }
   std::vector<std::string> errorLines() const { return world.log.texts(LogLevel::Error); }
 
   const CertificateChain chain = {certificate(1), certificate(2)};
@@ -49,7 +45,7 @@ TEST_F(DeviceAttestationHeaders, CarryTheSignatureOfTheBodyAndTheChain) {
   EXPECT_THAT(world.attestation.key->messages, ElementsAre(request.body));
   EXPECT_EQ(signature(), base64Encoded("signature"));
   ASSERT_TRUE(chainHeader());
-  EXPECT_THAT(standardLines(),
+  EXPECT_THAT(world.log.texts(LogLevel::Default),
               ElementsAre(kBegin, kSupported, kGenerated,
                           "-[KVRKestManager addKestAuthenticationHeadersToRequest:withBody:error:]: "
                           "signatureDataString: " +
@@ -84,8 +80,8 @@ TEST_F(DeviceAttestationHeaders, AreLeftOutAndTheReasonLoggedWhenTheyCannotBeMad
   using Attestation = SimulatedDeviceAttestation;
   using Lines = std::vector<std::string>;
   enum Headers { kNone, kSignature, kChain };
-  const auto expect = [&](const std::function<void(Attestation&)>& cause, Lines outcome, const Lines& errors,
-                          Headers headers = kNone) {
+  const auto expect = [&](Lines outcome, const Lines& errors, Headers headers,
+                          const std::function<void(Attestation&)>& cause) {
     SCOPED_TRACE(::testing::PrintToString(errors));
     SimulatedPlatform fresh;
     fresh.attestation.preferred.chain = chain;
@@ -102,59 +98,47 @@ TEST_F(DeviceAttestationHeaders, AreLeftOutAndTheReasonLoggedWhenTheyCannotBeMad
     EXPECT_THAT(fresh.faults(), IsEmpty());
   };
   const Lines ungenerated = {kSupported, kNotGenerated};
-  const Lines timedOut = {kSupported, kTimedOut, kNotGenerated};
+  const std::string generate = "-[KVRKestManager generateKestCertficate:]: ";
+  const Lines timedOut = {kSupported, generate + "Installation timed out after 60 seconds", kNotGenerated};
   const Lines generated = {kSupported, kGenerated};
   const Error locked{"keys", 5, "locked"};
   const std::string unableToSign = "Unable to sign data and encode with error: " + describe(locked);
-  const std::string missing =
-      "-[KVRKestManager generateKestCertficate:]: Failed to get reference key or cert!";
-  const std::string tooLong =
-      "Error Domain=zlib Code=0 \"the compressed form is longer than what it is made of\"";
+  const auto missing = generate + "Failed to get reference key or cert!";
+  const auto nullData = "-[KVRKestManager serializeCertificateChain:]: Found NULL attestation data!!";
+  const auto tooLong = "Error Domain=zlib Code=0 \"the compressed form is longer than what it is made of\"";
 
-  expect([](auto& a) { a.supported = false; }, {kUnsupported, kNotGenerated}, {});
-  expect([&](auto& a) { a.accessControlError = locked; }, ungenerated,
-         {"Failed to create access control: " + describe(locked)});
+  expect({kUnsupported, kNotGenerated}, {}, kNone, [](auto& a) { a.supported = false; });
+  expect(ungenerated, {"Failed to create access control: " + describe(locked)}, kNone,
+         [&](auto& a) { a.accessControlError = locked; });
   // Only the attestation service's own code says that a certificate is missing.
-  expect(
-      [](auto& a) {
-        a.preferred.error = Error{"elsewhere", -11, "not issued"};
-      },
-      ungenerated, {generationFailed("Error Domain=elsewhere Code=-11 \"not issued\"")});
-  expect([](auto& a) { a.preferred.chain.reset(); }, ungenerated, {missing});
-  expect([](auto& a) { a.preferred.key.reset(); }, ungenerated, {missing});
-  expect(
-      [](auto& a) {
-        a.preferred = Attestation::failed(-11);
-        a.fallback = Attestation::failed(3);
-      },
-      ungenerated, {fellBack(-11), generationFailed(issueError(3))});
-  expect(
-      [](auto& a) {
-        a.preferred = Attestation::failed(-4);
-        a.fallback.chain.reset();
-      },
-      ungenerated, {fellBack(-4)});
-  expect([](auto& a) { a.preferred.delay = 60.001; }, timedOut, {});
+  const Error elsewhere{"elsewhere", -11, "not issued"};
+  expect(ungenerated, {generationFailed(describe(elsewhere))}, kNone,
+         [&](auto& a) { a.preferred.error = elsewhere; });
+  expect(ungenerated, {missing}, kNone, [](auto& a) { a.preferred.chain.reset(); });
+  expect(ungenerated, {missing}, kNone, [](auto& a) { a.preferred.key.reset(); });
+  expect(ungenerated, {fellBack(-11), generationFailed(issueError(3))}, kNone, [](auto& a) {
+    a.preferred = Attestation::failed(-11);
+    a.fallback = Attestation::failed(3);
+  });
+  expect(ungenerated, {fellBack(-4)}, kNone, [](auto& a) {
+    a.preferred = Attestation::failed(-4);
+    a.fallback.chain.reset();
+  });
+  expect(timedOut, {}, kNone, [](auto& a) { a.preferred.delay = 60.001; });
   // Both attempts share one limit.
-  expect(
-      [](auto& a) {
-        a.preferred = Attestation::failed(-11, 31);
-        a.fallback.delay = 30;
-      },
-      timedOut, {fellBack(-11)});
-  expect([&](auto& a) { a.key->signature = locked; }, generated,
-         headersFailed({unableToSign}, describe(locked)), kChain);
-  expect([](auto& a) { a.preferred.chain = CertificateChain{""}; }, generated,
-         headersFailed({"-[KVRKestManager serializeCertificateChain:]: Found NULL attestation data!!",
-                        "Unable to sign request"},
-                       tooLong),
-         kSignature);
-  expect(
-      [&](auto& a) {
-        a.key->signature = locked;
-        a.preferred.chain = CertificateChain{};
-      },
-      generated, headersFailed({unableToSign, "Unable to sign request"}, describe(locked)));
+  expect(timedOut, {fellBack(-11)}, kNone, [](auto& a) {
+    a.preferred = Attestation::failed(-11, 31);
+    a.fallback.delay = 30;
+  });
+  expect(generated, headersFailed({unableToSign}, describe(locked)), kChain,
+         [&](auto& a) { a.key->signature = locked; });
+  expect(generated, headersFailed({nullData, "Unable to sign request"}, tooLong), kSignature,
+         [](auto& a) { a.preferred.chain = CertificateChain{""}; });
+  expect(generated, headersFailed({unableToSign, "Unable to sign request"}, describe(locked)), kNone,
+         [&](auto& a) {
+           a.key->signature = locked;
+           a.preferred.chain = CertificateChain{};
+         });
 }
 
 TEST_F(DeviceAttestationHeaders, AreNotTouchedByAnAnswerThatComesTooLate) {

@@ -7,8 +7,7 @@ namespace {
 
 constexpr const char* kBundle = "com.tarsil.support";
 
-class TheSupportApplication : public SimulatedTest {
- protected:
+struct TheSupportApplication : SimulatedTest {
   /// What the whole answer, or the store's part, holds besides the bundle.
   Value answer(bool storeOnly = false) {
     Array answers;

@@ -21,16 +21,16 @@ struct Client : SimulatedPlatform {
                                   {preference::kServerVersionURL, "https://assets.example/kvrV2.plist"}});
   }
   bool supported() {
-    std::optional<bool> answer;
-    Utilities::serverVersionSupported(
-        platform, Utilities::BoolCompletion(log, "test", [&](bool yes) { answer = yes; }));
-    queues.run();
-    return answer.value();
+    return answerTo([&](auto reply) { Utilities::serverVersionSupported(platform, std::move(reply)); });
   }
   bool highEnabled(std::uint64_t policy) {
+    return answerTo([&](auto reply) {
+      Utilities::isHighServerVersionFeaturesetEnabled(platform, policy, std::move(reply));
+    });
+  }
+  bool answerTo(const std::function<void(Utilities::BoolCompletion)>& ask) {
     std::optional<bool> answer;
-    Utilities::isHighServerVersionFeaturesetEnabled(
-        platform, policy, Utilities::BoolCompletion(log, "test", [&](bool yes) { answer = yes; }));
+    ask(Utilities::BoolCompletion(log, "test", [&](bool yes) { answer = yes; }));
     queues.run();
     return answer.value();
   }
@@ -48,8 +48,7 @@ TEST(TheVersionNegotiation, SharesTheVersionsThatBothSidesSpeak) {
       {pairOf(1, 5), false, false, {}},
       {pairOf(Array{}, true), false, false, {}},
       {low, false, false, {"Server version dictionary missing key 'HighServerVersion'"}},
-      {"text", false, false, {"Incorrect serverDictionary format"}},
-  };
+      {"text", false, false, {"Incorrect serverDictionary format"}}};
   for (const auto& [server, supported, high, errors] : cases) {
     SCOPED_TRACE(describe(server));
     Client client;
@@ -79,8 +78,7 @@ TEST(TheVersionNegotiation, TakesTheServersPairFromThePolicysSources) {
       {Utilities::kCacheOnly, false, true, true, 0, {}},
       {Utilities::kRefresh, true, true, true, 1, published},
       {Utilities::kRefresh, true, false, false, 1, cached},
-      {Utilities::kRefresh, false, false, true, 1, pairOf(2, 3)},
-  };
+      {Utilities::kRefresh, false, false, true, 1, pairOf(2, 3)}};
   for (const auto& [policy, hasCache, hasAsset, high, requests, cacheAfter] : cases) {
     SCOPED_TRACE(format("%d %d %d", policy, hasCache, hasAsset));
     Client client;
@@ -113,8 +111,7 @@ TEST(TheVersionNegotiation, GoesOnAfterAnyFailedFetchAndAsksOnceMoreForAnAssetTh
       {url, {unfolding}, client, "Error serializing plist file" + from},
       {url, {}, client, failed + from + " with error: Error Domain=http Code=7 \"refused\""},
       {"file:///nowhere", {}, client, failed + " from URL 'file:///nowhere'"},
-      {7, {}, client, failed + " from URL '7'"},
-  };
+      {7, {}, client, failed + " from URL '7'"}};
   for (const auto& [address, responses, cacheAfter, lastError] : cases) {
     SCOPED_TRACE(lastError);
     Client world;

@@ -3,29 +3,24 @@
 #include "warranty/CacheMetadata.h"
 #include "warranty/KVRWarrantyDownloader.h"
 
-#include <cerrno>
-
 namespace kvr {
 namespace {
 
-struct Answer {
-  bool success;
-  KVRWarrantyRef warranty;
-};
-
-class ADownload : public CoverageTest {
- protected:
+struct ADownload : CoverageTest {
+  struct Answer {
+    bool success;
+    KVRWarrantyRef warranty;
+  };
   Answer download(const std::optional<std::string>& serialNumber) {
     std::vector<Answer> answers;
-    const auto downloader = std::make_shared<KVRWarrantyDownloader>(world.platform, "com.example.client");
-    downloader->downloadWarrantyForSerialNumber(
-        serialNumber,
-        DownloadCompletion(world.log, "test", [&](bool success, const KVRWarrantyRef& warranty) {
-          answers.push_back({success, warranty});
-        }));
+    const DownloadCompletion completion(world.log, "test", [&](bool success, const KVRWarrantyRef& warranty) {
+      answers.push_back({success, warranty});
+    });
+    std::make_shared<KVRWarrantyDownloader>(world.platform, "com.example.client")
+        ->downloadWarrantyForSerialNumber(serialNumber, completion);
     world.queues.runUntil([&] { return !answers.empty(); });
     EXPECT_EQ(answers.size(), 1U);
-    return answers.empty() ? Answer{} : answers[0];
+    return answers.at(0);
   }
   std::string cachedFile(const std::string& serialNumber) const {
     return "/home/user/Library/Application Support/com.tarsil.Kavrel/" + sha256Hash(serialNumber) +
@@ -51,11 +46,8 @@ TEST_F(ADownload, LogsEachStepInItsOrder) {
   EXPECT_TRUE(download("WATCH").success);
   const auto path = cachedFile("WATCH");
   EXPECT_THAT(*world.files.get(path), ::testing::StartsWith("<?xml"));
-  std::vector<std::string> lines;
-  for (const auto& line : world.log.lines()) {
-    if (line.level == LogLevel::Default && !line.text.starts_with("default device"))
-      lines.push_back(line.text);
-  }
+  auto lines = world.log.texts(LogLevel::Default);
+  std::erase_if(lines, [](const std::string& line) { return line.starts_with("default device"); });
   EXPECT_THAT(
       lines,
       ElementsAre(
@@ -74,8 +66,7 @@ TEST_F(ADownload, LogsEachStepInItsOrder) {
 TEST_F(ADownload, TriesAgainAfter401OnlyAndRenewsTheTokenThen) {
   const std::tuple<std::vector<int>, bool, std::size_t> cases[] = {
       {{200}, true, 0},  {{401, 200}, true, 1},  {{401, 401, 200}, true, 2}, {{401, 401, 401}, false, 2},
-      {{500}, false, 0}, {{401, 503}, false, 1}, {{302}, false, 0},          {{204}, false, 0},
-  };
+      {{500}, false, 0}, {{401, 503}, false, 1}, {{302}, false, 0},          {{204}, false, 0}};
   for (const auto& [statuses, success, renewals] : cases) {
     std::vector<int> left = statuses;
     world.coverage = [&](const HTTPRequest&) {

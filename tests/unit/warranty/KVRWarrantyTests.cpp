@@ -5,8 +5,7 @@
 namespace kvr {
 namespace {
 
-class AWarranty : public SimulatedTest {
- protected:
+struct AWarranty : SimulatedTest {
   AWarranty() { world.clock.set(Date{1'800'000'000}); }
 
   std::shared_ptr<KVRWarranty> from(const Value& dictionary) {
@@ -19,8 +18,7 @@ class AWarranty : public SimulatedTest {
         {"zubLocalizedOfferPluralDescFormat", "%@ days left"},
         {"zubLocalizedOfferSingularDesc", "last day"},
         {"zubLocalizedOfferDetailsPluralEligibilityFormat", "within %@ days"},
-        {"zubLocalizedOfferDetailsSingularEligibility", "today"},
-    });
+        {"zubLocalizedOfferDetailsSingularEligibility", "today"}});
   }
 };
 
@@ -48,8 +46,7 @@ TEST_F(AWarranty, ReadsNumbersAsDatesByTheEpochRule) {
       {1e300, 18'446'744'073'709'551.0},
       {std::numeric_limits<double>::quiet_NaN(), 0},
       {"1700000000", std::nullopt},
-      {Date{5}, std::nullopt},
-  };
+      {Date{5}, std::nullopt}};
   for (const auto& [number, seconds] : cases) {
     const auto date = from(Dictionary{{"coverageEndDate", number}})->coverageEndDate();
     EXPECT_EQ(date ? std::optional(date->secondsSince1970) : std::nullopt, seconds) << describe(number);
@@ -64,8 +61,7 @@ TEST_F(AWarranty, FindsEachKeyAtItsPlaceOnly) {
                                              {"zubOfferToggle", Array{"00101"}}}},
       {"zubOfferDisplay", false},
       {"coverage", Dictionary{{"localizedCoverageTitle", 7},
-                              {"benefitsCard", Dictionary{{"localizedBenefitsCardTitle", "Card"}}}}},
-  });
+                              {"benefitsCard", Dictionary{{"localizedBenefitsCardTitle", "Card"}}}}}});
   EXPECT_TRUE(warranty->zubOfferDisplay());
   EXPECT_EQ(warranty->zubOfferBadgeDurationBeforeEndDate(), 0);
   EXPECT_EQ(warranty->zubOfferDurationBeforeEndDate(), 1.5 * 86400);
@@ -88,8 +84,7 @@ TEST_F(AWarranty, TakesItsConversionDateFromTheFirstSourceThatHasOne) {
       {{}, {{"zubOfferConversionDate", Value()}, {"coverageEndDate", end}}, std::nullopt},
       {{}, {{"zubOfferConversionDate", "12"}, {"coverageEndDate", end}}, std::nullopt},
       {{}, {{"coverageEndDate", end}}, Date{1'700'000'000 + 3600}},
-      {{}, {}, std::nullopt},
-  };
+      {{}, {}, std::nullopt}};
   world.preferences.setObject(3600, preference::kOneDayInterval);
   for (const auto& [override, dictionary, date] : cases) {
     world.preferences.setObject(override, preference::kConversionDate);
@@ -98,7 +93,6 @@ TEST_F(AWarranty, TakesItsConversionDateFromTheFirstSourceThatHasOne) {
 }
 
 TEST_F(AWarranty, CountsTheDaysLeftAndChoosesTheOfferTextByThem) {
-  constexpr double kDay = 86400;
   const std::tuple<double, Value, std::uint32_t, const char*, const char*> cases[] = {
       {2 * kDay + 1, {}, 3, "3 days left", "within 3 days"},
       {1.5 * kDay, {}, 2, "2 days left", "within 2 days"},
@@ -107,8 +101,7 @@ TEST_F(AWarranty, CountsTheDaysLeftAndChoosesTheOfferTextByThem) {
       {7200, 3600, 2, "2 days left", "within 2 days"},
       {2 * kDay, -3, 2, "2 days left", "within 2 days"},  // no day length: 86400
       {1234 * kDay, {}, 1234, "1,234 days left", "within 1,234 days"},
-      {1e9, 1e-9, 4294967295, "4,294,967,295 days left", "within 4,294,967,295 days"},
-  };
+      {1e9, 1e-9, 4294967295, "4,294,967,295 days left", "within 4,294,967,295 days"}};
   for (const auto& [secondsLeft, dayLength, days, offer, eligibility] : cases) {
     world.preferences.setObject(dayLength, preference::kOneDayInterval);
     const auto warranty = eligibleFor(secondsLeft);

@@ -56,8 +56,8 @@ void note(long descriptor, Opened kind) {
 }
 
 /// One call that counts: whether it is to fail. `atTheEnd` is what is still done when the program ends in it.
-template <class Do>
-bool fails(const Do& atTheEnd) {
+template <class Do = void (*)()>
+bool fails(const Do& atTheEnd = [] {}) {
   auto& shared = *page();
   const auto number = ++shared.calls;
   if (shared.first == 0 || number < shared.first || number > shared.last) return false;
@@ -68,10 +68,6 @@ bool fails(const Do& atTheEnd) {
   }
   errno = shared.error;
   return true;
-}
-
-bool fails() {
-  return fails([] {});
 }
 
 bool failsFor(const char* path) { return counts(path) && fails(); }
