@@ -1,5 +1,6 @@
 // What each kind of event does.
 
+#include "agent/LookupPolicy.h"
 #include "devices/DeviceKeys.h"
 #include "kvr-simulate/Life.h"
 #include "platform/PairedDeviceRegistry.h"
@@ -49,6 +50,11 @@ void Life::apply(const Event& event) {
       ++world_.boot;
       return end(false, dice.happens(0.7), dice.oneOf({20.0, kHour, kDay}));
     case EventKind::Stop:
+      // What is asked for just before is under way then.
+      if (process_ && dice.happens(0.5)) {
+        clients_.invoke(process_->simulated, "GetDefaultDeviceInfoUsingPolicy", {LookupPolicy::kRefresh});
+        clients_.invoke(process_->simulated, "GetAllDeviceInfosUsingPolicy", {LookupPolicy::kRefresh, true});
+      }
       return end(false, true, dice.oneOf({0.2, kMinute, kHour}));
     case EventKind::Crash:
       return crash(dice, false);

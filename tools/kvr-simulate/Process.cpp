@@ -1,9 +1,13 @@
 #include "kvr-simulate/Process.h"
 
+#include "followup/FollowUpKeys.h"
+
 #include <algorithm>
 
 namespace kvr::simulate {
 namespace {
+
+HTTPResponse endingResponse() { return {0, std::nullopt, Error{"http", 42, "the process is ending"}}; }
 
 class RecordingActivity : public Activity {
  public:
@@ -124,10 +128,20 @@ Process::~Process() {
 void Process::start() { startUp_ = std::make_unique<StartUp>(platform_); }
 
 void Process::stop() {
+  const auto shown = simulated.followUps.newClient(kFollowUpClientIdentifier);
+  const auto before = shown->pendingItems();
+  simulated.cleanExit.beginEnding();
   simulated.log.beginEnding();
   simulated.activities.beginEnding();
+  for (auto& [done, answer] : std::exchange(open_, {})) {
+    if (!std::exchange(*done, true)) answer(endingResponse());
+  }
   simulated.queues.beginEnding();
   simulated.queues.run();
+  const auto after = shown->pendingItems();
+  if (before && after && after->size() < before->size()) {
+    invariants_.report("the end takes no follow-up away", std::to_string(before->size() - after->size()));
+  }
 }
 
 void Process::answer(const HTTPRequest& request, const SimulatedHTTP::Answer& answer) {
@@ -140,8 +154,11 @@ void Process::answer(const HTTPRequest& request, const SimulatedHTTP::Answer& an
   } else {
     outcome.response = HTTPResponse{0, std::nullopt, Error{"http", 7, "There is no network."}};
   }
+  if (simulated.cleanExit.isEnding()) return answer(endingResponse());
   ++openRequests_;
   const auto done = std::make_shared<bool>(false);
+  std::erase_if(open_, [](const auto& open) { return *open.first; });
+  open_.emplace_back(done, answer);
   const auto queue = simulated.queues.concurrentQueue(Priority::Default);
   // A request that nobody answers fails by its own limit.
   simulated.queues.after(request.timeout, queue, [this, done] {

@@ -6,6 +6,7 @@
 #include <memory>
 #include <string>
 #include <utility>
+#include <vector>
 
 namespace kvr::simulate {
 
@@ -60,6 +61,8 @@ class Process {
   World& world_;
   Invariants& invariants_;
   int openRequests_ = 0;
+  /// Requests, with whether each has been answered.
+  std::vector<std::pair<std::shared_ptr<bool>, SimulatedHTTP::Answer>> open_;
   RecordingActivities activities_;
   RecordingCenter followUps_;
   Platform platform_;
