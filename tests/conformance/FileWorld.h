@@ -68,6 +68,7 @@ class FileWorld {
   SimulatedLog log;
 
  private:
+  // In this order: each is made with what stands above.
   const std::unique_ptr<TemporaryDirectory> directory_;
   SimulatedFiles simulated_{clock};
   const std::unique_ptr<Files> local_;

@@ -45,7 +45,7 @@ struct TheAgentAmongHostilePeers : ::testing::Test {
     return std::distance(all, std::filesystem::directory_iterator());
   }
 
-  /// How often calls were answered with each error, "" for none, once that were `count`.
+  /// Reads answers until it has those of `count` calls; how many bore each error, "" for none.
   static std::map<std::string, int> answers(const RawBusClient& client, int count) {
     std::map<std::string, int> found;
     for (; count > 0; --count) {

@@ -94,7 +94,9 @@ TEST_F(Kvrctl, AsksWhatItIsTold) {
   setAnswer("GetDeviceInfoForSerialNumber", info(Dictionary{{"covered", true}}));
   setAnswer("GetDefaultDeviceInfoUsingPolicy", info(Value()));
   setAnswer("GetAllDeviceInfosUsingPolicy", Array{info(Value()), info(Dictionary{})});
-  for (const auto* it : {"DismissFollowUpForSerialNumber", "ScheduleOutreachAfter"}) setAnswer(it, true);
+  for (const auto* member : {"DismissFollowUpForSerialNumber", "ScheduleOutreachAfter"}) {
+    setAnswer(member, true);
+  }
   setAnswer("TarsilAccountAdded", false);
   setAnswer("DefaultDevice", Dictionary{{"name", 7}, {"deviceType", "x"}});
   setAnswer("PairedDevices", Array{device("a watch")});

@@ -55,8 +55,9 @@ TEST_F(AnItem, CarriesABadgeNearTheEndAndNeverLosesABit) {
     world.log.clear();
     KVRFollowUp(world.platform)._setupFollowUpItem(item, *info("SN", warranty));
     EXPECT_EQ(item.displayStyle, after) << describe(warranty);
-    const auto setup = "-[KVRFollowUp _setupFollowUpItem:withDeviceInfo:]: ";
-    EXPECT_EQ(world.log.count(format("%sshouldShowRowBadge: %d", setup, shows)), 1U);
+    const auto line =
+        format("-[KVRFollowUp _setupFollowUpItem:withDeviceInfo:]: shouldShowRowBadge: %d", shows);
+    EXPECT_EQ(world.log.count(line), 1U);
   }
 }
 

@@ -65,17 +65,17 @@ struct AnOfferTest : CoverageTest {
   std::optional<Date> target(const std::string& identifier) {
     return world.preferences.dateForKey(identifier + preference::kTargetDateSuffix);
   }
-  /// Runs an activity by itself; its result.
+  /// Starts an activity by itself; its result, where it gives one at once.
   template <class Activity, class... Means>
-  std::optional<ActivityResult> run(Means... means) {
-    std::optional<ActivityResult> result;
+  std::optional<ActivityResult> start(Means... means) {
+    result.reset();
     const auto activity = std::make_shared<Activity>(world.platform, means...);
     activity->performActivityForScheduler(
         KVRScheduler::newSchedulerWithActivityDelegate(world.platform, activity),
-        ActivityHandler(world.log, "test", [&](ActivityResult it) { result = it; }));
-    world.queues.runUntil([&] { return result.has_value(); });
+        ActivityHandler(world.log, "test", [this](ActivityResult it) { result = it; }));
     return result;
   }
+  std::optional<ActivityResult> result;  ///< of the activity that was started last
   Array hashes(const char* key) {
     const auto list = world.preferences.objectForKey(key);
     return list.isArray() ? list.array() : Array{};

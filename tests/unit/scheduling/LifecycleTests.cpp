@@ -27,7 +27,9 @@ struct TheAgentsLife : AnOfferTest {
   template <class Activity>
   std::optional<ActivityResult> run() {
     world.log.clear();
-    return AnOfferTest::run<Activity>();
+    start<Activity>();
+    world.queues.runUntil([this] { return result.has_value(); });
+    return result;
   }
 };
 
