@@ -33,7 +33,7 @@ std::shared_ptr<void> RefreshLimit::begin(std::function<void()> again) {
     }
     ++state_->underWay;
   }
-  return {this, [state = state_](const void*) { state->end(); }};
+  return {state_.get(), [state = state_](const void*) { state->end(); }};
 }
 
 }  // namespace kvr

@@ -2,6 +2,8 @@
 
 #include <unistd.h>
 
+#include <cerrno>
+#include <string_view>
 #include <utility>
 
 namespace kvr {
@@ -29,5 +31,16 @@ class Descriptor {
  private:
   int descriptor_ = -1;
 };
+
+/// Writes all of it, for as long as that takes; whether that succeeded.
+inline bool writeAll(int descriptor, std::string_view bytes) {
+  while (!bytes.empty()) {
+    const auto count = ::write(descriptor, bytes.data(), bytes.size());
+    if (count < 0 && errno == EINTR) continue;
+    if (count < 0) return false;
+    bytes.remove_prefix(static_cast<std::size_t>(count));
+  }
+  return true;
+}
 
 }  // namespace kvr

@@ -99,16 +99,6 @@ std::optional<Error> readAll(int descriptor, std::string& bytes, std::size_t lim
   return std::nullopt;
 }
 
-bool writeAll(int descriptor, std::string_view bytes) {
-  while (!bytes.empty()) {
-    const auto count = ::write(descriptor, bytes.data(), bytes.size());
-    if (count < 0 && errno == EINTR) continue;
-    if (count < 0) return false;
-    bytes.remove_prefix(static_cast<std::size_t>(count));
-  }
-  return true;
-}
-
 /// Makes a directory's entries durable. File systems that have no such operation are taken at their word.
 std::optional<Error> syncDirectory(const std::string& directory) {
   const auto descriptor = openExisting(directory, O_RDONLY | O_DIRECTORY);

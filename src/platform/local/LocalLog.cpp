@@ -1,5 +1,7 @@
 #include "platform/local/LocalLog.h"
 
+#include "platform/local/Descriptor.h"
+
 #define SD_JOURNAL_SUPPRESS_LOCATION
 #include <poll.h>
 #include <sys/stat.h>
@@ -131,17 +133,6 @@ void appendEscaped(std::string& line, std::string_view message) {
       line += c;
     }
   }
-}
-
-/// Whether all was written.
-bool writeAll(int descriptor, std::string_view text) {
-  while (!text.empty()) {
-    const auto count = ::write(descriptor, text.data(), text.size());
-    if (count < 0 && errno == EINTR) continue;
-    if (count < 0) return false;
-    text.remove_prefix(static_cast<std::size_t>(count));
-  }
-  return true;
 }
 
 bool sendToJournal(LogLevel level, const std::string& message) {
