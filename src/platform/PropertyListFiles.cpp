@@ -92,6 +92,7 @@ Result<Value> PropertyListFiles::read(const std::string& path, Expected expected
 
 std::optional<Error> PropertyListFiles::write(const std::string& path, const Value& tree,
                                               PropertyListEncoding encoding) {
+  Look::current = nullptr;
   const auto bytes = writePropertyList(tree, encoding);
   if (!bytes) return bytes.error();
   if (bytes->size() > kLimit) return Error{"files", EFBIG, path + ": too large to be written"};

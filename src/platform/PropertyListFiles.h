@@ -43,7 +43,7 @@ class PropertyListFiles {
   /// Replaces the file, creating its directory as needed. On failure the old file stays.
   std::optional<Error> write(const std::string& path, const Value& tree, PropertyListEncoding encoding);
 
-  /// As `Files::lock`, for a change that depends on what is read under it.
+  /// As `Files::lock`, for a change that depends on what is read under it: from here on it is read anew.
   std::unique_ptr<FileLock> lock(const std::string& directory);
 
   Files& files() { return files_; }
@@ -88,8 +88,8 @@ class PropertyListFiles {
 
 /// Makes what its thread reads be of one moment, for facts that are weighed together: a file that was read
 /// once is not looked at again, and later readings give what the first one found. It ends with its scope, or
-/// when its thread takes a lock to change something. To be held while nothing is waited for; within another
-/// one it does nothing.
+/// when its thread changes something. To be held while nothing is waited for; within another one it does
+/// nothing.
 class PropertyListFiles::Look {
  public:
   explicit Look(const PropertyListFiles& lists);

@@ -77,6 +77,11 @@ TEST_P(APreference, IsReadOnceAtOneLookWhichAChangeEnds) {
   preferences.update("a", [](const Value& a) { return Value(a.asInteger() + 10); });
   EXPECT_EQ(stored(), Value(Dictionary{{"a", 12}, {"c", 3}}));
   EXPECT_EQ(both(), std::pair(std::int64_t{12}, Value(4)));
+  const PropertyListFiles::Look another(process.lists);
+  EXPECT_EQ(both(), std::pair(std::int64_t{12}, Value(4)));
+  const auto encoding = PropertyListEncoding::Binary;
+  EXPECT_FALSE(process.lists.write(pathOf("com.tarsil.Widgetry"), Dictionary{{"b", 5}}, encoding));
+  EXPECT_EQ(both(), std::pair(std::int64_t{12}, Value(5)));
 }
 
 TEST_P(APreference, IsWrittenOnlyWhenItChanges) {

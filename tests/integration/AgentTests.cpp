@@ -64,10 +64,16 @@ TEST_F(TheAgent, ServesOthersWhileSomeWaitForRenewalsAndAttestations) {
 }
 
 TEST_F(TheAgent, EndsWithAnErrorWhenItLosesTheBus) {
+  world.setPreferences(
+      Dictionary{{"PostUpgradeActivityCompleted", true}, {"InitialOutreachActivityScheduled", true}});
   world.startAgent();
+  const auto client = world.newClient();
+  client.send("TarsilAccountAdded");
+  world.agent().waitForErrorOutput("New warranty to be downloaded after: 3600");
   world.bus.kill();
   EXPECT_GT(world.agent().wait(), 0) << "a status, not a signal";
   EXPECT_THAT(world.agent().errorOutput(), HasSubstr("error com.tarsil.Kavrel:core "));
+  EXPECT_THAT(world.agent().errorOutput(), Not(HasSubstr("went without an answer")));
 }
 
 TEST_F(TheAgent, LeavesCleanlyAfterAChangeOfLanguageAndComesBackWhenItIsCalled) {
@@ -113,6 +119,10 @@ TEST_F(TheAgent, KnowsTheSupportApplicationInTheUsersLanguage) {
     EXPECT_EQ(answer["AppAvailablityText"], Value(text)) << locale;
     EXPECT_EQ(answer["AppVendorName"], Value(""));
   }
+  EXPECT_EQ(world.agent().terminate(), 0);
+  const auto atTheEnd = waiting.next();
+  ASSERT_TRUE(atTheEnd);
+  EXPECT_EQ(atTheEnd->error, "");
 }
 
 }  // namespace

@@ -97,6 +97,17 @@ TEST_F(AFollowUpActivity, PostsAndSchedulesWhatFollows) {
   }
 }
 
+TEST_F(AFollowUpActivity, SchedulesWhatComesDueWhileOthersArePosted) {
+  const KVRDeviceInfoList list{info("B", shownInDays(0.001, 30), old), info("A", due(30), old)};
+  const auto displayDate = list[0]->warranty()->zubOfferFollowupDisplayDate();
+  world.files.whenChanged([this, displayDate](const std::string& path, bool) {
+    if (path.find("/FollowUps/") != std::string::npos) world.clock.set(*displayDate + 1);
+  });
+  runWith<KVRFollowUpPost>(list);
+  EXPECT_THAT(pendingSerials(), ElementsAre("A"));
+  EXPECT_EQ(target(activity::kFollowUpPost), displayDate);
+}
+
 TEST_F(AFollowUpActivity, DropsTheAnswerOfAPostRunThatWasDeferredMeanwhile) {
   std::vector<DeviceInfosAnswer> held;
   const auto post = std::make_shared<KVRFollowUpPost>(
