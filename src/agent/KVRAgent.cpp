@@ -2,7 +2,6 @@
 
 #include "agent/AgentKeys.h"
 #include "agent/KVRUtilities.h"
-#include "agent/SerialNumber.h"
 #include "devices/DeviceKeys.h"
 #include "devices/KVRDevicesManager.h"
 #include "scheduling/KVROutreachActivity.h"
@@ -95,9 +94,7 @@ void KVRAgent::performMigrationIfNeeded() {
   const auto device = deviceProvider()->defaultDevice();
   const auto serialNumber = device->serialNumber();
   KVRWarrantyRef warranty;
-  if (serialNumber && faultOfSerialNumber(*serialNumber) == nullptr) {
-    warranty = provider->migrateLegacyCachedWarrantyIfNeededForSerialNumber(*serialNumber);
-  }
+  if (serialNumber) warranty = provider->migrateLegacyCachedWarrantyIfNeededForSerialNumber(*serialNumber);
   provider->migrateLegacyFollowUpIfNeededWithDeviceInfo(
       KVRDeviceInfo::deviceInfoWithDevice(device, warranty));
   provider->setMigrationVersion(kCurrentLayout);
@@ -161,13 +158,6 @@ KVRDeviceRef KVRAgent::deviceFor(const std::string& serialNumber) {
 void KVRAgent::getDeviceInfoForSerialNumber(const std::string& serialNumber, std::uint64_t usingPolicy,
                                             DeviceInfoReply withReply) {
   const auto mapped = mappedSerialNumber(serialNumber);
-  if (const auto* fault = faultOfSerialNumber(mapped)) {
-    platform_.log.error("%s: serial number refused, it %s",
-                        "-[KVRAgent getDeviceInfoForSerialNumber:usingPolicy:withReply:]", fault);
-    withReply(KVRDeviceInfo::deviceInfoWithDevice(
-        KVRDevice::deviceWithName("<unknown>", mapped, std::nullopt, KVRDevice::kOther), nullptr));
-    return;
-  }
   getWarrantyUsingPolicy(
       usingPolicy, mapped,
       WarrantyReply(platform_.log, "getDeviceInfoForSerialNumber",

@@ -50,8 +50,8 @@ class KVRAgent : public KVRAgentProtocol, public std::enable_shared_from_this<KV
   void performMigrationIfNeeded();
 
   /// The lookup policy for one device. Replies before it returns when nothing is downloaded, else on the
-  /// thread on which the download finishes. A serial number that no device can have is refused with an error
-  /// line and answered with nothing.
+  /// thread on which the download finishes. Any text is a serial number; without one, the reply is nothing,
+  /// with an error line.
   void getWarrantyUsingPolicy(std::uint64_t policy, const std::optional<std::string>& serialNumber,
                               const WarrantyReply& withReply);
   /// The same for the local device.

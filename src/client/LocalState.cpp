@@ -27,8 +27,9 @@ constexpr std::string_view kDownloadedDate = "_CachedWarrantyLastUpdatedDate";
 constexpr std::string_view kDismissedDate = ".dismissed";
 constexpr std::int64_t kBadge = 1;  // of the display style
 
-/// Under which the agent keeps what it knows of a device.
-std::string hashOf(const std::string& serialNumber) {
+/// Under which the agent keeps what it knows of a device: of what comes before a NUL.
+std::string hashOf(std::string_view serialNumber) {
+  serialNumber = serialNumber.substr(0, serialNumber.find('\0'));
   std::array<unsigned char, SHA256_DIGEST_LENGTH> digest{};
   SHA256(reinterpret_cast<const unsigned char*>(serialNumber.data()), serialNumber.size(), digest.data());
   std::string hash;

@@ -2,7 +2,6 @@
 
 #include "followup/KVRFollowUp.h"
 
-#include "agent/SerialNumber.h"
 #include "followup/DeviceFacts.h"
 #include "followup/FollowUpKeys.h"
 #include "followup/HashList.h"
@@ -128,11 +127,6 @@ bool KVRFollowUp::_checkConversionEligibilityForDevice(const KVRDeviceInfo& devi
 }
 
 void KVRFollowUp::dismissFollowUpForSerialNumber(const std::string& serialNumber) {
-  if (const auto* fault = faultOfSerialNumber(serialNumber)) {
-    platform_.log.error("%s: serial number refused, it %s", "-[KVRFollowUp dismissFollowUpForSerialNumber:]",
-                        fault);
-    return;
-  }
   const auto turn = takeTurn();
   const auto error = followUpProvider()->clearPendingFollowUpItemsWithUniqueIdentifiers(
       {uniqueIdentfierForSerialNumber(serialNumber)});

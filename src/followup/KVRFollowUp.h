@@ -43,8 +43,7 @@ class KVRFollowUp {
   /// Whether the offer has begun anew since its follow-up was dismissed; then it no longer counts as posted.
   bool _checkConversionEligibilityForDevice(const KVRDeviceInfo& deviceInfo);
 
-  /// Clears the follow-up and remembers the dismissal. What is no serial number is refused with an error
-  /// line.
+  /// Clears the follow-up and remembers the dismissal.
   void dismissFollowUpForSerialNumber(const std::string& serialNumber);
   void _clearFollowUpWithDevices(const std::vector<KVRDeviceRef>& devices);
 

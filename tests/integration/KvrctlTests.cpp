@@ -2,6 +2,8 @@
 #include "integration/support/BusFixture.h"
 #include "platform/JSON.h"
 #include "platform/local/BusIntrospection.h"
+#include "signing/SHA256Hash.h"
+#include "unit/OddSerialNumbers.h"
 
 #include <iterator>
 #include <sstream>
@@ -135,8 +137,11 @@ TEST_F(Kvrctl, TellsWhyItGotNoAnswerAndWhatHelps) {
                                                   HasSubstr(kProgram))));
   entitle(true, kProgram);
   EXPECT_THAT(run({"dismiss", "S1"}), IsFailure(2, HasSubstr("kvrctl paired")));
-  for (const auto& misuse : std::vector<std::vector<std::string>>{
-           {"devices"}, {"info", "S", "--all"}, {"info", "--policy", "7"}, {"info", ""}, {"info", "\xFF"}}) {
+  for (const auto& misuse : std::vector<std::vector<std::string>>{{"devices"},
+                                                                  {"info", "S", "--all"},
+                                                                  {"info", "--policy", "7"},
+                                                                  {"notify", ""},
+                                                                  {"info", "\xFF"}}) {
     EXPECT_EQ(run(misuse).status, 1);
   }
   const auto unanswered = hold("DefaultDevice");
@@ -202,6 +207,32 @@ TEST_F(Kvrctl, PrintsTextThatCannotCommandATerminal) {
               AllOf(HasSubstr("…1234"), Not(HasSubstr("C02XY1234")), HasSubstr("01/02/70 00:00:00")));
   EXPECT_THAT(run({"info", "--show-serial"}).output, HasSubstr("C02XY1234"));
   EXPECT_THAT(run({"info", "--json"}).output, AllOf(Not(HasSubstr("\u009B")), HasSubstr("\\u009b")));
+}
+
+TEST_F(Kvrctl, TakesAnyTextForASerialNumber) {
+  const auto serving = serveAgent();
+  const std::string call = "FollowUpForSerialNumber";
+  setAnswer("Dismiss" + call, true);
+  for (const auto& serialNumber : oddSerialNumbers()) {
+    const Value own = Dictionary{{"name", "a watch"}, {"serialNumber", serialNumber}};
+    setAnswer("DefaultDevice", own);
+    setAnswer("PairedDevices", Array{device("another watch")});
+    setAnswer("GetDeviceInfoForSerialNumber", Dictionary{{"device", own}});
+    setAnswer("GetAllDeviceInfosUsingPolicy", Array{Dictionary{{"device", own}}});
+    home.write("Library/Preferences/com.tarsil.kvragent.plist",
+               "{ \"" + sha256Hash(serialNumber) + ".dismissed\" = x; }");
+    const auto told = readJSON(run({"--json", "--show-serial"}).output);
+    ASSERT_TRUE(told);
+    const Value status = (*told)["statuses"].array().at(0);
+    EXPECT_EQ(status["device"]["serialNumber"], Value(serialNumber));
+    EXPECT_EQ(status["isDismissed"], Value(true)) << "known by the hash that the agent uses";
+    if (serialNumber.find('\0') != std::string::npos) continue;  // no command line can carry it
+    run({"dismiss", "--", serialNumber});
+    EXPECT_EQ(asked(), "Dismiss" + call + describe(Value(Array{serialNumber})));
+    EXPECT_EQ(run({"info", "--policy", "cache", "--", serialNumber}).errors, "");
+    // Nothing is known, so kvrctl looks whether there is such a device.
+    EXPECT_EQ(asked(), "PairedDevices()");
+  }
 }
 
 TEST_F(Kvrctl, WritesOneJSONDocumentOfEverythingTheAgentKnows) {

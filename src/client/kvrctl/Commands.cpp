@@ -54,23 +54,18 @@ Result<std::vector<Device>> knownDevices(const AgentClient& agent) {
   return known;
 }
 
-Error unknownDevice(const std::string& serialNumber, const Report& report) {
-  return {"kvrctl", 0,
-          "no device has the serial number " + report.serial(serialNumber) +
-              "; kvrctl device and kvrctl paired tell which there are"};
-}
-
-/// The whole of a serial number that may be given as it is shown.
-Result<std::string> wholeSerial(const AgentClient& agent, const Options& options) {
-  if (!options.text.starts_with(kShortened)) return options.text;
+/// The whole of a serial number that may be given as it is shown; itself when no device ends so.
+Result<std::string> wholeSerial(const AgentClient& agent, const std::string& given) {
+  if (!given.starts_with(kShortened)) return given;
   const auto devices = knownDevices(agent);
   if (!devices) return devices.error();
-  const auto end = options.text.substr(kShortened.size());
+  const auto end = given.substr(kShortened.size());
   std::vector<std::string> found;
   for (const Device& device : *devices) {
+    if (device.serialNumber == given) return given;
     if (device.serialNumber && device.serialNumber->ends_with(end)) found.push_back(*device.serialNumber);
   }
-  if (found.empty()) return unknownDevice(options.text, Report(Report::Serials::Whole));
+  if (found.empty()) return given;
   if (found.size() == 1) return found.front();
   return Error{"kvrctl", 0, "more than one serial number ends so; --show-serial shows them whole"};
 }
@@ -86,15 +81,16 @@ bool isKnownDevice(const AgentClient& agent, const std::string& serialNumber, co
   if (followUps && std::ranges::find(*followUps, serialNumber, &FollowUp::serialNumber) != followUps->end()) {
     return true;
   }
-  say(unknownDevice(serialNumber, options.report()).message);
+  say("no device has the serial number " + options.report().serial(serialNumber) +
+      "; kvrctl device and kvrctl paired tell which there are");
   return false;
 }
 
 Result<std::vector<DeviceInfo>> infosFor(const AgentClient& agent, const Options& options,
-                                         const std::string& serialNumber) {
+                                         const std::optional<std::string>& serialNumber) {
   if (options.all) return agent.allDeviceInfos(options.policy, false);
-  Result<DeviceInfo> info = serialNumber.empty() ? agent.defaultDeviceInfo(options.policy)
-                                                 : agent.deviceInfo(serialNumber, options.policy);
+  Result<DeviceInfo> info = serialNumber ? agent.deviceInfo(*serialNumber, options.policy)
+                                         : agent.defaultDeviceInfo(options.policy);
   if (!info) return info.error();
   return std::vector{*std::move(info)};
 }
@@ -165,19 +161,23 @@ Status showPaired(const AgentClient& agent, const Options& options) {
 }
 
 Status showInfo(const AgentClient& agent, const Options& options) {
-  const auto serialNumber = wholeSerial(agent, options);
-  if (!serialNumber) return fail(serialNumber.error());
-  const auto infos = infosFor(agent, options, *serialNumber);
+  auto serialNumber = options.serialNumber;
+  if (serialNumber) {
+    const auto whole = wholeSerial(agent, *serialNumber);
+    if (!whole) return fail(whole.error());
+    serialNumber = *whole;
+  }
+  const auto infos = infosFor(agent, options, serialNumber);
   const Status shown = show(infos, options, {});
   if (shown != kFine) return shown;
   const auto isKnown = [](const DeviceInfo& info) { return !info.warranty.isNull(); };
   if (std::ranges::any_of(*infos, isKnown)) return kFine;
-  if (!serialNumber->empty()) isKnownDevice(agent, *serialNumber, options);
+  if (serialNumber) isKnownDevice(agent, *serialNumber, options);
   return kNothingKnown;
 }
 
 Status dismiss(const AgentClient& agent, const Options& options) {
-  const auto serialNumber = wholeSerial(agent, options);
+  const auto serialNumber = wholeSerial(agent, options.serialNumber.value_or(""));
   if (!serialNumber) return fail(serialNumber.error());
   if (!isKnownDevice(agent, *serialNumber, options)) return kNothingKnown;
   const Result<bool> answer = agent.dismissFollowUp(*serialNumber);

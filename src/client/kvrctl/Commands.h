@@ -4,13 +4,15 @@
 #include "client/kvrctl/Output.h"
 #include "client/kvrctl/Report.h"
 
+#include <optional>
 #include <string>
 
 namespace kvr::client {
 
 /// What the command line says.
 struct Options {
-  std::string text;  ///< a command's one argument: a serial number, a bundle identifier, a name
+  std::string text;  ///< a command's one argument: a bundle identifier, a name
+  std::optional<std::string> serialNumber;
   std::string file;  ///< to draw into
   double seconds = 0;
   bool noWait = false;
@@ -23,7 +25,8 @@ struct Options {
 };
 
 // The commands. Each writes its answer to standard output, or says on standard error why there is none.
-// A serial number may be given as it is shown, "…1234", if only one device of this phone ends so.
+// Any text is a serial number. One may be given as it is shown, "…1234", if only one device of this phone
+// ends so.
 
 using AgentCommand = Status (*)(const AgentClient&, const Options&);
 

@@ -77,13 +77,18 @@ class CommandLine {
       return text.empty() ? std::string("it is empty") : std::string();
     });
   }
+  /// Any text is a serial number, an empty one too.
+  CLI::Option* addSerial(CLI::App* command, const char* description) {
+    return command->add_option_function<std::string>(
+        "SERIAL", [this](const std::string& text) { options_.serialNumber = text; }, description);
+  }
 
   void addQuestions() {
     add("status", "Every device at a glance, from what is known already (the default)", showStatus);
     add("device", "This device", showDevice);
     add("paired", "The paired devices", showPaired);
     CLI::App* const info = add("info", "A device and its warranty", showInfo);
-    CLI::Option* const serial = addText(info, "SERIAL", "Another device's serial number");
+    CLI::Option* const serial = addSerial(info, "Another device's serial number");
     info->add_option("--policy", options_.policy, "Where the warranty comes from: default, cache or refresh")
         ->transform(CLI::CheckedTransformer(std::map<std::string, Policy>{
             {"default", Policy::Default}, {"cache", Policy::CacheOnly}, {"refresh", Policy::Refresh}}))
@@ -97,7 +102,7 @@ class CommandLine {
   }
 
   void addOrders() {
-    addText(add("dismiss", "Takes a device's offer away", dismiss), "SERIAL", "The device's serial number")
+    addSerial(add("dismiss", "Takes a device's offer away", dismiss), "The device's serial number")
         ->required();
     add("schedule-outreach", "Has the agent ask about every device by itself", scheduleOutreach)
         ->add_option("--after", options_.seconds, "So many seconds from now");

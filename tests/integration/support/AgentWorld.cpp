@@ -85,7 +85,8 @@ void AgentWorld::pair(const std::vector<std::string>& serialNumbers) const {
                                  {"pairedDate", Date{1'750'000'000}},
                                  {"isPaired", true}});
   }
-  writeDeviceFile("PairedDevices.plist", watches);
+  // A serial number may hold what no XML can.
+  directory.write("device/PairedDevices.plist", *writePropertyList(watches, PropertyListEncoding::Binary));
 }
 
 void AgentWorld::setAccount(const Value& renewal) const {

@@ -122,16 +122,6 @@ TEST_F(AFollowUp, IsNotPostedWithoutWhatItNeeds) {
   EXPECT_THAT(provider->posts, IsEmpty());
 }
 
-TEST_F(AFollowUp, IsNotDismissedForWhatIsNoSerialNumber) {
-  for (const auto& serialNumber : {std::string(), std::string(1000, 'x'), std::string("A\0B", 3)}) {
-    world.log.clear();
-    recorded.dismissFollowUpForSerialNumber(serialNumber);
-    EXPECT_THAT(world.log.texts(LogLevel::Error), SizeIs(1));
-  }
-  EXPECT_THAT(provider->clears, IsEmpty());
-  EXPECT_THAT(hashes(kDismissed), IsEmpty());
-}
-
 TEST_F(AFollowUp, RefreshesByTheFirstRuleThatApplies) {
   const std::string cleared = "Cleared follow-up: success", updated = "Updated follow-up: success";
   const auto repost = "Device eligible for re-post. Re-post the followup for " + plain;
