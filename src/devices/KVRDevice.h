@@ -31,6 +31,7 @@ class KVRDevice {
                                                    std::optional<Date> activationDate,
                                                    std::uint64_t deviceType);
 
+  static constexpr bool supportsSecureCoding() { return true; }
   /// A device from its coded form; a value of a wrong kind is an absent property.
   static std::shared_ptr<KVRDevice> initWithCoder(const Value& coded);
   /// The coded form; an absent property has no key.

@@ -19,6 +19,7 @@ class KVRDeviceInfo {
   KVRDeviceInfo(KVRDeviceRef device, KVRWarrantyRef warranty);
   static std::shared_ptr<KVRDeviceInfo> deviceInfoWithDevice(KVRDeviceRef device, KVRWarrantyRef warranty);
 
+  static constexpr bool supportsSecureCoding() { return true; }
   static std::shared_ptr<KVRDeviceInfo> initWithCoder(Platform& platform, const Value& coded);
   Value encodeWithCoder() const;
 

@@ -17,8 +17,6 @@ constexpr std::uint64_t kNoRowBadge = 16;
 
 constexpr double kExpirationMargin = 0.001;  // seconds before the eligibility's end
 
-Value textOrNull(const Value& value) { return value.isString() ? value : Value(); }
-
 }  // namespace
 
 std::string KVRFollowUp::uniqueIdentfierForSerialNumber(const std::optional<std::string>& serialNumber) {
@@ -50,8 +48,8 @@ void KVRFollowUp::_setupFollowUpItem(FollowUpItem& item, const KVRDeviceInfo& wi
   platform_.log.standard("%s: %{private}@", kSetup, withDeviceInfo);
   const auto warranty = withDeviceInfo.warranty();
   const auto end = warranty->zubOfferEligibleUntil();
-  item.title = textOrNull(warranty->zubLocalizedOfferLabel());
-  item.informativeFooterText = textOrNull(warranty->zubLocalizedOfferDesc());
+  item.title = warranty->zubLocalizedOfferLabel();
+  item.informativeFooterText = warranty->zubLocalizedOfferDesc();
   item.expirationDate = end ? std::optional(*end - kExpirationMargin) : std::nullopt;
   const bool shouldShowRowBadge =
       showsRowBadge(warranty->zubOfferSettingsRowBadge(), end, warranty->zubOfferBadgeDurationBeforeEndDate(),
@@ -59,20 +57,20 @@ void KVRFollowUp::_setupFollowUpItem(FollowUpItem& item, const KVRDeviceInfo& wi
   platform_.log.standard("%s: shouldShowRowBadge: %d", kSetup, shouldShowRowBadge);
   item.displayStyle |= shouldShowRowBadge ? kRowBadge : kNoRowBadge;
   item.userInfo = userInfoFor(*warranty, serialNumberOf(withDeviceInfo).value());
-  item.actions = {{textOrNull(warranty->zubLocalizedOfferCTA()), std::nullopt}};
+  item.actions = {{warranty->zubLocalizedOfferCTA(), std::nullopt}};
 }
 
 Value::Dictionary KVRFollowUp::userInfoFor(const KVRWarranty& warranty,
                                            const std::string& serialNumber) const {
   Value::Dictionary userInfo{{kFollowUpSerialNumberKey, serialNumber},
                              {kFollowUpRelativeDateCeilingKey, true}};
-  const auto singular = textOrNull(warranty.zubLocalizedOfferSingularDesc());
+  const auto singular = warranty.zubLocalizedOfferSingularDesc();
   if (singular.isNull()) {
     platform_.log.error("Missing zubLocalizedOfferSingularDesc value");
   } else {
     userInfo.emplace(kFollowUpRelativeDateSingleDayKey, singular);
   }
-  const auto plural = textOrNull(warranty.zubLocalizedOfferPluralDescFormat());
+  const auto plural = warranty.zubLocalizedOfferPluralDescFormat();
   if (plural.isNull()) {
     platform_.log.error("Missing zubLocalizedOfferPluralDescFormat value");
   } else {

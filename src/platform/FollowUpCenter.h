@@ -22,7 +22,7 @@ inline constexpr const char* kFollowUpRelativeDatePluralDaysFormatKey =
     "FollowUpRelativeDatePluralDaysFormat";
 
 struct FollowUpAction {
-  Value label;  ///< text, null for none
+  Value label;  ///< text, or whatever the service sent for one; null for none
   std::optional<std::string> url;
 
   friend bool operator==(const FollowUpAction&, const FollowUpAction&) = default;
@@ -35,8 +35,8 @@ struct FollowUpItem {
   std::optional<std::string> targetBundleIdentifier;
   std::optional<std::string> extensionIdentifier;
   std::uint64_t displayStyle = 0;  ///< bit set; 1 is the row's badge
-  Value title;                     ///< text, null for none
-  Value informativeFooterText;     ///< text, null for none
+  Value title;                     ///< as a label
+  Value informativeFooterText;     ///< as a label
   std::optional<Date> expirationDate;
   Value::Dictionary userInfo;
   std::vector<FollowUpAction> actions;

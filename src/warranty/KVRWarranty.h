@@ -33,6 +33,7 @@ class KVRWarranty {
   /// The same, logged; for what came from the service or from a cache file.
   static std::shared_ptr<KVRWarranty> warrantyWithDictionary(
       Platform& platform, const Value& dictionary, const std::optional<std::string>& serialNumber = {});
+  static constexpr bool supportsSecureCoding() { return true; }
   /// A record from its coded form; null when it holds no dictionary of dictionaries, arrays, strings,
   /// numbers, dates and nulls.
   static std::shared_ptr<KVRWarranty> initWithCoder(Platform& platform, const Value& coded);

@@ -61,9 +61,8 @@ TEST_F(AnItem, CarriesABadgeNearTheEndAndNeverLosesABit) {
   }
 }
 
-TEST_F(AnItem, LeavesOutTextsThatAreMissingOrNoTextAndKeepsItsRouting) {
-  const auto rest =
-      info("SN", Dictionary{{"zubLocalizedOfferLabel", 7}, {"zubLocalizedOfferPluralDescFormat", Array{}}});
+TEST_F(AnItem, LeavesOutTextsThatAreMissingAndKeepsItsRouting) {
+  const auto rest = info("SN", Dictionary{{"zubLocalizedOfferPluralDescFormat", Value()}});
   FollowUpItem item;
   item.uniqueIdentifier = item.groupIdentifier = item.targetBundleIdentifier = "own";
   item.userInfo = {{"earlier", 1}};
@@ -76,6 +75,20 @@ TEST_F(AnItem, LeavesOutTextsThatAreMissingOrNoTextAndKeepsItsRouting) {
   EXPECT_EQ(item, expected);
   EXPECT_EQ(world.log.count("Missing zubLocalizedOfferSingularDesc value"), 1U);
   EXPECT_EQ(world.log.count("Missing zubLocalizedOfferPluralDescFormat value"), 1U);
+
+  world.log.clear();
+  expected.title = 7;
+  expected.informativeFooterText = 1.5;
+  expected.userInfo.insert(
+      {{kFollowUpRelativeDateSingleDayKey, 1.5}, {kFollowUpRelativeDatePluralDaysFormatKey, Array{}}});
+  expected.actions = {{false, std::nullopt}};
+  KVRFollowUp(world.platform)
+      ._setupFollowUpItem(item, *info("SN", Dictionary{{"zubLocalizedOfferLabel", 7},
+                                                       {"zubLocalizedOfferCTA", false},
+                                                       {"zubLocalizedOfferSingularDesc", 1.5},
+                                                       {"zubLocalizedOfferPluralDescFormat", Array{}}}));
+  EXPECT_EQ(item, expected) << "what is no string is kept as the service sent it";
+  EXPECT_THAT(world.log.texts(LogLevel::Error), IsEmpty());
 
   world.log.clear();
   auto noSingular = offer(3);
