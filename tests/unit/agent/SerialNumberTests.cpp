@@ -9,19 +9,19 @@
 namespace kvr {
 namespace {
 
-/// Each case is a device of its own: the local one of a new installation.
 struct AnySerialNumber : AnOfferTest {
-  void become(const std::string& serialNumber) {
-    world.deviceProperties.answers["SerialNumber"] = serialNumber;
-    for (const auto& item : pending()) {
-      world.followUps.newClient(kFollowUpClientIdentifier)->clearPendingItems({*item.uniqueIdentifier});
-    }
-    world.preferences.removeObject(preference::kMigrationVersion);
+  AnySerialNumber() {
     world.coverage = [this](const HTTPRequest& request) {
       EXPECT_THAT(request.url, HasSubstr("/api/v3/")) << "the local device's endpoint";
       asked.insert((*readJSON(request.body))["serialNumber"].string());
       return HTTPResponse{200, *writeJSON(due(10)), {}};
     };
+  }
+  /// From here on it is the local device's, with what an earlier version left behind.
+  void become(const std::string& serialNumber) {
+    world.deviceProperties.answers["SerialNumber"] = serialNumber;
+    world.preferences.removeObject(preference::kMigrationVersion);
+    KVRWarranty::initWithDictionary(world.platform, offer(10))->cache();
     asked.clear();
     world.log.clear();
   }
@@ -47,8 +47,6 @@ TEST_F(AnySerialNumber, IsMigratedLookedUpPostedRefreshedAndDismissedAsItIs) {
     SCOPED_TRACE(describe(Value(serialNumber.substr(0, 20))));
     become(serialNumber);
     const auto known = std::pair(std::make_optional(serialNumber), true);
-    const auto legacy = KVRWarranty::initWithDictionary(world.platform, offer(10));
-    legacy->cache();
     agent->performMigrationIfNeeded();
     EXPECT_TRUE(KVRWarranty::cachedWarrantyForSerialNumber(world.platform, serialNumber));
     EXPECT_FALSE(KVRWarranty::cachedWarrantyForSerialNumber(world.platform, {})) << "none is not empty";
