@@ -1,5 +1,7 @@
 #include "client/Records.h"
 
+#include "platform/EpochNumber.h"
+
 namespace kvr::client {
 
 Device Device::from(const Value& record) {
@@ -11,30 +13,17 @@ Device Device::from(const Value& record) {
   return device;
 }
 
-namespace {
-
-constexpr double kFirstMillisecondEpoch = 1e10;
-constexpr double kDay = 86400;  // seconds
-
-/// Seconds, or milliseconds when there are too many of them.
-std::optional<Date> epochDate(const Value& epoch) {
-  if (!epoch.isNumber()) return std::nullopt;
-  const double number = epoch.asDouble();
-  return Date{number > kFirstMillisecondEpoch ? number / 1000 : number};
-}
-
-}  // namespace
-
 Coverage Coverage::from(const Value& warranty) {
+  constexpr double kDay = 86400;  // seconds
   const Value& features = warranty["featureToggleParameters"];
   Coverage coverage{warranty["covered"].asBool(),
                     warranty["coverageLocalizedLabel"].stringIfAny(),
                     warranty["coverageLocalizedDesc"].stringIfAny(),
-                    epochDate(warranty["coverageEndDate"]),
+                    dateWithEpochNumber(warranty["coverageEndDate"]),
                     features["zubOfferDisplay"].asBool(),
                     warranty["zubLocalizedOfferLabel"].stringIfAny(),
-                    epochDate(warranty["zubOfferFollowupDisplayDate"]),
-                    epochDate(warranty["zubOfferEligibleUntil"])};
+                    dateWithEpochNumber(warranty["zubOfferFollowupDisplayDate"]),
+                    dateWithEpochNumber(warranty["zubOfferEligibleUntil"])};
   if (!coverage.offerFrom && coverage.offerEnd) {
     coverage.offerFrom = *coverage.offerEnd - features["zubOfferDurationDaysBeforeEndDate"].asDouble() * kDay;
   }

@@ -1,5 +1,6 @@
 #include "warranty/KVRWarranty.h"
 
+#include "platform/EpochNumber.h"
 #include "warranty/WarrantyKeys.h"
 
 #include <cmath>
@@ -9,27 +10,8 @@ namespace kvr {
 namespace {
 
 constexpr double kSecondsPerDay = 86400.0;
-constexpr std::uint64_t kLargestSeconds = 10'000'000'000;
 
 double daysToSeconds(const Value& days) { return days.asDouble() * kSecondsPerDay; }
-
-/// The reading of a number as an unsigned integer: fractions dropped, saturated at both ends.
-std::uint64_t asUnsigned(const Value& number) {
-  switch (number.kind()) {
-    case Value::Kind::Bool:
-      return number.boolean() ? 1 : 0;
-    case Value::Kind::Int:
-      return number.integer() < 0 ? 0 : static_cast<std::uint64_t>(number.integer());
-    case Value::Kind::UInt:
-      return number.unsignedInteger();
-    default:
-      break;
-  }
-  const double real = number.real();
-  if (!(real > 0)) return 0;
-  if (real >= 18446744073709551616.0) return std::numeric_limits<std::uint64_t>::max();
-  return static_cast<std::uint64_t>(real);
-}
 
 bool isCodable(const Value& tree) {
   switch (tree.kind()) {
@@ -219,10 +201,7 @@ Value KVRWarranty::zubLocalizedOfferDetailsEligibility() const {
 }
 
 std::optional<Date> KVRWarranty::_dateWithEpochNumber(const Value& number) {
-  if (!number.isNumber() && !number.isBool()) return std::nullopt;
-  auto seconds = asUnsigned(number);
-  if (seconds > kLargestSeconds) seconds /= 1000;
-  return Date{static_cast<double>(seconds)};
+  return dateWithEpochNumber(number);
 }
 
 bool KVRWarranty::isEqual(const KVRWarranty& other) const {

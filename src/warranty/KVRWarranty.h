@@ -64,8 +64,7 @@ class KVRWarranty {
   Value zubLocalizedOfferDesc() const;
   Value zubLocalizedOfferDetailsEligibility() const;
 
-  /// A number is seconds since 1970, above 10,000,000,000 milliseconds (fractions dropped); nothing else is a
-  /// date. What lies below 0 counts as 0.
+  /// As `dateWithEpochNumber`.
   static std::optional<Date> _dateWithEpochNumber(const Value& number);
 
   bool isEqual(const KVRWarranty& other) const;

@@ -252,6 +252,26 @@ TEST_F(Kvrctl, WritesOneJSONDocumentOfEverythingTheAgentKnows) {
                 told + "null}]}"));
 }
 
+TEST_F(Kvrctl, ReadsDatesAsTheAgentDoes) {
+  const auto serving = serveAgent();
+  const std::pair<Value, Value> cases[] = {{1'700'000'000'999, "2023-11-14T22:13:20Z"},
+                                           {10'000'000'000.9, "2286-11-20T17:46:40Z"},
+                                           {true, "1970-01-01T00:00:01Z"},
+                                           {-1, Value()}};  // beyond any calendar
+  for (const auto& [epoch, date] : cases) {
+    setAnswer("GetAllDeviceInfosUsingPolicy",
+              Array{info(Dictionary{{"covered", true},
+                                    {"coverageEndDate", epoch},
+                                    {"zubOfferEligibleUntil", epoch},
+                                    {"featureToggleParameters", Dictionary{{"zubOfferDisplay", true}}}})});
+    const auto document = readJSON(run({"--json"}).output);
+    ASSERT_TRUE(document);
+    EXPECT_EQ((*document)["statuses"].array().at(0)["coverageEndDate"], date);
+    EXPECT_EQ(run({}).status, 0);
+    EXPECT_EQ(run({"timeline"}).status, 0);
+  }
+}
+
 /// What the file declares, without its comments and line breaks.
 std::string declarationsIn(std::string text) {
   text.erase(0, text.find("<interface name=\"com.tarsil"));

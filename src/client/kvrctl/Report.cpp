@@ -31,11 +31,12 @@ void appendWarranty(std::vector<std::pair<std::string, std::string>>& lines, con
   append("Offer ends", dateText(coverage.offerEnd));
 }
 
-/// Whole days from one date to another, rounded up; "0" for one that has passed.
+/// Whole days from one date to another, rounded up; "0" for one that has passed, nothing for one that no
+/// calendar reaches.
 std::string daysBetween(Date from, Date until) {
-  const Date days{std::ceil((until - from) / static_cast<double>(kDaySeconds))};
-  return isInCalendar(days) ? std::to_string(std::max(0LL, static_cast<long long>(days.secondsSince1970)))
-                            : "";
+  if (!isInCalendar(until)) return "";
+  const double days = std::ceil((until - from) / static_cast<double>(kDaySeconds));
+  return std::to_string(std::max(0LL, static_cast<long long>(days)));
 }
 
 std::string ageText(double seconds) {

@@ -19,10 +19,11 @@ constexpr const char* kPlain = "\033[0m";
 constexpr std::size_t kGap = 2;  // columns between two
 
 std::string formatted(Date date, const char* format) {
+  if (!isInCalendar(date)) return "unknown";
   const auto time = static_cast<std::time_t>(std::floor(date.secondsSince1970));
   std::tm local{};
   std::array<char, 64> text{};
-  if (!isInCalendar(date) || ::localtime_r(&time, &local) == nullptr) return "unknown";
+  if (::localtime_r(&time, &local) == nullptr) return "unknown";
   return printable({text.data(), std::strftime(text.data(), text.size(), format, &local)});
 }
 

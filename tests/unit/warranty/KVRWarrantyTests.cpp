@@ -41,7 +41,13 @@ TEST_F(AWarranty, ReadsNumbersAsDatesByTheEpochRule) {
       {10'000'000'000, 10'000'000'000},  // still seconds
       {10'000'000'001, 10'000'000},      // milliseconds, remainder dropped
       {0, 0},
-      {-5, 0},
+      {-1, 18'446'744'073'709'551.0},  // wraps, and then counts as milliseconds
+      {-1.9, 18'446'744'073'709'551.0},
+      {-0.9, 0},
+      {std::numeric_limits<std::int64_t>::min(), 9'223'372'036'854'775.0},
+      {-1e300, 9'223'372'036'854'775.0},
+      {10'000'000'000.9, 10'000'000'000},
+      {true, 1},
       {18'446'744'073'709'551'615ULL, 18'446'744'073'709'551.0},
       {1e300, 18'446'744'073'709'551.0},
       {std::numeric_limits<double>::quiet_NaN(), 0},
@@ -110,6 +116,8 @@ TEST_F(AWarranty, CountsTheDaysLeftAndChoosesTheOfferTextByThem) {
     EXPECT_EQ(warranty->zubLocalizedOfferDetailsEligibility(), Value(eligibility)) << secondsLeft;
   }
   EXPECT_EQ(from(Dictionary{})->daysEligible(), 0U);
+  world.preferences.removeObject(preference::kOneDayInterval);
+  EXPECT_EQ(from(Dictionary{{"zubOfferEligibleUntil", -1}})->daysEligible(), 4294967295U);
 }
 
 TEST_F(AWarranty, FillsOnlyItsOwnPlaceholderInTextsFromTheService) {
