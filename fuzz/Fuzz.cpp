@@ -2,6 +2,7 @@
 
 #include "platform/PropertyList.h"
 
+#include <algorithm>
 #include <cstdio>
 #include <cstdlib>
 
@@ -27,9 +28,28 @@ void requireRoundTrips(const Value& tree) {
   require(second && *second == *xml, "XML gives the tree back");
 }
 
+namespace {
+
+/// What is read of the top level alone is what stands there in the whole tree.
+void requireSameTopLevel(std::string_view input, const Value& tree) {
+  if (!tree.isDictionary() || tree.dictionary().empty()) return;
+  const auto& [key, value] = *tree.dictionary().rbegin();
+  // Of a binary list, only such keys are looked for.
+  if (!std::ranges::all_of(key, [](char c) { return static_cast<unsigned char>(c) < 0x80; })) return;
+  const std::string_view keys[] = {key};
+  const auto part = readPropertyListWithin({0, 0}, input, keys);
+  require(part && !part->isWhole, "the top level can be read alone");
+  const auto expected = value.isArray()        ? Value(Value::Array())
+                        : value.isDictionary() ? Value(Value::Dictionary())
+                                               : value;
+  require(part->tree == Value(Value::Dictionary{{key, expected}}), "the top level is the same");
+}
+
+}  // namespace
+
 void readAndWriteBack(std::string_view input, Result<Value> (*read)(std::string_view)) {
   const auto tree = read(input);
-  static_cast<void>(readPropertyList(input));
+  if (const auto list = readPropertyList(input)) requireSameTopLevel(input, *list);
   if (!tree) {
     require(tree.error().domain == "plist" && !tree.error().message.empty(), "an error says what it is");
     return;

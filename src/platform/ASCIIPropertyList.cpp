@@ -41,7 +41,7 @@ unsigned hexadecimalDigit(char c) {
 /// Works through the text one value start or container end at a time.
 class Reader {
  public:
-  explicit Reader(std::string_view text) : text_(text) {}
+  Reader(std::string_view text, TreeBuilder builder) : text_(text), builder_(std::move(builder)) {}
 
   Result<Value> read();
 
@@ -80,7 +80,7 @@ class Reader {
 
   const std::string_view text_;
   std::size_t at_ = 0;
-  TreeBuilder builder_{kMaximumValues};
+  TreeBuilder builder_;
   bool isStringTable_ = false;  ///< the outermost dictionary has no braces
   const char* problem_ = "";
 };
@@ -280,14 +280,18 @@ bool Reader::skipComment(std::string_view end, bool mayEndWithText) {
 }  // namespace
 
 Result<Value> readASCIIPropertyList(std::string_view bytes) {
+  return readASCIIPropertyList(bytes, TreeBuilder(kMaximumValues));
+}
+
+Result<Value> readASCIIPropertyList(std::string_view bytes, TreeBuilder builder) {
   const bool isBigEndian = bytes.starts_with("\xFE\xFF");
   if (isBigEndian || bytes.starts_with("\xFF\xFE")) {
     const auto text = utf8FromUTF16(bytes.substr(2), isBigEndian ? ByteOrder::Big : ByteOrder::Little);
     if (!text) return plistError("text that is not UTF-16 as it says");
-    return Reader(*text).read();
+    return Reader(*text, std::move(builder)).read();
   }
   if (bytes.starts_with("\xEF\xBB\xBF")) bytes.remove_prefix(3);
-  return Reader(bytes).read();
+  return Reader(bytes, std::move(builder)).read();
 }
 
 }  // namespace kvr

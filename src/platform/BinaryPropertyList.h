@@ -1,6 +1,7 @@
 #pragma once
 
 #include "platform/Error.h"
+#include "platform/PropertyList.h"
 #include "platform/Value.h"
 
 #include <string>
@@ -15,8 +16,10 @@ namespace kvr {
 // shared; all numbers are big-endian. An object starts with a marker: its kind in the high four bits, and in
 // the low four its length, where 15 means that an integer object with the length follows.
 
-/// `largest` bounds what the tree may unfold to, in values and in bytes of text and data.
-Result<Value> readBinaryPropertyList(std::string_view bytes, std::size_t largest);
+Result<Value> readBinaryPropertyList(std::string_view bytes);
+/// As `readPropertyListWithin`.
+Result<PartialTree> readBinaryPropertyListWithin(const TreeExtent& most, std::string_view bytes,
+                                                 EntryKeys keys);
 
 /// Equal leaves are written once, as far as a reader lets them be shared.
 Result<std::string> writeBinaryPropertyList(const Value& tree);

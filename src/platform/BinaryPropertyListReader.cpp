@@ -26,18 +26,17 @@ struct Extent {
 };
 
 /// A small input can unfold to any size by sharing, so what it may unfold to depends on its size.
-Extent largestExtentOf(std::size_t inputSize, std::uint64_t largest) {
+Extent largestExtentOf(std::size_t inputSize) {
   constexpr std::uint64_t kValuesOfAnyInput = 1U << 16U;
   constexpr std::uint64_t kValuesPerByte = 16;
-  return {std::min({std::uint64_t{kMaximumValues}, kValuesOfAnyInput + kValuesPerByte * inputSize, largest}),
-          std::min(std::uint64_t{kMaximumSharedBytes} + inputSize, largest)};
+  return {std::min(std::uint64_t{kMaximumValues}, kValuesOfAnyInput + kValuesPerByte * inputSize),
+          std::uint64_t{kMaximumSharedBytes} + inputSize};
 }
 
 /// Reads from the top object on, depth first, each object once, with a stack of its own.
 class Reader {
  public:
-  Reader(std::string_view bytes, std::size_t largest)
-      : bytes_(bytes), limit_(largestExtentOf(bytes.size(), largest)) {}
+  Reader(std::string_view bytes, const Extent& most) : bytes_(bytes), limit_(most) {}
 
   Result<Value> read() {
     if (!readTrailer() || !enter(top_)) return plistError(problem_);
@@ -46,6 +45,12 @@ class Reader {
     }
     return std::move(objects_[top_].value);
   }
+  /// Whether the list was refused for what it unfolds to, or how deep, and for no damage that was found so
+  /// far.
+  bool isTooMuch() const { return isTooMuch_; }
+
+  /// What stands at the top level: of a dictionary the entries under `keys`, each container as an empty one.
+  Result<Value> readTopLevel(EntryKeys keys);
 
  private:
   enum class State : std::uint8_t { Unread, Open, Read };
@@ -79,6 +84,10 @@ class Reader {
     problem_ = problem;
     return false;
   }
+  bool refuseTooMuch(const char* problem) {
+    isTooMuch_ = true;
+    return refuse(problem);
+  }
 
   /// `size` is 1 to 8; the bytes must be there.
   std::uint64_t number(std::size_t at, std::size_t size) const {
@@ -107,6 +116,8 @@ class Reader {
   bool measure(const Container& container);
   bool finish(Object& object, Value value);
   bool mayCopy(std::uint64_t bytes);
+  bool isText(std::uint64_t object, std::string_view text);
+  std::optional<Value> leafOrEmpty(std::uint64_t object);
 
   const std::string_view bytes_;
   const Extent limit_;
@@ -119,6 +130,7 @@ class Reader {
   std::uint64_t values_ = 0;  ///< in all containers so far, no more than what the tree unfolds to
   std::uint64_t copied_ = 0;  ///< bytes of text and data
   const char* problem_ = "";
+  bool isTooMuch_ = false;
 };
 
 bool Reader::readTrailer() {
@@ -196,7 +208,7 @@ bool Reader::finish(Object& object, Value value) {
 /// that it is: beside what the tree unfolds to, that is no more than the input.
 bool Reader::mayCopy(std::uint64_t bytes) {
   copied_ += bytes;
-  return copied_ <= limit_.bytes + bytes_.size() || refuse("unfolds to too much text");
+  return copied_ <= limit_.bytes + bytes_.size() || refuseTooMuch("unfolds to too much text");
 }
 
 bool Reader::readSingleton(Object& object, unsigned which) {
@@ -266,9 +278,9 @@ bool Reader::openContainer(std::size_t object, bool isDictionary, Content conten
   if (!readLength(content, count)) return false;
   if (count > content.left / referenceSize_ / (isDictionary ? 2 : 1))
     return refuse("a length beyond the objects");
-  if (open_.size() == kMaximumDepth) return refuse("nested too deep");
+  if (open_.size() == kMaximumDepth) return refuseTooMuch("nested too deep");
   values_ += count;
-  if (values_ > limit_.values) return refuse("unfolds to too many values");
+  if (values_ > limit_.values) return refuseTooMuch("unfolds to too many values");
   objects_[object].state = State::Open;
   open_.push_back({object, isDictionary, content.at, count});
   return true;
@@ -305,10 +317,10 @@ bool Reader::measure(const Container& container) {
       object.height = std::max(object.height, child.height);
     }
     if (object.extent.values >= limit_.values || object.extent.bytes > limit_.bytes) {
-      return refuse("unfolds to too much");
+      return refuseTooMuch("unfolds to too much");
     }
   }
-  if (++object.height > kMaximumDepth) return refuse("nested too deep");
+  if (++object.height > kMaximumDepth) return refuseTooMuch("nested too deep");
   return true;
 }
 
@@ -330,10 +342,76 @@ bool Reader::closeContainer(const Container& container) {
   return finish(objects_[container.object], std::move(array));
 }
 
+/// Whether the object is this string, of ASCII. It is compared where it stands: many objects may claim the
+/// same bytes.
+bool Reader::isText(std::uint64_t object, std::string_view text) {
+  if (object >= objects_.size()) return false;
+  const auto offset = number(table_ + object * offsetSize_, offsetSize_);
+  if (offset < kHeader.size() || offset >= table_) return false;
+  const auto marker = static_cast<unsigned>(number(offset, 1));
+  const auto kind = static_cast<Kind>(marker >> 4U);
+  Content content{marker & 0xFU, offset + 1, table_ - offset - 1};
+  std::uint64_t length = 0;
+  if ((kind != Kind::ASCIIString && kind != Kind::UTF16String) || !readLength(content, length)) return false;
+  const std::size_t unitSize = kind == Kind::UTF16String ? 2 : 1;
+  if (length != text.size() || length > content.left / unitSize) return false;
+  for (std::size_t i = 0; i < text.size(); ++i) {
+    if (number(content.at + i * unitSize, unitSize) != static_cast<unsigned char>(text[i])) return false;
+  }
+  return true;
+}
+
+std::optional<Value> Reader::leafOrEmpty(std::uint64_t object) {
+  if (object >= objects_.size()) {
+    refuse("a reference to no object");
+    return std::nullopt;
+  }
+  auto& found = objects_[object];
+  if (found.state == State::Unread && !enter(object)) return std::nullopt;
+  if (found.state == State::Read) return found.value;
+  const auto container =
+      std::ranges::find(open_, object, [](const Container& open) -> std::uint64_t { return open.object; });
+  return container->isDictionary ? Value(Value::Dictionary()) : Value(Value::Array());
+}
+
+Result<Value> Reader::readTopLevel(EntryKeys keys) {
+  if (!readTrailer() || !enter(top_)) return plistError(problem_);
+  if (open_.empty()) return std::move(objects_[top_].value);
+  const auto top = open_.front();
+  if (!top.isDictionary) return Value(Value::Array());
+  Value::Dictionary entries;
+  for (const auto key : keys) {
+    // Of equal keys the last counts.
+    std::size_t at = top.count;
+    while (at > 0 && !isText(reference(top, at - 1), key)) --at;
+    if (at == 0) continue;
+    auto value = leafOrEmpty(reference(top, top.count + at - 1));
+    if (!value) return plistError(problem_);
+    entries.emplace(key, *std::move(value));
+  }
+  return Value(std::move(entries));
+}
+
 }  // namespace
 
-Result<Value> readBinaryPropertyList(std::string_view bytes, std::size_t largest) {
-  return Reader(bytes, largest).read();
+Result<Value> readBinaryPropertyList(std::string_view bytes) {
+  return Reader(bytes, largestExtentOf(bytes.size())).read();
+}
+
+Result<PartialTree> readBinaryPropertyListWithin(const TreeExtent& most, std::string_view bytes,
+                                                 EntryKeys keys) {
+  const auto largest = largestExtentOf(bytes.size());
+  {
+    Reader reader(bytes, {std::min<std::uint64_t>(most.values, largest.values),
+                          std::min<std::uint64_t>(most.textBytes, largest.bytes)});
+    auto whole = reader.read();
+    if (whole) return PartialTree{*std::move(whole), true};
+    if (!reader.isTooMuch()) return whole.error();
+  }
+  constexpr std::uint64_t kNoLimit = std::uint64_t{1} << 62U;  // no more than the input is looked at
+  auto part = Reader(bytes, {kNoLimit, kNoLimit}).readTopLevel(keys);
+  if (!part) return part.error();
+  return PartialTree{*std::move(part), false};
 }
 
 }  // namespace kvr

@@ -6,8 +6,8 @@
 #include "platform/XMLPropertyList.h"
 
 #include <algorithm>
-#include <limits>
 #include <string>
+#include <utility>
 
 namespace kvr {
 namespace {
@@ -56,14 +56,24 @@ std::optional<std::string_view> xmlDocument(std::string_view bytes) {
 }  // namespace
 
 Result<Value> readPropertyList(std::string_view bytes) {
-  return readPropertyListWithin(std::numeric_limits<std::size_t>::max(), bytes);
-}
-
-Result<Value> readPropertyListWithin(std::size_t largest, std::string_view bytes) {
-  if (bytes.size() > largest) return plistError("larger than " + std::to_string(largest) + " bytes");
-  if (bytes.starts_with("bplist")) return readBinaryPropertyList(bytes, largest);
+  if (bytes.starts_with("bplist")) return readBinaryPropertyList(bytes);
   if (const auto document = xmlDocument(bytes)) return readXMLPropertyList(*document);
   return readASCIIPropertyList(bytes);
+}
+
+Result<PartialTree> readPropertyListWithin(const TreeExtent& most, std::string_view bytes, EntryKeys keys) {
+  if (bytes.starts_with("bplist")) return readBinaryPropertyListWithin(most, bytes, keys);
+  const auto document = xmlDocument(bytes);
+  const auto read = [&](TreeBuilder builder) {
+    return document ? readXMLPropertyList(*document, std::move(builder))
+                    : readASCIIPropertyList(bytes, std::move(builder));
+  };
+  auto whole = read(TreeBuilder(std::min(most.values, kMaximumValues)));
+  if (whole) return PartialTree{*std::move(whole), true};
+  // A list that is damaged is so for this reading too.
+  auto part = read(TreeBuilder(keys));
+  if (!part) return whole.error();
+  return PartialTree{*std::move(part), false};
 }
 
 Result<std::string> writePropertyList(const Value& tree, PropertyListEncoding encoding) {

@@ -3,6 +3,8 @@
 #include "platform/Error.h"
 #include "platform/Value.h"
 
+#include <cstddef>
+#include <span>
 #include <string>
 #include <string_view>
 
@@ -20,10 +22,25 @@ inline constexpr std::size_t kMaximumDepth = 512;
 /// std::bad_alloc, never an error. Thread-safe, no state.
 Result<Value> readPropertyList(std::string_view bytes);
 
-/// As above, for what a stranger has sent and is kept or logged: an error too are more than `largest` bytes,
-/// and a tree of more than `largest` values or bytes of text and data, where what a binary list shares counts
-/// wherever it stands.
-Result<Value> readPropertyListWithin(std::size_t largest, std::string_view bytes);
+/// How much there may be of a tree. What a binary list shares counts wherever it stands; the text of the
+/// other encodings, which share nothing, is not counted.
+struct TreeExtent {
+  std::size_t values;
+  std::size_t textBytes;  ///< of text and data, keys included
+};
+
+/// A tree, or what could be read of it.
+struct PartialTree {
+  Value tree;
+  bool isWhole = true;
+};
+
+using EntryKeys = std::span<const std::string_view>;
+
+/// As above, for what a stranger has sent and is kept or logged. Of a list that holds more than `most`, or is
+/// nested too deep, only what stands at the top level is read: of a dictionary the entries under `keys`, each
+/// container as an empty one. The rest may then be of any size; of a binary list it is not looked at.
+Result<PartialTree> readPropertyListWithin(const TreeExtent& most, std::string_view bytes, EntryKeys keys);
 
 /// Writes a tree. XML holds no null, no character that XML forbids and no date outside the calendar, and
 /// drops a date's fraction of a second; the binary encoding holds every tree (a date before 1985 to a tenth

@@ -93,10 +93,10 @@ Result<Value> PropertyListFiles::read(const std::string& path, Expected expected
 std::optional<Error> PropertyListFiles::write(const std::string& path, const Value& tree,
                                               PropertyListEncoding encoding) {
   Look::current = nullptr;
+  if (auto error = files_.createDirectory(directoryOf(path))) return error;
   const auto bytes = writePropertyList(tree, encoding);
   if (!bytes) return bytes.error();
   if (bytes->size() > kLimit) return Error{"files", EFBIG, path + ": too large to be written"};
-  if (auto error = files_.createDirectory(directoryOf(path))) return error;
   if (auto error = files_.replace(path, *bytes)) return error;
   forget(path);
   return std::nullopt;

@@ -40,7 +40,8 @@ class PropertyListFiles {
   Result<Value> read(const std::string& path, Expected expected, WhenDamaged whenDamaged,
                      const Complaint& complaint = nullptr);
 
-  /// Replaces the file, creating its directory as needed. On failure the old file stays.
+  /// Replaces the file; first creates its directory as needed, even for a tree that then cannot be written.
+  /// On failure the old file stays.
   std::optional<Error> write(const std::string& path, const Value& tree, PropertyListEncoding encoding);
 
   /// As `Files::lock`, for a change that depends on what is read under it: from here on it is read anew.

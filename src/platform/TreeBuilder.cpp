@@ -1,6 +1,6 @@
 #include "platform/TreeBuilder.h"
 
-#include "platform/PropertyList.h"
+#include <algorithm>
 
 namespace kvr {
 
@@ -11,13 +11,19 @@ bool TreeBuilder::refuse(const char* problem) {
 
 bool TreeBuilder::mayTakeValue() {
   if (complete_) return refuse("a second value at the top level");
-  if (isInDictionary() && !open_.back().key) return refuse("a dictionary value without a key");
-  if (++values_ > maximumValues_) return refuse("too many values");
+  if (isInDictionary() && !hasKey()) return refuse("a dictionary value without a key");
+  if (!passedOver_.empty()) passedOver_.back().hasKey = false;
+  if (!only_ && ++values_ > maximumValues_) return refuse("too many values");
   return true;
 }
 
 bool TreeBuilder::open(bool isDictionary) {
   if (!mayTakeValue()) return false;
+  if (only_ && !open_.empty()) {
+    if (passedOver_.empty()) place(isDictionary ? Value(Value::Dictionary()) : Value(Value::Array()));
+    passedOver_.push_back({isDictionary, false});
+    return true;
+  }
   if (open_.size() == kMaximumDepth) return refuse("nested too deep");
   open_.push_back({isDictionary, {}, {}, std::nullopt});
   return true;
@@ -25,21 +31,29 @@ bool TreeBuilder::open(bool isDictionary) {
 
 bool TreeBuilder::setKey(std::string key) {
   if (!isInDictionary()) return refuse("a key outside a dictionary");
-  if (open_.back().key) return refuse("a dictionary key without a value");
-  open_.back().key = std::move(key);
+  if (hasKey()) return refuse("a dictionary key without a value");
+  if (passedOver_.empty()) {
+    open_.back().key = std::move(key);
+  } else {
+    passedOver_.back().hasKey = true;
+  }
   return true;
 }
 
 bool TreeBuilder::add(Value&& value) {
   if (!mayTakeValue()) return false;
-  place(std::move(value));
+  if (passedOver_.empty()) place(std::move(value));
   return true;
 }
 
 bool TreeBuilder::close() {
   if (open_.empty()) return refuse("the end of a container that is not open");
+  if (isInDictionary() && hasKey()) return refuse("a dictionary key without a value");
+  if (!passedOver_.empty()) {
+    passedOver_.pop_back();
+    return true;
+  }
   auto& container = open_.back();
-  if (container.key) return refuse("a dictionary key without a value");
   auto value =
       container.isDictionary ? Value(std::move(container.dictionary)) : Value(std::move(container.array));
   open_.pop_back();
@@ -54,6 +68,10 @@ void TreeBuilder::place(Value&& value) {
     return;
   }
   auto& container = open_.back();
+  if (only_ && (!container.isDictionary || std::ranges::find(*only_, *container.key) == only_->end())) {
+    container.key.reset();
+    return;
+  }
   if (!container.isDictionary) {
     container.array.push_back(std::move(value));
     return;

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "platform/PropertyList.h"
 #include "platform/Value.h"
 
 #include <cstddef>
@@ -19,6 +20,9 @@ class TreeBuilder {
  public:
   /// The tree may hold so many values, containers included.
   explicit TreeBuilder(std::size_t maximumValues) : maximumValues_(maximumValues) { open_.reserve(8); }
+  /// Only what stands at the top level is kept: of a dictionary the entries under these keys, each container
+  /// as an empty one; of an array nothing. What is passed over may be of any size and depth.
+  explicit TreeBuilder(EntryKeys only) : only_(only) {}
 
   bool openArray() { return open(false); }
   bool openDictionary() { return open(true); }
@@ -27,9 +31,12 @@ class TreeBuilder {
   bool close();
 
   /// How many containers are open.
-  std::size_t depth() const { return open_.size(); }
+  std::size_t depth() const { return open_.size() + passedOver_.size(); }
   /// Whether the innermost open container is a dictionary.
-  bool isInDictionary() const { return !open_.empty() && open_.back().isDictionary; }
+  bool isInDictionary() const {
+    if (!passedOver_.empty()) return passedOver_.back().isDictionary;
+    return !open_.empty() && open_.back().isDictionary;
+  }
   /// Whether the one value at the top level is there, with nothing left open.
   bool isComplete() const { return complete_; }
   /// The complete tree.
@@ -44,15 +51,25 @@ class TreeBuilder {
     Value::Dictionary dictionary;
     std::optional<std::string> key;
   };
+  /// A container of which nothing is kept.
+  struct PassedOver {
+    bool isDictionary;
+    bool hasKey;
+  };
 
+  bool hasKey() const {
+    return passedOver_.empty() ? open_.back().key.has_value() : passedOver_.back().hasKey;
+  }
   bool open(bool isDictionary);
   bool mayTakeValue();
   void place(Value&& value);
   bool refuse(const char* problem);
 
-  const std::size_t maximumValues_;
+  const std::size_t maximumValues_ = 0;
+  const std::optional<EntryKeys> only_;
   std::size_t values_ = 0;
   std::vector<Container> open_;
+  std::vector<PassedOver> passedOver_;  ///< the open containers inside `open_`
   Value tree_;
   bool complete_ = false;
   const char* problem_ = "";

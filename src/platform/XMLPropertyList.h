@@ -1,6 +1,7 @@
 #pragma once
 
 #include "platform/Error.h"
+#include "platform/TreeBuilder.h"
 #include "platform/Value.h"
 
 #include <string>
@@ -13,6 +14,8 @@ namespace kvr {
 /// Reads a document in any encoding that Expat knows, from its XML declaration, document type or root on. A
 /// document type may stand there but may declare nothing.
 Result<Value> readXMLPropertyList(std::string_view bytes);
+/// The tree as far as the builder takes it.
+Result<Value> readXMLPropertyList(std::string_view bytes, TreeBuilder builder);
 
 /// Writes UTF-8 without document type, an element a line.
 Result<std::string> writeXMLPropertyList(const Value& tree);

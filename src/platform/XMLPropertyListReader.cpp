@@ -117,6 +117,8 @@ Element elementNamed(std::string_view name) {
 /// calls afterwards do nothing.
 class Reader {
  public:
+  explicit Reader(TreeBuilder builder) : builder_(std::move(builder)) {}
+
   Result<Value> read(std::string_view bytes);
 
  private:
@@ -141,7 +143,7 @@ class Reader {
 
   std::unique_ptr<XML_ParserStruct, decltype(&XML_ParserFree)> parser_{XML_ParserCreate(nullptr),
                                                                        XML_ParserFree};
-  TreeBuilder builder_{kMaximumValues};
+  TreeBuilder builder_;
   bool inDocument_ = false;
   Element leaf_ = Element::None;
   std::string text_;  ///< of the open leaf, so far; copied from, so that it need not grow anew for each
@@ -268,6 +270,12 @@ std::optional<Value> Reader::leafValue() {
 
 }  // namespace
 
-Result<Value> readXMLPropertyList(std::string_view bytes) { return Reader().read(bytes); }
+Result<Value> readXMLPropertyList(std::string_view bytes) {
+  return readXMLPropertyList(bytes, TreeBuilder(kMaximumValues));
+}
+
+Result<Value> readXMLPropertyList(std::string_view bytes, TreeBuilder builder) {
+  return Reader(std::move(builder)).read(bytes);
+}
 
 }  // namespace kvr

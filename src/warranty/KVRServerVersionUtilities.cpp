@@ -1,6 +1,8 @@
 #include "warranty/KVRServerVersionUtilities.h"
 
 #include "platform/PropertyList.h"
+#include "platform/PropertyListFiles.h"
+#include "platform/PropertyListLimits.h"
 #include "platform/URL.h"
 #include "warranty/WarrantyKeys.h"
 
@@ -9,8 +11,11 @@
 namespace kvr {
 namespace {
 
-/// Many times what a version pair takes. It goes into the preferences and into several log lines.
-constexpr std::size_t kLargestAsset = 65536;
+constexpr std::size_t kLargestAsset = std::size_t{1} << 20U;  // bytes
+/// Half of what one store can hold, so that the preferences take an asset besides all they have. Only a
+/// binary list can hold more, by what it shares.
+constexpr TreeExtent kLargestKept{kMaximumValues / 2, PropertyListFiles::kLimit / 2};
+constexpr std::string_view kVersionKeys[] = {preference::kLowServerVersion, preference::kHighServerVersion};
 
 /// A string's leading digits as a number; anything else as it is.
 Value asVersion(const Value& value) { return value.isString() ? Value(value.asInteger()) : value; }
@@ -199,6 +204,15 @@ using DictionaryCompletion = KVRServerVersionUtilities::DictionaryCompletion;
 /// What a fetch brought: the bytes, or why there are none.
 using Fetched = Result<std::string>;
 
+/// What is kept of an asset that holds more than can be kept: the versions, as numbers.
+Value versionsOf(Platform& platform, const Value& url, const Value& asset) {
+  platform.log.error("The asset from URL '%@' holds more than can be kept: only its versions are", url);
+  if (!asset.isDictionary()) return asset;
+  Value::Dictionary versions;
+  for (const auto& [key, version] : asset.dictionary()) versions.emplace(key, asVersion(version));
+  return versions;
+}
+
 void handleFetched(Platform& platform, const Value& url, bool shouldRetry, const Fetched& fetched,
                    const DictionaryCompletion& completion) {
   if (!fetched) {
@@ -206,21 +220,22 @@ void handleFetched(Platform& platform, const Value& url, bool shouldRetry, const
     completion({});
     return;
   }
-  const auto parsed = readPropertyListWithin(kLargestAsset, *fetched);
+  const auto parsed = readPropertyListWithin(kLargestKept, *fetched, kVersionKeys);
   if (!parsed) {
     platform.log.error("Error serializing plist file from URL '%@': %@", url, parsed.error());
     completion({});
     return;
   }
-  if (parsed->isDictionary()) {
-    completion(*parsed);
+  const Value asset = parsed->isWhole ? parsed->tree : versionsOf(platform, url, parsed->tree);
+  if (asset.isDictionary()) {
+    completion(asset);
   } else if (shouldRetry) {
     platform.log.error("Incorrect format in response detected. retrying...");
     KVRServerVersionUtilities::_dictionaryFromURL(platform, url, false, completion);
   } else {
     platform.log.error(
         "Incorrect format in response detected from URL '%@'. Response: %@. Aborting without retry.", url,
-        *parsed);
+        asset);
     completion({});
   }
 }

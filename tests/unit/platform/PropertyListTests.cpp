@@ -209,6 +209,48 @@ TEST(AnXMLPropertyList, IsWrittenAnElementALineWithoutDocumentType) {
       "\tAQIDBA==\n\t</data>\n\t<key>t</key>\n\t<string>x&#13;&lt;\n</string>\n</dict>\n</plist>\n");
 }
 
+TEST(APropertyListWithin, GivesWhatStandsAtTheTopLevelWhateverElseItHolds) {
+  constexpr std::string_view kKeys[] = {"a", "b"};
+  const auto read = [&](const std::string& bytes) {
+    return readPropertyListWithin({100, 1000}, bytes, kKeys);
+  };
+  const auto xml = [](const std::string& content) {
+    return document("<dict><key>a</key><string>1</string>" + content + "</dict>");
+  };
+  const auto arrays = [](std::size_t count) {
+    return repeated("<array>", count) + repeated("</array>", count);
+  };
+  const auto binary = [](const Value& tree) { return *writePropertyList(tree, kBinary); };
+  const Value start = Dictionary{{"a", "1"}};
+  const Value both = Dictionary{{"a", "1"}, {"b", Array{}}};
+  const std::tuple<std::string, Value, bool> cases[] = {
+      {"{ a = 1; }", start, true},
+      {"{ a = 1; x = " + repeated("(", 9999) + repeated(")", 9999) + "; }", start, false},
+      {"{ x = {a = 2;}; a = 1; b = " + repeated("{k=", 9999) + "v" + repeated(";}", 9999) + "; }",
+       Dictionary{{"a", "1"}, {"b", Dictionary{}}}, false},
+      {"(" + repeated("a,", 100) + ")", Array{}, false},
+      {xml("<key>x</key>" + arrays(9999) + "<key>b</key><array/>"), both, false},
+      {xml("<key>b</key><array>" + repeated("<true/>", 100) + "</array>"), both, false},
+      {binary(Dictionary{{"a", "1"}, {"b", Array(100, 1)}}), both, false},
+      {binary(Dictionary{{"a", "1"}, {std::string(1001, 'x'), 1}}), start, false},
+      {binary(Array(100, 1)), Array{}, false},
+      {binary(std::string(1001, 'x')), std::string(1001, 'x'), true}};
+  for (const auto& [bytes, tree, isWhole] : cases) {
+    const auto found = read(bytes);
+    ASSERT_TRUE(found) << bytes.substr(0, 80);
+    EXPECT_EQ(found->tree, tree) << bytes.substr(0, 80);
+    EXPECT_EQ(found->isWhole, isWhole) << bytes.substr(0, 80);
+  }
+  auto leaf = binary(Dictionary{{"a", "1"}, {"b", Array{7}}});
+  leaf.replace(leaf.find("\x10\x07"), 1, "\x0F");
+  const auto keys = repeated("<dict><key>k</key>", 600);
+  const std::string damaged[] = {leaf, "{ a = 1; x = " + repeated("(", 9999),
+                                 xml("<key>x</key>" + arrays(9999) + "<key>y</key>"),
+                                 xml("<key>x</key>" + keys + repeated("</dict>", 600)),
+                                 xml("<key>x</key>" + keys + "<true/><true/>" + repeated("</dict>", 600))};
+  for (const auto& bytes : damaged) EXPECT_FALSE(read(bytes)) << bytes.substr(0, 80);
+}
+
 TEST(ATreesText, MayBeNestedToTheLimitAndNoFurther) {
   const std::tuple<TreeReader, std::string, std::string, std::string, std::string, std::string> cases[] = {
       {readJSON, "", "[", "0", "]", ""},
@@ -243,8 +285,7 @@ TEST(ATreesText, IsRefusedWhereverItIsCut) {
        "<?xml version='1.0' encoding='UTF-8'?><plist version='1.0'><dict><key>k\u00e9</key><array>"
        "<integer>-12</integer><real>1e3</real><true/><date>2024-02-29T00:00:00Z</date><data>AQIDBA==</data>"
        "</array><key>s</key><string>&lt;\U0001F600&#13;</string></dict></plist>"},
-      {[](std::string_view bytes) { return readBinaryPropertyList(bytes, SIZE_MAX); },
-       *writePropertyList(tree, kBinary)}};
+      {readBinaryPropertyList, *writePropertyList(tree, kBinary)}};
   for (const auto& [read, sample] : samples) {
     ASSERT_TRUE(read(sample));
     for (std::size_t i = 0; i < sample.size(); ++i) EXPECT_FALSE(read(sample.substr(0, i))) << i;

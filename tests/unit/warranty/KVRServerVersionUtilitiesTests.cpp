@@ -96,11 +96,6 @@ TEST(TheVersionNegotiation, GoesOnAfterAnyFailedFetchAndAsksOnceMoreForAnAssetTh
   const std::string url = "https://assets.example/kvrV2.plist";
   const std::string from = " from URL '" + url + "'", failed = "Failed to fetch plist data";
   const Value client = pairOf(2, 3);
-  // Small, but nothing to keep or to log.
-  const auto unfolding = *writePropertyList(
-      Dictionary{
-          {"LowServerVersion", 3}, {"HighServerVersion", 3}, {"x", Array(1000, std::string(100, 'x'))}},
-      PropertyListEncoding::Binary);
   const std::tuple<Value, std::vector<std::string>, Value, std::string> cases[] = {
       {url, {"(1)", asset(pairOf(3, 3))}, pairOf(3, 3), "Incorrect format in response detected. retrying..."},
       {url,
@@ -108,7 +103,6 @@ TEST(TheVersionNegotiation, GoesOnAfterAnyFailedFetchAndAsksOnceMoreForAnAssetTh
        client,
        "Incorrect format in response detected" + from + ". Response: (2). Aborting without retry."},
       {url, {"<html>"}, client, "Error serializing plist file" + from},
-      {url, {unfolding}, client, "Error serializing plist file" + from},
       {url, {}, client, failed + from + " with error: Error Domain=http Code=7 \"refused\""},
       {"file:///nowhere", {}, client, failed + " from URL 'file:///nowhere'"},
       {7, {}, client, failed + " from URL '7'"}};
@@ -125,6 +119,41 @@ TEST(TheVersionNegotiation, GoesOnAfterAnyFailedFetchAndAsksOnceMoreForAnAssetTh
     for (std::size_t i = 0; i < sent.size(); ++i) EXPECT_EQ(sent[i].uncached, i > 0);
     EXPECT_LE(sent.size(), 2U);
     EXPECT_THAT(world.faults(), IsEmpty());
+  }
+}
+
+TEST(TheVersionNegotiation, HeedsTheVersionsOfAnAssetWhateverElseItHolds) {
+  const auto assetWith = [](Value low, const Value& more) {
+    return Dictionary{{"LowServerVersion", std::move(low)}, {"HighServerVersion", "9"}, {"more", more}};
+  };
+  const Array manyTexts(100, std::string(100'000, 'x'));
+  const auto binary = [](const Value& tree) {
+    return *writePropertyList(tree, PropertyListEncoding::Binary);
+  };
+  const std::string deep(1000, '('), end(1000, ')');
+  const Value large = assetWith("8", std::string(1'000'000, 'x'));
+  const Value shared = assetWith("8", Array(10, std::string(100'000, 'x')));
+  const std::tuple<std::string, Value, bool> cases[] = {
+      {asset(large), large, false},
+      {binary(shared), shared, false},
+      {binary(assetWith("8", manyTexts)), pairOf(8, 9), false},
+      {binary(assetWith("3", manyTexts)), pairOf(3, 9), true},
+      {binary(assetWith(manyTexts, 1)), pairOf(Array{}, 9), false},
+      {"{ LowServerVersion = 8; more = " + deep + end + "; HighServerVersion = 9; }", pairOf(8, 9), false}};
+  for (const auto& [body, cacheAfter, supported] : cases) {
+    SCOPED_TRACE(body.substr(0, 80));
+    ASSERT_LE(body.size(), std::size_t{1} << 20U);
+    for (const bool fromFile : {false, true}) {
+      Client client;
+      if (fromFile) client.preferences.setObject("file:///asset", preference::kServerVersionURL);
+      client.files.put("/asset", body);
+      client.http.respond(200, body);
+      EXPECT_EQ(client.supported(), supported);
+      EXPECT_TRUE(client.cache() == cacheAfter) << describe(client.cache()).substr(0, 200);
+      EXPECT_EQ(client.log.contains("holds more than can be kept: only its versions are"),
+                !cacheAfter.contains("more"));
+      EXPECT_THAT(client.faults(), IsEmpty());
+    }
   }
 }
 
