@@ -13,6 +13,9 @@
 
 namespace kvr {
 
+/// Whether the text is a token, which methods and header names are.
+bool isHTTPToken(std::string_view text);
+
 /// Header fields in the order in which they were first set; names compare without regard to case.
 class HTTPHeaders {
  public:
@@ -22,6 +25,10 @@ class HTTPHeaders {
   void set(std::string_view name, std::optional<std::string> value);
   std::optional<std::string> value(std::string_view name) const;
   const std::vector<Field>& fields() const { return fields_; }
+
+  /// Why no request can carry such a field, if so: no name of a header, a line break or NUL in the value, or
+  /// a field with which the transport says where the message ends.
+  static std::optional<std::string> objectionTo(std::string_view name, std::string_view value);
 
  private:
   std::vector<Field> fields_;
@@ -33,7 +40,7 @@ struct HTTPRequest {
   HTTPHeaders headers;
   std::string body;
   double timeout = 60;           ///< seconds for the exchange as a whole, from sending to the last byte
-  bool followsRedirects = true;  ///< up to 5, towards https only
+  bool followsRedirects = true;  ///< up to 5, towards https or from one loopback address to another
   /// The bundle on whose behalf the request is made; handed on to a network stack that accounts by bundle.
   std::string sourceApplicationBundleID;
 };
@@ -45,7 +52,9 @@ struct HTTPResponse {
 };
 
 /// Sends requests. TLS is required (TLS 1.2, certificate and host name verified) except towards a loopback
-/// address. A header with a line break or NUL, or a URL that is no web address, fails the request.
+/// address. A header that no request can carry (`HTTPHeaders::objectionTo`), or a URL that is no web address,
+/// fails the request. Of a request that may have been sent, in part even, a failure is final: nobody sends it
+/// again.
 class HTTPSession {
  public:
   using Reply = std::function<void(HTTPResponse)>;

@@ -18,6 +18,9 @@ constexpr std::size_t kMebibyte = std::size_t{1} << 20;
 constexpr int kConnections = 64;  // to a host
 constexpr int kCouldNotConnect = 7;
 constexpr int kTimedOut = 28;
+constexpr int kNoHandshake = 35;
+constexpr int kTooManyRedirects = 47;
+constexpr int kNoAnswer = 52;
 constexpr int kAborted = 42;
 constexpr int kTooLarge = 63;
 
@@ -214,7 +217,7 @@ TEST_F(OverHTTP, AResponseIsTakenOnlyWhole) {
       {"1 MiB in chunks", oneChunk + "0\r\n\r\n", 200, mebibyte, 0},
       {"a chunk more", oneChunk + "1\r\na\r\n0\r\n\r\n", 200, none, kTooLarge},
       {"broken chunk", chunked + "zz\r\n", 0, none, 56},
-      {"redirect to plain http", movedTo("http://127.0.0.1:1/"), 301, none, 1},
+      {"redirect to plain http elsewhere", movedTo("http://a.example/"), 301, none, 1},
       {"redirect to a file", movedTo("file:///etc/hosts"), 301, none, 1},
       {"redirect to https", movedTo("https://127.0.0.1:1/"), 0, none, kCouldNotConnect},
       {"another answer with a location",
@@ -227,6 +230,14 @@ TEST_F(OverHTTP, AResponseIsTakenOnlyWhole) {
     EXPECT_TRUE(got.body == body) << got.body.value_or("none").substr(0, 100);
     EXPECT_EQ(codeOf(got), code);
   }
+  const ScriptedServer target(echo);
+  const ScriptedServer source(sends(movedTo(target.url("/there"))));
+  EXPECT_THAT(exchange(get(source.url())).body, Optional(HasSubstr("GET /there HTTP/1.1")));
+  const ScriptedServer circle([&](Peer& peer) {
+    while (!peer.request().empty() && peer.write(movedTo("/"))) {
+    }
+  });
+  EXPECT_EQ(codeOf(exchange(get(circle.url()))), kTooManyRedirects);
   for (const bool isPost : {false, true}) {
     const ScriptedServer server(sends(movedTo("https://127.0.0.1:1/")));
     HTTPRequest unfollowed = isPost ? post(server.url(), "{}") : get(server.url());
@@ -294,24 +305,36 @@ TEST_F(OverHTTP, TwoHundredRequestsAtOnceShareSixtyFourConnectionsThatCloseAfter
   allClosed.wait();
 }
 
-TEST_F(OverHTTP, AServiceThatTurnsConnectionsAwayIsAskedOverFewer) {
-  constexpr int kTaken = 8;
+TEST_F(OverHTTP, WhatWasNotSentGoesAgainOnceAndWhatWasSentNever) {
   std::latch allCame(50);
   std::atomic<int> came{0};
-  const ScriptedServer server([&](Peer& peer) {
-    const int number = ++came;
-    if (number <= 50) allCame.arrive_and_wait();
-    if (number <= kTaken || number > 50) echo(peer);
+  const ScriptedServer busy([&](Peer&) {
+    if (++came <= 50) allCame.arrive_and_wait();
   });
   std::vector<std::future<HTTPResponse>> replies;
-  for (int i = 0; i < 50; ++i) replies.push_back(start(get(server.url())));
-  for (auto& reply : replies) EXPECT_EQ(reply.get().status, 200);
-  EXPECT_EQ(server.connections(), 50);
-  const ScriptedServer rude([](Peer& peer) { peer.request(); });
-  EXPECT_EQ(exchange(get(rude.url())).status, 0);
-  EXPECT_EQ(rude.connections(), 2);
-  EXPECT_EQ(exchange(post(rude.url(), "{}")).status, 0);
-  EXPECT_EQ(rude.connections(), 3);  // what was sent and may count is not sent again
+  for (int i = 0; i < 50; ++i) replies.push_back(start(get("https://" + busy.host())));
+  for (auto& reply : replies) EXPECT_EQ(codeOf(reply.get()), kNoHandshake);
+  EXPECT_EQ(busy.connections(), 100);
+
+  // Over a new connection, over one that was kept alive, and with another one kept alive beside it.
+  for (const int answered : {0, 1, 2}) {
+    for (const bool isPost : {false, true}) {
+      std::latch allAtOnce(answered);
+      std::atomic<int> requests{0};
+      const ScriptedServer server([&](Peer& peer) {
+        while (!peer.request().empty() && ++requests <= answered) {
+          allAtOnce.arrive_and_wait();
+          peer.write(response("200 OK", ""));
+        }
+      });
+      std::vector<std::future<HTTPResponse>> kept;
+      for (int i = 0; i < answered; ++i) kept.push_back(start(get(server.url())));
+      for (auto& reply : kept) EXPECT_EQ(reply.get().status, 200);
+      EXPECT_EQ(codeOf(exchange(isPost ? post(server.url(), "{}") : get(server.url()))), kNoAnswer);
+      EXPECT_EQ(requests, answered + 1) << isPost;
+      EXPECT_EQ(server.connections(), std::max(answered, 1));
+    }
+  }
 }
 
 TEST_F(OverHTTP, TheTimeSpentWaitingForAConnectionCounts) {

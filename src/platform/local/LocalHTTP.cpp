@@ -3,7 +3,6 @@
 #include "platform/local/LoadedLibrary.h"
 #include "platform/local/http/HTTPTransfers.h"
 
-#include <algorithm>
 #include <chrono>
 #include <condition_variable>
 #include <mutex>
@@ -21,18 +20,6 @@ constexpr int kBadArgument = 43;
 
 Error failure(int code, std::string message) { return {"http", code, std::move(message)}; }
 
-/// Whether the text is a token, which methods and header names are.
-bool isToken(std::string_view text) {
-  return !text.empty() && std::ranges::all_of(text, [](char c) {
-    return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') ||
-           std::string_view("!#$%&'*+-.^_`|~").find(c) != std::string_view::npos;
-  });
-}
-
-bool breaksLine(std::string_view text) {
-  return text.find_first_of(std::string_view("\r\n\0", 3)) != std::string_view::npos;
-}
-
 /// Why a request must not be sent, if so.
 std::optional<Error> faultOf(const HTTPRequest& request) {
   const auto url = URL::parse(request.url);
@@ -41,14 +28,11 @@ std::optional<Error> faultOf(const HTTPRequest& request) {
   if (url->scheme() == "http" && !url->isLoopback()) {
     return failure(kUnsupportedProtocol, "TLS is required except towards a loopback address");
   }
-  if (!isToken(request.method)) return failure(kBadArgument, "invalid method");
+  if (!isHTTPToken(request.method)) return failure(kBadArgument, "invalid method");
   for (const auto& [name, value] : request.headers.fields()) {
-    if (!isToken(name)) return failure(kBadArgument, "invalid header name");
-    if (breaksLine(value)) return failure(kBadArgument, "line break or NUL in the header " + name);
-  }
-  // The length of the message is the transport's to say: a second opinion would split it in two.
-  for (const auto* framing : {"Content-Length", "Transfer-Encoding"}) {
-    if (request.headers.value(framing)) return failure(kBadArgument, std::string(framing) + " cannot be set");
+    if (auto objection = HTTPHeaders::objectionTo(name, value)) {
+      return failure(kBadArgument, *std::move(objection));
+    }
   }
   return std::nullopt;
 }

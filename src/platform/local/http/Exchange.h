@@ -35,6 +35,7 @@ using Clock = std::chrono::steady_clock;
 inline constexpr std::size_t kMaximumBody = std::size_t{1} << 20;
 inline constexpr std::size_t kMaximumHeaders = std::size_t{256} << 10;
 inline constexpr int kMaximumRedirects = 5;
+inline constexpr char kBrokenConnection[] = "the connection broke when the request had been sent";
 
 inline Error failure(CURLcode code, std::string message) { return {"http", code, std::move(message)}; }
 
@@ -91,9 +92,9 @@ class Exchange {
   void prepare();
   /// Takes in how a hop went. True when there is to be another one; otherwise the exchange has been answered.
   bool goOn(CURLcode code);
-  /// Whether a hop that was turned away may be made again, which is so once: when the service has not had the
-  /// request, or it makes no difference how often it gets it.
-  bool takeSecondTry(CURLcode code);
+  /// Whether a hop that was turned away may be made again, which is so once, and only if nothing of the
+  /// request was sent.
+  bool takeSecondTry();
   void fail(CURLcode code, std::string message) {
     answer({0, std::nullopt, failure(code, std::move(message))});
   }
@@ -101,10 +102,9 @@ class Exchange {
  private:
   // What libcurl calls.
   static std::size_t takeBody(char* bytes, std::size_t one, std::size_t size, void* exchange) noexcept;
-  static std::size_t giveBody(char* bytes, std::size_t one, std::size_t size, void* exchange) noexcept;
-  static int refuseToSeek(void*, curl_off_t, int) noexcept { return CURL_SEEKFUNC_FAIL; }
   static std::size_t takeHeader(char* bytes, std::size_t one, std::size_t size, void* exchange) noexcept;
   static curl_socket_t openSocket(void* exchange, curlsocktype purpose, curl_sockaddr* address) noexcept;
+  static int beginRequest(void* exchange, char*, char*, int, int) noexcept;
 
   template <class T>
   void set(CURLoption option, T value) {
@@ -113,6 +113,10 @@ class Exchange {
     if (code != CURLE_OK) throw std::runtime_error(curl_easy_strerror(code));
   }
   void setSafety();
+  /// Whether any byte of the hop's request has been written to a connection.
+  bool isSent() const { return writtenBefore_ && bytesWritten() > *writtenBefore_; }
+  long bytesWritten() const;
+  bool mayGoTo(const URL& target) const;
   void setMessage();
   void setHeaders();
   void follow(long status, const char* location);
@@ -129,7 +133,7 @@ class Exchange {
   int redirects_ = 0;
   bool hadSecondTry_ = false;
   std::string body_;
-  std::size_t sent_ = 0;  ///< of the request's body
+  std::optional<long> writtenBefore_;  ///< bytes for a proxy, before the request; once it begins
   std::size_t headerBytes_ = 0;
   std::optional<Error> refusal_;  ///< why we broke the hop off
   bool isBodyTooLarge_ = false;
@@ -142,7 +146,7 @@ inline void Exchange::prepare() {
   curl_easy_reset(handle_.get());
   url_ = URL::parse(request_.url).value();
   body_.clear();
-  sent_ = 0;
+  writtenBefore_.reset();
   headerBytes_ = 0;
   errorText_.front() = '\0';
 
@@ -167,6 +171,8 @@ inline void Exchange::setSafety() {
   set(CURLOPT_SSL_VERIFYHOST, 2L);
   set(CURLOPT_OPENSOCKETFUNCTION, openSocket);
   set(CURLOPT_OPENSOCKETDATA, static_cast<void*>(this));
+  set(CURLOPT_PREREQFUNCTION, beginRequest);
+  set(CURLOPT_PREREQDATA, static_cast<void*>(this));
   if (url_.isLoopback()) set(CURLOPT_PROXY, "");
 }
 
@@ -180,11 +186,7 @@ inline void Exchange::setMessage() {
   } else if (method == "POST" || !request_.body.empty()) {
     set(CURLOPT_POST, 1L);
     set(CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(request_.body.size()));
-    // A body that cannot be wound back: on a connection that was kept alive and breaks, libcurl would send
-    // the request once more of its own accord, and the service may have had it already.
-    set(CURLOPT_READFUNCTION, giveBody);
-    set(CURLOPT_READDATA, static_cast<void*>(this));
-    set(CURLOPT_SEEKFUNCTION, refuseToSeek);
+    set(CURLOPT_POSTFIELDS, request_.body.data());
   }
   if (method != "HEAD" && method != "POST" && method != "GET") set(CURLOPT_CUSTOMREQUEST, method.c_str());
   if (method == "GET" && !request_.body.empty()) set(CURLOPT_CUSTOMREQUEST, "GET");
@@ -225,14 +227,6 @@ inline std::size_t Exchange::takeBody(char* bytes, std::size_t, std::size_t size
   }
 }
 
-inline std::size_t Exchange::giveBody(char* bytes, std::size_t one, std::size_t size,
-                                      void* exchange) noexcept {
-  auto& self = *static_cast<Exchange*>(exchange);
-  const std::size_t count = self.request_.body.copy(bytes, one * size, self.sent_);
-  self.sent_ += count;
-  return count;
-}
-
 inline std::size_t Exchange::takeHeader(char*, std::size_t, std::size_t size, void* exchange) noexcept {
   auto& self = *static_cast<Exchange*>(exchange);
   try {
@@ -246,9 +240,24 @@ inline std::size_t Exchange::takeHeader(char*, std::size_t, std::size_t size, vo
   }
 }
 
+inline long Exchange::bytesWritten() const {
+  long count = 0;
+  curl_easy_getinfo(handle_.get(), CURLINFO_REQUEST_SIZE, &count);
+  return count;
+}
+
+// On a connection that was kept alive and breaks before an answer, libcurl sends a request once more of its
+// own accord, over another connection. The service may have had it already, so it is stopped wherever it
+// takes one up; what was not sent at all may go on.
+
 inline curl_socket_t Exchange::openSocket(void* exchange, curlsocktype, curl_sockaddr* address) noexcept {
   auto& self = *static_cast<Exchange*>(exchange);
   try {
+    if (self.isSent()) {
+      self.refusal_ = failure(CURLE_GOT_NOTHING, kBrokenConnection);
+      return CURL_SOCKET_BAD;
+    }
+    self.writtenBefore_.reset();
     if (self.url_.scheme() == "http" && !isLoopback(address->addr)) {
       self.refusal_ = failure(CURLE_COULDNT_CONNECT, "a loopback name led to an address elsewhere");
       return CURL_SOCKET_BAD;
@@ -257,6 +266,26 @@ inline curl_socket_t Exchange::openSocket(void* exchange, curlsocktype, curl_soc
   } catch (...) {
     return CURL_SOCKET_BAD;
   }
+}
+
+inline int Exchange::beginRequest(void* exchange, char*, char*, int, int) noexcept {
+  auto& self = *static_cast<Exchange*>(exchange);
+  try {
+    if (self.isSent()) {
+      self.refusal_ = failure(CURLE_GOT_NOTHING, kBrokenConnection);
+      return CURL_PREREQFUNC_ABORT;
+    }
+    self.writtenBefore_ = self.bytesWritten();
+    return CURL_PREREQFUNC_OK;
+  } catch (...) {
+    return CURL_PREREQFUNC_ABORT;
+  }
+}
+
+/// Plain http is for loopback addresses, and nobody elsewhere says what is asked there.
+inline bool Exchange::mayGoTo(const URL& target) const {
+  return target.scheme() == "https" ||
+         (target.scheme() == "http" && target.isLoopback() && url_.isLoopback());
 }
 
 inline bool Exchange::goOn(CURLcode code) {
@@ -272,7 +301,7 @@ inline bool Exchange::goOn(CURLcode code) {
   curl_easy_getinfo(handle_.get(), CURLINFO_REDIRECT_URL, &location);
   if (request_.followsRedirects && isRedirect(status) && location != nullptr) {
     const auto target = URL::parse(location);
-    if (target && target->scheme() == "https" && redirects_ < kMaximumRedirects) {
+    if (target && mayGoTo(*target) && redirects_ < kMaximumRedirects) {
       follow(status, location);
       return true;
     }
@@ -286,10 +315,8 @@ inline bool Exchange::goOn(CURLcode code) {
   return false;
 }
 
-inline bool Exchange::takeSecondTry(CURLcode code) {
-  const bool isUnsent = code == CURLE_COULDNT_CONNECT || code == CURLE_SSL_CONNECT_ERROR;
-  const bool isHarmless = request_.method == "GET" && request_.body.empty();
-  return !refusal_ && (isUnsent || isHarmless) && !std::exchange(hadSecondTry_, true);
+inline bool Exchange::takeSecondTry() {
+  return !refusal_ && !isSent() && !std::exchange(hadSecondTry_, true);
 }
 
 inline void Exchange::follow(long status, const char* location) {

@@ -204,7 +204,7 @@ void CurlTransfers::collectFinished() {
 bool CurlTransfers::yields(Exchange& exchange, CURLcode code) {
   if (!mayBeTurnedAway(code) || !wereMany_) return false;
   curl_multi_setopt(multi_.get(), CURLMOPT_MAX_HOST_CONNECTIONS, kFewConnections);
-  return exchange.takeSecondTry(code);
+  return exchange.takeSecondTry();
 }
 
 void CurlTransfers::expire() {
