@@ -63,9 +63,36 @@ std::optional<std::string> renewedToken(Platform& platform, AccountStore& store,
   return renewal->token;
 }
 
-/// The stored override, else the storefront of the store account linked to `account`; sets the header.
+/// The value of a header that the request can do without, or nothing when it cannot be sent: it would fail
+/// the whole request.
+std::optional<std::string> sendable(Log& log, std::string_view name,
+                                    const std::optional<std::string>& value) {
+  const auto objection = value ? HTTPHeaders::objectionTo(name, *value) : std::nullopt;
+  if (!objection) return value;
+  log.error("header '%s' is left out, it cannot be sent: %s", name, *objection);
+  return std::nullopt;
+}
+
+void addSessionHeaders(Platform& platform, HTTPRequest& request) {
+  const auto add = [&](const std::string& name, const std::string& value) {
+    if (const auto sent = sendable(platform.log, name, value)) request.headers.set(name, sent);
+  };
+  HTTPRequest withSession = request;
+  platform.accountSession.addClientInfoHeader(withSession);
+  platform.accountSession.addDeviceIdentifierHeader(withSession);
+  for (const auto& [name, value] : withSession.headers.fields()) {
+    if (request.headers.value(name) != value) add(name, value);
+  }
+  for (const auto& [name, value] : platform.accountSession.authenticationHeadersFor(request)) {
+    add(name, value);
+  }
+}
+
+/// The stored override, of whatever kind it is by its description; else the storefront of the store account
+/// linked to `account`. Sets the header.
 void setStorefront(Platform& platform, HTTPRequest& request, const std::optional<CloudAccount>& account) {
-  std::optional<std::string> storefront = platform.preferences.stringForKey(preference::kStorefrontLocale);
+  const auto override = platform.preferences.objectForKey(preference::kStorefrontLocale);
+  auto storefront = override.isNull() ? std::nullopt : std::optional(describe(override));
   if (!storefront) {
     if (!account) {
       platform.log.error("Primary Nimbra Account is nil!");
@@ -73,7 +100,8 @@ void setStorefront(Platform& platform, HTTPRequest& request, const std::optional
       storefront = store->storefront;
     }
   }
-  request.headers.set(header::kStorefrontLocale, storefront);
+  request.headers.set(header::kStorefrontLocale,
+                      sendable(platform.log, header::kStorefrontLocale, storefront));
   platform.log.standard("storeLocale %@", storefront);
 }
 
@@ -107,11 +135,7 @@ bool kvr_signWithAccountHeaders(Platform& platform, HTTPRequest& request, bool f
     platform.log.standard("Failed to add Vornic headers, can't sign this request");
     return false;
   }
-  platform.accountSession.addClientInfoHeader(request);
-  platform.accountSession.addDeviceIdentifierHeader(request);
-  for (const auto& [name, value] : platform.accountSession.authenticationHeadersFor(request)) {
-    request.headers.set(name, value);
-  }
+  addSessionHeaders(platform, request);
   request.headers.set(header::kAltDSID, account->altDSID);
   request.headers.set(header::kUserAgent, _userAgent(platform));
   setStorefront(platform, request, account);

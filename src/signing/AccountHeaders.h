@@ -16,7 +16,8 @@ namespace kvr {
 void kvr_setCoverageRequestBodyWithSerialNumber(Platform& platform, HTTPRequest& request,
                                                 const std::optional<std::string>& serialNumber);
 
-/// Adds the account token and the account's headers. `force` renews the token even when one is held; a
+/// Adds the account token and the account's headers; a header of the account session that cannot be sent is
+/// left out, with an error line. `force` renews the token even when one is held; a
 /// renewal blocks the calling thread for up to 60 s, so never on the thread that delivers renewals. False
 /// when the request cannot be signed; nothing has been added then.
 bool kvr_signWithAccountHeaders(Platform& platform, HTTPRequest& request, bool force, bool avoidUI);

@@ -2,7 +2,8 @@
 
 namespace kvr::preference {
 
-/// Override of the store account's storefront: string. Never written by the agent.
+/// Override of the store account's storefront: string, or a value of any other kind by its description (an
+/// operator who stores 143441 as a number means that storefront). Never written by the agent.
 inline constexpr const char* kStorefrontLocale = "storefrontLocale";
 /// The user's text-size category in the UI toolkit's own domain: string. Written by the platform.
 inline constexpr const char* kWidgetryDomain = "com.tarsil.Widgetry";

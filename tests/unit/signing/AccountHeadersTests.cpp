@@ -48,6 +48,19 @@ TEST_F(ACoverageRequest, CarriesTheAccountsHeadersInTheirOrder) {
   EXPECT_THAT(world.log.texts(), ElementsAre("storeLocale 143441"));
 }
 
+TEST_F(ACoverageRequest, LeavesOutHeadersThatCannotBeSentAndNoOthers) {
+  world.accountSession.clientInfo = {{"X-Client", "a\r\nX-Forged: b"}, {"X Device", "id"}, {"X-Good", "1"}};
+  world.accountSession.deviceIdentifier = {{"content-length", "7"}, {"X-Vornic", "2"}};
+  world.accountSession.authentication = {{"X-Auth", std::string("a\0b", 3)}, {"X-Tarsil-Vornic-Token", "\n"}};
+  world.preferences.setObject(Array{"a\nb"}, "storefrontLocale");
+  EXPECT_TRUE(sign(false));
+  EXPECT_THAT(request.headers.fields(),
+              ElementsAre(Pair("X-Tarsil-Vornic-Token", "token"), Pair("X-Good", "1"), Pair("X-Vornic", "2"),
+                          Pair("altDSID", "alt-dsid"), Pair("User-Agent", ::testing::_)));
+  EXPECT_EQ(world.log.texts(LogLevel::Error).size(), 6U);
+  EXPECT_TRUE(world.log.contains("header 'content-length' is left out, it cannot be sent: "));
+}
+
 TEST_F(ACoverageRequest, LeavesOutWhatThePlatformDoesNotKnow) {
   world.deviceProperties.answers.clear();
   world.accounts.primary = CloudAccount{};
@@ -60,6 +73,9 @@ TEST_F(ACoverageRequest, LeavesOutWhatThePlatformDoesNotKnow) {
   world.accounts.store = StoreAccount{1, "account"};
   EXPECT_TRUE(sign(false));
   EXPECT_EQ(request.headers.value("storefrontLocale"), "override");
+  world.preferences.setObject(143465, "storefrontLocale");
+  EXPECT_TRUE(sign(false));
+  EXPECT_EQ(request.headers.value("storefrontLocale"), "143465");
 }
 
 TEST_F(ACoverageRequest, RenewsTheTokenWhenThereIsNoneOrWhenForced) {
