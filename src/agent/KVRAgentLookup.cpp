@@ -14,19 +14,19 @@ bool KVRAgent::isCacheValid(KVRAgentWarrantyProvider& provider, const std::strin
                             const KVRWarrantyRef& cached) {
   auto& log = platform_.log;
   CacheFacts facts;
-  std::optional<std::string> version;
-  std::optional<std::string> cachedLocale;
+  Value version;
+  Value cachedLocale;
   std::string locale;
   facts.present = cached != nullptr;
   if (facts.present) {
     log.standard("Has cached warranty : %@", serialNumber);
     version = provider.cachedWarrantyVersionForSerialNumber(serialNumber);
-    facts.versionMatches = version == kCacheFormatVersion;
+    facts.versionMatches = version == Value(kCacheFormatVersion);
   }
   if (facts.versionMatches) {
     cachedLocale = provider.cachedWarrantyLocaleForSerialNumber(serialNumber);
     locale = platform_.locale.preferredIdentifier();
-    facts.localeMatches = cachedLocale == locale;
+    facts.localeMatches = cachedLocale == Value(locale);
   }
   if (facts.localeMatches) facts.signedIn = provider.isSignedInToNimbra();
 

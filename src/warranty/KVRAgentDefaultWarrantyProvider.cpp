@@ -53,14 +53,12 @@ std::optional<Date> KVRAgentDefaultWarrantyProvider::lastUpdatedDateForSerialNum
   return platform_.preferences.dateForKey(CacheMetadata(serialNumber).lastUpdatedDateKey);
 }
 
-std::optional<std::string> KVRAgentDefaultWarrantyProvider::cachedWarrantyVersionForSerialNumber(
-    const std::string& serialNumber) {
-  return platform_.preferences.stringForKey(CacheMetadata(serialNumber).versionKey);
+Value KVRAgentDefaultWarrantyProvider::cachedWarrantyVersionForSerialNumber(const std::string& serialNumber) {
+  return platform_.preferences.objectForKey(CacheMetadata(serialNumber).versionKey);
 }
 
-std::optional<std::string> KVRAgentDefaultWarrantyProvider::cachedWarrantyLocaleForSerialNumber(
-    const std::string& serialNumber) {
-  return platform_.preferences.stringForKey(CacheMetadata(serialNumber).localeKey);
+Value KVRAgentDefaultWarrantyProvider::cachedWarrantyLocaleForSerialNumber(const std::string& serialNumber) {
+  return platform_.preferences.objectForKey(CacheMetadata(serialNumber).localeKey);
 }
 
 KVRWarrantyRef KVRAgentDefaultWarrantyProvider::migrateLegacyCachedWarrantyIfNeededForSerialNumber(

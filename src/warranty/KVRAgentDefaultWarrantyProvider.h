@@ -17,8 +17,8 @@ class KVRAgentDefaultWarrantyProvider : public KVRAgentWarrantyProvider {
                                        DownloadCompletion completionHandler) override;
   KVRWarrantyRef cachedWarrantyForSerialNumber(const std::string& serialNumber) override;
   std::optional<Date> lastUpdatedDateForSerialNumber(const std::string& serialNumber) override;
-  std::optional<std::string> cachedWarrantyVersionForSerialNumber(const std::string& serialNumber) override;
-  std::optional<std::string> cachedWarrantyLocaleForSerialNumber(const std::string& serialNumber) override;
+  Value cachedWarrantyVersionForSerialNumber(const std::string& serialNumber) override;
+  Value cachedWarrantyLocaleForSerialNumber(const std::string& serialNumber) override;
   KVRWarrantyRef migrateLegacyCachedWarrantyIfNeededForSerialNumber(const std::string& serialNumber) override;
   void migrateLegacyFollowUpIfNeededWithDeviceInfo(const KVRDeviceInfoRef& deviceInfo) override;
   double cachedWarrantyValidityDuration() override;

@@ -29,11 +29,10 @@ class KVRAgentWarrantyProvider {
   virtual KVRWarrantyRef cachedWarrantyForSerialNumber(const std::string& serialNumber) = 0;
   /// When the cached warranty was downloaded.
   virtual std::optional<Date> lastUpdatedDateForSerialNumber(const std::string& serialNumber) = 0;
-  /// The format of the cached warranty.
-  virtual std::optional<std::string> cachedWarrantyVersionForSerialNumber(
-      const std::string& serialNumber) = 0;
-  /// The locale that the cached warranty was fetched for.
-  virtual std::optional<std::string> cachedWarrantyLocaleForSerialNumber(const std::string& serialNumber) = 0;
+  /// The format of the cached warranty: a string unless somebody else has stored what is none.
+  virtual Value cachedWarrantyVersionForSerialNumber(const std::string& serialNumber) = 0;
+  /// The locale that the cached warranty was fetched for; likewise.
+  virtual Value cachedWarrantyLocaleForSerialNumber(const std::string& serialNumber) = 0;
   virtual KVRWarrantyRef migrateLegacyCachedWarrantyIfNeededForSerialNumber(
       const std::string& serialNumber) = 0;
   virtual void migrateLegacyFollowUpIfNeededWithDeviceInfo(const KVRDeviceInfoRef& deviceInfo) = 0;

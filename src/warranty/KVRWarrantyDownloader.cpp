@@ -12,38 +12,95 @@
 #include "warranty/KVRServerVersionUtilities.h"
 #include "warranty/WarrantyKeys.h"
 
+#include <cerrno>
+#include <cmath>
+
 namespace kvr {
 namespace {
 
 constexpr std::int32_t kRetries = 2;
 constexpr double kAttemptTimeout = 30;  // seconds
-constexpr std::size_t kLargestFile = 1U << 20U;
+constexpr std::size_t kLargestFile = std::size_t{64} << 20U;
+constexpr std::size_t kLongestFileName = 255;
 
-/// The conversion date that was scheduled and could not be stored, if the last one could not: the downloads
-/// of its own outreach would schedule it again, back to back for as long as the disk is full. Guarded by the
-/// turn.
+/// The conversion date that was scheduled and could not be stored, if the last one could not. It counts as
+/// stored, or the downloads of its own outreach would schedule it again, back to back for as long as the disk
+/// is full. Guarded by the turn.
 struct UnstoredDate {
   std::optional<Date> date;
 };
 
-/// "w.plist" for serial number ABC is "w.ABC.plist"; nothing for a serial number that is no file name.
-std::optional<std::string> variantPath(const std::string& path,
-                                       const std::optional<std::string>& serialNumber) {
-  if (!serialNumber || serialNumber->find('/') != std::string::npos ||
-      serialNumber->find('\0') != std::string::npos) {
-    return std::nullopt;
+std::shared_ptr<UnstoredDate> unstoredDate(Platform& platform) {
+  return platform.sharedObjects.get<UnstoredDate>([] { return new UnstoredDate; });
+}
+
+std::shared_ptr<KVRScheduler> newConversionScheduler(Platform& platform) {
+  return KVRScheduler::newSchedulerWithActivityDelegate(
+      platform, std::make_shared<KVRConversionOutreachActivity>(platform));
+}
+
+/// Whether the date was stored, whose fractions the file may round.
+bool isStored(const std::optional<Date>& stored, Date date) {
+  constexpr double kRounding = 0.001;  // seconds
+  return stored && std::abs(*stored - date) <= kRounding;
+}
+
+/// Stores for when the conversion outreach has been scheduled, or remembers that it could not.
+void storeScheduledDate(Platform& platform, Date date) {
+  constexpr auto kKey = preference::kConversionOutreachScheduledDate;
+  platform.preferences.setObject(date, kKey);
+  const bool isDone = isStored(platform.preferences.dateForKey(kKey), date);
+  unstoredDate(platform)->date = isDone ? std::nullopt : std::optional(date);
+}
+
+/// Tries again to store a date that could not be stored. What was scheduled with it is lost with the process
+/// as well, so that is scheduled once more; but not before the disk takes its target date.
+void makeUpForUnstoredDate(Platform& platform) {
+  const auto date = unstoredDate(platform)->date;
+  if (!date) return;
+  const auto stored = platform.preferences.dateForKey(preference::kConversionOutreachScheduledDate);
+  if (stored && *stored <= *date) {
+    unstoredDate(platform)->date.reset();
+    return;
   }
+  const auto scheduler = newConversionScheduler(platform);
+  if (!isStored(scheduler->scheduledActivityDate(), *date)) {
+    platform.preferences.setObject(*date, scheduler->identifier() + preference::kTargetDateSuffix);
+    if (!isStored(scheduler->scheduledActivityDate(), *date)) {
+      platform.log.standard("conversion outreach %@ is scheduled, which still cannot be stored", *date);
+      return;
+    }
+    scheduler->scheduleActivityForDate(date);
+  }
+  storeScheduledDate(platform, *date);
+}
+
+/// "w.plist" for serial number ABC is "w.ABC.plist", and "w" is "w.ABC.": the old extension stands last, even
+/// an empty one. Nothing for a serial number that cannot be a part of a file name.
+std::optional<std::string> variantPath(const std::string& path, const std::string& serialNumber) {
   const auto nameStart = path.rfind('/') + 1;
   const auto dot = path.rfind('.');
   const bool hasExtension = dot != std::string::npos && dot > nameStart && dot + 1 < path.size();
-  if (!hasExtension) return path + "." + *serialNumber;
-  return path.substr(0, dot) + "." + *serialNumber + path.substr(dot);
+  const auto stem = path.substr(0, hasExtension ? dot : path.size());
+  const auto name = stem.substr(nameStart) + "." + serialNumber + (hasExtension ? path.substr(dot) : ".");
+  if (name.size() > kLongestFileName || name.find_first_of(std::string_view("/\0", 2)) != std::string::npos) {
+    return std::nullopt;
+  }
+  return path.substr(0, nameStart) + name;
 }
 
-std::optional<std::string> contentOf(Platform& platform, const std::string& path) {
+/// A file's content, nothing when there is none. What is there and cannot be read is reported: it counts as
+/// no content, but for a file that is too large, whose place nothing else may take.
+Result<std::optional<std::string>> contentOf(Platform& platform, const std::string& path) {
   auto contents = platform.files.read(path, kLargestFile);
-  if (!contents || !*contents || (*contents)->bytes.empty()) return std::nullopt;
-  return (*contents)->bytes;
+  if (!contents) {
+    platform.log.error("URL '%@' cannot be read: %@", URL::fileURL(path), contents.error());
+    if (contents.error().code == EFBIG) return contents.error();
+    return std::optional<std::string>();
+  }
+  auto file = *std::move(contents);
+  if (!file || file->bytes.empty()) return std::optional<std::string>();
+  return std::optional(std::move(file->bytes));
 }
 
 }  // namespace
@@ -143,7 +200,7 @@ void KVRWarrantyDownloader::handleResponse(const HTTPResponse& response, const U
   const bool isParsed = response.body && parsed;
   platform_.log.standard("load warranty status: %ld : %@", response.status,
                          isParsed ? describe(*parsed) : describe(response.error));
-  if (response.body && !parsed) {
+  if (response.status == 200 && response.body && !parsed) {
     platform_.log.error("The coverage service's answer is no JSON: %@", parsed.error());
   }
   if (response.status == 401 && retries >= 1) {
@@ -185,13 +242,18 @@ void KVRWarrantyDownloader::store(const KVRWarranty& warranty,
 Value KVRWarrantyDownloader::dictionaryFromURL(const URL& url,
                                                const std::optional<std::string>& forSerialNumber) const {
   std::optional<std::string> content;
-  if (const auto variant = variantPath(url.filePath(), forSerialNumber)) {
-    content = contentOf(platform_, *variant);
+  const auto variant = forSerialNumber ? variantPath(url.filePath(), *forSerialNumber) : std::nullopt;
+  if (variant) {
+    auto own = contentOf(platform_, *variant);
+    if (!own) return {};
+    content = *std::move(own);
     if (content) platform_.log.standard("loading warranty from: %@", URL::fileURL(*variant));
+  } else if (forSerialNumber) {
+    platform_.log.standard("the serial number cannot be a part of a file name: URL '%@' has no variant", url);
   }
   if (!content) {
     platform_.log.standard("loading warranty from: %@", url);
-    content = contentOf(platform_, url.filePath());
+    if (auto common = contentOf(platform_, url.filePath())) content = *std::move(common);
   }
   if (!content) {
     platform_.log.error("URL '%@' contains no plist data", url);
@@ -206,30 +268,26 @@ Value KVRWarrantyDownloader::dictionaryFromURL(const URL& url,
 void KVRWarrantyDownloader::_scheduleConversionOutreachIfRequiredForWarranty(
     const KVRWarrantyRef& warranty, const KVRWarrantyRef& andCachedWarranty) {
   if (!warranty) return;
+  // Downloads of several devices come here at once; of two dates, the earlier one has to stay.
+  const auto turn = KVRScheduler::takeTurn(platform_);
+  makeUpForUnstoredDate(platform_);
   const auto date = warranty->zubOfferConversionDate();
   if (andCachedWarranty) {
     const auto cachedDate = andCachedWarranty->zubOfferConversionDate();
     if (!cachedDate || !date || *cachedDate == *date) return;
   }
   if (!date) return;
-  // Downloads of several devices come here at once; of two dates, the earlier one has to stay.
-  const auto turn = KVRScheduler::takeTurn(platform_);
-  const auto unstored = platform_.sharedObjects.get<UnstoredDate>([] { return new UnstoredDate; });
   auto scheduled = platform_.preferences.dateForKey(preference::kConversionOutreachScheduledDate);
-  if (unstored->date && (!scheduled || *unstored->date < *scheduled)) scheduled = unstored->date;
+  const auto unstored = unstoredDate(platform_)->date;
+  if (unstored && (!scheduled || *unstored < *scheduled)) scheduled = unstored;
   if (scheduled && *date >= *scheduled) return;
   if (scheduled) {
     platform_.log.standard("Re-scheduling conversion outreach %@", *date);
   } else {
     platform_.log.standard("scheduling conversion outreach %@", *date);
   }
-  KVRScheduler::newSchedulerWithActivityDelegate(platform_,
-                                                 std::make_shared<KVRConversionOutreachActivity>(platform_))
-      ->scheduleActivityForDate(date);
-  platform_.preferences.setObject(*date, preference::kConversionOutreachScheduledDate);
-  const bool isStored =
-      platform_.preferences.dateForKey(preference::kConversionOutreachScheduledDate) == date;
-  unstored->date = isStored ? std::nullopt : date;
+  newConversionScheduler(platform_)->scheduleActivityForDate(date);
+  storeScheduledDate(platform_, *date);
 }
 
 }  // namespace kvr

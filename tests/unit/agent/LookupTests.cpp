@@ -1,11 +1,12 @@
 #include "agent/KVRAgent.h"
 #include "unit/SimulatedTest.h"
+#include "warranty/CacheMetadata.h"
 #include "warranty/KVRAgentDefaultWarrantyProvider.h"
 
 namespace kvr {
 namespace {
 
-/// A warranty provider whose facts are plain fields.
+/// A warranty provider whose facts, but for the version and the locale, are plain fields.
 struct FakeWarrantyProvider : KVRAgentDefaultWarrantyProvider {
   using KVRAgentDefaultWarrantyProvider::KVRAgentDefaultWarrantyProvider;
 
@@ -17,12 +18,6 @@ struct FakeWarrantyProvider : KVRAgentDefaultWarrantyProvider {
   std::optional<Date> lastUpdatedDateForSerialNumber(const std::string&) override {
     return facts.lastUpdated;
   }
-  std::optional<std::string> cachedWarrantyVersionForSerialNumber(const std::string&) override {
-    return facts.version;
-  }
-  std::optional<std::string> cachedWarrantyLocaleForSerialNumber(const std::string&) override {
-    return facts.locale;
-  }
   double cachedWarrantyValidityDuration() override { return 86400; }
   bool isSignedInToNimbra() override { return facts.signedIn; }
 
@@ -30,8 +25,8 @@ struct FakeWarrantyProvider : KVRAgentDefaultWarrantyProvider {
     KVRWarrantyRef cached;
     KVRWarrantyRef downloaded;
     std::optional<Date> lastUpdated;
-    std::optional<std::string> version = "2";
-    std::optional<std::string> locale = "en_US";
+    Value version = "2";
+    Value locale = "en_US";
     bool signedIn = true;
     std::size_t downloads = 0;
   } facts;
@@ -43,6 +38,9 @@ struct ALookup : SimulatedTest {
     return KVRWarranty::initWithDictionary(world.platform, Dictionary{{"quorURL", mark}});
   }
   KVRWarrantyRef lookUp(std::uint64_t policy, const std::optional<std::string>& serialNumber = "SN") {
+    const CacheMetadata stored(serialNumber.value_or(""));
+    world.preferences.setObject(facts.version, stored.versionKey);
+    world.preferences.setObject(facts.locale, stored.localeKey);
     std::optional<KVRWarrantyRef> answer;
     agent->getWarrantyUsingPolicy(
         policy, serialNumber,
@@ -105,11 +103,16 @@ TEST_F(ALookup, SaysWhyItTrustsTheCacheOrNot) {
   const std::string invalid = "Default policy query: cached warranty is invalid, refresh it";
   const auto now = world.clock.now();
   expect(1, [&] { facts.cached = nullptr; }, false, {"no cached warranty : SN"});
-  expect(0, [&] { facts.version.reset(); }, true,
+  expect(0, [&] { facts.version = Value(); }, true,
          {has, "cached warranty is of outdated version '(null)', current version is '2', consider it invalid",
           invalid});
-  expect(2, [&] { facts.locale.reset(); }, true,
+  expect(0, [&] { facts.version = 2; }, true,
+         {has, "cached warranty is of outdated version '2', current version is '2', consider it invalid",
+          invalid});
+  expect(2, [&] { facts.locale = Value(); }, true,
          {has, "cached warranty is for locale '(null)', system is now in 'en_US', consider it invalid"});
+  expect(2, [&] { facts.locale = Array{"en_US"}; }, true,
+         {has, "cached warranty is for locale '(en_US)', system is now in 'en_US', consider it invalid"});
   expect(0, [&] { facts.signedIn = false; }, true,
          {has, "user is signed out of Nimbra, cached warranty not allowed", invalid});
   expect(0, [&] { facts.lastUpdated = now - 3600; }, false,

@@ -1,4 +1,5 @@
 #include "platform/JSON.h"
+#include "scheduling/SchedulingKeys.h"
 #include "unit/CoverageWorld.h"
 #include "warranty/CacheMetadata.h"
 #include "warranty/KVRWarrantyDownloader.h"
@@ -21,6 +22,15 @@ struct ADownload : CoverageTest {
     world.queues.runUntil([&] { return !answers.empty(); });
     EXPECT_EQ(answers.size(), 1U);
     return answers.at(0);
+  }
+  /// Has the service answer this conversion date.
+  void converts(const std::string& epoch) {
+    world.coverage = [epoch](auto&) {
+      return HTTPResponse{200, "{\"zubOfferConversionDate\":" + epoch + "}", {}};
+    };
+  }
+  std::optional<Date> scheduledDate() {
+    return world.preferences.dateForKey(preference::kConversionOutreachScheduledDate);
   }
   std::string cachedFile(const std::string& serialNumber) const {
     return "/home/user/Library/Application Support/com.tarsil.Kavrel/" + sha256Hash(serialNumber) +
@@ -86,6 +96,16 @@ TEST_F(ADownload, TriesAgainAfter401OnlyAndRenewsTheTokenThen) {
   }
 }
 
+TEST_F(ADownload, ComplainsAboutWhatIsNoJSONOnlyInASuccessfulAnswer) {
+  for (const int status : {200, 401, 503}) {
+    world.log.clear();
+    world.coverage = [status](auto&) { return HTTPResponse{status, "<html>", {}}; };
+    EXPECT_FALSE(download("WATCH").success);
+    EXPECT_EQ(world.log.contains("The coverage service's answer is no JSON: "), status == 200) << status;
+    EXPECT_EQ(world.log.texts(LogLevel::Error).size(), status == 200 ? 2U : 1U);
+  }
+}
+
 TEST_F(ADownload, LeavesTheCacheAloneWhenItFails) {
   ASSERT_TRUE(download("WATCH").success);
   const auto fileBefore = world.files.get(cachedFile("WATCH"));
@@ -124,6 +144,11 @@ TEST_F(ADownload, LeavesTheCacheAloneWhenItFails) {
 }
 
 TEST_F(ADownload, AnswersWhatTheCacheCannotHoldAndLeavesTheOldFile) {
+  world.coverage = [](auto&) { return HTTPResponse{200, R"({"x":null})", {}}; };
+  EXPECT_TRUE(download("WATCH").success);
+  const auto found = world.files.stamp("/home/user/Library/Application Support/com.tarsil.Kavrel");
+  EXPECT_TRUE(!found && found.error().code == EISDIR) << "the cache's directory is made first";
+  world.reset();
   ASSERT_TRUE(download("WATCH").success);
   const auto fileBefore = world.files.get(cachedFile("WATCH"));
   const auto dateKey = CacheMetadata("WATCH").lastUpdatedDateKey;
@@ -138,10 +163,52 @@ TEST_F(ADownload, AnswersWhatTheCacheCannotHoldAndLeavesTheOldFile) {
 }
 
 TEST_F(ADownload, SchedulesAConversionOutreachOnceThoughNothingCanBeStored) {
-  world.coverage = [](auto&) { return HTTPResponse{200, R"({"zubOfferConversionDate":1700000000})", {}}; };
+  converts("1700000000");
   world.files.setWriteFault(Error{"files", ENOSPC, "no space"});
   for (int round = 0; round < 3; ++round) EXPECT_TRUE(download("WATCH").success);
   EXPECT_EQ(world.log.count("scheduling conversion outreach 2023-11-14 22:13:20 +0000"), 1U);
+  EXPECT_TRUE(world.log.contains("is scheduled, which still cannot be stored"));
+}
+
+TEST_F(ADownload, StoresAConversionDateThatCouldNotBeStoredBefore) {
+  // Where nothing could be stored, and where the cached answer holds the date already.
+  for (const bool isCached : {false, true}) {
+    const Date date{1'900'000'000.0 - isCached};
+    converts(std::to_string(1'900'000'000 - isCached));
+    const Error full{"files", ENOSPC, "no space"};
+    const std::string preferences = "/home/user/Library/Preferences/com.tarsil.kvragent.plist";
+    const auto device = isCached ? "WATCH" : CoverageWorld::kLocal;
+    if (isCached) {
+      world.files.setWriteFault(preferences, full);
+    } else {
+      world.files.setWriteFault(full);
+    }
+    EXPECT_TRUE(download(device).success);
+    EXPECT_NE(scheduledDate(), date);
+    EXPECT_EQ(world.files.get(cachedFile(device)).has_value(), isCached);
+    world.files.setWriteFault(std::nullopt);
+    world.files.setWriteFault(preferences, std::nullopt);
+    EXPECT_TRUE(download(device).success);
+    // What a killed agent finds, with that by which the run is taken up again.
+    const auto registered =
+        world.files.getPropertyList("/home/user/Library/Activities/com.tarsil.kvragent.plist");
+    EXPECT_TRUE(registered["activities"].contains(activity::kConversionOutreach));
+    const auto stored = world.files.getPropertyList(preferences);
+    EXPECT_EQ(stored[preference::kConversionOutreachScheduledDate], Value(date));
+    EXPECT_EQ(stored[std::string(activity::kConversionOutreach) + preference::kTargetDateSuffix],
+              Value(date));
+  }
+}
+
+TEST_F(ADownload, TakesANegativeConversionDateForOneInTheFarFuture) {
+  converts("-1");
+  EXPECT_TRUE(download("WATCH").success);
+  EXPECT_EQ(scheduledDate(), Date{18'446'744'073'709'551.0});
+  world.queues.advance(30 * kDay);
+  EXPECT_FALSE(world.log.contains("for conversion outreach"));
+  converts("1900000000");
+  EXPECT_TRUE(download("WATCH").success);
+  EXPECT_EQ(scheduledDate(), Date{1'900'000'000});
 }
 
 TEST_F(ADownload, ReadsALocalFileOrItsVariantForTheDeviceInTheServicesPlace) {
@@ -159,10 +226,31 @@ TEST_F(ADownload, ReadsALocalFileOrItsVariantForTheDeviceInTheServicesPlace) {
   world.files.put("/data/w x.WATCH.plist", "{ half");
   EXPECT_FALSE(download("WATCH").success);
   EXPECT_TRUE(world.log.contains("Error serializing plist file from URL 'file:///data/w%20x.plist': "));
-  world.files.put("/secret.plist", "{ covered = YES; }");
+  for (const std::size_t size : {std::size_t{64} << 20U, (std::size_t{64} << 20U) + 1}) {
+    std::string variant = "{ quorURL = v; } //";
+    variant.resize(size, ' ');
+    world.files.put("/data/w x.WATCH.plist", variant);
+    world.log.clear();
+    EXPECT_EQ(download("WATCH").success, size == std::size_t{64} << 20U);
+    EXPECT_FALSE(world.log.contains("loading warranty from: file:///data/w%20x.plist"));
+  }
+  EXPECT_TRUE(world.log.contains("URL 'file:///data/w%20x.WATCH.plist' cannot be read: "));
+  world.files.setReadFault("/data/w x.WATCH.plist", Error{"files", EACCES, "denied"});
+  EXPECT_TRUE(download("WATCH").warranty->covered());
+  EXPECT_TRUE(world.log.contains("URL 'file:///data/w%20x.WATCH.plist' cannot be read: "));
+
+  world.files.put("/secret.plist", "{ quorURL = secret; }");
+  for (const auto& noName :
+       {std::string("/../../../secret"), std::string("A\0B", 3), std::string(256, 'x')}) {
+    EXPECT_TRUE(download(noName).warranty->covered()) << "no way out of the directory";
+    EXPECT_TRUE(world.log.contains("the serial number cannot be a part of a file name"));
+  }
   world.files.erase("/data/w x.plist");
-  EXPECT_FALSE(download("/../../../secret").success) << "no way out of the directory";
+  EXPECT_FALSE(download(std::nullopt).success);
   EXPECT_TRUE(world.log.contains("URL 'file:///data/w%20x.plist' contains no plist data"));
+  world.preferences.setObject("file:///data/plain", preference::kWearablesWarrantyURL);
+  world.files.put("/data/plain.WATCH.", "{ quorURL = plain; }");
+  EXPECT_EQ(download("WATCH").warranty->quorURL(), Value("plain"));
   for (const auto& sent : world.http.requests()) EXPECT_THAT(sent.request.url, HasSubstr("assets.example"));
 }
 
