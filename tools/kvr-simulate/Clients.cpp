@@ -9,6 +9,7 @@
 namespace kvr::simulate {
 namespace {
 
+constexpr const char* kDismiss = "DismissFollowUpForSerialNumber";
 constexpr double kLimit = 3 * 3600;  ///< seconds for an answer, the longest delay included
 
 const std::vector<std::string> kMembers{"ScheduleOutreach",
@@ -24,8 +25,8 @@ const std::vector<std::string> kMembers{"ScheduleOutreach",
                                         "GetDeviceInfoForSerialNumber",
                                         "GetAllDeviceInfosUsingPolicy",
                                         "GetAllDeviceInfosUsingPolicy",
-                                        "DismissFollowUpForSerialNumber",
-                                        "DismissFollowUpForSerialNumber"};
+                                        kDismiss,
+                                        kDismiss};
 
 std::uint64_t policyIn(const Value& value) { return static_cast<std::uint64_t>(value.asInteger()); }
 
@@ -47,7 +48,7 @@ Value::Array Clients::argumentsFor(const std::string& member, Dice& dice) const 
   if (member == "GetDefaultDeviceInfoUsingPolicy") return {policy};
   if (member == "GetDeviceInfoForSerialNumber") return {serialNumber, policy};
   if (member == "GetAllDeviceInfosUsingPolicy") return {policy, dice.happens(0.5)};
-  if (member == "DismissFollowUpForSerialNumber") return {serialNumber};
+  if (member == kDismiss) return {serialNumber};
   return {};
 }
 
@@ -135,6 +136,14 @@ void Clients::checkInfo(const OpenCall& call, const Value& info, const std::stri
   if (policy == LookupPolicy::kRefresh && offer->lastServed < call.made) {
     invariants_.report("answers are right", "a refresh answered what was known before");
   }
+}
+
+std::set<std::string> Clients::serialNumbersToDismiss() const {
+  std::set<std::string> serialNumbers;
+  for (const auto& call : open_) {
+    if (call.member == kDismiss) serialNumbers.insert(call.arguments[0].string());
+  }
+  return serialNumbers;
 }
 
 void Clients::excuse(double seconds) {

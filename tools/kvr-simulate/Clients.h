@@ -4,6 +4,7 @@
 #include "platform/simulated/SimulatedServiceListeners.h"
 
 #include <memory>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -20,6 +21,8 @@ class Clients {
                                                                  const std::string& member,
                                                                  Value::Array arguments);
   void checkAnswers();
+  /// Whose follow-ups somebody has asked to dismiss and not been answered.
+  std::set<std::string> serialNumbersToDismiss() const;
   /// Whether nobody waits for an answer.
   bool areServed() const { return open_.empty(); }
   /// Nobody was served for so long, and nobody could have been.

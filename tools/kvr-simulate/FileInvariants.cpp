@@ -202,7 +202,10 @@ void Invariants::checkNewPost(const Offer& offer, const std::string& name, Date 
 }
 
 void Invariants::posted(const FollowUpItem& item, bool wasPending, bool isDone) {
-  if (!isWatching() || !isDone) return;
+  if (!isWatching()) return;
+  // One that could not be updated is not tried again before its next refresh.
+  if (!isDone) refreshed_.erase(*item.uniqueIdentifier);
+  if (!isDone) return;
   ++figures.posts;
   if (runs_.contains(activity::kFollowUpRefresh)) {
     refreshed_[*item.uniqueIdentifier] = world_.now;
@@ -210,6 +213,19 @@ void Invariants::posted(const FollowUpItem& item, bool wasPending, bool isDone) 
     refreshed_.erase(*item.uniqueIdentifier);
   }
   if (!wasPending) toBeListed_.insert(sha256Hash(item.userInfo.at(kFollowUpSerialNumberKey).string()));
+}
+
+/// The end fails what was asked for. Neither a dismissal nor the refresh activity has asked for anything.
+void Invariants::clearing(const std::vector<std::string>& uniqueIdentifiers,
+                          const std::vector<FollowUpItem>& pending) {
+  if (!isWatching() || !endDismisses_ || runs_.contains(activity::kFollowUpRefresh)) return;
+  for (const auto& item : pending) {
+    if (std::ranges::find(uniqueIdentifiers, item.uniqueIdentifier) == uniqueIdentifiers.end()) continue;
+    const auto serial = item.userInfo.find(kFollowUpSerialNumberKey);
+    if (serial == item.userInfo.end() || !endDismisses_->contains(serial->second.string())) {
+      report("the end takes no follow-up away", describe(item.title));
+    }
+  }
 }
 
 }  // namespace kvr::simulate

@@ -51,6 +51,7 @@ void Invariants::beginProcess(SimulatedPlatform& platform) {
   toBeListed_.clear();
   filesFailed_ = filesFail_;
   excuseRuns();
+  endDismisses_.reset();
   lastRequest_ = -1e9;
   leftovers_.clear();
   for (const auto& path : platform.files.list("")) {

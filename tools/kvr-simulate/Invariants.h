@@ -47,6 +47,10 @@ class Invariants {
 
   /// Before the agent starts: what it finds must be sound.
   void beginProcess(SimulatedPlatform& platform);
+  /// The process is told to end, while somebody waits for the dismissal of these devices' follow-ups.
+  void beginEnding(std::set<std::string> serialNumbersToDismiss) {
+    endDismisses_ = std::move(serialNumbersToDismiss);
+  }
   /// From here on it is nobody's fault what the process does.
   void endProcess();
   /// Whether the process is alive and not cut off from its files.
@@ -65,6 +69,7 @@ class Invariants {
   /// Whether it takes the place of one that is shown.
   bool posting(const FollowUpItem& item, const std::vector<FollowUpItem>& pending);
   void posted(const FollowUpItem& item, bool wasPending, bool isDone);
+  void clearing(const std::vector<std::string>& uniqueIdentifiers, const std::vector<FollowUpItem>& pending);
   void fileChanged(const std::string& path, bool isDone);
   void requested(const HTTPRequest& request, bool isCoverage);
   void coverageAnswered(int status);
@@ -126,6 +131,7 @@ class Invariants {
   /// When the refresh activity updated what is shown, by unique identifier. What others updated since has to
   /// wait for the refresh that was scheduled before.
   std::map<std::string, double> refreshed_;
+  std::optional<std::set<std::string>> endDismisses_;  ///< once the process is told to end
   double lastRequest_ = -1e9;
   std::size_t versionRequests_ = 0;
   std::size_t coverageRequests_ = 0;

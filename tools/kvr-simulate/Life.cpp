@@ -49,7 +49,7 @@ void Life::end(bool losesPower, bool isStopped, double pause) {
   if (!process_) return;
   say(isStopped ? "the agent ends" : losesPower ? "the power is lost" : "the agent dies");
   auto& simulated = process_->simulated;
-  if (isStopped) process_->stop();
+  if (isStopped) process_->stop(clients_.serialNumbersToDismiss());
   invariants_.endProcess();
   clients_.processEnded();
   auto files = std::make_unique<SimulatedFiles>(idleClock_);

@@ -1,7 +1,5 @@
 #include "kvr-simulate/Process.h"
 
-#include "followup/FollowUpKeys.h"
-
 #include <algorithm>
 
 namespace kvr::simulate {
@@ -52,6 +50,8 @@ class RecordingClient : public FollowUpCenterClient {
     return error;
   }
   std::optional<Error> clearPendingItems(const std::vector<std::string>& uniqueIdentifiers) override {
+    const auto pending = client_->pendingItems();
+    if (pending) invariants_.clearing(uniqueIdentifiers, *pending);
     return client_->clearPendingItems(uniqueIdentifiers);
   }
   Result<std::vector<FollowUpItem>> pendingItems() override { return client_->pendingItems(); }
@@ -127,9 +127,8 @@ Process::~Process() {
 
 void Process::start() { startUp_ = std::make_unique<StartUp>(platform_); }
 
-void Process::stop() {
-  const auto shown = simulated.followUps.newClient(kFollowUpClientIdentifier);
-  const auto before = shown->pendingItems();
+void Process::stop(std::set<std::string> serialNumbersToDismiss) {
+  invariants_.beginEnding(std::move(serialNumbersToDismiss));
   simulated.cleanExit.beginEnding();
   simulated.log.beginEnding();
   simulated.activities.beginEnding();
@@ -138,10 +137,6 @@ void Process::stop() {
   }
   simulated.queues.beginEnding();
   simulated.queues.run();
-  const auto after = shown->pendingItems();
-  if (before && after && after->size() < before->size()) {
-    invariants_.report("the end takes no follow-up away", std::to_string(before->size() - after->size()));
-  }
 }
 
 void Process::answer(const HTTPRequest& request, const SimulatedHTTP::Answer& answer) {

@@ -4,6 +4,7 @@
 #include "kvr-simulate/Invariants.h"
 
 #include <memory>
+#include <set>
 #include <string>
 #include <utility>
 #include <vector>
@@ -48,8 +49,8 @@ class Process {
   Process& operator=(const Process&) = delete;
 
   void start();
-  /// Ends as on a termination signal.
-  void stop();
+  /// Ends as on a termination signal. What a client has asked to dismiss may go meanwhile.
+  void stop(std::set<std::string> serialNumbersToDismiss);
   /// Nothing but what may wait for days is under way.
   bool isIdle() const { return openRequests_ == 0 && simulated.activities.runsUnderWay() == 0; }
 
