@@ -66,6 +66,7 @@ std::string Clients::ask(Dice& dice, SimulatedPlatform& platform) {
   std::string text = member + " " + describe(Value(arguments));
   const auto asked = connection(dice, platform);
   open_.push_back({member, arguments, asked->invoke(member, arguments), world_.now, kLimit});
+  if (member == kDismiss) invariants_.dismissalAsked(arguments[0].string());
   ++invariants_.figures.calls;
   invariants_.excuseRuns();
   if (dice.happens(0.1)) {

@@ -28,12 +28,17 @@ bool mayBeRemoved(const std::string& key) {
 
 }  // namespace
 
+bool isWithoutWatches(const Value& serverVersion) {
+  return !serverVersion.isNull() && serverVersion[preference::kHighServerVersion].asInteger() < 3;
+}
+
 Value Invariants::preferences() const { return platform_->files.getPropertyList(kPreferencesPath); }
 
 void Invariants::readFilesAgain() {
   if (platform_ == nullptr) return;
   preferences_ = preferences();
   durable_.clear();
+  readCaches();
 }
 
 void Invariants::checkNames(const std::string& path) {
@@ -51,6 +56,7 @@ void Invariants::fileChanged(const std::string& path, bool isDone) {
   } else {
     durable_.erase(path);
   }
+  cacheChanged(path);
   if (!isWatching()) return;
   checkNames(path);
   if (bytes && path.ends_with(".plist") && !damageIsPlanted_ && !readPropertyList(*bytes)) {
@@ -107,6 +113,12 @@ void Invariants::checkChange(const std::string& key, const Value& before, const 
       report("dismissals are never forgotten", describe(before) + " became " + describe(after));
     }
   }
+  if (key == preference::kConversionOutreachScheduledDate && !after.isNull()) checkConversionDate(after);
+  if (key == preference::kServerVersionCache && isWithoutWatches(before)) trouble();
+  if (key.ends_with(std::string("_") + preference::kCachedWarrantyLastUpdatedDate)) downloaded(key);
+  // A post run schedules the refresh for what it looked up, in the place of what others wait for.
+  const auto refreshDate = std::string(activity::kFollowUpRefresh) + preference::kTargetDateSuffix;
+  if (key == refreshDate && runs_.contains(activity::kFollowUpPost)) refreshed_.clear();
   if (!after.isNull() || mayBeRemoved(key)) return;
   if (key.ends_with(preference::kTargetDateSuffix)) {
     checkTargetDateRemoval(key.substr(0, key.size() - std::string_view(preference::kTargetDateSuffix).size()),
@@ -157,6 +169,16 @@ void Invariants::checkFollowUps() {
   }
 }
 
+/// What has expired and could not be taken from the file is shown again when the clock is set back. Its
+/// refreshes are over, until the next start.
+void Invariants::rememberExpired() {
+  if (platform_ == nullptr) return;
+  for (const auto& entry : listIn(platform_->files.getPropertyList(kFollowUpsPath)["items"])) {
+    const auto expires = entry["expirationDate"].dateIfAny();
+    if (expires && *expires <= platform_->clock.now()) expired_.insert(entry["uniqueIdentifier"].string());
+  }
+}
+
 bool Invariants::posting(const FollowUpItem& item, const std::vector<FollowUpItem>& pending) {
   const auto isPending = [&](const std::string& identifier) {
     return std::ranges::any_of(
@@ -180,7 +202,7 @@ bool Invariants::posting(const FollowUpItem& item, const std::vector<FollowUpIte
   // What an earlier version showed is shown on, whatever it is made of.
   if (isMigrated) return true;
   if (!offer->isOffered) report("nothing is posted that is not offered", describe(item.title));
-  if (!offer->end || *offer->end <= now) {
+  if (!(offer->end() > now)) {
     report("nothing is posted after its eligibility", describe(item.title));
   }
   if (!wasPending) checkNewPost(*offer, describe(item.title), now);
@@ -206,6 +228,7 @@ void Invariants::posted(const FollowUpItem& item, bool wasPending, bool isDone) 
   // One that could not be updated is not tried again before its next refresh.
   if (!isDone) refreshed_.erase(*item.uniqueIdentifier);
   if (!isDone) return;
+  expired_.erase(*item.uniqueIdentifier);
   ++figures.posts;
   if (runs_.contains(activity::kFollowUpRefresh)) {
     refreshed_[*item.uniqueIdentifier] = world_.now;
@@ -215,14 +238,17 @@ void Invariants::posted(const FollowUpItem& item, bool wasPending, bool isDone) 
   if (!wasPending) toBeListed_.insert(sha256Hash(item.userInfo.at(kFollowUpSerialNumberKey).string()));
 }
 
-/// The end fails what was asked for. Neither a dismissal nor the refresh activity has asked for anything.
 void Invariants::clearing(const std::vector<std::string>& uniqueIdentifiers,
                           const std::vector<FollowUpItem>& pending) {
-  if (!isWatching() || !endDismisses_ || runs_.contains(activity::kFollowUpRefresh)) return;
+  if (!isWatching()) return;
   for (const auto& item : pending) {
     if (std::ranges::find(uniqueIdentifiers, item.uniqueIdentifier) == uniqueIdentifiers.end()) continue;
     const auto serial = item.userInfo.find(kFollowUpSerialNumberKey);
-    if (serial == item.userInfo.end() || !endDismisses_->contains(serial->second.string())) {
+    if (serial == item.userInfo.end()) continue;
+    checkCleared(serial->second.string());
+    // The end fails what was asked for. Neither a dismissal nor the refresh activity has asked for anything.
+    if (endDismisses_ && !endDismisses_->contains(serial->second.string()) &&
+        !runs_.contains(activity::kFollowUpRefresh)) {
       report("the end takes no follow-up away", describe(item.title));
     }
   }

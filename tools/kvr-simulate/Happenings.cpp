@@ -48,8 +48,10 @@ void Life::apply(const Event& event) {
       [[fallthrough]];
     case EventKind::Reboot:
       ++world_.boot;
+      foretellDeath(dice);
       return end(false, dice.happens(0.7), dice.oneOf({20.0, kHour, kDay}));
     case EventKind::Stop:
+      foretellDeath(dice);
       // What is asked for just before is under way then.
       if (process_ && dice.happens(0.5)) {
         clients_.invoke(process_->simulated, "GetDefaultDeviceInfoUsingPolicy", {LookupPolicy::kRefresh});
@@ -124,9 +126,11 @@ void Life::token(Dice& dice) {
   world_.renewal.resultCode = dice.happens(0.7) ? 0 : 1;
   world_.renewal.delay = dice.oneOf({0.5, 20.0, 100.0});
   world_.renewal.never = dice.happens(0.1);
+  invariants_.trouble();
   if (process_) world_.show(process_->simulated);
   later(dice.between(0, kDay), [this] {
     world_.renewal = {};
+    invariants_.trouble();
     if (process_) world_.show(process_->simulated);
   });
 }
@@ -186,6 +190,7 @@ void Life::crash(Dice& dice, bool losesPower) {
 }
 
 void Life::serviceFault(Dice& dice) {
+  invariants_.trouble();
   using Fault = Service::Fault;
   const auto draw = [&dice] {
     return dice.oneOf({Fault::Refuses, Fault::Refuses, Fault::Breaks, Fault::Late, Fault::Never,
@@ -243,14 +248,24 @@ void Life::attestation(Dice& dice) {
 }
 
 void Life::damage(Dice& dice) {
+  // The agent's preferences more often than others, and while it is not there: it has to find out.
+  const bool isOfPreferences = dice.happens(0.5);
+  if (isOfPreferences) {
+    foretellDeath(dice);
+    end(false, dice.happens(0.5), dice.oneOf({0.2, kHour}));
+  }
   auto& files = process_ ? process_->simulated.files : *files_;
-  const auto paths = files.list(files.homeDirectory());
+  const auto paths = files.list(files.homeDirectory() + (isOfPreferences ? "/Library/Preferences" : ""));
   if (paths.empty()) return;
   const auto& path = dice.oneOf(paths);
   const auto bytes = *files.get(path);
   invariants_.allowDamage();
   say("  " + path);
-  files.put(path, dice.happens(0.5) ? bytes.substr(0, dice.below(bytes.size() + 1)) : "garbage {");
+  if (dice.happens(0.2)) {
+    files.erase(path);
+  } else {
+    files.put(path, dice.happens(0.5) ? bytes.substr(0, dice.below(bytes.size() + 1)) : "garbage {");
+  }
   invariants_.readFilesAgain();
 }
 
@@ -261,7 +276,7 @@ void Life::setting(Dice& dice) {
   switch (dice.below(3)) {
     case 0:
       invariants_.shortestDay = 1800;
-      preferences.setObject(dice.oneOf({1800, 7200}), preference::kOneDayInterval);
+      preferences.setObject(dice.oneOf({kDayLengths[1], kDayLengths[2]}), preference::kOneDayInterval);
       break;
     case 1:
       preferences.setObject(dice.oneOf({0, 60, 1'000'000}), preference::kCachedWarrantyValidityDuration);
@@ -279,6 +294,7 @@ void Life::endFaults() {
   world_.renewal = {};
   world_.hasAttestation = world_.hasAccount = world_.isNetworkReachable = true;
   stepFault_ = nullptr;
+  stepsToLive_.reset();
   invariants_.endFileFaults();
   if (clockOffset_ != 0) setClock(0);
   disturb();

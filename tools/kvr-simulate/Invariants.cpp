@@ -2,6 +2,7 @@
 
 #include "kvr-simulate/Invariants.h"
 
+#include "agent/AgentKeys.h"
 #include "followup/FollowUpKeys.h"
 #include "platform/PropertyList.h"
 #include "platform/URL.h"
@@ -18,6 +19,7 @@ constexpr double kHour = 3600;
 constexpr double kSlack = 3 * kHour;  ///< back-offs and the like
 constexpr double kQuiet = 200;        ///< seconds after which requests belong to other downloads
 constexpr std::size_t kAttempts = 3;
+constexpr double kMostDays = 4294967295;  ///< that are counted
 
 /// Of "1,234 days left".
 double daysIn(const Value& text) {
@@ -51,7 +53,10 @@ void Invariants::beginProcess(SimulatedPlatform& platform) {
   toBeListed_.clear();
   filesFailed_ = filesFail_;
   excuseRuns();
+  begun_.clear();
+  dismissed_.clear();
   endDismisses_.reset();
+  expired_.clear();
   lastRequest_ = -1e9;
   leftovers_.clear();
   for (const auto& path : platform.files.list("")) {
@@ -68,6 +73,8 @@ void Invariants::beginProcess(SimulatedPlatform& platform) {
     }
   }
   readFilesAgain();
+  conversionAtStart_ =
+      preferences_[std::string(activity::kConversionOutreach) + preference::kTargetDateSuffix];
 }
 
 void Invariants::endProcess() {
@@ -89,18 +96,26 @@ void Invariants::step() {
   toBeListed_.clear();
 }
 
+/// The service is offered last.
+bool Invariants::isStartingUp() const { return !platform_->services.isListening(kServiceName); }
+
 // Runs.
 
 void Invariants::runBegins(const std::string& activity) {
   if (!isWatching()) return;
   ++figures.runs;
   if (runs_.contains(activity)) report("an activity never runs twice at once", activity);
+  if (isStartingUp()) report("start-up is alone", activity + " runs meanwhile");
+  if (activity == activity::kPostBoot && begun_.contains(activity::kPostUpgrade)) {
+    report("post-boot comes before post-upgrade", "it came after");
+  }
+  begun_.insert(activity);
   Run run;
   run.startedFor = platform_->preferences.objectForKey(activity + preference::kTargetDateSuffix);
   run.started = platform_->clock.now();
   run.began = world_.now;
   run.isFirstUpgrade = activity == activity::kPostUpgrade &&
-                       !platform_->preferences.boolForKey("PostUpgradeActivityCompleted");
+                       !platform_->preferences.boolForKey(preference::kPostUpgradeActivityCompleted);
   runs_.insert_or_assign(activity, run);
   auto& times = runTimes_[activity];
   times.push_back(world_.now);
@@ -158,6 +173,7 @@ void Invariants::coverageAnswered(int status) {
 
 void Invariants::clockMoved() {
   clockMoved_ = world_.now;
+  rememberExpired();
   excuseRuns();
 }
 
@@ -177,6 +193,9 @@ void Invariants::checkCalm() {
     if (run.began < world_.now - kSlack) report("runs come to an end", activity);
   }
   if (filesFailed_) return;
+  if (!stored[preference::kPostUpgradeActivityCompleted].asBool()) {
+    report("no agent is dormant", "the post-upgrade activity has not run");
+  }
   checkOverdue(stored, registered["activities"]);
   checkShown(stored, registered["activities"]);
 }
@@ -210,13 +229,16 @@ void Invariants::checkShown(const Value& stored, const Value& registrations) {
       stored[std::string(activity::kFollowUpRefresh) + preference::kTargetDateSuffix].dateIfAny();
   if (refresh) datesAreDamaged_ = false;
   // The first run after an upgrade clears the date; what is registered stays so.
-  const bool isToCome = refresh || registrations.contains(activity::kFollowUpRefresh);
-  if (!pending.empty() && !stored[preference::kFollowUpPostedHashes].isNull() && !isToCome &&
-      !datesAreDamaged_ && !runs_.contains(activity::kFollowUpRefresh) &&
-      !runs_.contains(activity::kFollowUpPost)) {
+  const bool isToCome = refresh || registrations.contains(activity::kFollowUpRefresh) ||
+                        runs_.contains(activity::kFollowUpRefresh) || runs_.contains(activity::kFollowUpPost);
+  const bool isAnyRefreshed = std::ranges::any_of(pending, [this](const FollowUpItem& item) {
+    // One that an earlier version posted and nobody could take over is no device's.
+    return item.userInfo.contains(kFollowUpSerialNumberKey) && !expired_.contains(*item.uniqueIdentifier);
+  });
+  if (isAnyRefreshed && !isToCome && !datesAreDamaged_) {
     report("what is shown is kept up to date", "no refresh is to come");
   }
-  // A single follow-up of an earlier version begins no chain of refreshes; and one may be late, by its grace.
+  // One may be late, by its grace.
   if (shortestDay < 86400 || !refresh || *refresh <= platform_->clock.now()) return;
   for (const auto& item : pending) {
     const auto posted = refreshed_.find(*item.uniqueIdentifier);
@@ -224,8 +246,8 @@ void Invariants::checkShown(const Value& stored, const Value& registrations) {
     if (posted == refreshed_.end() || posted->second < clockMoved_ || offer == nullptr) continue;
     const auto activation = activationOf(offer->serialNumber, stored);
     // One that was posted by another setting of the clock counts as not shown until its date comes again.
-    if (std::max(activation, offer->displayed) > platform_->clock.now()) continue;
-    const double left = std::ceil((*offer->end - platform_->clock.now()) / 86400);
+    if (std::max(activation, offer->displayed()) > platform_->clock.now()) continue;
+    const double left = std::min(std::ceil((*offer->end() - platform_->clock.now()) / 86400), kMostDays);
     const double shown = std::max(daysIn(item.informativeFooterText), 1.0);
     if (std::abs(shown - std::max(left, 1.0)) > 1) {
       report("what is shown is kept up to date",
@@ -284,7 +306,7 @@ bool Invariants::isDismissed(const Offer& offer, const Value& stored) const {
   const auto& list = stored[preference::kFollowUpDismissedHashes];
   if (!list.isArray() || std::ranges::find(list.array(), hash) == list.array().end()) return false;
   const auto when = stored[hash.string() + preference::kDismissedSuffix].dateIfAny();
-  return !when || !offer.displayed || *when >= *offer.displayed;
+  return !when || !offer.displayed() || *when >= *offer.displayed();
 }
 
 /// The earliest that the agent may go by, while a watch is being paired again.

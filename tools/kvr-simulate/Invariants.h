@@ -4,6 +4,7 @@
 #include "platform/ActivityScheduler.h"
 #include "platform/FollowUpCenter.h"
 
+#include <array>
 #include <deque>
 #include <map>
 #include <optional>
@@ -12,6 +13,9 @@
 #include <vector>
 
 namespace kvr::simulate {
+
+/// What operators set the length of a day to, in seconds; the first one is what it is otherwise.
+inline constexpr std::array kDayLengths{86400, 1800, 7200};
 
 /// How much life was covered.
 struct Figures {
@@ -27,6 +31,9 @@ struct Figures {
 
   void add(const Figures& other);
 };
+
+/// Whether a service of that version has no watches looked after.
+bool isWithoutWatches(const Value& serverVersion);
 
 /// An invariant that did not hold.
 struct Breach {
@@ -73,13 +80,19 @@ class Invariants {
   void fileChanged(const std::string& path, bool isDone);
   void requested(const HTTPRequest& request, bool isCoverage);
   void coverageAnswered(int status);
+  void answered(const Value& warranty);
 
   // What happens to it.
 
   /// Activities may run anew.
   void excuseRuns() { runTimes_.clear(); }
   void clockMoved();
+  /// Something after which look-ups may fail for a while, or have found out something else before.
+  void trouble() { troubled_ = world_.now; }
+  void dismissalAsked(const std::string& serialNumber) { dismissed_.insert(serialNumber); }
   void suspended(double seconds);
+  /// What is shown may be what was shown before.
+  void powerLost() { refreshed_.clear(); }
   /// Faults of files begin: what is not recorded then is lost.
   void excuseFiles() { filesFail_ = filesFailed_ = true; }
   void endFileFaults() { filesFail_ = false; }
@@ -98,13 +111,29 @@ class Invariants {
     bool isFirstUpgrade = false;
     bool removedDate = false;
   };
+  struct Cache {
+    Value warranty;
+    Value earlier;
+    double changed = -1e9;
+    bool hasNews = false;  ///< a conversion date, which could not be stored so far
+  };
 
+  bool isStartingUp() const;
+  void checkConversionDate(const Value& stored);
+  void readCaches();
+  void cacheChanged(const std::string& path);
+  void downloaded(const std::string& lastUpdatedKey);
+  void checkConversionStored(Cache& cache);
+  std::optional<Date> conversionDateOf(const Value& warranty) const;
+  bool isSurelyOpen(const std::string& serialNumber) const;
+  void checkCleared(const std::string& serialNumber);
   void checkNames(const std::string& path);
   void checkPreferences();
   void checkChange(const std::string& key, const Value& before, const Value& after, const Value& tree);
   void checkTargetDateRemoval(const std::string& activity, const Value& before);
   void checkPostedList(const Value& before, const Value& after, const Value& tree);
   void checkFollowUps();
+  void rememberExpired();
   void checkNewPost(const Offer& offer, const std::string& name, Date now);
   void checkOverdue(const Value& preferences, const Value& registrations);
   void checkShown(const Value& preferences, const Value& registrations);
@@ -131,6 +160,13 @@ class Invariants {
   /// When the refresh activity updated what is shown, by unique identifier. What others updated since has to
   /// wait for the refresh that was scheduled before.
   std::map<std::string, double> refreshed_;
+  std::set<std::string> begun_;     ///< activities, in this process
+  Value conversionAtStart_;         ///< for when the conversion outreach was pending when the process began
+  std::set<Date> conversionDates_;  ///< that the service ever brought
+  std::map<std::string, Cache> caches_;
+  std::set<std::string> dismissed_;  ///< serial numbers, in this process
+  double troubled_ = -1e9;
+  std::set<std::string> expired_;  ///< by a clock that was set anew since, in this process
   std::optional<std::set<std::string>> endDismisses_;  ///< once the process is told to end
   double lastRequest_ = -1e9;
   std::size_t versionRequests_ = 0;

@@ -29,6 +29,7 @@ void Life::say(const std::string& text) const {
 void Life::birth() {
   files_ = std::make_unique<SimulatedFiles>(idleClock_);
   if (world_.dice.happens(0.3)) world_.putLegacyFiles(*files_);
+  foretellDeath(world_.dice);
 }
 
 void Life::start() {
@@ -42,7 +43,20 @@ void Life::start() {
   disturb();
   say("the agent starts");
   invariants_.beginProcess(simulated);
-  process_->start();
+  if (stepsToLive_) simulated.files.killAfterSteps(*stepsToLive_);
+  losesPower_ = stepsToLive_ && losesPowerNext_;
+  stepsToLive_.reset();
+  try {
+    process_->start();
+  } catch (const std::exception& error) {
+    invariants_.report("no activity spins", error.what());
+  }
+}
+
+void Life::foretellDeath(Dice& dice) {
+  if (!dice.happens(0.2)) return;
+  stepsToLive_ = 1 + dice.below(40);
+  losesPowerNext_ = dice.happens(0.4);
 }
 
 void Life::end(bool losesPower, bool isStopped, double pause) {
@@ -54,7 +68,10 @@ void Life::end(bool losesPower, bool isStopped, double pause) {
   clients_.processEnded();
   auto files = std::make_unique<SimulatedFiles>(idleClock_);
   files->takeOver(simulated.files);
-  if (losesPower) files->losePower(world_.dice.random);
+  if (losesPower) {
+    files->losePower(world_.dice.random);
+    invariants_.powerLost();
+  }
   files_ = std::move(files);
   digest_ = digest_ * 31 + invariants_.figures.requests + simulated.files.readCount();
   lastLines_ = simulated.log.texts();

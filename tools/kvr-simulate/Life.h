@@ -40,6 +40,8 @@ class Life {
   void birth();
   void start();
   void end(bool losesPower, bool isStopped, double pause);
+  /// Now and then the next process dies while it starts, or soon after.
+  void foretellDeath(Dice& dice);
   void advanceTo(double time);
   void runUntil(double time);
   bool noticeDeath();
@@ -51,7 +53,10 @@ class Life {
   void apply(const Event& event);
   void say(const std::string& text) const;
   /// Something calm is over for a while.
-  void disturb() { disturbed_ = world_.now; }
+  void disturb() {
+    disturbed_ = world_.now;
+    invariants_.trouble();
+  }
   void later(double delay, std::function<void()> work) {
     agenda_.emplace(world_.now + delay, std::move(work));
   }
@@ -85,8 +90,10 @@ class Life {
   double processBegan_ = 0;
   double clockOffset_ = 0;  ///< of the wall clock
   double disturbed_ = 0;
-  double nextLook_ = 0;      ///< whether all is in order
-  bool losesPower_ = false;  ///< when the crash under way comes
+  double nextLook_ = 0;                     ///< whether all is in order
+  bool losesPower_ = false;                 ///< when the crash under way comes
+  std::optional<std::size_t> stepsToLive_;  ///< changes of files, for the next process
+  bool losesPowerNext_ = false;             ///< when it dies after them
   std::uint64_t starts_ = 0;
   SimulatedFiles::StepFault stepFault_;
   std::multimap<double, std::function<void()>> agenda_;

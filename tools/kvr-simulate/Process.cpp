@@ -5,15 +5,22 @@
 namespace kvr::simulate {
 namespace {
 
+constexpr std::uint64_t kSlowStarts = 4;  ///< one of so many is
+constexpr double kLongestPause = 20;      ///< seconds, between two steps of a slow start
+
 HTTPResponse endingResponse() { return {0, std::nullopt, Error{"http", 42, "the process is ending"}}; }
 
 class RecordingActivity : public Activity {
  public:
-  RecordingActivity(std::unique_ptr<Activity> activity, Log& log, Invariants& invariants)
-      : activity_(std::move(activity)), log_(log), invariants_(invariants) {}
+  RecordingActivity(std::unique_ptr<Activity> activity, Log& log, Invariants& invariants,
+                    const std::function<void()>& checkedIn)
+      : activity_(std::move(activity)), log_(log), invariants_(invariants), checkedIn_(checkedIn) {}
 
   const std::string& identifier() const override { return activity_->identifier(); }
-  void setPreregistered(bool preregistered) override { activity_->setPreregistered(preregistered); }
+  void setPreregistered(bool preregistered) override {
+    activity_->setPreregistered(preregistered);
+    isPreregistered_ = preregistered;
+  }
   void setCriteria(const ActivityCriteria& criteria) override { activity_->setCriteria(criteria); }
   void setExpectation(const ActivityExpectation& expectation) override {
     activity_->setExpectation(expectation);
@@ -29,12 +36,15 @@ class RecordingActivity : public Activity {
         handler(result);
       }));
     });
+    if (isPreregistered_) checkedIn_();
   }
 
  private:
   const std::unique_ptr<Activity> activity_;
   Log& log_;
   Invariants& invariants_;
+  const std::function<void()>& checkedIn_;
+  bool isPreregistered_ = false;
 };
 
 class RecordingClient : public FollowUpCenterClient {
@@ -64,8 +74,8 @@ class RecordingClient : public FollowUpCenterClient {
 }  // namespace
 
 std::unique_ptr<Activity> RecordingActivities::newActivity(std::string identifier) {
-  return std::make_unique<RecordingActivity>(scheduler_.newActivity(std::move(identifier)), log_,
-                                             invariants_);
+  return std::make_unique<RecordingActivity>(scheduler_.newActivity(std::move(identifier)), log_, invariants_,
+                                             checkedIn_);
 }
 
 std::unique_ptr<FollowUpCenterClient> RecordingCenter::newClient(std::string clientIdentifier) {
@@ -77,7 +87,10 @@ Process::Process(World& world, Invariants& invariants, std::uint64_t seed, LogLe
     : simulated(seed, leastLogged),
       world_(world),
       invariants_(invariants),
-      activities_(simulated.activities, simulated.log, invariants),
+      began_(world.now),
+      pause_(seed % kSlowStarts == 0 ? Dice(seed).between(0, kLongestPause) : 0),
+      activities_(simulated.activities, simulated.log, invariants, [this] { letOthersRun(); }),
+      services_(simulated.services, [this] { letOthersRun(); }),
       followUps_(simulated.followUps, invariants),
       platform_{simulated.log,
                 simulated.clock,
@@ -94,7 +107,7 @@ Process::Process(World& world, Invariants& invariants, std::uint64_t seed, LogLe
                 simulated.accounts,
                 simulated.accountSession,
                 simulated.attestation,
-                simulated.services,
+                services_,
                 simulated.processes,
                 activities_,
                 followUps_,
@@ -126,6 +139,13 @@ Process::~Process() {
 }
 
 void Process::start() { startUp_ = std::make_unique<StartUp>(platform_); }
+
+void Process::letOthersRun() {
+  if (startUp_) return;
+  simulated.queues.advance(pause_);
+  world_.now = began_ + simulated.clock.elapsed();
+  invariants_.step();
+}
 
 void Process::stop(std::set<std::string> serialNumbersToDismiss) {
   invariants_.beginEnding(std::move(serialNumbersToDismiss));
@@ -163,7 +183,10 @@ void Process::answer(const HTTPRequest& request, const SimulatedHTTP::Answer& an
   simulated.queues.after(outcome.delay, queue, [this, outcome, answer, isCoverage, done] {
     if (!std::exchange(*done, true)) --openRequests_;
     if (isCoverage) invariants_.coverageAnswered(outcome.response->status);
-    if (outcome.offer) world_.service.at(*outcome.offer).lastServed = world_.now;
+    if (outcome.offer) {
+      world_.service.at(*outcome.offer).lastServed = world_.now;
+      invariants_.answered(world_.service.treeOf(*outcome.offer));
+    }
     answer(*outcome.response);
   });
 }

@@ -3,6 +3,7 @@
 #include "agent/StartUp.h"
 #include "kvr-simulate/Invariants.h"
 
+#include <functional>
 #include <memory>
 #include <set>
 #include <string>
@@ -11,11 +12,13 @@
 
 namespace kvr::simulate {
 
-/// Passes activities on to the simulated scheduler and tells the invariants of their runs.
+/// Passes activities on to the simulated scheduler and tells the invariants of their runs; and somebody that
+/// an activity has checked in.
 class RecordingActivities : public ActivityScheduler {
  public:
-  RecordingActivities(ActivityScheduler& scheduler, Log& log, Invariants& invariants)
-      : scheduler_(scheduler), log_(log), invariants_(invariants) {}
+  RecordingActivities(ActivityScheduler& scheduler, Log& log, Invariants& invariants,
+                      std::function<void()> checkedIn)
+      : scheduler_(scheduler), log_(log), invariants_(invariants), checkedIn_(std::move(checkedIn)) {}
 
   std::unique_ptr<Activity> newActivity(std::string identifier) override;
 
@@ -23,6 +26,23 @@ class RecordingActivities : public ActivityScheduler {
   ActivityScheduler& scheduler_;
   Log& log_;
   Invariants& invariants_;
+  const std::function<void()> checkedIn_;
+};
+
+/// Passes listeners on, and tells somebody before each new one.
+class RecordingListeners : public ServiceListeners {
+ public:
+  RecordingListeners(ServiceListeners& listeners, std::function<void()> beforeNew)
+      : listeners_(listeners), beforeNew_(std::move(beforeNew)) {}
+
+  std::unique_ptr<ServiceListener> newListener(std::string name) override {
+    beforeNew_();
+    return listeners_.newListener(std::move(name));
+  }
+
+ private:
+  ServiceListeners& listeners_;
+  const std::function<void()> beforeNew_;
 };
 
 /// Passes follow-ups on to the simulated centre and tells the invariants of them.
@@ -57,14 +77,19 @@ class Process {
   SimulatedPlatform simulated;
 
  private:
+  /// Start-up takes its time, in which whatever else can run does.
+  void letOthersRun();
   void answer(const HTTPRequest& request, const SimulatedHTTP::Answer& answer);
 
   World& world_;
   Invariants& invariants_;
+  const double began_;
+  const double pause_;  ///< seconds between two steps of start-up
   int openRequests_ = 0;
   /// Requests, with whether each has been answered.
   std::vector<std::pair<std::shared_ptr<bool>, SimulatedHTTP::Answer>> open_;
   RecordingActivities activities_;
+  RecordingListeners services_;
   RecordingCenter followUps_;
   Platform platform_;
   std::unique_ptr<StartUp> startUp_;

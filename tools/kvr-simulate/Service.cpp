@@ -1,5 +1,6 @@
 #include "kvr-simulate/Service.h"
 
+#include "kvr-simulate/Epochs.h"
 #include "platform/JSON.h"
 #include "signing/SigningKeys.h"
 
@@ -17,13 +18,20 @@ HTTPResponse failure(int code, const char* message) {
   return {0, std::nullopt, Error{"http", code, message}};
 }
 
-Value epoch(std::optional<Date> date) { return date ? Value(date->secondsSince1970) : Value(); }
+std::optional<Date> dateIn(const Value::Dictionary& epochs, const char* key) {
+  const auto found = epochs.find(key);
+  return found == epochs.end() ? std::nullopt : dateOf(found->second);
+}
 
 }  // namespace
 
+std::optional<Date> Offer::end() const { return dateIn(epochs, "zubOfferEligibleUntil"); }
+
+std::optional<Date> Offer::displayed() const { return dateIn(epochs, "zubOfferFollowupDisplayDate"); }
+
 std::optional<Date> Offer::postDate(std::optional<Date> activation) const {
-  auto date = displayed;
-  if (!date && end) date = *end - daysBeforeEnd * kDay;
+  auto date = displayed();
+  if (!date && end()) date = *end() - daysBeforeEnd * kDay;
   if (date && activation && *activation > *date) date = activation;
   return date;
 }
@@ -43,6 +51,12 @@ std::size_t Service::currentOf(const std::string& serialNumber) {
   return publish(std::move(none));
 }
 
+bool Service::areOpen(const std::string& serialNumber, double time, Date now) const {
+  return std::ranges::all_of(offers_, [&](const Offer& offer) {
+    return offer.serialNumber != serialNumber || offer.lastServed < time || offer.isOpen(now);
+  });
+}
+
 Offer* Service::find(const Value& label) {
   if (!label.isString() || !label.string().starts_with("Offer ")) return nullptr;
   const auto number = static_cast<std::size_t>(std::stoul(label.string().substr(6)));
@@ -59,9 +73,7 @@ Value Service::treeOf(std::size_t number) const {
                          {"featureToggleParameters",
                           Value::Dictionary{{"zubOfferDisplay", offer.isOffered},
                                             {"zubOfferDurationDaysBeforeEndDate", offer.daysBeforeEnd}}}};
-  if (offer.end) tree.emplace("zubOfferEligibleUntil", epoch(offer.end));
-  if (offer.displayed) tree.emplace("zubOfferFollowupDisplayDate", epoch(offer.displayed));
-  if (offer.conversion) tree.emplace("zubOfferConversionDate", epoch(offer.conversion));
+  tree.insert(offer.epochs.begin(), offer.epochs.end());
   return tree;
 }
 

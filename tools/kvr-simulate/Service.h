@@ -17,16 +17,16 @@ namespace kvr::simulate {
 struct Offer {
   std::string serialNumber;
   bool isOffered = false;
-  std::optional<Date> end;
-  std::optional<Date> displayed;
-  std::optional<Date> conversion;
+  Value::Dictionary epochs;  ///< the dates as they are sent, by key
   double daysBeforeEnd = 0;
   bool isCovered = false;
   double lastServed = -1;  ///< seconds since birth
 
+  std::optional<Date> end() const;
+  std::optional<Date> displayed() const;
   /// From when it may be posted to a device activated at `activation`.
   std::optional<Date> postDate(std::optional<Date> activation) const;
-  bool isOpen(Date now) const { return isOffered && end && *end > now; }
+  bool isOpen(Date now) const { return isOffered && end() > now; }
 };
 
 /// The coverage service as it is during one life, with its faults.
@@ -45,6 +45,8 @@ class Service {
   std::size_t publish(Offer offer);
   /// The device's present offer; one without anything for a device that is not known.
   std::size_t currentOf(const std::string& serialNumber);
+  /// Whether each of a device's offers that was answered since `time` is open.
+  bool areOpen(const std::string& serialNumber, double time, Date now) const;
   /// The offer of that label.
   Offer* find(const Value& label);
   Offer& at(std::size_t number) { return offers_[number]; }

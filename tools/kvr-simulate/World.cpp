@@ -1,6 +1,7 @@
 #include "kvr-simulate/World.h"
 
 #include "followup/FollowUpKeys.h"
+#include "kvr-simulate/Epochs.h"
 #include "platform/PropertyList.h"
 #include "warranty/WarrantyKeys.h"
 
@@ -37,12 +38,13 @@ Offer World::drawOffer(Dice& from, const std::string& serialNumber, Date today) 
   offer.serialNumber = serialNumber;
   offer.isOffered = from.happens(0.75);
   offer.isCovered = from.happens(0.5);
-  const auto wholeSeconds = [today](double days) {
-    return Date{static_cast<double>(static_cast<long long>((today + days * kDay).secondsSince1970))};
+  const auto sends = [&](const char* key, double probability, double leastDays, double mostDays) {
+    if (from.happens(probability)) offer.epochs.emplace(key, drawEpoch(from, today, leastDays, mostDays));
   };
-  if (from.happens(0.95)) offer.end = wholeSeconds(from.between(-3, 70));
-  if (from.happens(0.7)) offer.displayed = wholeSeconds(from.between(-20, 40));
-  if (from.happens(0.5)) offer.conversion = wholeSeconds(from.between(-20, 60));
+  sends("zubOfferEligibleUntil", 0.95, -3, 70);
+  sends("zubOfferFollowupDisplayDate", 0.7, -20, 40);
+  sends("zubOfferConversionDate", 0.5, -20, 60);
+  sends("coverageEndDate", 0.3, -20, 400);
   if (from.happens(0.7)) offer.daysBeforeEnd = from.between(0, 60);
   return offer;
 }
@@ -66,6 +68,11 @@ const World::Watch* World::watch(const std::string& serialNumber) const {
     return candidate.serialNumber == serialNumber;
   });
   return found == watches.end() ? nullptr : &*found;
+}
+
+bool World::isInTrouble() const {
+  return !hasAccount || !isNetworkReachable || renewal.never || renewal.resultCode != 0 ||
+         service.coverageFault != Service::Fault::None || service.versionFault != Service::Fault::None;
 }
 
 void World::show(SimulatedPlatform& platform) const {

@@ -29,6 +29,8 @@ struct World {
   /// Those that are looked after.
   std::vector<std::string> trackedSerialNumbers() const;
   const Watch* watch(const std::string& serialNumber) const;
+  /// Whether a look-up may fail as things are.
+  bool isInTrouble() const;
   /// Makes a platform show this world as it is.
   void show(SimulatedPlatform& platform) const;
   /// Puts the files of the earlier layout in place.
