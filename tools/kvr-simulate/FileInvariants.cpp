@@ -224,10 +224,12 @@ void Invariants::checkNewPost(const Offer& offer, const std::string& name, Date 
 }
 
 void Invariants::posted(const FollowUpItem& item, bool wasPending, bool isDone) {
-  if (!isWatching()) return;
-  // One that could not be updated is not tried again before its next refresh.
-  if (!isDone) refreshed_.erase(*item.uniqueIdentifier);
-  if (!isDone) return;
+  if (!isWatching() || !isDone) {
+    // Not tried again before the next refresh; and with the process cut off it may have been done all the
+    // same.
+    refreshed_.erase(*item.uniqueIdentifier);
+    return;
+  }
   expired_.erase(*item.uniqueIdentifier);
   ++figures.posts;
   if (runs_.contains(activity::kFollowUpRefresh)) {

@@ -51,6 +51,7 @@ void Life::start() {
   } catch (const std::exception& error) {
     invariants_.report("no activity spins", error.what());
   }
+  noticeDeath();
 }
 
 void Life::foretellDeath(Dice& dice) {
