@@ -78,7 +78,7 @@ class InProcess {
   std::unique_ptr<LocalPlatform> build() {
     ::setenv("HOME", programs_.world.home().c_str(), 1);
     ::setenv("KVR_DEVICE_ROOT", (programs_.world.directory / "device").c_str(), 1);
-    return std::make_unique<LocalPlatform>(loop_, [] {});
+    return std::make_unique<LocalPlatform>(loop_, LocalLog::fromEnvironment(), [] {});
   }
 
   const Silence silence_;

@@ -11,6 +11,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <exception>
+#include <utility>
 
 namespace {
 
@@ -54,8 +55,10 @@ void finish(kvr::LocalPlatform& local) {
 
 int run() {
   blockSignals();
+  auto log = kvr::LocalLog::fromEnvironment();
+  kvr::StartUp::announce(*log);
   kvr::EventLoop loop;
-  kvr::LocalPlatform local(loop, [&loop, &local] {
+  kvr::LocalPlatform local(loop, std::move(log), [&loop, &local] {
     loop.post([&loop, &local] {
       local.beginEnding();
       loop.exit(EXIT_FAILURE);

@@ -45,7 +45,7 @@ void KVRAgent::scheduleOutreachAfter(double delay, BoolReply withReply) {
   if (isInCalendar(platform_.clock.now() + delay)) {
     KVRScheduler::newSchedulerWithActivityDelegate(platform_,
                                                    std::make_shared<KVROutreachActivity>(platform_))
-        ->scheduleActivityWithDelay(delay);
+        ->scheduleActivityWithDelay(delay, RegistrationCause::Demand);
   } else {
     platform_.log.error("%s: delay refused, no date lies %f seconds ahead",
                         "-[KVRAgent scheduleOutreachAfter:withReply:]", delay);

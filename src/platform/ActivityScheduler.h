@@ -24,6 +24,15 @@ struct ActivityCriteria {
 
 enum class DeferralReason { NetworkLost, ProcessEnding };
 
+/// Why an activity is registered.
+enum class RegistrationCause {
+  /// A client asks for it, an occasion that comes once, or the calendar alone: each is run, however many.
+  Demand,
+  /// A run, an answer of the service or a notification leads to it, which it may lead to again: how often
+  /// such registrations are started is limited.
+  Reaction
+};
+
 /// What a client that checks in knows of its activity's registration.
 struct ActivityExpectation {
   Date date;                  ///< from when it may run
@@ -48,6 +57,8 @@ class Activity {
   virtual void setPreregistered(bool preregistered) = 0;
   /// Set before `schedule`, for an activity that is not preregistered.
   virtual void setCriteria(const ActivityCriteria& criteria) = 0;
+  /// Set before `schedule`, for an activity that is not preregistered; a reaction unless set.
+  virtual void setCause(RegistrationCause cause) = 0;
   /// Installs the run block. Preregistered: for what the platform knows without a block. Not preregistered:
   /// registers the activity anew with its criteria, counted from now; an earlier registration of the
   /// identifier, one whose run is under way included, is replaced, and the end of that run leaves the new
@@ -56,6 +67,9 @@ class Activity {
   /// Set before `schedule`, for a preregistered activity: what its client holds it to be registered for.
   /// Should the platform have lost that registration, or never got it, the activity is registered so.
   virtual void setExpectation(const ActivityExpectation& expectation) = 0;
+  /// Set before `schedule`, for a preregistered activity: whether its client has no record of a run that
+  /// there should have been. One that the platform runs after an upgrade is run then as after one.
+  virtual void setOwed(bool isOwed) = 0;
   /// Tells the platform, during a run that is about to be deferred, the date before which running again is of
   /// no use.
   virtual void setEarliestDate(Date date) = 0;
@@ -65,12 +79,16 @@ class Activity {
 
 /// The platform's scheduler of named background activities. It runs an activity once, no earlier than its
 /// delay, within its grace period where it can. A deferred run comes back by itself: within a second after
-/// the date it waits for, else after 10 s, doubling up to an hour. Activities never run twice at once, and
-/// one that is registered anew again and again not more than six times in ten minutes.
+/// the date it waits for, else after 10 s, doubling up to an hour. Activities never run twice at once. What
+/// reactions register is started six times in ten minutes at most.
 class ActivityScheduler {
  public:
   virtual ~ActivityScheduler() = default;
   virtual std::unique_ptr<Activity> newActivity(std::string identifier) = 0;
+  /// From here on no run is started: check-ins and registrations are only taken in, until as many `resume`
+  /// follow. Any thread.
+  virtual void suspend() = 0;
+  virtual void resume() = 0;
 };
 
 }  // namespace kvr

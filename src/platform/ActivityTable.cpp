@@ -18,6 +18,7 @@ constexpr const char* kRequiresNetwork = "requiresNetwork";
 constexpr const char* kPriority = "priority";
 constexpr const char* kRegisteredDate = "registeredDate";
 constexpr const char* kDueDate = "dueDate";
+constexpr const char* kHeldUntilDate = "heldUntilDate";
 
 constexpr const char* kResult = "result";
 constexpr const char* kEndedDate = "endedDate";
@@ -70,7 +71,9 @@ void ActivityTable::adopt(const Value& tree) {
     entry.registration = Registration{
         {value[kDelay].asInteger(), value[kGracePeriod].asInteger(), value[kRequiresNetwork].asBool()},
         value[kRegisteredDate].date(),
-        value[kDueDate].date()};
+        value[kDueDate].date(),
+        RegistrationCause::Demand,
+        std::nullopt};
     entry.registrationNumber = ++lastNumber_;
   }
 }
@@ -79,36 +82,61 @@ Value ActivityTable::tree() const {
   Value::Dictionary activities;
   for (const auto& [identifier, entry] : entries_) {
     if (!entry.registration) continue;
-    const auto& [criteria, registered, due] = *entry.registration;
-    activities.emplace(identifier, Value::Dictionary{{kDelay, criteria.delay},
-                                                     {kGracePeriod, criteria.gracePeriod},
-                                                     {kRequiresNetwork, criteria.requiresNetwork},
-                                                     {kPriority, kUtility},
-                                                     {kRegisteredDate, registered},
-                                                     {kDueDate, due}});
+    const auto& [criteria, registered, due, cause, heldUntil] = *entry.registration;
+    Value::Dictionary registration{{kDelay, criteria.delay},
+                                   {kGracePeriod, criteria.gracePeriod},
+                                   {kRequiresNetwork, criteria.requiresNetwork},
+                                   {kPriority, kUtility},
+                                   {kRegisteredDate, registered},
+                                   {kDueDate, due}};
+    if (heldUntil) registration.emplace(kHeldUntilDate, *heldUntil);
+    activities.emplace(identifier, std::move(registration));
   }
   Value::Dictionary tree = records_;
   tree.insert_or_assign(kActivities, std::move(activities));
   return tree;
 }
 
-ActivityBlock ActivityTable::add(const std::string& identifier, const ActivityCriteria& criteria,
-                                 ActivityBlock block, const Now& now, double draw) {
+ActivityTable::Registered ActivityTable::add(const std::string& identifier, const ActivityCriteria& criteria,
+                                             RegistrationCause cause, ActivityBlock block, const Now& now,
+                                             double draw) {
   Entry& entry = entries_[identifier];
   const Date opens = now.date + seconds(criteria.delay);
-  entry.registration = Registration{criteria, now.date, opens + seconds(criteria.gracePeriod) * draw};
+  entry.registration =
+      Registration{criteria, now.date, opens + seconds(criteria.gracePeriod) * draw, cause, std::nullopt};
   entry.registrationNumber = ++lastNumber_;
   entry.earliest.reset();
-  entry.notBefore = notBefore(identifier);
   entry.backOff = 0;
-  return std::exchange(entry.block, std::move(block));
+  holdBack(entry, now);
+  Registered registered{std::exchange(entry.block, std::move(block)), std::nullopt};
+  if (entry.registration->heldUntil && std::exchange(entry.knownHold, entry.notBefore) != entry.notBefore) {
+    registered.heldUntil = entry.registration->heldUntil;
+  }
+  return registered;
 }
 
-/// The uptime before which an activity is started too often.
-double ActivityTable::notBefore(const std::string& identifier) const {
-  const auto found = starts_.find(identifier);
-  if (found == starts_.end() || found->second.size() < kMostStarts) return 0;
-  return found->second.front() + kStartsPeriod;
+/// Has a new registration wait for as long as the limit of starts says, if it would come before.
+void ActivityTable::holdBack(Entry& entry, const Now& now) {
+  Registration& registration = *entry.registration;
+  entry.notBefore = 0;
+  registration.heldUntil.reset();
+  if (registration.cause == RegistrationCause::Demand || entry.starts.size() < kMostStarts) return;
+  const double end = *(entry.starts.end() - kMostStarts) + kStartsPeriod;
+  const Date date = now.date + (end - now.uptime);
+  if (date <= registration.due) return;
+  entry.notBefore = end;
+  registration.heldUntil = date;
+}
+
+/// Takes back that a run was started which the activity's own date has deferred; whether that changes the
+/// tree.
+bool ActivityTable::uncount(Entry& entry, const UnderWay& run, const Now& now) {
+  if (!run.isCounted) return false;
+  const auto start = std::ranges::find(entry.starts, run.started);
+  if (start != entry.starts.end()) entry.starts.erase(start);
+  if (entry.registrationNumber == run.registrationNumber || !entry.registration->heldUntil) return false;
+  holdBack(entry, now);
+  return true;
 }
 
 ActivityBlock ActivityTable::checkIn(const std::string& identifier, ActivityBlock block) {
@@ -120,22 +148,24 @@ ActivityBlock ActivityTable::checkIn(const std::string& identifier, ActivityBloc
 bool ActivityTable::isRegisteredFor(const std::string& identifier, Date date, const Now& now) const {
   const auto found = entries_.find(identifier);
   if (found == entries_.end() || !found->second.registration) return false;
-  const auto& [criteria, registered, due] = *found->second.registration;
-  const Date opens = registered + seconds(criteria.delay);
+  const Registration& registration = *found->second.registration;
+  const Date opens = registration.registered + seconds(registration.criteria.delay);
   // A date that had passed when it was registered opened its window at once.
-  return opens <= std::max(date, now.date) + kRounding && due <= opens + seconds(criteria.gracePeriod);
+  return opens <= std::max(date, now.date) + kRounding &&
+         registration.due <= opens + seconds(registration.criteria.gracePeriod);
 }
 
 // Occasions.
 
 void ActivityTable::noticeSystemVersion(const std::string& identifier,
-                                        const std::optional<std::string>& version) {
+                                        const std::optional<std::string>& version, bool isOwed) {
   const auto found = records_.find(kOSVersion);
   const bool isRecorded = found != records_.end();
+  const bool isAnother = version && isRecorded && found->second != Value(*version);
+  if (isRecorded && !isAnother && !isOwed) return;
   // A version that cannot be found out leaves an empty record, so that the occasion does not come back.
-  if (!isRecorded || (version && found->second != Value(*version))) {
-    noticeOccasion(identifier, kOSVersion, version.value_or(""));
-  }
+  const std::string recorded = isRecorded ? found->second.stringIfAny().value_or("") : "";
+  noticeOccasion(identifier, OccasionKind::Upgrade, version.value_or(recorded));
 }
 
 bool ActivityTable::noticeBoot(const std::string& identifier, const std::string& boot, bool recordsLost) {
@@ -145,29 +175,33 @@ bool ActivityTable::noticeBoot(const std::string& identifier, const std::string&
     return true;
   }
   if (found == records_.end() || found->second != Value(boot)) {
-    noticeOccasion(identifier, kBootIdentifier, boot);
+    noticeOccasion(identifier, OccasionKind::Boot, boot);
   }
   return false;
 }
 
-void ActivityTable::noticeOccasion(const std::string& identifier, std::string record, std::string fact) {
-  entries_[identifier].occasion = Occasion{++lastNumber_, std::move(record), std::move(fact)};
+void ActivityTable::noticeOccasion(const std::string& identifier, OccasionKind kind, std::string fact) {
+  entries_[identifier].occasion = Occasion{kind, ++lastNumber_, std::move(fact)};
 }
 
-/// Whether the entry's occasion is the first of those that can be served.
+/// Whether the entry's occasion is the first of those that can be served, and no other is being served.
 bool ActivityTable::isInTurn(const Entry& entry) const {
-  return entry.occasion && std::ranges::none_of(entries_, [&entry](const auto& other) {
-           const Entry& candidate = other.second;
-           return candidate.occasion && candidate.block && candidate.occasion->order < entry.occasion->order;
+  return entry.occasion && std::ranges::none_of(entries_, [&entry](const auto& item) {
+           const Entry& other = item.second;
+           if (&other == &entry) return false;
+           if (other.run && other.run->occasion) return true;
+           return other.occasion && other.block && other.occasion->kind < entry.occasion->kind;
          });
 }
 
-/// Whether some occasion's run is under way, or about to be.
+/// Whether some occasion's run is under way, or about to be. One that waits because its run failed holds up
+/// nothing but the occasion behind it.
 bool ActivityTable::isServingOccasions(const Now& now) const {
-  return std::ranges::any_of(entries_, [&now](const auto& item) {
+  return std::ranges::any_of(entries_, [this, &now](const auto& item) {
     const Entry& entry = item.second;
     if (!entry.occasion || !entry.block) return false;
-    return entry.run || (now.uptime >= entry.notBefore && now.date >= entry.earliest.value_or(now.date));
+    return entry.run || (isInTurn(entry) && now.uptime >= entry.notBefore &&
+                         now.date >= entry.earliest.value_or(now.date));
   });
 }
 
@@ -209,12 +243,16 @@ std::vector<ActivityTable::Run> ActivityTable::takeDue(const Now& now) {
     run.number = ++lastNumber_;
     run.registrationNumber = entry.registrationNumber;
     run.needsNetwork = entry.registration && entry.registration->criteria.requiresNetwork;
-    if (isInTurn(entry)) run.occasion = entry.occasion->order;
+    if (isInTurn(entry)) run.occasion = entry.occasion->number;
     run.started = now.uptime;
+    run.isCounted =
+        !run.occasion && entry.registration && entry.registration->cause == RegistrationCause::Reaction;
     entry.run = run;
-    auto& starts = starts_[identifier];
-    starts.push_back(now.uptime);
-    if (starts.size() > kMostStarts) starts.pop_front();
+    if (run.isCounted) {
+      entry.starts.push_back(now.uptime);
+      // One more than the limit asks for: this one may not count in the end.
+      if (entry.starts.size() > kMostStarts + 1) entry.starts.pop_front();
+    }
     runs.push_back({identifier, run.number, entry.block});
   }
   return runs;
@@ -271,18 +309,23 @@ ActivityTable::Ending ActivityTable::end(const std::string& identifier, std::uin
   Ending ending;
   ending.changesTree = recordRun(identifier, result, now);
   if (result != ActivityResult::Finished) {
+    if (run.earliest && uncount(*entry, run, now)) ending.changesTree = true;
     if (!isReplaced) defer(*entry, run, now);
     return ending;
   }
-  if (run.occasion && entry->occasion && entry->occasion->order == *run.occasion) {
-    records_.insert_or_assign(entry->occasion->record, entry->occasion->fact);
+  if (run.occasion && entry->occasion && entry->occasion->number == *run.occasion) {
+    const bool isBoot = entry->occasion->kind == OccasionKind::Boot;
+    records_.insert_or_assign(isBoot ? kBootIdentifier : kOSVersion, entry->occasion->fact);
     entry->occasion.reset();
-    ending.changesTree = true;
+    ending.changesTree = ending.servesOccasion = true;
   }
   if (isReplaced) return ending;
   ending.changesTree = ending.changesTree || entry->registration;
   ending.released = std::move(entry->block);
-  entries_.erase(identifier);
+  Entry rest;
+  rest.starts = std::move(entry->starts);
+  rest.knownHold = entry->knownHold;
+  *entry = std::move(rest);
   return ending;
 }
 

@@ -16,14 +16,13 @@ namespace kvr {
 /// A *registration* is an activity's criteria and the dates that follow from them: its *window* opens `delay`
 /// seconds after it was registered and is `gracePeriod` seconds long; the *due date* is one point in it,
 /// drawn once. A *check-in* brings the block to run; without one a registration waits. An *occasion* is a
-/// reason of the platform's own to run an activity that has checked in: the system was upgraded, or started
-/// anew. Occasions are served one after the other, in the order noticed, and before what is registered, so
-/// that none works on what another is about to change.
+/// reason of the platform's own to run an activity that has checked in: the system was started anew, or
+/// upgraded. Occasions are served one after the other, the boot before the upgrade whichever was noticed
+/// first, and before what is registered, so that none works on what another is about to change.
 ///
-///     table.add("outreach", {.delay = 3600, .gracePeriod = 360}, block, now, 0.5);
-///     const auto wait = table.secondsToNext(now);           // arm a timer
-///     for (auto& run : table.takeDue(later)) start(run);
-///     table.end(identifier, number, ActivityResult::Finished, later);
+///     table.add("outreach", {.delay = 3600, .gracePeriod = 360}, RegistrationCause::Demand, block, now,
+///     0.5); const auto wait = table.secondsToNext(now);           // arm a timer for (auto& run :
+///     table.takeDue(later)) start(run); table.end(identifier, number, ActivityResult::Finished, later);
 ///
 /// Facts in, decisions out: it reads no clock and starts nothing. Not thread-safe.
 class ActivityTable {
@@ -44,17 +43,25 @@ class ActivityTable {
 
   /// What the end of a run led to.
   struct Ending {
-    bool changesTree = false;  ///< whether what is persisted has changed
-    ActivityBlock released;    ///< a block that is not needed any more
+    bool changesTree = false;     ///< whether what is persisted has changed
+    bool servesOccasion = false;  ///< which is to be stored before anything else is started
+    ActivityBlock released;       ///< a block that is not needed any more
+  };
+
+  /// What a registration led to.
+  struct Registered {
+    ActivityBlock replaced;         ///< a block that is not needed any more
+    std::optional<Date> heldUntil;  ///< it waits until then for the limit of starts, which was not known yet
   };
 
   static constexpr double kFirstBackOff = 10;      ///< seconds
   static constexpr double kLongestBackOff = 3600;  ///< seconds
   /// Between the starts of two runs that are one registration's, in seconds.
   static constexpr double kShortestCycle = 0.5;
-  /// An activity that was started so often within so many seconds waits when it is registered anew. Nobody
-  /// who can have it registered again and again (a service whose dates change with each answer, whoever posts
-  /// notifications) makes it run without a pause.
+  /// An activity that reactions had started so often within so many seconds waits when one more registers it
+  /// for before then. Nobody who can have it registered again and again (a service whose dates change with
+  /// each answer, whoever posts notifications) makes it run without a pause. A run that the activity's own
+  /// date deferred does not count.
   static constexpr std::size_t kMostStarts = 6;
   static constexpr double kStartsPeriod = 600;
 
@@ -68,10 +75,10 @@ class ActivityTable {
   void adopt(const Value& tree);
   Value tree() const;
 
-  /// Registers an activity anew. `draw`, from 0 to below 1, decides the due date. Returns the block that was
-  /// replaced. A run that is under way goes on and no longer concerns the registration.
-  ActivityBlock add(const std::string& identifier, const ActivityCriteria& criteria, ActivityBlock block,
-                    const Now& now, double draw);
+  /// Registers an activity anew. `draw`, from 0 to below 1, decides the due date. A run that is under way
+  /// goes on and no longer concerns the registration.
+  Registered add(const std::string& identifier, const ActivityCriteria& criteria, RegistrationCause cause,
+                 ActivityBlock block, const Now& now, double draw);
   /// Brings a block for whatever the identifier is or will be due for; a registration that was made with a
   /// block keeps its own. Returns the block that is not needed.
   ActivityBlock checkIn(const std::string& identifier, ActivityBlock block);
@@ -79,9 +86,10 @@ class ActivityTable {
   /// grace period.
   bool isRegisteredFor(const std::string& identifier, Date date, const Now& now) const;
 
-  /// An occasion when none or another version is recorded. Nothing as the version (it cannot be found out) is
-  /// one only when none is recorded. The version is recorded once the run has finished.
-  void noticeSystemVersion(const std::string& identifier, const std::optional<std::string>& version);
+  /// An occasion when none or another version is recorded, or when a run is owed. Nothing as the version (it
+  /// cannot be found out) is no other one. The version is recorded once the run has finished.
+  void noticeSystemVersion(const std::string& identifier, const std::optional<std::string>& version,
+                           bool isOwed);
   /// An occasion when another boot is recorded, or when `recordsLost`: then it may have been any. The first
   /// boot ever is only recorded. Returns whether what is persisted has changed.
   bool noticeBoot(const std::string& identifier, const std::string& boot, bool recordsLost);
@@ -105,19 +113,24 @@ class ActivityTable {
     ActivityCriteria criteria;
     Date registered;
     Date due;
+    RegistrationCause cause = RegistrationCause::Demand;
+    std::optional<Date> heldUntil;  ///< by the limit of starts
   };
+  /// In the order in which they are served.
+  enum class OccasionKind { Boot, Upgrade };
   struct Occasion {
-    std::uint64_t order = 0;
-    std::string record;  ///< the key under which `fact` is recorded once the occasion has been served
-    std::string fact;
+    OccasionKind kind = OccasionKind::Boot;
+    std::uint64_t number = 0;
+    std::string fact;  ///< is recorded once the occasion has been served
   };
   struct UnderWay {
     std::uint64_t number = 0;
     std::uint64_t registrationNumber = 0;
     bool needsNetwork = false;
     bool lostNetwork = false;
-    std::optional<std::uint64_t> occasion;  ///< its order
+    std::optional<std::uint64_t> occasion;  ///< its number
     double started = 0;                     ///< uptime
+    bool isCounted = false;                 ///< among the starts
     std::optional<Date> earliest;
   };
   struct Entry {
@@ -130,11 +143,15 @@ class ActivityTable {
     std::optional<Date> earliest;
     double notBefore = 0;  ///< uptime
     double backOff = 0;    ///< seconds of the last wait
+    // These outlive registrations.
+    std::deque<double> starts;  ///< the last ones that reactions led to, in uptime
+    double knownHold = 0;       ///< the uptime until which a hold has been told
   };
 
-  double notBefore(const std::string& identifier) const;
+  static void holdBack(Entry& entry, const Now& now);
+  static bool uncount(Entry& entry, const UnderWay& run, const Now& now);
   Entry* runningEntry(const std::string& identifier);
-  void noticeOccasion(const std::string& identifier, std::string record, std::string fact);
+  void noticeOccasion(const std::string& identifier, OccasionKind kind, std::string fact);
   bool isInTurn(const Entry& entry) const;
   bool isServingOccasions(const Now& now) const;
   bool mayRun(const Entry& entry, const Now& now) const;
@@ -145,8 +162,7 @@ class ActivityTable {
   void defer(Entry& entry, const UnderWay& run, const Now& now);
 
   std::map<std::string, Entry, std::less<>> entries_;
-  std::map<std::string, std::deque<double>> starts_;  ///< the last ones of each activity, in uptime
-  Value::Dictionary records_;                         ///< the tree's top level, but for the registrations
+  Value::Dictionary records_;  ///< the tree's top level, but for the registrations
   std::uint64_t lastNumber_ = 0;
 };
 

@@ -27,6 +27,10 @@ class FileActivityScheduler::Handle : public Activity {
     const std::lock_guard lock(mutex_);
     criteria_ = criteria;
   }
+  void setCause(RegistrationCause cause) override {
+    const std::lock_guard lock(mutex_);
+    cause_ = cause;
+  }
   void schedule(ActivityBlock block) override {
     bool preregistered = false;
     {
@@ -40,6 +44,10 @@ class FileActivityScheduler::Handle : public Activity {
     const std::lock_guard lock(mutex_);
     expectation_ = expectation;
   }
+  void setOwed(bool isOwed) override {
+    const std::lock_guard lock(mutex_);
+    isOwed_ = isOwed;
+  }
   void setEarliestDate(Date date) override { scheduler_.setEarliestDate(identifier_, date); }
   std::optional<DeferralReason> shouldDefer() const override { return scheduler_.shouldDefer(identifier_); }
 
@@ -47,9 +55,17 @@ class FileActivityScheduler::Handle : public Activity {
     const std::lock_guard lock(mutex_);
     return criteria_;
   }
+  RegistrationCause cause() const {
+    const std::lock_guard lock(mutex_);
+    return cause_;
+  }
   std::optional<ActivityExpectation> expectation() const {
     const std::lock_guard lock(mutex_);
     return expectation_;
+  }
+  bool isOwed() const {
+    const std::lock_guard lock(mutex_);
+    return isOwed_;
   }
 
  private:
@@ -58,7 +74,9 @@ class FileActivityScheduler::Handle : public Activity {
   mutable std::mutex mutex_;  ///< guards what follows
   bool preregistered_ = false;
   ActivityCriteria criteria_;
+  RegistrationCause cause_ = RegistrationCause::Reaction;
   std::optional<ActivityExpectation> expectation_;
+  bool isOwed_ = false;
 };
 
 /// The other end of a run's handler. A handler that goes without an answer defers its run.
@@ -90,6 +108,27 @@ class FileActivityScheduler::RunEnd {
   bool told_ = false;
 };
 
+/// One `suspend`, which has been called; `resume` follows at its end, however that comes.
+class FileActivityScheduler::Suspension {
+ public:
+  explicit Suspension(FileActivityScheduler& scheduler) : scheduler_(scheduler), life_(scheduler.life_) {}
+  Suspension(const Suspension&) = delete;
+  Suspension& operator=(const Suspension&) = delete;
+  ~Suspension() {
+    const auto alive = life_.lock();
+    if (!alive) return;
+    try {
+      scheduler_.resume();
+    } catch (const std::exception& error) {
+      scheduler_.log().error("activities are not started: %@", std::string(error.what()));
+    }
+  }
+
+ private:
+  FileActivityScheduler& scheduler_;
+  const std::weak_ptr<const bool> life_;
+};
+
 FileActivityScheduler::FileActivityScheduler(PropertyListFiles& lists, const Clock& clock, WorkQueues& queues,
                                              Random& random, const DeviceProperties& device, Log& log,
                                              const std::string& mainBundleIdentifier,
@@ -108,6 +147,19 @@ std::unique_ptr<Activity> FileActivityScheduler::newActivity(std::string identif
   return std::make_unique<Handle>(*this, std::move(identifier));
 }
 
+void FileActivityScheduler::suspend() {
+  const std::lock_guard lock(mutex_);
+  ++suspensions_;
+}
+
+void FileActivityScheduler::resume() {
+  {
+    const std::lock_guard lock(mutex_);
+    --suspensions_;
+  }
+  startDue();
+}
+
 void FileActivityScheduler::checkIn(const Handle& handle, ActivityBlock block) {
   const std::string& identifier = handle.identifier();
   const auto expected = handle.expectation();
@@ -120,12 +172,16 @@ void FileActivityScheduler::checkIn(const Handle& handle, ActivityBlock block) {
   {
     const std::lock_guard lock(mutex_);
     if (expected && !table_.isRegisteredFor(identifier, expected->date, now())) {
-      replaced = table_.add(identifier, expected->criteria, std::move(block), now(), fraction);
+      replaced = table_
+                     .add(identifier, expected->criteria, RegistrationCause::Demand, std::move(block), now(),
+                          fraction)
+                     .replaced;
       changed = true;
     } else {
       replaced = table_.checkIn(identifier, std::move(block));
     }
-    if (identifier == occasions_.afterUpgrade) table_.noticeSystemVersion(identifier, version);
+    if (identifier == occasions_.afterUpgrade)
+      table_.noticeSystemVersion(identifier, version, handle.isOwed());
     if (identifier == occasions_.afterBoot) {
       changed |= table_.noticeBoot(identifier, bootIdentifier(), registrationsLost_);
       registrationsLost_ = false;
@@ -137,11 +193,17 @@ void FileActivityScheduler::checkIn(const Handle& handle, ActivityBlock block) {
 
 void FileActivityScheduler::registerAnew(const Handle& handle, ActivityBlock block) {
   const double fraction = draw();
-  ActivityBlock replaced;
+  ActivityTable::Registered registered;
   load();
   {
     const std::lock_guard lock(mutex_);
-    replaced = table_.add(handle.identifier(), handle.criteria(), std::move(block), now(), fraction);
+    registered =
+        table_.add(handle.identifier(), handle.criteria(), handle.cause(), std::move(block), now(), fraction);
+  }
+  if (registered.heldUntil) {
+    log_.standard("'%@' was started %d times within %d seconds, and is held back until %@",
+                  handle.identifier(), ActivityTable::kMostStarts,
+                  static_cast<int>(ActivityTable::kStartsPeriod), *registered.heldUntil);
   }
   save();
   startDue();
@@ -195,7 +257,7 @@ void FileActivityScheduler::startDue() {
   std::vector<ActivityTable::Run> runs;
   {
     const std::lock_guard lock(mutex_);
-    if (ending_) return;
+    if (ending_ || suspensions_ > 0) return;
     const auto moment = now();
     runs = table_.takeDue(moment);
     arm(table_.secondsToNext(moment));
@@ -220,10 +282,12 @@ void FileActivityScheduler::end(const std::string& identifier, std::uint64_t num
   {
     const std::lock_guard lock(mutex_);
     ending = table_.end(identifier, number, result, now());
+    if (ending.servesOccasion) ++suspensions_;
   }
+  const auto suspension = ending.servesOccasion ? std::make_shared<Suspension>(*this) : nullptr;
   if (ending.changesTree) {
     // Whoever tells the end of a run, the main queue perhaps, is not made to wait for the disk.
-    queues_.concurrentQueue(Priority::Default)->async([this, alive = life()] {
+    queues_.concurrentQueue(Priority::Default)->async([this, alive = life(), suspension] {
       if (!alive.expired()) save();
     });
   }

@@ -19,7 +19,7 @@ namespace kvr {
 
 /// The activities that the platform itself has run.
 struct ActivityOccasions {
-  std::string afterUpgrade;  ///< once on a new device, and whenever the system's version has changed
+  std::string afterUpgrade;  ///< once on a new device, when a run is owed, and when the version has changed
   std::string afterBoot;     ///< whenever the device has been started anew
 };
 
@@ -31,10 +31,14 @@ struct ActivityOccasions {
 /// check-in that says the date it expects is registered for that date. A file that cannot be read is left
 /// alone; meanwhile registrations are held in memory.
 ///
-/// Runs are started on the concurrent queue of default priority. Whoever destroys it has ended the queues.
+/// Runs are started on the concurrent queue of default priority; after an occasion that has been served, only
+/// when the file says so: whoever is killed then must not have it come back after what followed it. Whoever
+/// destroys it has ended the queues.
 class FileActivityScheduler : public ActivityScheduler {
  public:
   std::unique_ptr<Activity> newActivity(std::string identifier) override;
+  void suspend() override;
+  void resume() override;
 
   /// From here on no run is started, and those under way are asked to defer. Any thread.
   void beginEnding();
@@ -64,6 +68,7 @@ class FileActivityScheduler : public ActivityScheduler {
  private:
   class Handle;
   class RunEnd;
+  class Suspension;
 
   void checkIn(const Handle& handle, ActivityBlock block);
   void registerAnew(const Handle& handle, ActivityBlock block);
@@ -95,6 +100,7 @@ class FileActivityScheduler : public ActivityScheduler {
   bool unreadable_ = false;  ///< the file, so far: nothing may be written in its place
   bool registrationsLost_ = false;
   bool networkReachable_ = true;
+  int suspensions_ = 0;
   bool ending_ = false;
 
   /// Ends first: what goes with the rest finds nobody to tell.

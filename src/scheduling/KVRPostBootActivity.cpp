@@ -32,7 +32,7 @@ std::optional<Date> KVRPostBootActivity::registerAgain(
   const auto date = scheduler->scheduledActivityDate();
   if (!date) return std::nullopt;
   platform_.log.standard("'%@' not complete, rescheduling", scheduler->identifier());
-  scheduler->scheduleActivityForDate(date);
+  scheduler->scheduleActivityForDate(date, RegistrationCause::Demand);
   return date;
 }
 

@@ -12,13 +12,13 @@ namespace kvr {
 
 std::string KVRPostUpgradeActivity::identifier() const { return activity::kPostUpgrade; }
 
+bool KVRPostUpgradeActivity::isOwed() const {
+  return !platform_.preferences.boolForKey(preference::kPostUpgradeActivityCompleted);
+}
+
 void KVRPostUpgradeActivity::performActivityForScheduler(const std::shared_ptr<KVRScheduler>& /*scheduler*/,
                                                          ActivityHandler withCompletionHandler) {
-  if (platform_.preferences.boolForKey(preference::kPostUpgradeActivityCompleted)) {
-    performLaterRun();
-  } else {
-    performFirstRun();
-  }
+  isOwed() ? performFirstRun() : performLaterRun();
   recordOSVersion();
   withCompletionHandler(ActivityResult::Finished);
 }
@@ -31,7 +31,7 @@ void KVRPostUpgradeActivity::performLaterRun() {
   platform_.log.standard("Forcing conversion outreach on upgrade");
   KVRScheduler::newSchedulerWithActivityDelegate(platform_,
                                                  std::make_shared<KVRConversionOutreachActivity>(platform_))
-      ->scheduleActivityForDate(platform_.clock.now());
+      ->scheduleActivityForDate(platform_.clock.now(), RegistrationCause::Demand);
 }
 
 void KVRPostUpgradeActivity::performFirstRun() {
@@ -43,7 +43,7 @@ void KVRPostUpgradeActivity::performFirstRun() {
   if (hasAccount) {
     KVRScheduler::newSchedulerWithActivityDelegate(platform_,
                                                    std::make_shared<KVROutreachActivity>(platform_))
-        ->scheduleActivityForDate(platform_.clock.now());
+        ->scheduleActivityForDate(platform_.clock.now(), RegistrationCause::Demand);
     preferences.setObject(true, preference::kInitialOutreachActivityScheduled);
   } else {
     platform_.log.standard(

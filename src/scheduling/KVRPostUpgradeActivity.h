@@ -14,6 +14,8 @@ class KVRPostUpgradeActivity : public KVRSchedulerActivityDelegate {
 
   std::string identifier() const override;
   bool requiresNetwork() const override { return false; }
+  /// Until the first run: also when the preferences have been lost.
+  bool isOwed() const override;
   void performActivityForScheduler(const std::shared_ptr<KVRScheduler>& scheduler,
                                    ActivityHandler withCompletionHandler) override;
 

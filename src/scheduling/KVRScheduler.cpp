@@ -80,6 +80,7 @@ std::unique_lock<std::recursive_mutex> KVRScheduler::takeTurn(Platform& platform
 void KVRScheduler::monitorForScheduledActivity() {
   platform_.log.standard("monitorForScheduledActivity for '%@'", identifier());
   activity_->setPreregistered(true);
+  activity_->setOwed(activityDelegate()->isOwed());
   if (const auto target = scheduledActivityDate()) {
     activity_->setExpectation(
         {*target, criteria(*target - platform_.clock.now(), activityDelegate()->requiresNetwork())});
@@ -89,18 +90,20 @@ void KVRScheduler::monitorForScheduledActivity() {
   });
 }
 
-void KVRScheduler::scheduleActivityWithDelay(double delay) {
-  _scheduleActivityWithDelay(delay, platform_.clock.now() + delay);
+void KVRScheduler::scheduleActivityWithDelay(double delay, RegistrationCause cause) {
+  _scheduleActivityWithDelay(delay, platform_.clock.now() + delay, cause);
 }
 
-void KVRScheduler::scheduleActivityForDate(std::optional<Date> date) {
-  _scheduleActivityWithDelay(date ? *date - platform_.clock.now() : 0, date);
+void KVRScheduler::scheduleActivityForDate(std::optional<Date> date, RegistrationCause cause) {
+  _scheduleActivityWithDelay(date ? *date - platform_.clock.now() : 0, date, cause);
 }
 
-void KVRScheduler::_scheduleActivityWithDelay(double delay, std::optional<Date> forDate) {
+void KVRScheduler::_scheduleActivityWithDelay(double delay, std::optional<Date> forDate,
+                                              RegistrationCause cause) {
   const auto turn = takeTurn(platform_);
   platform_.log.standard("scheduled '%@' with delay: %.02f (%@)", identifier(), delay, forDate);
   activity_->setPreregistered(false);
+  activity_->setCause(cause);
   activity_->setCriteria(criteria(delay, activityDelegate()->requiresNetwork()));
   platform_.preferences.setObject(forDate, targetDateKey_);
   activity_->schedule([self = shared_from_this()](const ActivityHandler& handler) {

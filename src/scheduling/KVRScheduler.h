@@ -39,10 +39,12 @@ class KVRScheduler : public std::enable_shared_from_this<KVRScheduler> {
 
   /// Checks in for an activity that was scheduled by an earlier start, or that the platform runs by itself.
   void monitorForScheduledActivity();
-  /// `delay` in seconds; one below zero makes a target date in the past.
-  void scheduleActivityWithDelay(double delay);
+  /// `delay` in seconds; one below zero makes a target date in the past. Whoever passes on what a client
+  /// asked for says that it is a demand.
+  void scheduleActivityWithDelay(double delay, RegistrationCause cause = RegistrationCause::Reaction);
   /// A date in the past, and no date at all, run without delay; no date removes the stored one.
-  void scheduleActivityForDate(std::optional<Date> date);
+  void scheduleActivityForDate(std::optional<Date> date,
+                               RegistrationCause cause = RegistrationCause::Reaction);
   /// The stored target date.
   std::optional<Date> scheduledActivityDate() const;
   /// The gate: one run by the platform. Answers `block` once.
@@ -58,7 +60,7 @@ class KVRScheduler : public std::enable_shared_from_this<KVRScheduler> {
   AtomicProperty<std::shared_ptr<KVRSchedulerActivityDelegate>> activityDelegate;
 
  private:
-  void _scheduleActivityWithDelay(double delay, std::optional<Date> forDate);
+  void _scheduleActivityWithDelay(double delay, std::optional<Date> forDate, RegistrationCause cause);
   void relay(ActivityResult result, const Value& startedFor, const ActivityHandler& block);
 
   Platform& platform_;

@@ -126,8 +126,11 @@ TEST_F(ALocalScheduler, WaitsForTheNetworkWithoutAskingAgain) {
 TEST_F(ALocalScheduler, RunsOccasionsAfterUpgradeBootAndDamage) {
   const auto runsOfAStart = [this] {
     const auto local = start();
+    local->scheduler.suspend();
     local->monitor(kUpgrade);
     local->monitor(kBoot);
+    EXPECT_EQ(local->scheduler.runsUnderWay(), 0U);
+    local->scheduler.resume();
     return local->finish();
   };
   properties.answers["ProductVersion"] = "17.1";
@@ -135,17 +138,18 @@ TEST_F(ALocalScheduler, RunsOccasionsAfterUpgradeBootAndDamage) {
   EXPECT_THAT(runsOfAStart(), IsEmpty());
   writeFile(device + "/boot_id", "two\n");
   EXPECT_THAT(runsOfAStart(), ElementsAre(kBoot));
+  writeFile(device + "/boot_id", "three\n");
   properties.answers["ProductVersion"] = "17.2";
-  EXPECT_THAT(runsOfAStart(), ElementsAre(kUpgrade));
+  EXPECT_THAT(runsOfAStart(), ElementsAre(kBoot, kUpgrade));
   properties.answers.erase("ProductVersion");
   EXPECT_THAT(runsOfAStart(), IsEmpty());
   properties.answers["ProductVersion"] = "17.2";
   EXPECT_THAT(runsOfAStart(), IsEmpty());
   EXPECT_THAT(world.errors(), IsEmpty());
   world.put(path, "damaged");
-  EXPECT_THAT(runsOfAStart(), ElementsAre(kUpgrade, kBoot));
+  EXPECT_THAT(runsOfAStart(), ElementsAre(kBoot, kUpgrade));
   EXPECT_THAT(world.errors(), SizeIs(1));
-  EXPECT_EQ(stored()["bootIdentifier"], Value("two"));
+  EXPECT_EQ(stored()["bootIdentifier"], Value("three"));
 }
 
 TEST(LocalCarriers, AreNamedByTheirIndex) {

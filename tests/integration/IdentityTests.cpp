@@ -28,9 +28,7 @@ struct TheAgentsPeer : ::testing::Test {
     // Another user can get at the bus and the programs. What a member does is done at once.
     fs::permissions(world.bus.directory(), fs::perms(0711));
     fs::permissions(world.directory.path(), fs::perms(0711));
-    Dictionary preferences = world.preferences().dictionary();
-    preferences["PostUpgradeOutreachDelay"] = 0;
-    world.setPreferences(preferences);
+    world.changePreference("PostUpgradeOutreachDelay", 0);
     world.misbehave(R"([{"status":500}])");
     world.startAgent();
   }

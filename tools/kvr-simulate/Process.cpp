@@ -22,6 +22,8 @@ class RecordingActivity : public Activity {
     isPreregistered_ = preregistered;
   }
   void setCriteria(const ActivityCriteria& criteria) override { activity_->setCriteria(criteria); }
+  void setCause(RegistrationCause cause) override { activity_->setCause(cause); }
+  void setOwed(bool isOwed) override { activity_->setOwed(isOwed); }
   void setExpectation(const ActivityExpectation& expectation) override {
     activity_->setExpectation(expectation);
   }
@@ -138,7 +140,10 @@ Process::~Process() {
   simulated.queues.end();
 }
 
-void Process::start() { startUp_ = std::make_unique<StartUp>(platform_); }
+void Process::start() {
+  StartUp::announce(simulated.log);
+  startUp_ = std::make_unique<StartUp>(platform_);
+}
 
 void Process::letOthersRun() {
   if (startUp_) return;

@@ -21,6 +21,8 @@ class RecordingActivities : public ActivityScheduler {
       : scheduler_(scheduler), log_(log), invariants_(invariants), checkedIn_(std::move(checkedIn)) {}
 
   std::unique_ptr<Activity> newActivity(std::string identifier) override;
+  void suspend() override { scheduler_.suspend(); }
+  void resume() override { scheduler_.resume(); }
 
  private:
   ActivityScheduler& scheduler_;

@@ -1,11 +1,14 @@
 #include "platform/local/LocalPlatform.h"
 
 #include <chrono>
+#include <utility>
 
 namespace kvr {
 
-LocalPlatform::LocalPlatform(EventLoop& mainLoop, std::function<void()> busLost)
-    : queues(mainLoop, *log),
+LocalPlatform::LocalPlatform(EventLoop& mainLoop, std::unique_ptr<LocalLog> theLog,
+                             std::function<void()> busLost)
+    : log(std::move(theLog)),
+      queues(mainLoop, *log),
       services(queues, *log, entitlements, std::move(busLost)),
       activities(mainLoop, root, clock, queues, random, deviceProperties, *log, kMainBundleIdentifier,
                  {"com.tarsil.kvragent.upgrade", "com.tarsil.kvragent.boot"}, {}),

@@ -40,7 +40,7 @@ namespace kvr {
 /// Built on the main thread, before the main loop runs. At the end, after the loop: `end`, then destroy.
 struct LocalPlatform {
   /// `busLost` is called on the bus thread, see `LocalServiceListeners`.
-  LocalPlatform(EventLoop& mainLoop, std::function<void()> busLost);
+  LocalPlatform(EventLoop& mainLoop, std::unique_ptr<LocalLog> log, std::function<void()> busLost);
 
   /// From here on nothing new is begun of the agent's own accord. To be called before the loop is left, which
   /// lets go of what was delayed.
@@ -50,7 +50,7 @@ struct LocalPlatform {
   bool end(double limit);
 
   // In this order: what stands further down uses what stands above.
-  const std::unique_ptr<LocalLog> log = LocalLog::fromEnvironment();
+  const std::unique_ptr<LocalLog> log;
   LocalClock clock;
   LocalRandom random;
   LocalFiles files{*log};

@@ -2,6 +2,7 @@
 
 #include "platform/DeviceProperties.h"
 
+#include <functional>
 #include <map>
 #include <string>
 
@@ -12,8 +13,10 @@ class SimulatedDeviceProperties : public DeviceProperties {
  public:
   std::map<std::string, std::string, std::less<>> answers;
   bool internalInstall = false;
+  std::function<void()> whenAsked;  ///< does what others do meanwhile
 
   std::optional<std::string> answer(std::string_view question) const override {
+    if (whenAsked) whenAsked();
     const auto found = answers.find(question);
     return found == answers.end() ? std::nullopt : std::optional(found->second);
   }

@@ -36,7 +36,8 @@ AgentWorld::AgentWorld(Attestation attestation) {
   constexpr std::string_view kListening = "listening on ";
   serviceURL_ = service_->waitForOutput(kListening).substr(kListening.size());
   directory.write(std::string("home/") + kActivities, "{ OSVersion = \"17.9\"; activities = {}; }");
-  setPreferences(Dictionary{{"ServerVersionURL", serviceURL_ + "/library/TARSIL/asset/kvrV2.plist"},
+  setPreferences(Dictionary{{"PostUpgradeActivityCompleted", true},
+                            {"ServerVersionURL", serviceURL_ + "/library/TARSIL/asset/kvrV2.plist"},
                             {"WarrantyURL", serviceURL_ + "/api/v3/coverage/summary"},
                             {"WearablesWarrantyURL", serviceURL_ + "/api/v2/coverage/summary"}});
 }

@@ -24,7 +24,10 @@ class AgentWorld {
   explicit AgentWorld(Attestation attestation = Attestation::Required);
 
   /// From here on it is the device's first start.
-  void becomeNewDevice() const { std::filesystem::remove(home() / kActivities); }
+  void becomeNewDevice() const {
+    std::filesystem::remove(home() / kActivities);
+    changePreference("PostUpgradeActivityCompleted", {});
+  }
   /// Starts the agent, after killing one that runs, and returns once it has its name on the bus.
   void startAgent();
   /// Instead: has the bus start it at the first call. It prints to the bus's error output, and its exit
@@ -35,8 +38,12 @@ class AgentWorld {
   ChildProcess& agent() { return *agent_; }
   RawBusClient newClient() const { return RawBusClient(bus.address()); }
 
+  /// A new file in the old one's place: nobody reads half of it.
   void writeDeviceFile(const std::string& name, const Value& tree) const {
-    directory.write("device/" + name, *writePropertyList(tree, PropertyListEncoding::XML));
+    const auto path = directory.write("device/new", *writePropertyList(tree, PropertyListEncoding::XML));
+    const auto place = directory / "device" / name;
+    std::filesystem::create_directories(place.parent_path());
+    std::filesystem::rename(path, place);
   }
   void entitle(const Value& value) const;
   void setLocale(const std::string& identifier) const {
@@ -62,6 +69,12 @@ class AgentWorld {
     writeFile(home() / kPreferences, *writePropertyList(preferences, PropertyListEncoding::Binary));
   }
   Value preferences() const { return file(kPreferences); }
+  void changePreference(const std::string& key, const Value& value) const {
+    Dictionary changed = preferences().dictionary();
+    changed.erase(key);
+    if (!value.isNull()) changed.emplace(key, value);
+    setPreferences(changed);
+  }
   std::string cacheFileOf(const std::string& serialNumber) const;
   std::filesystem::path home() const { return directory / "home"; }
 

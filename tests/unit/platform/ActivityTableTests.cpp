@@ -18,6 +18,10 @@ struct AnActivityTable : ::testing::Test {
     }
     return names;
   }
+  ActivityTable::Registered add(const std::string& name, const ActivityCriteria& criteria, double draw = 0,
+                                RegistrationCause cause = RegistrationCause::Demand) {
+    return table.add(name, criteria, cause, kBlock, now, draw);
+  }
   ActivityTable::Ending end(const std::string& name, ActivityResult result) {
     return table.end(name, numbers[name], result, now);
   }
@@ -40,7 +44,7 @@ TEST_F(AnActivityTable, RunsAnActivityOnceAtThePointDrawnInItsWindow) {
   const std::tuple<ActivityCriteria, double, double> cases[] = {
       {{0, 0}, 0.5, 0}, {{3600, 360}, 0, 3600}, {{3600, 360}, 0.5, 3780}, {{-5, -5}, 0.5, 0}};
   for (const auto& [criteria, draw, due] : cases) {
-    table.add("a", criteria, kBlock, now, draw);
+    add("a", criteria, draw);
     EXPECT_THAT(table.secondsToNext(now), Optional(due));
     EXPECT_TRUE(due == 0 || started().empty());
     EXPECT_THAT(next(), ElementsAre("a"));
@@ -51,15 +55,15 @@ TEST_F(AnActivityTable, RunsAnActivityOnceAtThePointDrawnInItsWindow) {
 }
 
 TEST_F(AnActivityTable, SharesAWakeUpBetweenOverlappingWindows) {
-  table.add("early", {100, 50}, kBlock, now, 0.8);
-  table.add("late", {120, 500}, kBlock, now, 0.9);
-  table.add("apart", {200, 0}, kBlock, now, 0);
+  add("early", {100, 50}, 0.8);
+  add("late", {120, 500}, 0.9);
+  add("apart", {200, 0});
   EXPECT_THAT(next(), ElementsAre("early", "late"));
   EXPECT_THAT(table.secondsToNext(now), Optional(60.0));
 }
 
 TEST_F(AnActivityTable, WaitsForTheNetworkThatAnActivityNeeds) {
-  table.add("remote", {10, 0, true}, kBlock, now, 0);
+  add("remote", {10, 0, true});
   now.networkReachable = false;
   EXPECT_EQ(table.secondsToNext(now), std::nullopt);
   pass(1000);
@@ -79,7 +83,7 @@ TEST_F(AnActivityTable, WaitsForTheNetworkThatAnActivityNeeds) {
 }
 
 TEST_F(AnActivityTable, BacksOffFromTenSecondsToAnHour) {
-  table.add("a", {}, kBlock, now, 0);
+  add("a", {});
   EXPECT_THAT(started(), ElementsAre("a"));
   for (const double wait : {10, 20, 40, 80, 160, 320, 640, 1280, 2560, 3600, 3600}) {
     // That it is deferred is news once.
@@ -91,13 +95,13 @@ TEST_F(AnActivityTable, BacksOffFromTenSecondsToAnHour) {
     EXPECT_THAT(next(), ElementsAre("a"));
   }
   // A new registration counts afresh.
-  table.add("a", {}, kBlock, now, 0);
+  add("a", {});
   end("a", kDeferred);
   EXPECT_THAT(started(), ElementsAre("a"));
 }
 
 TEST_F(AnActivityTable, RunsAgainAtTheDateADeferredRunWaitsFor) {
-  table.add("a", {}, kBlock, now, 0);
+  add("a", {});
   EXPECT_THAT(started(), ElementsAre("a"));
   table.setEarliestDate("a", now.date + 500, now);
   pass(1);
@@ -120,9 +124,9 @@ TEST_F(AnActivityTable, RunsAgainAtTheDateADeferredRunWaitsFor) {
 
 TEST_F(AnActivityTable, KeepsARegistrationThatWasMadeDuringTheRun) {
   for (const auto result : {kFinished, kDeferred}) {
-    table.add("a", {}, kBlock, now, 0);
+    add("a", {});
     EXPECT_THAT(started(), ElementsAre("a"));
-    table.add("a", {5, 0}, kBlock, now, 0);
+    add("a", {5, 0});
     pass(20);
     EXPECT_THAT(started(), IsEmpty()) << "never twice at once";
     end("a", result);
@@ -135,22 +139,51 @@ TEST_F(AnActivityTable, KeepsARegistrationThatWasMadeDuringTheRun) {
   }
 }
 
-TEST_F(AnActivityTable, DoesNotRunWithoutAPauseHoweverOftenItIsRegisteredAnew) {
+TEST_F(AnActivityTable, SpacesOutWhatReactionsRegisterAgainAndAgainAndNothingElse) {
+  const auto react = [&] { return add("a", {}, 0, RegistrationCause::Reaction).heldUntil; };
   const double start = now.uptime;
+  std::vector<Date> told;
   for (int run = 0; run < 20; ++run) {
-    table.add("a", {}, kBlock, now, 0);
+    for (int times = 0; times < 3; ++times) {
+      if (const auto heldUntil = react()) told.push_back(*heldUntil);
+    }
+    const Value held = table.tree()["activities"]["a"]["heldUntilDate"];
+    EXPECT_EQ(held.isNull(), *table.secondsToNext(now) == 0) << "the file says so while it waits";
     EXPECT_THAT(next(), ElementsAre("a"));
-    table.add("a", {}, kBlock, now, 0);  // by the run itself, and once more by somebody else
+    if (const auto heldUntil = react()) told.push_back(*heldUntil);  // by the run itself
     pass(1);
     EXPECT_THAT(started(), IsEmpty());
     end("a", kFinished);
   }
   EXPECT_NEAR(now.uptime - start, 3 * ActivityTable::kStartsPeriod, 30);
+  EXPECT_THAT(told, SizeIs(21 - ActivityTable::kMostStarts))
+      << "once for each run, however often it is registered";
+
+  add("a", {700, 0}, 0, RegistrationCause::Reaction);
+  EXPECT_THAT(table.secondsToNext(now), Optional(700.0)) << "a date that comes later anyway";
+  for (int run = 0; run < 20; ++run) {
+    EXPECT_EQ(add("a", {}).heldUntil, std::nullopt);
+    EXPECT_THAT(started(), ElementsAre("a")) << "on demand, without a wait";
+    end("a", kFinished);
+  }
+}
+
+TEST_F(AnActivityTable, DoesNotCountRunsThatTheirOwnDateDefers) {
+  for (std::size_t run = 0; run < ActivityTable::kMostStarts; ++run) {
+    EXPECT_EQ(add("a", {}, 0, RegistrationCause::Reaction).heldUntil, std::nullopt);
+    EXPECT_THAT(started(), ElementsAre("a"));
+    table.setEarliestDate("a", now.date + 0.7, now);
+    pass(1);
+    end("a", kDeferred);
+    EXPECT_THAT(started(), ElementsAre("a"));
+    end("a", kFinished);
+  }
+  EXPECT_NE(add("a", {}, 0, RegistrationCause::Reaction).heldUntil, std::nullopt);
 }
 
 TEST_F(AnActivityTable, TakesUpItsTreeAgainAndKeepsWhatNobodyChecksInFor) {
-  table.add("a", {3600, 360, true}, kBlock, now, 0.5);
-  table.add("b", {60, 0}, kBlock, now, 0);
+  add("a", {3600, 360, true}, 0.5);
+  add("b", {60, 0});
   ActivityTable next;
   next.adopt(table.tree());
   EXPECT_EQ(next.tree(), table.tree());
@@ -164,7 +197,7 @@ TEST_F(AnActivityTable, TakesUpItsTreeAgainAndKeepsWhatNobodyChecksInFor) {
 }
 
 TEST_F(AnActivityTable, ComplainsOfATreeThatIsNotItsOwn) {
-  table.add("a", {1, 2}, kBlock, now, 0);
+  add("a", {1, 2});
   auto entry = table.tree()["activities"]["a"].dictionary();
   const auto with = [&entry](const char* key, const Value& value) {
     auto changed = entry;
@@ -179,26 +212,44 @@ TEST_F(AnActivityTable, ComplainsOfATreeThatIsNotItsOwn) {
   }
 }
 
-TEST_F(AnActivityTable, ServesOneOccasionAfterTheOtherAndRecordsItAtTheEnd) {
+TEST_F(AnActivityTable, ServesTheBootBeforeTheUpgradeAndRecordsEachAtItsEnd) {
   EXPECT_TRUE(table.noticeBoot("boot", "one", false)) << "the first boot is only recorded";
   EXPECT_THAT(started(), IsEmpty());
   table.checkIn("upgrade", kBlock);
-  table.noticeSystemVersion("upgrade", "17.1");
+  table.noticeSystemVersion("upgrade", "17.1", false);
   table.checkIn("boot", kBlock);
   EXPECT_FALSE(table.noticeBoot("boot", "two", false));
-  EXPECT_THAT(started(), ElementsAre("upgrade"));
-  end("upgrade", kDeferred);
-  table.add("overdue", {}, kBlock, now, 0);
+  EXPECT_THAT(started(), ElementsAre("boot"));
+  end("boot", kDeferred);
+  add("overdue", {});
+  EXPECT_THAT(started(), ElementsAre("overdue")) << "a run that failed holds up nothing but its successor";
+  end("overdue", kFinished);
+  EXPECT_THAT(next(), ElementsAre("boot"));
+  add("overdue", {});
   EXPECT_THAT(started(), IsEmpty()) << "nothing else meanwhile";
-  EXPECT_THAT(next(), ElementsAre("upgrade"));
+  EXPECT_EQ(table.tree()["bootIdentifier"], Value("one"));
+  EXPECT_TRUE(end("boot", kFinished).servesOccasion);
+  EXPECT_EQ(table.tree()["bootIdentifier"], Value("two"));
+  EXPECT_THAT(started(), ElementsAre("upgrade"));
   EXPECT_TRUE(table.tree()["OSVersion"].isNull());
   end("upgrade", kFinished);
   EXPECT_EQ(table.tree()["OSVersion"], Value("17.1"));
-  EXPECT_THAT(started(), ElementsAre("boot"));
-  EXPECT_EQ(table.tree()["bootIdentifier"], Value("one"));
-  end("boot", kFinished);
-  EXPECT_EQ(table.tree()["bootIdentifier"], Value("two"));
   EXPECT_THAT(started(), ElementsAre("overdue"));
+}
+
+TEST_F(AnActivityTable, RunsTheUpgradeForAnotherVersionAndWhenARunIsOwed) {
+  using Version = std::optional<std::string>;
+  const std::tuple<Version, bool, bool, const char*> cases[] = {
+      {{}, false, true, ""},          {{}, false, false, ""},       {"17.1", false, true, "17.1"},
+      {"17.1", false, false, "17.1"}, {"17.1", true, true, "17.1"}, {"17.2", true, true, "17.2"},
+      {{}, false, false, "17.2"},     {{}, true, true, "17.2"}};
+  for (const auto& [version, isOwed, runs, recorded] : cases) {
+    table.checkIn("upgrade", kBlock);
+    table.noticeSystemVersion("upgrade", version, isOwed);
+    EXPECT_EQ(started().size(), runs ? 1U : 0U);
+    end("upgrade", kFinished);
+    EXPECT_EQ(table.tree()["OSVersion"], Value(recorded));
+  }
 }
 
 }  // namespace

@@ -90,6 +90,25 @@ TEST_F(AScheduler, ClearsEveryTargetDateAndNothingElse) {
   EXPECT_THAT(newLines(), ElementsAre("Clearing a.TargetDate", "Clearing b.TargetDate"));
 }
 
+TEST_F(AScheduler, SaysOnceThatReactionsAreHeldBackAndRunsADemandAllTheSame) {
+  int runs = 0;
+  activity->work = [&runs](const ActivityHandler& handler) {
+    ++runs;
+    handler(ActivityResult::Finished);
+  };
+  for (int i = 0; i < 12; ++i) {
+    scheduler->scheduleActivityForDate(start);
+    world.queues.advance(5);
+  }
+  EXPECT_EQ(runs, 6);
+  EXPECT_EQ(world.log.count("'test' was started 6 times within 600 seconds, and is held back until " +
+                            describe(start + 600)),
+            1U);
+  scheduler->scheduleActivityWithDelay(0, RegistrationCause::Demand);
+  world.queues.advance(5);
+  EXPECT_EQ(runs, 7);
+}
+
 TEST_F(AScheduler, ComesBackToARunWhoseWorkFailsOrDropsItsAnswer) {
   int runs = 0;
   activity->work = [&](const ActivityHandler&) {
