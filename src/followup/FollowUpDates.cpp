@@ -7,6 +7,9 @@ namespace kvr {
 namespace {
 
 constexpr double kLeastInterval = 60;  // seconds
+constexpr double kUsualDay = 86400;    // seconds
+constexpr double kShortestDay = 1;     // second; below, it is no length of a day
+constexpr double kLeastPause = 1;      // second
 
 /// `next` is the date found so far; while there is none, now stands in its place.
 bool isEarlier(std::optional<Date> date, std::optional<Date> next, Date now) {
@@ -76,9 +79,10 @@ Date followingPostDate(Date next, const std::vector<FollowUpDateFacts>& devices,
   return std::min(nextPostDate(offered, now).value_or(later), later);
 }
 
-Date followingRefreshDate(Date next, Date now) {
-  const auto earliest = now + kLeastInterval;
-  return next > earliest ? next : earliest;
+Date followingRefreshDate(Date next, Date now, double day) {
+  if (!(day >= kShortestDay)) return std::max(next, now + kLeastInterval);
+  if (next > now) return next;
+  return now + std::clamp(kLeastInterval * day / kUsualDay, kLeastPause, kLeastInterval);
 }
 
 }  // namespace kvr

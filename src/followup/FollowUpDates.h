@@ -25,9 +25,13 @@ std::optional<Date> nextRefreshDate(const std::vector<FollowUpDateFacts>& device
                                     bool isInitialCall);
 
 /// The date for which an activity schedules itself again when `next` was computed at the end of a run: never
-/// one that would make it run back to back, whatever day length is stored. When an offer's end has passed,
-/// the other devices' follow-ups are posted no later for it.
+/// one that would make it run back to back, whatever day length is stored.
+///
+/// When an offer's end has passed, the other devices' follow-ups are posted no later for it.
 Date followingPostDate(Date next, const std::vector<FollowUpDateFacts>& devices, Date now, double day);
-Date followingRefreshDate(Date next, Date now);
+/// A date that lies ahead is kept, for a count changes then. Any other is put off by a minute, or by the same
+/// share of a shorter day, a second at least. With a day of less than a second, whose counts nobody could
+/// follow, refreshes are a minute apart.
+Date followingRefreshDate(Date next, Date now, double day);
 
 }  // namespace kvr

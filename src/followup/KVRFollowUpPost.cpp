@@ -74,7 +74,7 @@ void KVRFollowUpPost::postAndSchedule(const KVRDeviceInfoList& devicesInfo) {
     const auto date = KVRFollowUpRefresh::_refreshDateWithDevicesInfo(platform_, devicesInfo);
     platform_.log.standard("%s: Schedule refresh for: %@", kPerform, date);
     KVRScheduler::newSchedulerWithActivityDelegate(platform_, std::make_shared<KVRFollowUpRefresh>(platform_))
-        ->scheduleActivityForDate(date);
+        ->scheduleActivityForDate(date, RegistrationCause::Demand);
   }
 }
 

@@ -37,10 +37,14 @@ void KVRFollowUpRefresh::refreshAndSchedule(const KVRDeviceInfoList& devicesInfo
   }
   log.standard("Followup present, schedule refresh for %@", shown);
   const auto now = platform_.clock.now();
-  const auto date = followingRefreshDate(_refreshDateWithDevicesInfo(platform_, shown), now);
+  const auto next = _refreshDateWithDevicesInfo(platform_, shown);
+  const auto date =
+      followingRefreshDate(next, now, platform_.preferences.doubleForKey(preference::kOneDayInterval));
+  if (date != next) log.standard("Next refresh for %@ would come too soon, put off", next);
   log.standard("Schedule next refresh for %@", date);
+  // What the calendar says is to come at its moment, however soon.
   KVRScheduler::newSchedulerWithActivityDelegate(platform_, shared_from_this())
-      ->scheduleActivityForDate(date);
+      ->scheduleActivityForDate(date, date == next ? RegistrationCause::Demand : RegistrationCause::Reaction);
 }
 
 std::optional<Date> KVRFollowUpRefresh::nextFollowUpRefreshDateWithDevicesInfo(

@@ -1,3 +1,4 @@
+#include "followup/FollowUpDates.h"
 #include "followup/KVRFollowUpPost.h"
 #include "followup/KVRFollowUpRefresh.h"
 #include "unit/followup/OfferWorld.h"
@@ -123,6 +124,34 @@ TEST_F(AFollowUpActivity, DropsTheAnswerOfAPostRunThatWasDeferredMeanwhile) {
   EXPECT_THAT(pendingSerials(), ElementsAre("A")) << "the work is done all the same";
   EXPECT_EQ(world.log.count("activity run was answered already, result 1 dropped"), 1U);
   EXPECT_TRUE(target("com.tarsil.kvragent.followuppost").has_value());
+}
+
+TEST_F(AFollowUpActivity, PutsOffOnlyARefreshThatDoesNotLieAhead) {
+  const Date now = world.clock.now();
+  const std::tuple<double, double, double> cases[] = {{0.5, 86400, 0.5}, {0, 86400, 60},     {-5, 86400, 60},
+                                                      {-5, 14400, 10},   {-5, 10, 1},        {0.5, 10, 0.5},
+                                                      {0, 0, 60},        {0.001, 0.1, 60},   {90, -5, 90},
+                                                      {-5, -5, 60},      {1, -kInfinity, 60}};
+  for (const auto& [next, day, expected] : cases) {
+    EXPECT_EQ(followingRefreshDate(now + next, now, day) - now, expected) << next << " of a day of " << day;
+  }
+}
+
+TEST_F(AFollowUpActivity, ShowsEveryCountOfShortDaysFromItsMomentOn) {
+  constexpr double kShortDay = 10;  // seconds
+  world.preferences.setObject(kShortDay, preference::kOneDayInterval);
+  const Date end = world.clock.now() + 20.5 * kShortDay;
+  const KVRDeviceInfoList list{info("A", due((end - world.clock.now()) / kDay), old)};
+  runWith<KVRFollowUpPost>(list);
+  const auto refresh = std::make_shared<KVRFollowUpRefresh>(
+      world.platform, [list](std::uint64_t, const DeviceInfosAnswer& answer) { answer(list); });
+  KVRScheduler::newSchedulerWithActivityDelegate(world.platform, refresh)
+      ->scheduleActivityForDate(world.clock.now());
+  for (int left = 20; left > 0; --left) {
+    world.queues.advance(end - left * kShortDay + 1.5 - world.clock.now());
+    EXPECT_EQ(pending().at(0).informativeFooterText,
+              Value(left > 1 ? std::to_string(left) + " days left" : "One day left"));
+  }
 }
 
 TEST_F(AFollowUpActivity, RefreshesForAsLongAsAnythingIsShown) {
