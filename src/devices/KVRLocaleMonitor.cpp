@@ -16,7 +16,9 @@ std::shared_ptr<KVRLocaleMonitor> KVRLocaleMonitor::initWithAgent(Platform& plat
 }
 
 KVRLocaleMonitor::KVRLocaleMonitor(Platform& platform, std::shared_ptr<KVRAgentProtocol> theAgent)
-    : agent(std::move(theAgent)), platform_(platform), refreshes_(platform.queues.mainQueue()) {}
+    : agent(std::move(theAgent)),
+      platform_(platform),
+      refreshes_(platform.log, platform.queues.mainQueue()) {}
 
 KVRLocaleMonitor::~KVRLocaleMonitor() { platform_.notifications.cancel(_languageNotifyToken); }
 

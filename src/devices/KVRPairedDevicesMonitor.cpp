@@ -13,7 +13,9 @@ std::shared_ptr<KVRPairedDevicesMonitor> KVRPairedDevicesMonitor::initWithAgent(
 
 KVRPairedDevicesMonitor::KVRPairedDevicesMonitor(Platform& platform,
                                                  std::shared_ptr<KVRAgentProtocol> theAgent)
-    : agent(std::move(theAgent)), platform_(platform), refreshes_(platform.queues.mainQueue()) {}
+    : agent(std::move(theAgent)),
+      platform_(platform),
+      refreshes_(platform.log, platform.queues.mainQueue()) {}
 
 KVRPairedDevicesMonitor::~KVRPairedDevicesMonitor() {
   for (const auto token : {pairNotifyToken.load(), unpairNotifyToken.load()}) {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "platform/Log.h"
 #include "platform/WorkQueues.h"
 
 #include <functional>
@@ -9,12 +10,12 @@ namespace kvr {
 
 /// Bounds how many look-ups of all devices a monitor has under way. Anyone may post notifications, and a
 /// service may leave requests without an answer: beyond `kMost`, what is notified is made up for by one more,
-/// afterwards. Any thread.
+/// afterwards, which the log says. Any thread.
 class RefreshLimit {
  public:
   static constexpr int kMost = 16;
 
-  explicit RefreshLimit(WorkQueueRef queue);
+  RefreshLimit(Log& log, WorkQueueRef queue);
 
   /// A token to be held while a look-up is under way. Nothing when there are too many: `again` then runs on
   /// the queue when one of them has ended, once however often it was wanted.

@@ -22,8 +22,8 @@
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
-#include <set>
 #include <string_view>
+#include <vector>
 
 namespace kvr {
 namespace {
@@ -40,7 +40,8 @@ class Waker {
     for (const auto* name : {UserLocale::kLanguageChanged, PairedDeviceRegistry::kDeviceDidPair,
                              PairedDeviceRegistry::kDeviceDidUnpair}) {
       notifications_.registerFor(name, [this, name] {
-        heard_.insert(name);
+        const auto before = static_cast<std::size_t>(std::ranges::count(heard_, name));
+        if (before < LocalNotifications::kMostInARow) heard_.push_back(name);
         look();
       });
     }
@@ -128,13 +129,13 @@ class Waker {
       loop_.after(kRetry, [this] { look(); });
       return;
     }
-    for (const auto& name : heard_) notifications_.post(name);
+    for (const auto name : heard_) notifications_.post(std::string(name));
     bus_.thread()->post([this] { loop_.exit(EXIT_SUCCESS); });
   }
 
-  bool isActing_ = false;    ///< since the agent has ended
-  bool isStarting_ = false;  ///< the next one
-  std::set<std::string> heard_;
+  bool isActing_ = false;                ///< since the agent has ended
+  bool isStarting_ = false;              ///< the next one
+  std::vector<std::string_view> heard_;  ///< in this order, as many of a name as are handled each on its own
   EventLoop loop_;
   const std::unique_ptr<LocalLog> log_ = LocalLog::fromEnvironment();
   LocalClock clock_;

@@ -130,6 +130,44 @@ TEST_F(TheAgent, FollowsTheFileOfPairedWatches) {
   EXPECT_THAT(world.coverageRequests(), SizeIs(2));
 }
 
+TEST_F(TheAgent, SaysFirstThatItWasLaunched) {
+  for (const auto* file : {"Network.plist", "Locale.plist", "PairedDevices.plist"}) {
+    world.directory.write(std::string("device/") + file, "damaged");
+  }
+  world.moreEnvironment = {{"KVR_LOG_LEVEL", "debug"}};
+  world.startAgent();
+  world.agent().waitForErrorOutput("Network.plist is damaged");
+  const auto output = world.agent().errorOutput();
+  EXPECT_THAT(output.substr(0, output.find('\n')), HasSubstr(" default com.tarsil.Kavrel:core launched"));
+}
+
+TEST_F(TheAgent, HandlesSixteenNotificationsInARowAndAsManyEditsEachOnItsOwn) {
+  for (const bool areEdits : {false, true}) {
+    world.writeDeviceFile("FeatureFlags.plist", Dictionary{});  // the phone alone is looked up
+    world.pair({});
+    world.startAgent();
+    const auto client = world.newClient();
+    World::info(client, World::kPhone, World::Default);
+    for (int i = 0; i < 16; ++i) {
+      if (areEdits) {
+        i % 2 == 0 ? world.pair({World::kFirstWatch}) : world.pair({});
+      } else {
+        sd_bus_emit_signal(client.bus(), "/com/tarsil/NotificationCenter", "com.tarsil.NotificationCenter",
+                           "Posted", "s", "com.tarsil.pairedregistry.device-did-unpair");
+      }
+    }
+    ASSERT_GE(sd_bus_flush(client.bus()), 0);
+    const std::string line = "Devices followups to be posted, if required, after paired device change";
+    std::size_t from = 0;
+    for (int i = 0; i < 16; ++i) {
+      world.agent().waitForErrorOutput(line, from);
+      from = world.agent().errorOutput().find(line, from) + line.size();
+    }
+    EXPECT_EQ(world.agent().terminate(), 0);
+    world.waitForName(false);
+  }
+}
+
 TEST_F(TheAgent, KnowsTheSupportApplicationInTheUsersLanguage) {
   world.writeDeviceFile("Applications.plist",
                         Dictionary{{"com.tarsil.support", Dictionary{{"localizedName", "Support"}}}});

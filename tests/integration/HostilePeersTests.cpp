@@ -204,7 +204,8 @@ TEST_F(TheAgentAmongHostilePeers, HandlesTheLastOfAFloodOfNotifications) {
   const auto seconds = std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
   const auto* const handled = "-[KVRPairedDevicesMonitor _pairedOrActiveDevicesDidChange:]";
   const auto count = static_cast<double>(countOf(handled, world.agent().errorOutput()));
-  EXPECT_LE(count, 2 + seconds * 2) << "two calls a second";
+  EXPECT_LE(count, 16 * (seconds + 1) + 2 * seconds + 1) << "sixteen a second, and two of a flood";
+  EXPECT_THAT(world.agent().errorOutput(), HasSubstr("come in a flood, those beyond 16 in a row"));
   expectNothingIsLeft("after a flood of notifications");
 }
 

@@ -184,13 +184,14 @@ Status monitor(const Report& report, bool inJSON) {
   Differences activities(teller, "activity", [&] { return activityLines(state); });
   Differences downloads(teller, "download", [&] { return downloadLines(state); });
   const FileWatch followUpWatch(loop, *log, library + "FollowUps/com.tarsil.Kavrel.plist",
-                                [&] { followUps.update(); });
+                                [&](std::size_t) { followUps.update(); });
   const FileWatch activityWatch(loop, *log, library + "Activities/com.tarsil.kvragent.plist",
-                                [&] { activities.update(); });
-  const FileWatch preferenceWatch(loop, *log, library + "Preferences/com.tarsil.kvragent.plist", [&] {
-    activities.update();
-    downloads.update();
-  });
+                                [&](std::size_t) { activities.update(); });
+  const FileWatch preferenceWatch(loop, *log, library + "Preferences/com.tarsil.kvragent.plist",
+                                  [&](std::size_t) {
+                                    activities.update();
+                                    downloads.update();
+                                  });
   teller.tell("monitor", "", "watching");
   const int status = loop.run();
   sd_bus_detach_event(opened);

@@ -14,12 +14,13 @@
 namespace kvr {
 namespace {
 
-constexpr std::uint32_t kChanges = IN_CLOSE_WRITE | IN_CREATE | IN_DELETE | IN_MOVED_FROM | IN_MOVED_TO;
+constexpr std::uint32_t kWrites = IN_CLOSE_WRITE | IN_MOVED_TO;
+constexpr std::uint32_t kChanges = kWrites | IN_CREATE | IN_DELETE | IN_MOVED_FROM;
 constexpr std::uint32_t kOwnEnd = IN_DELETE_SELF | IN_MOVE_SELF;
 
 }  // namespace
 
-FileWatch::FileWatch(EventLoop& loop, Log& log, std::filesystem::path path, std::function<void()> changed)
+FileWatch::FileWatch(EventLoop& loop, Log& log, std::filesystem::path path, Changed changed)
     : loop_(loop),
       path_(std::move(path)),
       changed_(std::move(changed)),
@@ -65,6 +66,7 @@ void FileWatch::readEvents() {
   const std::string awaited = awaited_.filename().string();
   bool concerns = false;
   bool isWatchLost = false;
+  std::size_t writes = 0;
   for (;;) {
     const auto size = ::read(inotify_.get(), buffer.data(), buffer.size());
     if (size <= 0) break;
@@ -75,13 +77,15 @@ void FileWatch::readEvents() {
       // An older watch's last words concern nobody; a lost event (which names none) may be any.
       if (event.wd == watch_ || event.wd == -1) {
         if (event.len == 0 || awaited == name) concerns = true;
+        if (event.len != 0 && awaited == name && (event.mask & kWrites) != 0) ++writes;
         if ((event.mask & (kOwnEnd | IN_IGNORED)) != 0) isWatchLost = true;
       }
       at += sizeof event + event.len;
     }
   }
+  if (awaited_ != path_) writes = 0;
   if (isWatchLost || (concerns && awaited_ != path_)) watch();
-  if (concerns || isWatchLost) loop_.post(changed_);
+  if (concerns || isWatchLost) loop_.post([changed = changed_, writes] { changed(writes); });
 }
 
 }  // namespace kvr

@@ -4,6 +4,7 @@
 #include "platform/local/Descriptor.h"
 #include "platform/local/EventLoop.h"
 
+#include <cstddef>
 #include <filesystem>
 #include <functional>
 #include <string>
@@ -17,9 +18,13 @@ namespace kvr {
 /// on the loop's thread.
 class FileWatch {
  public:
+  /// Told how often the file has been written, or put in place, meanwhile: 0 when it has gone, or may be
+  /// about to be written.
+  using Changed = std::function<void(std::size_t writes)>;
+
   /// `changed` is posted to the loop; it may be called without a change. Where the kernel refuses, which is
   /// one error line, nothing is noticed.
-  FileWatch(EventLoop& loop, Log& log, std::filesystem::path path, std::function<void()> changed);
+  FileWatch(EventLoop& loop, Log& log, std::filesystem::path path, Changed changed);
   ~FileWatch();
   FileWatch(const FileWatch&) = delete;
   FileWatch& operator=(const FileWatch&) = delete;
@@ -30,7 +35,7 @@ class FileWatch {
 
   EventLoop& loop_;
   const std::filesystem::path path_;
-  const std::function<void()> changed_;
+  const Changed changed_;
   Descriptor inotify_;
   sd_event_source* source_ = nullptr;
   int watch_ = -1;

@@ -5,8 +5,10 @@
 #include "platform/local/LocalPairedDeviceRegistry.h"
 #include "platform/local/LocalUserLocale.h"
 
-#include <array>
+#include <chrono>
+#include <cstddef>
 #include <memory>
+#include <optional>
 #include <set>
 #include <string>
 #include <vector>
@@ -15,7 +17,9 @@ namespace kvr {
 
 /// Posts the notifications of what is changed by editing a file: another locale in "Locale.plist", or in the
 /// host's own setting where that file names none; a watch that has come to or gone from
-/// "PairedDevices.plist". Built and destroyed on the loop's thread.
+/// "PairedDevices.plist". One for each edit, also of several that are seen at once. A file that is gone, or
+/// cannot be read, may be about to be replaced: it is looked at again before that counts. Built and destroyed
+/// on the loop's thread.
 class LocalChanges {
  public:
   /// Where hosts keep their locale.
@@ -26,20 +30,38 @@ class LocalChanges {
                const std::vector<std::string>& hostLocale = hostLocaleFiles());
 
  private:
+  using Clock = std::chrono::steady_clock;
   /// What the language in use depends on.
   std::string languageNow() const;
   std::set<std::string> watchesNow() const;
-  void noticeSoon();
-  void notice();
+  /// One file of the device root, and how it is looked at.
+  struct Subject {
+    const char* file;
+    /// Tells of so many edits, or finds nothing to tell. One that changes nothing counts only if it is
+    /// certain that it was one.
+    bool (LocalChanges::*tell)(std::size_t edits, bool isCertain);
+    std::size_t edits = 0;          ///< not told of
+    std::optional<FileStamp> seen;  ///< of the version that was looked at last
+    Clock::time_point lastEdit{};
+    bool isLookToCome = false;
+  };
+  std::optional<FileStamp> stampOf(const char* file) const;
+  void handleEdit(Subject& subject, std::size_t writes, bool isWhole);
+  void lookLater(Subject& subject);
+  bool tellLocale(std::size_t edits, bool isCertain);
+  bool tellWatches(std::size_t edits, bool isCertain);
+  void post(const char* notification, std::size_t times);
 
+  const DeviceRoot& root_;
   const LocalUserLocale& locale_;
   const LocalPairedDeviceRegistry& pairedDevices_;
   LocalNotifications& notifications_;
   const std::vector<std::string> hostLocale_;
   EventLoop& loop_;
-  bool isNoticing_ = false;  ///< soon
   std::string language_;
   std::set<std::string> watches_;
+  Subject localeFile_;
+  Subject watchesFile_;
   std::vector<std::unique_ptr<FileWatch>> fileWatches_;
 };
 

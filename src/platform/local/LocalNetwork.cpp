@@ -31,8 +31,8 @@ LocalNetwork::LocalNetwork(EventLoop& loop, Log& log, const DeviceRoot& root,
                            const std::function<void(bool)>& changed, std::string hostState)
     : root_(root),
       hostState_(std::move(hostState)),
-      ownWatch_(loop, log, root.pathOf(kFile), [this, changed] { changed(isReachable()); }),
-      hostWatch_(loop, log, hostState_, [this, changed] { changed(isReachable()); }) {}
+      ownWatch_(loop, log, root.pathOf(kFile), [this, changed](std::size_t) { changed(isReachable()); }),
+      hostWatch_(loop, log, hostState_, [this, changed](std::size_t) { changed(isReachable()); }) {}
 
 bool LocalNetwork::isReachable() const { return isReachable(root_.dictionary(kFile), hostState_); }
 

@@ -1,6 +1,7 @@
 #include "platform/local/LocalNotifications.h"
 
 #include <chrono>
+#include <optional>
 #include <string_view>
 #include <utility>
 
@@ -13,6 +14,10 @@ constexpr const char* kMember = "Posted";
 
 using Clock = std::chrono::steady_clock;
 
+double secondsBetween(Clock::time_point from, Clock::time_point until) {
+  return std::chrono::duration<double>(until - from).count();
+}
+
 }  // namespace
 
 /// What the bus thread and the main queue use as well.
@@ -20,44 +25,75 @@ struct LocalNotifications::State : std::enable_shared_from_this<State> {
   struct Registration {
     std::string name;
     std::shared_ptr<const std::function<void()>> handler;
-    bool isDue = false;       ///< its handler is to be called
-    Clock::time_point rests;  ///< until then it is not called
+    std::size_t inARow = 0;       ///< notifications up to the last one
+    Clock::time_point last;       ///< of them
+    Clock::time_point called;     ///< the handler, the last time
+    std::size_t callsToCome = 0;  ///< which the main queue has
+    bool isFlooded = false;       ///< one of them stands for all that comes before it
+    bool isFloodTold = false;     ///< that the row has become a flood
   };
   using Registrations = std::map<Token, Registration>;
+  /// A call to be made, in so many seconds.
+  struct Call {
+    Token token;
+    double delay;
+    bool isOfFlood;
+    bool isNews;  ///< that there is a flood
+  };
 
   State(WorkQueues& theQueues, Log& theLog) : queues(theQueues), log(theLog) {}
 
   /// On the bus thread.
   void deliver(std::string_view name) {
-    std::vector<std::pair<Token, double>> due;
+    std::vector<Call> calls;
     {
       const std::lock_guard lock(mutex);
       const auto now = Clock::now();
       for (auto& [token, registration] : registrations) {
-        if (registration.name != name || std::exchange(registration.isDue, true)) continue;
-        due.emplace_back(token, std::chrono::duration<double>(registration.rests - now).count());
+        if (registration.name != name) continue;
+        if (const auto call = callFor(token, registration, now)) calls.push_back(*call);
       }
     }
-    for (const auto& [token, delay] : due) {
-      Work work = [self = shared_from_this(), key = token] { self->handle(key); };
-      if (delay > 0) {
-        queues.after(delay, queues.mainQueue(), std::move(work));
+    for (const auto& call : calls) {
+      if (call.isNews) {
+        log.standard("Notifications %@ come in a flood, those beyond %d in a row are taken together",
+                     std::string(name), static_cast<int>(kMostInARow));
+      }
+      Work work = [self = shared_from_this(), call] { self->handle(call); };
+      if (call.delay > 0) {
+        queues.after(call.delay, queues.mainQueue(), std::move(work));
       } else {
         queues.mainQueue()->async(std::move(work));
       }
     }
   }
 
-  void handle(Token token) {
+  /// Nothing when a call is to come that stands for this notification as well.
+  static std::optional<Call> callFor(Token token, Registration& registration, Clock::time_point now) {
+    if (secondsBetween(registration.last, now) > kPause) {
+      registration.inARow = 0;
+      registration.isFloodTold = false;
+    }
+    registration.last = now;
+    ++registration.inARow;
+    const double rest = kInterval - secondsBetween(registration.called, now);
+    const bool isOwn = (registration.inARow <= kMostInARow || rest <= 0) &&
+                       registration.callsToCome < kMostInARow && !registration.isFlooded;
+    if (!isOwn && std::exchange(registration.isFlooded, true)) return std::nullopt;
+    ++registration.callsToCome;
+    return Call{token, isOwn ? 0 : rest, !isOwn, !isOwn && !std::exchange(registration.isFloodTold, true)};
+  }
+
+  void handle(const Call& call) {
     std::shared_ptr<const std::function<void()>> handler;
     {
       const std::lock_guard lock(mutex);
-      if (const auto found = registrations.find(token); found != registrations.end()) {
+      if (const auto found = registrations.find(call.token); found != registrations.end()) {
         Registration& registration = found->second;
         handler = registration.handler;
-        registration.isDue = false;
-        registration.rests = Clock::now() + std::chrono::duration_cast<Clock::duration>(
-                                                std::chrono::duration<double>(kInterval));
+        registration.called = Clock::now();
+        --registration.callsToCome;
+        if (call.isOfFlood) registration.isFlooded = false;
       }
     }
     if (handler) (*handler)();
@@ -85,9 +121,10 @@ LocalNotifications::Token LocalNotifications::registerFor(const std::string& nam
   {
     const std::lock_guard lock(state_->mutex);
     token = ++state_->last;
-    state_->registrations.emplace(
-        token, State::Registration{
-                   name, std::make_shared<const std::function<void()>>(std::move(handler)), false, {}});
+    State::Registration registration;
+    registration.name = name;
+    registration.handler = std::make_shared<const std::function<void()>>(std::move(handler));
+    state_->registrations.emplace(token, std::move(registration));
   }
   bus_.thread()->post([state = state_, &bus = bus_, name] {
     sd_bus* const connection = state->slots.contains(name) ? nullptr : bus.bus();

@@ -5,6 +5,7 @@
 #include "platform/WorkQueues.h"
 #include "platform/local/BusConnection.h"
 
+#include <cstddef>
 #include <map>
 #include <memory>
 #include <mutex>
@@ -16,12 +17,15 @@ namespace kvr {
 /// Notifications as signals on the session bus, which anyone on it may send:
 /// `com.tarsil.NotificationCenter.Posted` from `/com/tarsil/NotificationCenter`, with the name.
 ///
-/// The bus is asked for those that somebody has registered for. A handler is called at once, but not again
-/// within half a second of the last time: what comes meanwhile is one call then. So the last notification is
-/// always followed by a call, and a flood costs two a second.
+/// The bus is asked for those that somebody has registered for. A handler is called for each one at once. Of
+/// a *row*, notifications without a second's pause, this holds for the first sixteen. What comes on top of
+/// them within half a second of the last call is a flood: one call then stands for all of it. So the last
+/// notification is always followed by a call, and a flood costs two a second.
 class LocalNotifications : public Notifications {
  public:
-  static constexpr double kInterval = 0.5;  ///< seconds
+  static constexpr std::size_t kMostInARow = 16;  ///< that are surely handled each on its own
+  static constexpr double kPause = 1;             ///< seconds, after which a new row begins
+  static constexpr double kInterval = 0.5;        ///< seconds, from one call of a flood to the next
 
   /// The bus must outlive this.
   LocalNotifications(BusConnection& bus, WorkQueues& queues, Log& log);
