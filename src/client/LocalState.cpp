@@ -93,6 +93,7 @@ Result<std::vector<Activity>> LocalState::activities() const {
   if (const Value& all = (*registered)["activities"]; all.isDictionary()) {
     for (const auto& [identifier, entry] : all.dictionary()) {
       activities[identifier].dueDate = entry["dueDate"].dateIfAny();
+      activities[identifier].heldUntil = entry["heldUntilDate"].dateIfAny();
       activities[identifier].requiresNetwork = entry["requiresNetwork"].asBool();
     }
   }

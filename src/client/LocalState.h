@@ -29,6 +29,7 @@ struct Activity {
   std::string identifier;
   std::optional<Date> targetDate;  ///< before which it does nothing
   std::optional<Date> dueDate;     ///< when the platform runs it
+  std::optional<Date> heldUntil;   ///< because it was started too often
   bool requiresNetwork = false;
   std::optional<std::string> lastResult;  ///< "finished" or "deferred"
   std::optional<Date> lastEnd;            ///< when its last run ended
@@ -36,7 +37,9 @@ struct Activity {
   /// Whether it is to come; else it has only run.
   bool isToCome() const { return targetDate || dueDate; }
   /// Before which nothing can be expected of it.
-  Date date() const { return std::max(targetDate.value_or(Date{}), dueDate.value_or(Date{})); }
+  Date date() const {
+    return std::max({targetDate.value_or(Date{}), dueDate.value_or(Date{}), heldUntil.value_or(Date{})});
+  }
 };
 
 /// What the agent's files below the home directory say. Looking changes nothing, and needs no agent.

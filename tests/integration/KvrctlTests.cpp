@@ -183,16 +183,25 @@ TEST_F(Kvrctl, WritesOneDocumentWithAVersionWhateverItIsAsked) {
 TEST_F(Kvrctl, TellsOfAnActivityHowItEndedAndWhatItWaitsFor) {
   home.write("Library/Activities/com.tarsil.kvragent.plist",
              "<plist><dict><key>activities</key><dict><key>late</key><dict><key>dueDate</key>"
-             "<date>2026-01-01T00:00:00Z</date></dict></dict><key>lastRuns</key><dict>"
+             "<date>2026-01-01T00:00:00Z</date></dict><key>often</key><dict><key>dueDate</key>"
+             "<date>2026-01-01T00:00:00Z</date><key>heldUntilDate</key><date>2999-01-01T00:00:00Z</date>"
+             "</dict></dict><key>lastRuns</key><dict>"
              "<key>late</key><dict><key>result</key><string>deferred</string></dict>"
              "<key>over</key><dict><key>result</key><string>finished</string></dict></dict></dict></plist>");
-  const auto document = readJSON(run({"activities", "--json"}).output);
-  ASSERT_TRUE(document);
-  std::vector<std::string> told;
-  for (const auto& it : (*document)["activities"].array()) {
-    told.push_back(describe(it["lastResult"]) + ", waits for " + describe(it["waitsFor"]));
-  }
-  EXPECT_THAT(told, ElementsAre("deferred, waits for the agent, to start", "finished, waits for (null)"));
+  const auto told = [&] {
+    std::vector<std::string> lines;
+    const auto document = readJSON(run({"activities", "--json"}).output);
+    for (const auto& it : (*document)["activities"].array()) {
+      lines.push_back(describe(it["lastResult"]) + ", waits for " + describe(it["waitsFor"]));
+    }
+    return lines;
+  };
+  EXPECT_THAT(told(), ElementsAre("deferred, waits for the agent, to start",
+                                  "(null), waits for the agent, to start", "finished, waits for (null)"));
+  const auto serving = serveAgent();
+  EXPECT_THAT(told(), ElementsAre("deferred, waits for its next try",
+                                  HasSubstr("waits for the limit of starts, until 01/01/99"),
+                                  "finished, waits for (null)"));
 }
 
 TEST_F(Kvrctl, PrintsTextThatCannotCommandATerminal) {

@@ -74,6 +74,8 @@ std::string waitsFor(const Activity& activity, const Circumstances& circumstance
     return "its date";
   if (activity.requiresNetwork && !circumstances.isNetworkReachable) return "the network";
   if (!circumstances.isAgentRunning) return "the agent, to start";
+  if (isAhead(activity.heldUntil, circumstances.now))
+    return "the limit of starts, until " + Style::moment(*activity.heldUntil);
   return activity.lastResult == "deferred" ? "its next try" : "its turn";
 }
 

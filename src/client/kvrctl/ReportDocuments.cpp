@@ -142,6 +142,7 @@ Result<std::string> Report::json(const std::vector<Activity>& activities,
                            {"requiresNetwork", activity.requiresNetwork}};
     if (activity.targetDate) tree.emplace("targetDate", *activity.targetDate);
     if (activity.dueDate) tree.emplace("dueDate", *activity.dueDate);
+    if (activity.heldUntil) tree.emplace("heldUntilDate", *activity.heldUntil);
     if (activity.lastResult) tree.emplace("lastResult", *activity.lastResult);
     if (activity.lastEnd) tree.emplace("lastEndedDate", *activity.lastEnd);
     if (activity.isToCome()) tree.emplace("waitsFor", waitsFor(activity, circumstances));
