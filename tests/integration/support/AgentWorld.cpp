@@ -87,7 +87,7 @@ void AgentWorld::pair(const std::vector<std::string>& serialNumbers) const {
                                  {"isPaired", true}});
   }
   // A serial number may hold what no XML can.
-  directory.write("device/PairedDevices.plist", *writePropertyList(watches, PropertyListEncoding::Binary));
+  writeDeviceFile("PairedDevices.plist", watches, PropertyListEncoding::Binary);
 }
 
 void AgentWorld::setAccount(const Value& renewal) const {

@@ -39,8 +39,9 @@ class AgentWorld {
   RawBusClient newClient() const { return RawBusClient(bus.address()); }
 
   /// A new file in the old one's place: nobody reads half of it.
-  void writeDeviceFile(const std::string& name, const Value& tree) const {
-    const auto path = directory.write("device/new", *writePropertyList(tree, PropertyListEncoding::XML));
+  void writeDeviceFile(const std::string& name, const Value& tree,
+                       PropertyListEncoding encoding = PropertyListEncoding::XML) const {
+    const auto path = directory.write("device/new", *writePropertyList(tree, encoding));
     const auto place = directory / "device" / name;
     std::filesystem::create_directories(place.parent_path());
     std::filesystem::rename(path, place);
