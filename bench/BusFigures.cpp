@@ -4,11 +4,11 @@
 #include "Figures.h"
 #include "Measurement.h"
 #include "Programs.h"
-#include "platform/JSON.h"
-#include "platform/PropertyList.h"
-#include "signing/SHA256Hash.h"
-#include "warranty/CacheMetadata.h"
-#include "warranty/WarrantyKeys.h"
+#include "core/warranty/CacheMetadata.h"
+#include "core/warranty/WarrantyKeys.h"
+#include "platform/codec/JSON.h"
+#include "platform/codec/PropertyList.h"
+#include "platform/text/SHA256Hash.h"
 
 #include <systemd/sd-bus.h>
 

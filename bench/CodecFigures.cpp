@@ -3,8 +3,8 @@
 #include "CoverageAnswer.h"
 #include "Figures.h"
 #include "Measurement.h"
-#include "platform/JSON.h"
-#include "platform/PropertyList.h"
+#include "platform/codec/JSON.h"
+#include "platform/codec/PropertyList.h"
 
 #include <expat.h>
 #include <nlohmann/json.hpp>

@@ -5,12 +5,14 @@
 #include "Figures.h"
 #include "Measurement.h"
 #include "Programs.h"
-#include "agent/Configuration.h"
-#include "platform/local/EventLoop.h"
-#include "platform/local/LocalPlatform.h"
-#include "signing/AccountHeaders.h"
-#include "signing/KestHeaders.h"
-#include "warranty/KVRWarrantyDownloader.h"
+#include "core/agent/Activities.h"
+#include "core/agent/Configuration.h"
+#include "core/outreach/WarrantyDownloads.h"
+#include "core/signing/AccountHeaders.h"
+#include "core/signing/KestHeaders.h"
+#include "core/warranty/WarrantyKeys.h"
+#include "local/LocalPlatform.h"
+#include "local/loop/EventLoop.h"
 
 #include <fcntl.h>
 #include <httplib.h>
@@ -93,7 +95,7 @@ void pause() { std::this_thread::sleep_for(std::chrono::milliseconds(60)); }
 /// Seconds from the answer's arrival until the download has completed.
 double stored(Platform& platform, const Canned& canned) {
   std::promise<bool> done;
-  std::make_shared<KVRWarrantyDownloader>(platform, "com.tarsil.Preferences")
+  newWarrantyDownloader(platform, kPreferencesBundleID)
       ->_downloadWarrantyForSerialNumber(
           AgentWorld::kFirstWatch,
           DownloadCompletion(platform.log, "bench",
@@ -116,32 +118,35 @@ void store() {
   InProcess process;
   Platform& platform = process.local().platform;
   Canned canned(platform.queues);
-  Platform cannedPlatform{platform.log,
-                          platform.clock,
-                          platform.queues,
-                          platform.files,
-                          platform.propertyLists,
-                          platform.preferences,
-                          platform.locale,
-                          platform.random,
-                          canned,
-                          platform.deviceProperties,
-                          platform.featureFlags,
-                          platform.pairedDevices,
-                          platform.accounts,
-                          platform.accountSession,
-                          platform.attestation,
-                          platform.services,
-                          platform.processes,
-                          platform.activities,
-                          platform.followUps,
-                          platform.carriers,
-                          platform.notifications,
-                          platform.cleanExit,
-                          platform.applications,
-                          platform.store,
-                          platform.stringTables,
-                          platform.mainBundleIdentifier};
+  Platform cannedPlatform{
+      .log = platform.log,
+      .clock = platform.clock,
+      .queues = platform.queues,
+      .files = platform.files,
+      .propertyLists = platform.propertyLists,
+      .preferences = platform.preferences,
+      .locale = platform.locale,
+      .random = platform.random,
+      .http = canned,
+      .deviceProperties = platform.deviceProperties,
+      .featureFlags = platform.featureFlags,
+      .pairedDevices = platform.pairedDevices,
+      .accounts = platform.accounts,
+      .accountSession = platform.accountSession,
+      .attestation = platform.attestation,
+      .services = platform.services,
+      .processes = platform.processes,
+      .activities = platform.activities,
+      .followUps = platform.followUps,
+      .carriers = platform.carriers,
+      .notifications = platform.notifications,
+      .cleanExit = platform.cleanExit,
+      .applications = platform.applications,
+      .store = platform.store,
+      .stringTables = platform.stringTables,
+      .mainBundleIdentifier = platform.mainBundleIdentifier,
+  };
+  registerActivities(cannedPlatform);
   const std::string answer = coverageAnswer();
   const std::string path = (process.programs().world.home() / "by-hand.plist").string();
   const auto series = inTurns(

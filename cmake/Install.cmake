@@ -25,7 +25,8 @@ install(DIRECTORY examples DESTINATION ${CMAKE_INSTALL_DOCDIR} USE_SOURCE_PERMIS
 
 set(CMAKE_INSTALL_DEFAULT_COMPONENT_NAME client)
 install(TARGETS kvragent-client EXPORT kvragent-client LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR})
-foreach(header client/AgentClient client/LocalState client/Records platform/Date platform/Error platform/Value)
+foreach(header client/AgentClient client/LocalState client/Records platform/value/Date
+        platform/value/Error platform/value/Value)
   get_filename_component(folder ${header} DIRECTORY)
   install(FILES src/${header}.h DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/kvragent/${folder})
 endforeach()

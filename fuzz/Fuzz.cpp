@@ -1,6 +1,6 @@
 #include "Fuzz.h"
 
-#include "platform/PropertyList.h"
+#include "platform/codec/PropertyList.h"
 
 #include <algorithm>
 #include <cstdio>

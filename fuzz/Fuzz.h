@@ -1,7 +1,7 @@
 #pragma once
 
-#include "platform/Error.h"
-#include "platform/Value.h"
+#include "platform/value/Error.h"
+#include "platform/value/Value.h"
 
 #include <string>
 #include <string_view>

@@ -1,11 +1,11 @@
 // Reads files while memory is short: one allocation after the other fails, each once.
 #include "Fuzz.h"
-#include "platform/FilePreferences.h"
-#include "platform/JSON.h"
-#include "platform/PropertyListFiles.h"
-#include "platform/simulated/SimulatedClock.h"
-#include "platform/simulated/SimulatedFiles.h"
-#include "platform/simulated/SimulatedLog.h"
+#include "platform/codec/JSON.h"
+#include "platform/stores/FilePreferences.h"
+#include "platform/stores/PropertyListFiles.h"
+#include "simulated/SimulatedFiles.h"
+#include "simulated/SimulatedLog.h"
+#include "simulated/loop/SimulatedClock.h"
 
 #include <cstdio>
 #include <filesystem>

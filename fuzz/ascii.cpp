@@ -1,4 +1,4 @@
 #include "Fuzz.h"
-#include "platform/ASCIIPropertyList.h"
+#include "platform/codec/ASCIIPropertyList.h"
 
 void kvr::fuzz::run(std::string_view input) { readAndWriteBack(input, readASCIIPropertyList); }

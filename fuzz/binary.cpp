@@ -1,4 +1,4 @@
 #include "Fuzz.h"
-#include "platform/BinaryPropertyList.h"
+#include "platform/codec/BinaryPropertyList.h"
 
 void kvr::fuzz::run(std::string_view input) { readAndWriteBack(input, readBinaryPropertyList); }

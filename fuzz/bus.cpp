@@ -1,9 +1,9 @@
 // What comes over the bus: a message whose body is the input, as a peer may send it; and what was read, sent
 // on.
 #include "Fuzz.h"
-#include "platform/local/Descriptor.h"
-#include "platform/local/bus/BusCodec.h"
-#include "platform/local/bus/BusHandles.h"
+#include "local/buscodec/BusCodec.h"
+#include "local/buscodec/BusHandles.h"
+#include "local/system/Descriptor.h"
 
 #include <sys/socket.h>
 #include <unistd.h>

@@ -1,7 +1,7 @@
 // The agent's own property lists below the home directory: the input stands in the place of each.
 #include "Fuzz.h"
-#include "platform/simulated/SimulatedPlatform.h"
-#include "warranty/KVRWarranty.h"
+#include "core/warranty/KVRWarranty.h"
+#include "simulated/SimulatedPlatform.h"
 
 #include <algorithm>
 
@@ -91,9 +91,12 @@ void runActivities(SimulatedPlatform& simulated, const std::string& bytes) {
   const auto store = storeAt(simulated, bytes, "Activities/com.tarsil.kvragent.plist");
   const auto schedule = [](SimulatedPlatform& on, const char* identifier, bool isNew) {
     const auto activity = on.activities.newActivity(identifier);
-    activity->setPreregistered(!isNew);
-    activity->setCriteria({.delay = 3600, .gracePeriod = 60});
-    activity->schedule([](const ActivityHandler& handler) { handler(ActivityResult::Finished); });
+    const auto finish = [](const ActivityHandler& handler) { handler(ActivityResult::Finished); };
+    if (isNew) {
+      activity->registerAnew({.criteria = {.delay = 3600, .gracePeriod = 60}}, finish);
+    } else {
+      activity->checkIn({}, finish);
+    }
   };
   for (const auto* known : {"com.tarsil.kvragent.outreach", "com.tarsil.kvragent.followuprefresh"}) {
     schedule(simulated, known, false);

@@ -1,11 +1,11 @@
 // One exchange over HTTP: what stands before the first byte FF sets the request's headers, the rest is what
 // the server answers.
 #include "Fuzz.h"
-#include "platform/local/Descriptor.h"
-#include "platform/local/EventLoop.h"
-#include "platform/local/LocalHTTP.h"
-#include "platform/local/LocalWorkQueues.h"
-#include "platform/simulated/SimulatedLog.h"
+#include "local/http/LocalHTTP.h"
+#include "local/loop/EventLoop.h"
+#include "local/loop/LocalWorkQueues.h"
+#include "local/system/Descriptor.h"
+#include "simulated/SimulatedLog.h"
 
 #include <arpa/inet.h>
 #include <poll.h>

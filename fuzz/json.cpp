@@ -1,9 +1,9 @@
 // What the service answers: from JSON to a record, and through every form a record takes.
-#include "platform/JSON.h"
+#include "platform/codec/JSON.h"
 
 #include "Fuzz.h"
-#include "platform/simulated/SimulatedPlatform.h"
-#include "warranty/KVRWarranty.h"
+#include "core/warranty/KVRWarranty.h"
+#include "simulated/SimulatedPlatform.h"
 
 namespace kvr::fuzz {
 namespace {

@@ -1,9 +1,9 @@
 // The files of attested keys: the input stands in the place of each, the others are sound.
 #include "Fuzz.h"
-#include "platform/local/LocalKeyStore.h"
-#include "platform/simulated/SimulatedClock.h"
-#include "platform/simulated/SimulatedFiles.h"
-#include "platform/simulated/SimulatedLog.h"
+#include "local/keys/LocalKeyStore.h"
+#include "simulated/SimulatedFiles.h"
+#include "simulated/SimulatedLog.h"
+#include "simulated/loop/SimulatedClock.h"
 
 #include <openssl/objects.h>
 

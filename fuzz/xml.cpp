@@ -1,4 +1,4 @@
 #include "Fuzz.h"
-#include "platform/XMLPropertyList.h"
+#include "platform/codec/XMLPropertyList.h"
 
 void kvr::fuzz::run(std::string_view input) { readAndWriteBack(input, readXMLPropertyList); }

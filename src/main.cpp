@@ -1,8 +1,8 @@
 // The agent's program: builds the platform of this machine, starts the agent on it, and runs the main loop.
 
-#include "agent/StartUp.h"
-#include "platform/local/EventLoop.h"
-#include "platform/local/LocalPlatform.h"
+#include "core/agent/StartUp.h"
+#include "local/LocalPlatform.h"
+#include "local/loop/EventLoop.h"
 
 #include <systemd/sd-daemon.h>
 #include <systemd/sd-event.h>

@@ -1,7 +1,7 @@
 #pragma once
 
 // Before the names below, which some of its enumerators have too.
-#include "platform/PropertyListFiles.h"
+#include "platform/stores/PropertyListFiles.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>

@@ -1,17 +1,14 @@
 #include "client/AgentClient.h"
 
-#include "platform/local/bus/BusCodec.h"
-#include "platform/local/bus/BusHandles.h"
+#include "local/buscodec/BusCodec.h"
+#include "local/buscodec/BusHandles.h"
+#include "platform/names/Names.h"
 
 #include <cerrno>
 #include <utility>
 
 namespace kvr::client {
 namespace {
-
-constexpr const char* kName = "com.tarsil.kvragent";
-constexpr const char* kPath = "/com/tarsil/kvragent";
-constexpr const char* kInterface = "com.tarsil.kvragent.KVRAgentProtocol";
 
 constexpr std::uint64_t kSecond = 1'000'000;  // microseconds
 
@@ -69,8 +66,9 @@ void AgentClient::Close::operator()(sd_bus* bus) const { sd_bus_close_unref(bus)
 bool AgentClient::isAgentRunning() const {
   sd_bus_message* answer = nullptr;
   int isOwned = 0;
-  const int r = sd_bus_call_method(bus_.get(), "org.freedesktop.DBus", "/org/freedesktop/DBus",
-                                   "org.freedesktop.DBus", "NameHasOwner", nullptr, &answer, "s", kName);
+  const int r =
+      sd_bus_call_method(bus_.get(), "org.freedesktop.DBus", "/org/freedesktop/DBus", "org.freedesktop.DBus",
+                         "NameHasOwner", nullptr, &answer, "s", names::kAgent);
   const BusMessageRef reply(answer);
   return r >= 0 && sd_bus_message_read(answer, "b", &isOwned) >= 0 && isOwned != 0;
 }
@@ -78,7 +76,8 @@ bool AgentClient::isAgentRunning() const {
 Result<Value> AgentClient::call(const char* member, const std::vector<Argument>& arguments,
                                 const char* replyType) const {
   sd_bus_message* made = nullptr;
-  int r = sd_bus_message_new_method_call(bus_.get(), &made, kName, kPath, kInterface, member);
+  int r = sd_bus_message_new_method_call(bus_.get(), &made, names::kAgent, names::kObjectPath,
+                                         names::kInterface, member);
   const BusMessageRef message(made);
   if (r < 0) return failure(OtherFailure, busError(r, "the call cannot be made").message);
   for (const Argument& argument : arguments) {
@@ -164,7 +163,8 @@ Result<std::optional<std::string>> AgentClient::webURLOverride() const {
 
 std::optional<Error> AgentClient::tell(const char* member) const {
   sd_bus_message* made = nullptr;
-  int r = sd_bus_message_new_method_call(bus_.get(), &made, kName, kPath, kInterface, member);
+  int r = sd_bus_message_new_method_call(bus_.get(), &made, names::kAgent, names::kObjectPath,
+                                         names::kInterface, member);
   const BusMessageRef message(made);
   if (r >= 0) r = sd_bus_send(bus_.get(), made, nullptr);
   if (r >= 0) r = sd_bus_flush(bus_.get());
@@ -172,8 +172,8 @@ std::optional<Error> AgentClient::tell(const char* member) const {
 }
 
 std::optional<Error> AgentClient::post(const std::string& notification) const {
-  int r = sd_bus_emit_signal(bus_.get(), "/com/tarsil/NotificationCenter", "com.tarsil.NotificationCenter",
-                             "Posted", "s", notification.c_str());
+  int r = sd_bus_emit_signal(bus_.get(), names::kNotificationPath, names::kNotificationInterface,
+                             names::kNotificationMember, "s", notification.c_str());
   if (r >= 0) r = sd_bus_flush(bus_.get());
   return r < 0 ? std::optional(failureOf(r, BusError())) : std::nullopt;
 }

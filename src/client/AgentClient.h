@@ -1,7 +1,7 @@
 #pragma once
 
 #include "client/Records.h"
-#include "platform/Error.h"
+#include "platform/value/Error.h"
 
 #include <functional>
 #include <memory>

@@ -1,16 +1,15 @@
 #include "client/LocalState.h"
 
 #include "client/AgentClient.h"
-#include "platform/PropertyList.h"
+#include "platform/codec/PropertyList.h"
+#include "platform/names/Names.h"
+#include "platform/text/SHA256Hash.h"
 
-#include <openssl/sha.h>
 #include <pwd.h>
 #include <unistd.h>
 
 #include <algorithm>
-#include <array>
 #include <cerrno>
-#include <cstdio>
 #include <cstdlib>
 #include <fstream>
 #include <iterator>
@@ -19,32 +18,13 @@
 namespace kvr::client {
 namespace {
 
-constexpr const char* kFollowUps = "Library/FollowUps/com.tarsil.Kavrel.plist";
-constexpr const char* kActivities = "Library/Activities/com.tarsil.kvragent.plist";
-constexpr const char* kPreferences = "Library/Preferences/com.tarsil.kvragent.plist";
-constexpr std::string_view kTargetDate = ".TargetDate";
-constexpr std::string_view kDownloadedDate = "_CachedWarrantyLastUpdatedDate";
-constexpr std::string_view kDismissedDate = ".dismissed";
+const std::string kDownloadedDate = std::string("_") + names::kLastUpdatedDate;
 constexpr std::int64_t kBadge = 1;  // of the display style
-
-/// Under which the agent keeps what it knows of a device: of what comes before a NUL.
-std::string hashOf(std::string_view serialNumber) {
-  serialNumber = serialNumber.substr(0, serialNumber.find('\0'));
-  std::array<unsigned char, SHA256_DIGEST_LENGTH> digest{};
-  SHA256(reinterpret_cast<const unsigned char*>(serialNumber.data()), serialNumber.size(), digest.data());
-  std::string hash;
-  for (const auto byte : digest) {
-    std::array<char, 3> digits{};
-    std::snprintf(digits.data(), digits.size(), "%02x", byte);
-    hash += digits.data();
-  }
-  return hash;
-}
 
 }  // namespace
 
 FollowUp FollowUp::from(const Value& entry) {
-  return {entry["userInfo"]["FollowupSerialNumber"].stringIfAny(),
+  return {entry["userInfo"][names::kFollowUpSerialNumber].stringIfAny(),
           entry["title"].stringIfAny(),
           entry["informativeFooterText"].stringIfAny(),
           entry["targetBundleIdentifier"].stringIfAny(),
@@ -77,7 +57,7 @@ Result<Value> LocalState::dictionaryIn(const std::string& path) const {
 }
 
 Result<std::vector<FollowUp>> LocalState::followUps() const {
-  const auto tree = dictionaryIn(kFollowUps);
+  const auto tree = dictionaryIn(names::followUpsFile());
   if (!tree) return tree.error();
   std::vector<FollowUp> followUps;
   if (!(*tree)["items"].isArray()) return followUps;
@@ -86,8 +66,8 @@ Result<std::vector<FollowUp>> LocalState::followUps() const {
 }
 
 Result<std::vector<Activity>> LocalState::activities() const {
-  const auto registered = dictionaryIn(kActivities);
-  const auto preferences = dictionaryIn(kPreferences);
+  const auto registered = dictionaryIn(names::activitiesFile());
+  const auto preferences = dictionaryIn(names::preferencesFile());
   if (!registered || !preferences) return registered ? preferences.error() : registered.error();
   std::map<std::string, Activity> activities;
   if (const Value& all = (*registered)["activities"]; all.isDictionary()) {
@@ -105,8 +85,9 @@ Result<std::vector<Activity>> LocalState::activities() const {
   }
   if (preferences->isDictionary()) {
     for (const auto& [key, value] : preferences->dictionary()) {
-      if (!key.ends_with(kTargetDate)) continue;
-      activities[key.substr(0, key.size() - kTargetDate.size())].targetDate = value.dateIfAny();
+      constexpr std::string_view kSuffix = names::kTargetDateSuffix;
+      if (!key.ends_with(kSuffix)) continue;
+      activities[key.substr(0, key.size() - kSuffix.size())].targetDate = value.dateIfAny();
     }
   }
   std::vector<Activity> sorted;
@@ -120,13 +101,13 @@ Result<std::vector<Activity>> LocalState::activities() const {
 }
 
 Result<std::optional<Date>> LocalState::downloadedDate(const std::string& serialNumber) const {
-  const auto preferences = dictionaryIn(kPreferences);
+  const auto preferences = dictionaryIn(names::preferencesFile());
   if (!preferences) return preferences.error();
-  return (*preferences)[hashOf(serialNumber) + std::string(kDownloadedDate)].dateIfAny();
+  return (*preferences)[sha256Hash(serialNumber) + kDownloadedDate].dateIfAny();
 }
 
 Result<std::map<std::string, Date>> LocalState::downloads() const {
-  const auto preferences = dictionaryIn(kPreferences);
+  const auto preferences = dictionaryIn(names::preferencesFile());
   if (!preferences) return preferences.error();
   std::map<std::string, Date> dates;
   if (!preferences->isDictionary()) return dates;
@@ -138,8 +119,8 @@ Result<std::map<std::string, Date>> LocalState::downloads() const {
 }
 
 bool LocalState::isDismissed(const std::string& serialNumber) const {
-  const auto preferences = dictionaryIn(kPreferences);
-  return preferences && preferences->contains(hashOf(serialNumber) + std::string(kDismissedDate));
+  const auto preferences = dictionaryIn(names::preferencesFile());
+  return preferences && preferences->contains(sha256Hash(serialNumber) + names::kDismissedSuffix);
 }
 
 }  // namespace kvr::client

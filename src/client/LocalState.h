@@ -1,8 +1,8 @@
 #pragma once
 
-#include "platform/Date.h"
-#include "platform/Error.h"
-#include "platform/Value.h"
+#include "platform/value/Date.h"
+#include "platform/value/Error.h"
+#include "platform/value/Value.h"
 
 #include <algorithm>
 #include <map>

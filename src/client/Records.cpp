@@ -1,6 +1,6 @@
 #include "client/Records.h"
 
-#include "platform/EpochNumber.h"
+#include "platform/value/EpochNumber.h"
 
 namespace kvr::client {
 

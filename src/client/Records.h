@@ -1,7 +1,7 @@
 #pragma once
 
-#include "platform/Date.h"
-#include "platform/Value.h"
+#include "platform/value/Date.h"
+#include "platform/value/Value.h"
 
 #include <cstdint>
 #include <optional>

@@ -6,13 +6,14 @@
 // agent when a notification has been posted, which it then posts again, or when an activity is due. It leaves
 // when there is an agent.
 
-#include "platform/local/BusConnection.h"
-#include "platform/local/LocalChanges.h"
-#include "platform/local/LocalClock.h"
-#include "platform/local/LocalFiles.h"
-#include "platform/local/LocalLog.h"
-#include "platform/local/LocalWorkQueues.h"
-#include "platform/local/bus/BusHandles.h"
+#include "local/bus/BusConnection.h"
+#include "local/buscodec/BusHandles.h"
+#include "local/loop/LocalWorkQueues.h"
+#include "local/process/LocalChanges.h"
+#include "local/system/LocalClock.h"
+#include "local/system/LocalFiles.h"
+#include "local/system/LocalLog.h"
+#include "platform/names/Names.h"
 
 #include <sys/epoll.h>
 #include <systemd/sd-event.h>
@@ -28,7 +29,6 @@
 namespace kvr {
 namespace {
 
-constexpr const char* kName = "com.tarsil.kvragent";
 constexpr const char* kBus = "org.freedesktop.DBus";
 constexpr const char* kBusPath = "/org/freedesktop/DBus";
 constexpr double kLongestWait = 86400;  // seconds; between two looks at a clock that may have been set
@@ -37,8 +37,7 @@ constexpr double kRetry = 60;           // seconds; after a start that failed
 class Waker {
  public:
   int run() {
-    for (const auto* name : {UserLocale::kLanguageChanged, PairedDeviceRegistry::kDeviceDidPair,
-                             PairedDeviceRegistry::kDeviceDidUnpair}) {
+    for (const auto* name : {names::kLanguageChanged, names::kDeviceDidPair, names::kDeviceDidUnpair}) {
       notifications_.registerFor(name, [this, name] {
         const auto before = static_cast<std::size_t>(std::ranges::count(heard_, name));
         if (before < LocalNotifications::kMostInARow) heard_.push_back(name);
@@ -70,7 +69,7 @@ class Waker {
         const char* before = nullptr;
         const char* now = nullptr;
         if (sd_bus_message_read(message, "sss", &name, &before, &now) >= 0 &&
-            std::string_view(name) == kName && *now != '\0') {
+            std::string_view(name) == names::kAgent && *now != '\0') {
           static_cast<Waker*>(context)->loop_.exit(EXIT_SUCCESS);
         }
         return 0;
@@ -92,7 +91,7 @@ class Waker {
   /// When the next activity is due, by what the agent has left on disk.
   std::optional<Date> dueDate() {
     const auto tree =
-        lists_.read(files_.homeDirectory() + "/Library/Activities/" + kName + ".plist",
+        lists_.read(files_.homeDirectory() + "/" + names::activitiesFile(),
                     PropertyListFiles::Expected::Dictionary, PropertyListFiles::WhenDamaged::Leave);
     std::optional<Date> due;
     if (!tree || !(*tree)["activities"].isDictionary()) return due;
@@ -118,7 +117,7 @@ class Waker {
       sd_bus* const bus = bus_.bus();
       const bool isStarted =
           bus != nullptr && sd_bus_call_method(bus, kBus, kBusPath, kBus, "StartServiceByName", nullptr,
-                                               nullptr, "su", kName, 0U) >= 0;
+                                               nullptr, "su", names::kAgent, 0U) >= 0;
       loop_.post([this, isStarted] { finishStart(isStarted); });
     });
   }

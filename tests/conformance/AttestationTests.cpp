@@ -1,6 +1,6 @@
 #include "conformance/FileWorld.h"
-#include "platform/local/LocalDeviceAttestation.h"
-#include "platform/simulated/SimulatedDeviceProperties.h"
+#include "local/keys/LocalDeviceAttestation.h"
+#include "simulated/SimulatedDeviceProperties.h"
 
 #include <openssl/pem.h>
 #include <openssl/x509v3.h>

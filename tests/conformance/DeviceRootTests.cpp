@@ -1,10 +1,10 @@
 #include "conformance/FileWorld.h"
-#include "platform/local/DeviceRoot.h"
-#include "platform/local/LocalAccountStore.h"
-#include "platform/local/LocalDeviceProperties.h"
-#include "platform/local/LocalEntitlements.h"
-#include "platform/local/LocalProcesses.h"
-#include "platform/local/LocalUserLocale.h"
+#include "local/device/DeviceRoot.h"
+#include "local/device/LocalAccountStore.h"
+#include "local/device/LocalDeviceProperties.h"
+#include "local/device/LocalEntitlements.h"
+#include "local/locale/LocalUserLocale.h"
+#include "local/process/LocalProcesses.h"
 
 #include <spawn.h>
 #include <sys/stat.h>

@@ -2,10 +2,10 @@
 
 #include "Prelude.h"
 #include "integration/support/TemporaryDirectory.h"
-#include "platform/local/LocalFiles.h"
-#include "platform/simulated/SimulatedClock.h"
-#include "platform/simulated/SimulatedFiles.h"
-#include "platform/simulated/SimulatedLog.h"
+#include "local/system/LocalFiles.h"
+#include "simulated/SimulatedFiles.h"
+#include "simulated/SimulatedLog.h"
+#include "simulated/loop/SimulatedClock.h"
 
 namespace kvr {
 

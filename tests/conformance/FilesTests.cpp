@@ -1,6 +1,6 @@
 #include "conformance/FileWorld.h"
-#include "platform/local/Descriptor.h"
-#include "platform/local/LocalLog.h"
+#include "local/system/Descriptor.h"
+#include "local/system/LocalLog.h"
 
 #include <fcntl.h>
 #include <sys/file.h>

@@ -1,5 +1,5 @@
 #include "conformance/FileWorld.h"
-#include "platform/FileFollowUpCenter.h"
+#include "platform/stores/FileFollowUpCenter.h"
 
 namespace kvr {
 namespace {

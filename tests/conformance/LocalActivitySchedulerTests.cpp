@@ -1,11 +1,11 @@
 #include "conformance/FileWorld.h"
-#include "platform/local/EventLoop.h"
-#include "platform/local/LocalActivityScheduler.h"
-#include "platform/local/LocalCarrierInfo.h"
-#include "platform/local/LocalClock.h"
-#include "platform/local/LocalRandom.h"
-#include "platform/local/LocalWorkQueues.h"
-#include "platform/simulated/SimulatedDeviceProperties.h"
+#include "local/device/LocalCarrierInfo.h"
+#include "local/loop/EventLoop.h"
+#include "local/loop/LocalWorkQueues.h"
+#include "local/process/LocalActivityScheduler.h"
+#include "local/system/LocalClock.h"
+#include "local/system/LocalRandom.h"
+#include "simulated/SimulatedDeviceProperties.h"
 
 #include <mutex>
 
@@ -39,14 +39,10 @@ struct Start {
     };
   }
   void add(const std::string& identifier, const ActivityCriteria& criteria) {
-    const auto activity = scheduler.newActivity(identifier);
-    activity->setCriteria(criteria);
-    activity->schedule(recorder(identifier));
+    scheduler.newActivity(identifier)->registerAnew({.criteria = criteria}, recorder(identifier));
   }
   void monitor(const std::string& identifier) {
-    const auto activity = scheduler.newActivity(identifier);
-    activity->setPreregistered(true);
-    activity->schedule(recorder(identifier));
+    scheduler.newActivity(identifier)->checkIn({}, recorder(identifier));
   }
   /// Ends this start in order; what ran in it.
   std::vector<std::string> finish() {

@@ -1,5 +1,5 @@
 #include "conformance/FileWorld.h"
-#include "platform/FilePreferences.h"
+#include "platform/stores/FilePreferences.h"
 
 #include <thread>
 

@@ -1,8 +1,8 @@
 #include "Prelude.h"
-#include "platform/local/EventLoop.h"
-#include "platform/local/LocalWorkQueues.h"
-#include "platform/simulated/SimulatedLog.h"
-#include "platform/simulated/SimulatedWorkQueues.h"
+#include "local/loop/EventLoop.h"
+#include "local/loop/LocalWorkQueues.h"
+#include "simulated/SimulatedLog.h"
+#include "simulated/loop/SimulatedWorkQueues.h"
 
 #include <atomic>
 #include <future>

@@ -1,5 +1,5 @@
 #include "integration/support/AgentWorld.h"
-#include "platform/JSON.h"
+#include "platform/codec/JSON.h"
 
 #include <ctime>
 

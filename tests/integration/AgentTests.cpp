@@ -1,6 +1,6 @@
 #include "integration/support/AgentWorld.h"
-#include "platform/JSON.h"
-#include "signing/SHA256Hash.h"
+#include "platform/codec/JSON.h"
+#include "platform/text/SHA256Hash.h"
 #include "unit/OddSerialNumbers.h"
 
 namespace kvr::testing {

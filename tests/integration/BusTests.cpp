@@ -1,6 +1,6 @@
+#include "Trees.h"
 #include "integration/support/BusFixture.h"
-#include "platform/local/bus/BusCodec.h"
-#include "unit/platform/Trees.h"
+#include "local/buscodec/BusCodec.h"
 
 #include <atomic>
 #include <numeric>

@@ -2,9 +2,9 @@
 #include "integration/support/ChildProcess.h"
 #include "integration/support/HTTPClient.h"
 #include "integration/support/TemporaryDirectory.h"
-#include "platform/JSON.h"
-#include "platform/local/LocalCertificates.h"
-#include "signing/Base64.h"
+#include "local/keys/LocalCertificates.h"
+#include "platform/codec/JSON.h"
+#include "platform/text/Base64.h"
 
 #include <zlib.h>
 
@@ -36,12 +36,12 @@ struct Identity {
   static CertifiedKey authorityOf(const openssl::Key& key) { return {key, *newAuthorityCertificate(key)}; }
   /// The JSON of the chain.
   std::string chain(JSONSlashes slashes = JSONSlashes::Escaped) const {
-    const Array certificates{base64Encoded(*derOf(leaf)), base64Encoded(*derOf(authority.certificate))};
+    const Array certificates{base64Encode(*derOf(leaf)), base64Encode(*derOf(authority.certificate))};
     return *writeJSON(Dictionary{{"certs", certificates}}, slashes);
   }
   void attest(HTTPRequest& request) const {
-    request.headers.set("X-Tarsil-Kest-S", base64Encoded(*sign(key, request.body)));
-    request.headers.set("X-Tarsil-Kest", base64Encoded(deflated(chain(), -MAX_WBITS)));
+    request.headers.set("X-Tarsil-Kest-S", base64Encode(*sign(key, request.body)));
+    request.headers.set("X-Tarsil-Kest", base64Encode(deflated(chain(), -MAX_WBITS)));
   }
 };
 
@@ -108,7 +108,7 @@ TEST_F(ACoverageService, RefusesEveryBrokenRuleWithAReason) {
   const auto replace = [](const std::string& part, const char* other) {
     return [=](HTTPRequest& request) { request.body.replace(request.body.find(part), part.size(), other); };
   };
-  const auto chain = [&set](const std::string& bytes) { return set("X-Tarsil-Kest", base64Encoded(bytes)); };
+  const auto chain = [&set](const std::string& bytes) { return set("X-Tarsil-Kest", base64Encode(bytes)); };
   const Case signedCases[] = {
       {"the method is not POST", [](auto& request) { request.method = "PUT"; }},
       {"Content-Type", set("Content-Type", "application/json; charset=utf-8")},

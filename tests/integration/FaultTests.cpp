@@ -1,7 +1,7 @@
 // The real agent, ended or refused at each of its calls about files in turn.
 #include "integration/support/AgentWorld.h"
 #include "integration/support/Injection.h"
-#include "signing/SHA256Hash.h"
+#include "platform/text/SHA256Hash.h"
 
 #include <fcntl.h>
 #include <sys/mman.h>

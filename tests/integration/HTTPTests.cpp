@@ -1,6 +1,6 @@
 #include "Prelude.h"
 #include "integration/support/HTTPClient.h"
-#include "platform/local/Descriptor.h"
+#include "local/system/Descriptor.h"
 
 #include <arpa/inet.h>
 #include <netinet/in.h>

@@ -1,6 +1,6 @@
-#include "followup/KVRFollowUp.h"
+#include "core/followup/KVRFollowUp.h"
 #include "integration/support/AgentWorld.h"
-#include "platform/PropertyList.h"
+#include "platform/codec/PropertyList.h"
 
 #include <future>
 

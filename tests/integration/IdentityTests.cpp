@@ -1,4 +1,4 @@
-#include "agent/KVRAgentProtocol.h"
+#include "core/agent/KVRAgentProtocol.h"
 #include "integration/support/AgentWorld.h"
 
 #include <signal.h>

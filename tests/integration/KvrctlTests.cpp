@@ -1,8 +1,8 @@
-#include "agent/KVRAgentProtocol.h"
+#include "core/agent/KVRAgentProtocol.h"
 #include "integration/support/BusFixture.h"
-#include "platform/JSON.h"
-#include "platform/local/BusIntrospection.h"
-#include "signing/SHA256Hash.h"
+#include "local/bus/BusIntrospection.h"
+#include "platform/codec/JSON.h"
+#include "platform/text/SHA256Hash.h"
 #include "unit/OddSerialNumbers.h"
 
 #include <iterator>

@@ -1,8 +1,9 @@
 #pragma once
 
-#include "signing/SHA256Hash.h"
+#include "core/agent/Activities.h"
+#include "core/warranty/WarrantyKeys.h"
+#include "platform/text/SHA256Hash.h"
 #include "unit/SimulatedTest.h"
-#include "warranty/WarrantyKeys.h"
 
 namespace kvr {
 
@@ -12,6 +13,7 @@ struct CoverageWorld : SimulatedPlatform {
   static constexpr const char* kLocal = "LOCAL";
 
   explicit CoverageWorld(std::uint64_t seed = 1) : SimulatedPlatform(seed) {
+    registerActivities(platform);
     clock.set(Date{1'800'000'000});
     featureFlags.enabled.insert({"Kavrel", "Bravik_3_0"});
     attestation.preferred = SimulatedDeviceAttestation::issued(attestation.key, {std::string(600, 'c')});

@@ -1,7 +1,7 @@
 #pragma once
 
 #include "Prelude.h"
-#include "platform/simulated/SimulatedPlatform.h"
+#include "simulated/SimulatedPlatform.h"
 
 namespace kvr {
 

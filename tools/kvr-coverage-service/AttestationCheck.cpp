@@ -1,8 +1,8 @@
 #include "AttestationCheck.h"
 
-#include "platform/Base64.h"
-#include "platform/JSON.h"
-#include "platform/local/OpenSSLHandles.h"
+#include "local/keys/OpenSSLHandles.h"
+#include "platform/codec/JSON.h"
+#include "platform/text/Base64.h"
 
 #include <openssl/pem.h>
 #include <zlib.h>

@@ -1,7 +1,7 @@
 #include "CoverageCheck.h"
 
 #include "AttestationCheck.h"
-#include "platform/JSON.h"
+#include "platform/codec/JSON.h"
 
 #include <cmath>
 #include <string_view>

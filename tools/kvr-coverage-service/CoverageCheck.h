@@ -1,7 +1,7 @@
 #pragma once
 
 #include "ReceivedRequest.h"
-#include "platform/Value.h"
+#include "platform/value/Value.h"
 
 #include <optional>
 #include <string>

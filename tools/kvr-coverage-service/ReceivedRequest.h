@@ -1,6 +1,6 @@
 #pragma once
 
-#include "platform/HTTP.h"
+#include "platform/services/HTTP.h"
 
 #include <string>
 #include <vector>

@@ -1,8 +1,8 @@
 #include "RequestRecords.h"
 
-#include "platform/Base64.h"
-#include "platform/JSON.h"
-#include "platform/UTF8.h"
+#include "platform/codec/JSON.h"
+#include "platform/text/Base64.h"
+#include "platform/text/UTF8.h"
 
 #include <algorithm>
 #include <charconv>
@@ -38,8 +38,7 @@ Value documentOf(const ReceivedRequest& request, int status, const std::optional
   if (isUTF8(request.body)) {
     document.emplace("body", request.body);
   } else {
-    document.emplace("bodyBase64", base64Encode({reinterpret_cast<const std::uint8_t*>(request.body.data()),
-                                                 request.body.size()}));
+    document.emplace("bodyBase64", base64Encode(request.body));
   }
   if (reason) document.emplace("reason", legible(*reason));
   return document;

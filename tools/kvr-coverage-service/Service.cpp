@@ -2,8 +2,8 @@
 
 #include "CoverageCheck.h"
 #include "ReadFile.h"
-#include "platform/JSON.h"
-#include "platform/PropertyList.h"
+#include "platform/codec/JSON.h"
+#include "platform/codec/PropertyList.h"
 
 #include <algorithm>
 #include <chrono>

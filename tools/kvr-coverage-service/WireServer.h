@@ -1,7 +1,7 @@
 #pragma once
 
-#include "platform/HTTP.h"
-#include "platform/local/Descriptor.h"
+#include "local/system/Descriptor.h"
+#include "platform/services/HTTP.h"
 
 #include <httplib.h>
 

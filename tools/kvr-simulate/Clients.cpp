@@ -1,7 +1,8 @@
 #include "kvr-simulate/Clients.h"
 
-#include "agent/AgentKeys.h"
-#include "agent/LookupPolicy.h"
+#include "core/agent/AgentKeys.h"
+#include "core/warranty/LookupPolicy.h"
+#include "platform/names/Names.h"
 
 #include <algorithm>
 #include <limits>
@@ -55,8 +56,8 @@ Value::Array Clients::argumentsFor(const std::string& member, Dice& dice) const 
 std::shared_ptr<SimulatedServiceConnection> Clients::connection(Dice& dice, SimulatedPlatform& platform) {
   if (!connections_.empty() && dice.happens(0.5)) return dice.oneOf(connections_);
   SimulatedPeer peer;
-  if (!dice.happens(0.05)) peer.entitlements = {{kRequiredEntitlement, true}};
-  connections_.push_back(platform.services.connect(kServiceName, peer));
+  if (!dice.happens(0.05)) peer.entitlements = {{names::kEntitlement, true}};
+  connections_.push_back(platform.services.connect(names::kAgent, peer));
   return connections_.back();
 }
 
@@ -80,7 +81,7 @@ std::string Clients::ask(Dice& dice, SimulatedPlatform& platform) {
 std::shared_ptr<const SimulatedServiceConnection::Call> Clients::invoke(SimulatedPlatform& platform,
                                                                         const std::string& member,
                                                                         Value::Array arguments) {
-  connections_.push_back(platform.services.connect(kServiceName, {{{kRequiredEntitlement, true}}}));
+  connections_.push_back(platform.services.connect(names::kAgent, {{{names::kEntitlement, true}}}));
   auto call = connections_.back()->invoke(member, arguments);
   open_.push_back({member, std::move(arguments), call, world_.now, kLimit});
   return call;

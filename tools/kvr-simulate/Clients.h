@@ -1,7 +1,7 @@
 #pragma once
 
 #include "kvr-simulate/Invariants.h"
-#include "platform/simulated/SimulatedServiceListeners.h"
+#include "simulated/SimulatedServiceListeners.h"
 
 #include <memory>
 #include <set>

@@ -1,11 +1,12 @@
 // Conversion dates, and what is known of a device's warranty.
 
+#include "core/scheduling/SchedulingKeys.h"
+#include "core/warranty/CacheMetadata.h"
+#include "core/warranty/WarrantyKeys.h"
 #include "kvr-simulate/Epochs.h"
 #include "kvr-simulate/Invariants.h"
-#include "scheduling/SchedulingKeys.h"
-#include "signing/SHA256Hash.h"
-#include "warranty/CacheMetadata.h"
-#include "warranty/WarrantyKeys.h"
+#include "platform/names/Names.h"
+#include "platform/text/SHA256Hash.h"
 
 #include <algorithm>
 #include <cmath>
@@ -36,7 +37,7 @@ void Invariants::answered(const Value& warranty) {
 /// Downloads bring dates. After a boot what is pending counts, and an upgrade in the same start schedules
 /// only then.
 void Invariants::checkConversionDate(const Value& stored) {
-  if (runs_.contains(activity::kPostBoot) && stored == conversionAtStart_) return;
+  if (runs_.contains(names::kPostBoot) && stored == conversionAtStart_) return;
   const auto date = stored.dateIfAny();
   const bool isBrought = date && std::ranges::any_of(conversionDates_, [&](Date brought) {
                            return std::abs(brought - *date) <= roundingOf(*date);

@@ -1,8 +1,8 @@
 #pragma once
 
 #include "kvr-simulate/Dice.h"
-#include "platform/Date.h"
-#include "platform/Value.h"
+#include "platform/value/Date.h"
+#include "platform/value/Value.h"
 
 #include <optional>
 

@@ -1,11 +1,12 @@
 // Files, preferences and follow-ups.
 
-#include "followup/FollowUpKeys.h"
+#include "core/followup/FollowUpKeys.h"
+#include "core/scheduling/SchedulingKeys.h"
+#include "core/warranty/WarrantyKeys.h"
 #include "kvr-simulate/Invariants.h"
-#include "platform/PropertyList.h"
-#include "scheduling/SchedulingKeys.h"
-#include "signing/SHA256Hash.h"
-#include "warranty/WarrantyKeys.h"
+#include "platform/codec/PropertyList.h"
+#include "platform/names/Names.h"
+#include "platform/text/SHA256Hash.h"
 
 #include <algorithm>
 
@@ -14,15 +15,15 @@ namespace {
 
 const std::string kPreferencesPath =
     std::string(SimulatedFiles::kHomeDirectory) + "/Library/Preferences/com.tarsil.kvragent.plist";
-const std::string kFollowUpsPath = std::string(SimulatedFiles::kHomeDirectory) + "/Library/FollowUps/" +
-                                   kFollowUpClientIdentifier + ".plist";
+const std::string kFollowUpsPath =
+    std::string(SimulatedFiles::kHomeDirectory) + "/Library/FollowUps/" + names::kFollowUpClient + ".plist";
 
 bool isTemporary(const std::string& path) { return path.find(".kvr-") != std::string::npos; }
 
 Value::Array listIn(const Value& value) { return value.isArray() ? value.array() : Value::Array(); }
 
 bool mayBeRemoved(const std::string& key) {
-  return key == preference::kServerVersionCache || key == preference::kCachedWarrantyLastUpdatedDate ||
+  return key == preference::kServerVersionCache || key == names::kLastUpdatedDate ||
          key == preference::kCachedWarrantyLocale || key == preference::kCachedWarrantyVersion;
 }
 
@@ -115,13 +116,13 @@ void Invariants::checkChange(const std::string& key, const Value& before, const 
   }
   if (key == preference::kConversionOutreachScheduledDate && !after.isNull()) checkConversionDate(after);
   if (key == preference::kServerVersionCache && isWithoutWatches(before)) trouble();
-  if (key.ends_with(std::string("_") + preference::kCachedWarrantyLastUpdatedDate)) downloaded(key);
+  if (key.ends_with(std::string("_") + names::kLastUpdatedDate)) downloaded(key);
   // A post run schedules the refresh for what it looked up, in the place of what others wait for.
-  const auto refreshDate = std::string(activity::kFollowUpRefresh) + preference::kTargetDateSuffix;
-  if (key == refreshDate && runs_.contains(activity::kFollowUpPost)) refreshed_.clear();
+  const auto refreshDate = std::string(names::kFollowUpRefresh) + names::kTargetDateSuffix;
+  if (key == refreshDate && runs_.contains(names::kFollowUpPost)) refreshed_.clear();
   if (!after.isNull() || mayBeRemoved(key)) return;
-  if (key.ends_with(preference::kTargetDateSuffix)) {
-    checkTargetDateRemoval(key.substr(0, key.size() - std::string_view(preference::kTargetDateSuffix).size()),
+  if (key.ends_with(names::kTargetDateSuffix)) {
+    checkTargetDateRemoval(key.substr(0, key.size() - std::string_view(names::kTargetDateSuffix).size()),
                            before);
   } else {
     report("preferences are never lost", key);
@@ -131,7 +132,7 @@ void Invariants::checkChange(const std::string& key, const Value& before, const 
 /// The end of the run that was started for this date removes it, and the very first run after an upgrade all
 /// of them; whoever schedules for no date, none in the agent, would do so as well.
 void Invariants::checkTargetDateRemoval(const std::string& activity, const Value& before) {
-  const auto upgrade = runs_.find(activity::kPostUpgrade);
+  const auto upgrade = runs_.find(names::kPostUpgrade);
   if (upgrade != runs_.end() && upgrade->second.isFirstUpgrade) return;
   const auto run = runs_.find(activity);
   if (run != runs_.end() && run->second.startedFor == before) {
@@ -150,7 +151,7 @@ void Invariants::checkPostedList(const Value& before, const Value& after, const 
   }
   for (const auto& hash : listIn(before)) {
     if (seen.contains(hash.string())) continue;
-    if (tree[hash.string() + preference::kDismissedSuffix].isNull()) {
+    if (tree[hash.string() + names::kDismissedSuffix].isNull()) {
       report("what is posted is remembered", hash.string() + " was forgotten");
     }
   }
@@ -161,7 +162,7 @@ void Invariants::checkPostedList(const Value& before, const Value& after, const 
 void Invariants::checkFollowUps() {
   std::set<std::string> serialNumbers;
   for (const auto& item : pendingItems()) {
-    const auto found = item.userInfo.find(kFollowUpSerialNumberKey);
+    const auto found = item.userInfo.find(names::kFollowUpSerialNumber);
     if (found == item.userInfo.end()) continue;
     if (!serialNumbers.insert(found->second.string()).second) {
       report("no follow-up is posted twice", found->second.string());
@@ -184,11 +185,11 @@ bool Invariants::posting(const FollowUpItem& item, const std::vector<FollowUpIte
     return std::ranges::any_of(
         pending, [&](const FollowUpItem& other) { return other.uniqueIdentifier == identifier; });
   };
-  const bool isMigrated = isPending(kFollowUpClientIdentifier);
+  const bool isMigrated = isPending(names::kFollowUpClient);
   const bool wasPending = isMigrated || isPending(item.uniqueIdentifier.value_or(""));
   if (!isWatching()) return wasPending;
   const auto now = platform_->clock.now();
-  const auto serial = item.userInfo.find(kFollowUpSerialNumberKey);
+  const auto serial = item.userInfo.find(names::kFollowUpSerialNumber);
   auto* const offer = world_.service.find(item.title);
   if (serial == item.userInfo.end() || offer == nullptr || offer->lastServed < 0) {
     report("follow-ups are made from what the service said", describe(item.title));
@@ -196,7 +197,7 @@ bool Invariants::posting(const FollowUpItem& item, const std::vector<FollowUpIte
   }
   const auto hash = sha256Hash(serial->second.string());
   if (offer->serialNumber != serial->second.string() ||
-      item.uniqueIdentifier != std::string(kFollowUpClientIdentifier) + "." + hash) {
+      item.uniqueIdentifier != std::string(names::kFollowUpClient) + "." + hash) {
     report("follow-ups are made from what the service said", "another device's");
   }
   // What an earlier version showed is shown on, whatever it is made of.
@@ -216,7 +217,7 @@ void Invariants::checkNewPost(const Offer& offer, const std::string& name, Date 
   if (due && *due > now) {
     report("nothing is posted before its date", name + ", due at " + describe(*due));
   }
-  const auto run = runs_.find(activity::kFollowUpPost);
+  const auto run = runs_.find(names::kFollowUpPost);
   if (run == runs_.end() || offer.lastServed < run->second.began) {
     report("what is posted was asked for anew", name);
   }
@@ -232,12 +233,12 @@ void Invariants::posted(const FollowUpItem& item, bool wasPending, bool isDone) 
   }
   expired_.erase(*item.uniqueIdentifier);
   ++figures.posts;
-  if (runs_.contains(activity::kFollowUpRefresh)) {
+  if (runs_.contains(names::kFollowUpRefresh)) {
     refreshed_[*item.uniqueIdentifier] = world_.now;
   } else {
     refreshed_.erase(*item.uniqueIdentifier);
   }
-  if (!wasPending) toBeListed_.insert(sha256Hash(item.userInfo.at(kFollowUpSerialNumberKey).string()));
+  if (!wasPending) toBeListed_.insert(sha256Hash(item.userInfo.at(names::kFollowUpSerialNumber).string()));
 }
 
 void Invariants::clearing(const std::vector<std::string>& uniqueIdentifiers,
@@ -245,12 +246,12 @@ void Invariants::clearing(const std::vector<std::string>& uniqueIdentifiers,
   if (!isWatching()) return;
   for (const auto& item : pending) {
     if (std::ranges::find(uniqueIdentifiers, item.uniqueIdentifier) == uniqueIdentifiers.end()) continue;
-    const auto serial = item.userInfo.find(kFollowUpSerialNumberKey);
+    const auto serial = item.userInfo.find(names::kFollowUpSerialNumber);
     if (serial == item.userInfo.end()) continue;
     checkCleared(serial->second.string());
     // The end fails what was asked for. Neither a dismissal nor the refresh activity has asked for anything.
     if (endDismisses_ && !endDismisses_->contains(serial->second.string()) &&
-        !runs_.contains(activity::kFollowUpRefresh)) {
+        !runs_.contains(names::kFollowUpRefresh)) {
       report("the end takes no follow-up away", describe(item.title));
     }
   }

@@ -1,12 +1,13 @@
 // What each kind of event does.
 
-#include "agent/LookupPolicy.h"
-#include "devices/DeviceKeys.h"
+#include "core/devices/DeviceKeys.h"
+#include "core/warranty/LookupPolicy.h"
+#include "core/warranty/WarrantyKeys.h"
 #include "kvr-simulate/Life.h"
-#include "platform/PairedDeviceRegistry.h"
-#include "platform/PropertyList.h"
-#include "platform/UserLocale.h"
-#include "warranty/WarrantyKeys.h"
+#include "platform/codec/PropertyList.h"
+#include "platform/names/Names.h"
+#include "platform/services/PairedDeviceRegistry.h"
+#include "platform/services/UserLocale.h"
 
 #include <cerrno>
 
@@ -85,17 +86,17 @@ void Life::offer(Dice& dice) {
 void Life::watch(Dice& dice) {
   if (world_.watches.empty()) return;
   auto& watch = world_.watches[dice.below(world_.watches.size())];
-  const char* notification = PairedDeviceRegistry::kDeviceDidUnpair;
+  const char* notification = names::kDeviceDidUnpair;
   if (!watch.isPaired) {
     watch.isPaired = true;
     watch.isArchived = false;
     const Date now = SimulatedClock::kDefaultStart + world_.now + clockOffset_;
     watch.pairedBefore = std::exchange(watch.paired, now);
     watch.pairedBefore = std::min(watch.pairedBefore, watch.paired);
-    notification = PairedDeviceRegistry::kDeviceDidPair;
+    notification = names::kDeviceDidPair;
   } else if (dice.happens(0.3)) {
     watch.isArchived = !watch.isArchived;
-    if (!watch.isArchived) notification = PairedDeviceRegistry::kDeviceDidPair;
+    if (!watch.isArchived) notification = names::kDeviceDidPair;
   } else {
     watch.isPaired = false;
   }
@@ -140,7 +141,7 @@ void Life::language(Dice& dice) {
   disturb();
   if (!process_) return;
   world_.show(process_->simulated);
-  process_->simulated.notifications.post(UserLocale::kLanguageChanged);
+  process_->simulated.notifications.post(names::kLanguageChanged);
 }
 
 void Life::setClock(double offset) {

@@ -2,12 +2,12 @@
 
 #include "kvr-simulate/Invariants.h"
 
-#include "agent/AgentKeys.h"
-#include "followup/FollowUpKeys.h"
-#include "platform/PropertyList.h"
-#include "platform/URL.h"
-#include "scheduling/SchedulingKeys.h"
-#include "signing/SHA256Hash.h"
+#include "core/followup/FollowUpKeys.h"
+#include "core/scheduling/SchedulingKeys.h"
+#include "platform/codec/PropertyList.h"
+#include "platform/names/Names.h"
+#include "platform/text/SHA256Hash.h"
+#include "platform/text/URL.h"
 
 #include <algorithm>
 #include <cmath>
@@ -73,8 +73,7 @@ void Invariants::beginProcess(SimulatedPlatform& platform) {
     }
   }
   readFilesAgain();
-  conversionAtStart_ =
-      preferences_[std::string(activity::kConversionOutreach) + preference::kTargetDateSuffix];
+  conversionAtStart_ = preferences_[std::string(names::kConversionOutreach) + names::kTargetDateSuffix];
 }
 
 void Invariants::endProcess() {
@@ -97,7 +96,7 @@ void Invariants::step() {
 }
 
 /// The service is offered last.
-bool Invariants::isStartingUp() const { return !platform_->services.isListening(kServiceName); }
+bool Invariants::isStartingUp() const { return !platform_->services.isListening(names::kAgent); }
 
 // Runs.
 
@@ -106,15 +105,15 @@ void Invariants::runBegins(const std::string& activity) {
   ++figures.runs;
   if (runs_.contains(activity)) report("an activity never runs twice at once", activity);
   if (isStartingUp()) report("start-up is alone", activity + " runs meanwhile");
-  if (activity == activity::kPostBoot && begun_.contains(activity::kPostUpgrade)) {
+  if (activity == names::kPostBoot && begun_.contains(names::kPostUpgrade)) {
     report("post-boot comes before post-upgrade", "it came after");
   }
   begun_.insert(activity);
   Run run;
-  run.startedFor = platform_->preferences.objectForKey(activity + preference::kTargetDateSuffix);
+  run.startedFor = platform_->preferences.objectForKey(activity + names::kTargetDateSuffix);
   run.started = platform_->clock.now();
   run.began = world_.now;
-  run.isFirstUpgrade = activity == activity::kPostUpgrade &&
+  run.isFirstUpgrade = activity == names::kPostUpgrade &&
                        !platform_->preferences.boolForKey(preference::kPostUpgradeActivityCompleted);
   runs_.insert_or_assign(activity, run);
   auto& times = runTimes_[activity];
@@ -204,8 +203,8 @@ void Invariants::checkOverdue(const Value& stored, const Value& registrations) {
   if (!stored.isDictionary()) return;
   const auto now = platform_->clock.now();
   for (const auto& [key, value] : stored.dictionary()) {
-    if (!key.ends_with(preference::kTargetDateSuffix)) continue;
-    const auto activity = key.substr(0, key.size() - std::string_view(preference::kTargetDateSuffix).size());
+    if (!key.ends_with(names::kTargetDateSuffix)) continue;
+    const auto activity = key.substr(0, key.size() - std::string_view(names::kTargetDateSuffix).size());
     const auto& registration = registrations[activity];
     if (runs_.contains(activity)) continue;
     if (registration.isNull()) {
@@ -225,15 +224,14 @@ void Invariants::checkOverdue(const Value& stored, const Value& registrations) {
 
 void Invariants::checkShown(const Value& stored, const Value& registrations) {
   const auto pending = pendingItems();
-  const auto refresh =
-      stored[std::string(activity::kFollowUpRefresh) + preference::kTargetDateSuffix].dateIfAny();
+  const auto refresh = stored[std::string(names::kFollowUpRefresh) + names::kTargetDateSuffix].dateIfAny();
   if (refresh) datesAreDamaged_ = false;
   // The first run after an upgrade clears the date; what is registered stays so.
-  const bool isToCome = refresh || registrations.contains(activity::kFollowUpRefresh) ||
-                        runs_.contains(activity::kFollowUpRefresh) || runs_.contains(activity::kFollowUpPost);
+  const bool isToCome = refresh || registrations.contains(names::kFollowUpRefresh) ||
+                        runs_.contains(names::kFollowUpRefresh) || runs_.contains(names::kFollowUpPost);
   const bool isAnyRefreshed = std::ranges::any_of(pending, [this](const FollowUpItem& item) {
     // One that an earlier version posted and nobody could take over is no device's.
-    return item.userInfo.contains(kFollowUpSerialNumberKey) && !expired_.contains(*item.uniqueIdentifier);
+    return item.userInfo.contains(names::kFollowUpSerialNumber) && !expired_.contains(*item.uniqueIdentifier);
   });
   if (isAnyRefreshed && !isToCome && !datesAreDamaged_) {
     report("what is shown is kept up to date", "no refresh is to come");
@@ -263,7 +261,7 @@ void Invariants::checkRest(Date postedAt) {
   const auto pending = pendingItems();
   const auto tracked = world_.trackedSerialNumbers();
   for (const auto& item : pending) {
-    const auto found = item.userInfo.find(kFollowUpSerialNumberKey);
+    const auto found = item.userInfo.find(names::kFollowUpSerialNumber);
     if (found == item.userInfo.end() || std::ranges::find(tracked, found->second.string()) == tracked.end()) {
       report("the end state is right", "a follow-up of a device that is not there");
     }
@@ -277,8 +275,8 @@ void Invariants::checkDevice(const std::string& serialNumber, const std::vector<
   const Offer& offer = world_.service.at(number);
   const auto now = platform_->clock.now();
   const auto found = std::ranges::find_if(pending, [&](const FollowUpItem& item) {
-    return item.userInfo.contains(kFollowUpSerialNumberKey) &&
-           item.userInfo.at(kFollowUpSerialNumberKey) == Value(serialNumber);
+    return item.userInfo.contains(names::kFollowUpSerialNumber) &&
+           item.userInfo.at(names::kFollowUpSerialNumber) == Value(serialNumber);
   });
   if (!offer.isOpen(now)) {
     if (found != pending.end()) report("the end state is right", "a follow-up of an offer that has ended");
@@ -305,7 +303,7 @@ bool Invariants::isDismissed(const Offer& offer, const Value& stored) const {
   const Value hash = sha256Hash(offer.serialNumber);
   const auto& list = stored[preference::kFollowUpDismissedHashes];
   if (!list.isArray() || std::ranges::find(list.array(), hash) == list.array().end()) return false;
-  const auto when = stored[hash.string() + preference::kDismissedSuffix].dateIfAny();
+  const auto when = stored[hash.string() + names::kDismissedSuffix].dateIfAny();
   return !when || !offer.displayed() || *when >= *offer.displayed();
 }
 
@@ -317,7 +315,7 @@ std::optional<Date> Invariants::activationOf(const std::string& serialNumber, co
 }
 
 std::vector<FollowUpItem> Invariants::pendingItems() const {
-  auto items = platform_->followUps.newClient(kFollowUpClientIdentifier)->pendingItems();
+  auto items = platform_->followUps.newClient(names::kFollowUpClient)->pendingItems();
   return items ? *std::move(items) : std::vector<FollowUpItem>();
 }
 

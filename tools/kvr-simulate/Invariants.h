@@ -1,8 +1,8 @@
 #pragma once
 
 #include "kvr-simulate/World.h"
-#include "platform/ActivityScheduler.h"
-#include "platform/FollowUpCenter.h"
+#include "platform/services/ActivityScheduler.h"
+#include "platform/services/FollowUpCenter.h"
 
 #include <array>
 #include <deque>

@@ -1,5 +1,7 @@
 #include "kvr-simulate/Process.h"
 
+#include "platform/names/Names.h"
+
 #include <algorithm>
 
 namespace kvr::simulate {
@@ -17,36 +19,32 @@ class RecordingActivity : public Activity {
       : activity_(std::move(activity)), log_(log), invariants_(invariants), checkedIn_(checkedIn) {}
 
   const std::string& identifier() const override { return activity_->identifier(); }
-  void setPreregistered(bool preregistered) override {
-    activity_->setPreregistered(preregistered);
-    isPreregistered_ = preregistered;
-  }
-  void setCriteria(const ActivityCriteria& criteria) override { activity_->setCriteria(criteria); }
-  void setCause(RegistrationCause cause) override { activity_->setCause(cause); }
-  void setOwed(bool isOwed) override { activity_->setOwed(isOwed); }
-  void setExpectation(const ActivityExpectation& expectation) override {
-    activity_->setExpectation(expectation);
-  }
   void setEarliestDate(Date date) override { activity_->setEarliestDate(date); }
-  std::optional<DeferralReason> shouldDefer() const override { return activity_->shouldDefer(); }
-  void schedule(ActivityBlock block) override {
-    activity_->schedule([name = identifier(), block = std::move(block), &log = log_,
-                         &invariants = invariants_](const ActivityHandler& handler) {
+  bool shouldDefer() const override { return activity_->shouldDefer(); }
+  void checkIn(const ActivityCheckIn& known, ActivityBlock block) override {
+    activity_->checkIn(known, recorded(std::move(block)));
+    checkedIn_();
+  }
+  void registerAnew(const ActivityRegistration& registration, ActivityBlock block) override {
+    activity_->registerAnew(registration, recorded(std::move(block)));
+  }
+
+ private:
+  ActivityBlock recorded(ActivityBlock block) const {
+    return [name = identifier(), block = std::move(block), &log = log_,
+            &invariants = invariants_](const ActivityHandler& handler) {
       invariants.runBegins(name);
       block(ActivityHandler(log, "a run", [name, handler, &invariants](ActivityResult result) {
         invariants.runEnds(name, result);
         handler(result);
       }));
-    });
-    if (isPreregistered_) checkedIn_();
+    };
   }
 
- private:
   const std::unique_ptr<Activity> activity_;
   Log& log_;
   Invariants& invariants_;
   const std::function<void()>& checkedIn_;
-  bool isPreregistered_ = false;
 };
 
 class RecordingClient : public FollowUpCenterClient {
@@ -119,7 +117,7 @@ Process::Process(World& world, Invariants& invariants, std::uint64_t seed, LogLe
                 simulated.applications,
                 simulated.store,
                 simulated.stringTables,
-                SimulatedPlatform::kMainBundleIdentifier} {
+                names::kAgent} {
   simulated.log.keepLast(60);
   if (files != nullptr) simulated.files.takeOver(*files);
   world.show(simulated);

@@ -1,6 +1,6 @@
 #pragma once
 
-#include "agent/StartUp.h"
+#include "core/agent/StartUp.h"
 #include "kvr-simulate/Invariants.h"
 
 #include <functional>

@@ -1,8 +1,8 @@
 #include "kvr-simulate/Service.h"
 
+#include "core/signing/SigningKeys.h"
 #include "kvr-simulate/Epochs.h"
-#include "platform/JSON.h"
-#include "signing/SigningKeys.h"
+#include "platform/codec/JSON.h"
 
 #include <algorithm>
 

@@ -1,9 +1,9 @@
 #pragma once
 
 #include "kvr-simulate/Dice.h"
-#include "platform/Date.h"
-#include "platform/HTTP.h"
-#include "platform/Value.h"
+#include "platform/services/HTTP.h"
+#include "platform/value/Date.h"
+#include "platform/value/Value.h"
 
 #include <map>
 #include <optional>

@@ -1,9 +1,10 @@
 #include "kvr-simulate/World.h"
 
-#include "followup/FollowUpKeys.h"
+#include "core/followup/FollowUpKeys.h"
+#include "core/warranty/WarrantyKeys.h"
 #include "kvr-simulate/Epochs.h"
-#include "platform/PropertyList.h"
-#include "warranty/WarrantyKeys.h"
+#include "platform/codec/PropertyList.h"
+#include "platform/names/Names.h"
 
 #include <algorithm>
 
@@ -107,18 +108,17 @@ void World::putLegacyFiles(SimulatedFiles& files) {
   const std::string home = files.homeDirectory();
   files.put(home + "/Library/Application Support/com.tarsil.Kavrel/Warranty.plist",
             *writePropertyList(service.treeOf(number), PropertyListEncoding::XML));
+  files.putPropertyList(home + "/Library/Preferences/com.tarsil.kvragent.plist",
+                        Value::Dictionary{{names::kLastUpdatedDate, SimulatedClock::kDefaultStart - 100},
+                                          {preference::kCachedWarrantyLocale, locale},
+                                          {preference::kCachedWarrantyVersion, "2"}});
   files.putPropertyList(
-      home + "/Library/Preferences/com.tarsil.kvragent.plist",
-      Value::Dictionary{{preference::kCachedWarrantyLastUpdatedDate, SimulatedClock::kDefaultStart - 100},
-                        {preference::kCachedWarrantyLocale, locale},
-                        {preference::kCachedWarrantyVersion, "2"}});
-  files.putPropertyList(home + "/Library/FollowUps/" + kFollowUpClientIdentifier + ".plist",
-                        Value::Dictionary{{"items", Value::Array{Value::Dictionary{
-                                                        {"uniqueIdentifier", kFollowUpClientIdentifier},
-                                                        {"title", Service::labelOf(number)},
-                                                        {"displayStyle", 2},
-                                                        {"userInfo", Value::Dictionary{}},
-                                                        {"actions", Value::Array{}}}}}});
+      home + "/Library/FollowUps/" + names::kFollowUpClient + ".plist",
+      Value::Dictionary{{"items", Value::Array{Value::Dictionary{{"uniqueIdentifier", names::kFollowUpClient},
+                                                                 {"title", Service::labelOf(number)},
+                                                                 {"displayStyle", 2},
+                                                                 {"userInfo", Value::Dictionary{}},
+                                                                 {"actions", Value::Array{}}}}}});
 }
 
 }  // namespace kvr::simulate

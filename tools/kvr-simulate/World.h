@@ -1,7 +1,7 @@
 #pragma once
 
 #include "kvr-simulate/Service.h"
-#include "platform/simulated/SimulatedPlatform.h"
+#include "simulated/SimulatedPlatform.h"
 
 #include <cstdint>
 #include <string>

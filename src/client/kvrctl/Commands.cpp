@@ -3,9 +3,9 @@
 #include "client/LocalState.h"
 #include "client/kvrctl/Doctor.h"
 #include "client/kvrctl/Timeline.h"
-#include "platform/PropertyList.h"
-#include "platform/local/DeviceRoot.h"
-#include "platform/local/LocalNetwork.h"
+#include "local/device/DeviceRoot.h"
+#include "local/device/LocalNetwork.h"
+#include "platform/codec/PropertyList.h"
 
 #include <sys/ioctl.h>
 #include <unistd.h>

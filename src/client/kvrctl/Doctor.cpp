@@ -3,9 +3,10 @@
 #include "client/AgentClient.h"
 #include "client/LocalState.h"
 #include "client/kvrctl/Output.h"
-#include "platform/PropertyList.h"
-#include "platform/URL.h"
-#include "platform/local/DeviceRoot.h"
+#include "local/device/DeviceRoot.h"
+#include "platform/codec/PropertyList.h"
+#include "platform/names/Names.h"
+#include "platform/text/URL.h"
 
 #include <fcntl.h>
 #include <netdb.h>
@@ -168,16 +169,16 @@ Verdict endpointVerdict(const Endpoint& endpoint, const Value& preferences) {
 
 std::vector<Verdict> examine() {
   const fs::path home = LocalState::homeDirectoryOfUser();
-  const auto preferences = home / "Library/Preferences/com.tarsil.kvragent.plist";
+  const auto preferences = home / names::preferencesFile();
   std::vector<Verdict> verdicts{agentVerdict(), trustVerdict(deviceRoot())};
   std::error_code unknown;
   for (const auto* file : {"Accounts.plist", "Entitlements.plist"}) {
     if (fs::exists(deviceRoot() / file, unknown)) verdicts.push_back(trustVerdict(deviceRoot() / file));
   }
   verdicts.push_back(listVerdict("preferences", preferences));
-  verdicts.push_back(listVerdict("activities", home / "Library/Activities/com.tarsil.kvragent.plist"));
-  verdicts.push_back(listVerdict("follow-ups", home / "Library/FollowUps/com.tarsil.Kavrel.plist"));
-  for (auto& verdict : cacheVerdicts(home / "Library/Application Support/com.tarsil.Kavrel")) {
+  verdicts.push_back(listVerdict("activities", home / names::activitiesFile()));
+  verdicts.push_back(listVerdict("follow-ups", home / names::followUpsFile()));
+  for (auto& verdict : cacheVerdicts(home / names::kCacheFolder)) {
     verdicts.push_back(std::move(verdict));
   }
   verdicts.push_back(clockVerdict());

@@ -4,10 +4,11 @@
 #include "client/LocalState.h"
 #include "client/kvrctl/Output.h"
 #include "client/kvrctl/Terminal.h"
-#include "platform/local/EventLoop.h"
-#include "platform/local/FileWatch.h"
-#include "platform/local/LocalLog.h"
-#include "platform/local/bus/BusHandles.h"
+#include "local/buscodec/BusHandles.h"
+#include "local/loop/EventLoop.h"
+#include "local/loop/FileWatch.h"
+#include "local/system/LocalLog.h"
+#include "platform/names/Names.h"
 
 #include <systemd/sd-event.h>
 
@@ -20,8 +21,6 @@
 
 namespace kvr::client {
 namespace {
-
-constexpr const char* kAgent = "com.tarsil.kvragent";
 
 /// Where what happens is told, a line each: text, or a JSON document.
 class Teller {
@@ -170,28 +169,27 @@ Status monitor(const Report& report, bool inJSON) {
   Teller teller(inJSON);
   sd_bus_set_exit_on_disconnect(opened, 1);
   sd_bus_attach_event(opened, loop.event(), 0);
-  sd_bus_match_signal(opened, nullptr, nullptr, "/com/tarsil/NotificationCenter",
-                      "com.tarsil.NotificationCenter", "Posted", handlePosted, &teller);
+  sd_bus_match_signal(opened, nullptr, nullptr, names::kNotificationPath, names::kNotificationInterface,
+                      names::kNotificationMember, handlePosted, &teller);
   const std::string owner =
-      std::string("type='signal',sender='org.freedesktop.DBus',member='NameOwnerChanged',arg0='") + kAgent +
-      "'";
+      std::string("type='signal',sender='org.freedesktop.DBus',member='NameOwnerChanged',arg0='") +
+      names::kAgent + "'";
   sd_bus_add_match(opened, nullptr, owner.c_str(), handleOwner, &teller);
 
   const auto log = LocalLog::fromEnvironment();
   const LocalState state;
-  const std::string library = LocalState::homeDirectoryOfUser() + "/Library/";
+  const std::string home = LocalState::homeDirectoryOfUser() + "/";
   Differences followUps(teller, "follow-up", [&] { return followUpLines(state, report); });
   Differences activities(teller, "activity", [&] { return activityLines(state); });
   Differences downloads(teller, "download", [&] { return downloadLines(state); });
-  const FileWatch followUpWatch(loop, *log, library + "FollowUps/com.tarsil.Kavrel.plist",
+  const FileWatch followUpWatch(loop, *log, home + names::followUpsFile(),
                                 [&](std::size_t) { followUps.update(); });
-  const FileWatch activityWatch(loop, *log, library + "Activities/com.tarsil.kvragent.plist",
+  const FileWatch activityWatch(loop, *log, home + names::activitiesFile(),
                                 [&](std::size_t) { activities.update(); });
-  const FileWatch preferenceWatch(loop, *log, library + "Preferences/com.tarsil.kvragent.plist",
-                                  [&](std::size_t) {
-                                    activities.update();
-                                    downloads.update();
-                                  });
+  const FileWatch preferenceWatch(loop, *log, home + names::preferencesFile(), [&](std::size_t) {
+    activities.update();
+    downloads.update();
+  });
   teller.tell("monitor", "", "watching");
   const int status = loop.run();
   sd_bus_detach_event(opened);

@@ -2,7 +2,7 @@
 
 #include "client/AgentClient.h"
 #include "client/kvrctl/Terminal.h"
-#include "platform/local/DeviceRoot.h"
+#include "local/device/DeviceRoot.h"
 
 #include <cstdio>
 #include <filesystem>

@@ -3,7 +3,7 @@
 #include "client/LocalState.h"
 #include "client/Records.h"
 #include "client/kvrctl/Terminal.h"
-#include "platform/Error.h"
+#include "platform/value/Error.h"
 
 #include <string>
 #include <string_view>

@@ -1,6 +1,6 @@
 #include "client/kvrctl/Report.h"
-#include "platform/Base64.h"
-#include "platform/JSON.h"
+#include "platform/codec/JSON.h"
+#include "platform/text/Base64.h"
 
 #include <cmath>
 #include <cstdio>

@@ -1,6 +1,6 @@
 #include "client/kvrctl/Terminal.h"
 
-#include "platform/UTF8.h"
+#include "platform/text/UTF8.h"
 
 #include <unistd.h>
 

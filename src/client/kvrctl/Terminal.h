@@ -1,6 +1,6 @@
 #pragma once
 
-#include "platform/Date.h"
+#include "platform/value/Date.h"
 
 #include <string>
 #include <string_view>

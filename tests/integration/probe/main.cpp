@@ -5,7 +5,7 @@
 //   KVR_PROBE_WAITS    print "ready" and wait for SIGUSR1 first
 //   KVR_PROBE_LEAVES   have a child make the calls once the process that connected has ended
 
-#include "platform/local/bus/BusHandles.h"
+#include "local/buscodec/BusHandles.h"
 
 #include <poll.h>
 #include <sys/socket.h>

@@ -1,7 +1,7 @@
 #include "integration/support/AgentWorld.h"
 
-#include "platform/JSON.h"
-#include "signing/SHA256Hash.h"
+#include "platform/codec/JSON.h"
+#include "platform/text/SHA256Hash.h"
 
 #include <httplib.h>
 

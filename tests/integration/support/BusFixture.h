@@ -3,12 +3,12 @@
 #include "Prelude.h"
 #include "integration/support/PrivateBus.h"
 #include "integration/support/RawBusClient.h"
-#include "platform/local/EventLoop.h"
-#include "platform/local/LocalClock.h"
-#include "platform/local/LocalFiles.h"
-#include "platform/local/LocalServiceListeners.h"
-#include "platform/local/LocalWorkQueues.h"
-#include "platform/simulated/SimulatedLog.h"
+#include "local/bus/LocalServiceListeners.h"
+#include "local/loop/EventLoop.h"
+#include "local/loop/LocalWorkQueues.h"
+#include "local/system/LocalClock.h"
+#include "local/system/LocalFiles.h"
+#include "simulated/SimulatedLog.h"
 
 #include <stdlib.h>
 

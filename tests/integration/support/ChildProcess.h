@@ -1,6 +1,6 @@
 #pragma once
 
-#include "platform/local/Descriptor.h"
+#include "local/system/Descriptor.h"
 
 #include <fcntl.h>
 #include <poll.h>

@@ -1,9 +1,9 @@
 #pragma once
 
-#include "platform/local/EventLoop.h"
-#include "platform/local/LocalHTTP.h"
-#include "platform/local/LocalWorkQueues.h"
-#include "platform/simulated/SimulatedLog.h"
+#include "local/http/LocalHTTP.h"
+#include "local/loop/EventLoop.h"
+#include "local/loop/LocalWorkQueues.h"
+#include "simulated/SimulatedLog.h"
 
 #include <future>
 #include <memory>

@@ -1,8 +1,8 @@
 #pragma once
 
 #include "Prelude.h"
-#include "platform/local/bus/BusCodec.h"
-#include "platform/local/bus/BusHandles.h"
+#include "local/buscodec/BusCodec.h"
+#include "local/buscodec/BusHandles.h"
 
 #include <stdexcept>
 

@@ -1,5 +1,5 @@
-#include "agent/KVRAgent.h"
-#include "platform/JSON.h"
+#include "core/agent/KVRAgent.h"
+#include "platform/codec/JSON.h"
 #include "unit/CoverageWorld.h"
 
 namespace kvr {

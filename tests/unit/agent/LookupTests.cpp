@@ -1,7 +1,7 @@
-#include "agent/KVRAgent.h"
+#include "core/agent/KVRAgent.h"
+#include "core/agent/KVRAgentDefaultWarrantyProvider.h"
+#include "core/warranty/CacheMetadata.h"
 #include "unit/SimulatedTest.h"
-#include "warranty/CacheMetadata.h"
-#include "warranty/KVRAgentDefaultWarrantyProvider.h"
 
 namespace kvr {
 namespace {

@@ -1,6 +1,7 @@
-#include "agent/KVRAgent.h"
-#include "unit/followup/OfferWorld.h"
-#include "warranty/CacheMetadata.h"
+#include "core/agent/KVRAgent.h"
+#include "core/warranty/CacheMetadata.h"
+#include "platform/names/Names.h"
+#include "unit/OfferWorld.h"
 
 namespace kvr {
 namespace {
@@ -11,7 +12,7 @@ const std::string kLegacyFile = kFolder + "/com.tarsil.Kavrel/Warranty.plist";
 using Migration = AnOfferTest;
 
 TEST_F(Migration, BringsWhatThereIsOfTheOldLayoutToTheNewOneOnce) {
-  const std::string legacy = kFollowUpClientIdentifier;
+  const std::string legacy = names::kFollowUpClient;
   const std::string own = legacy + "." + sha256Hash("LOCAL");
   const CacheMetadata metadata("LOCAL");
   auto& preferences = world.preferences;

@@ -1,10 +1,10 @@
-#include "agent/KVRAgent.h"
-#include "followup/KVRFollowUp.h"
-#include "followup/KVRFollowUpPost.h"
-#include "platform/JSON.h"
-#include "scheduling/KVROutreachActivity.h"
+#include "core/agent/KVRAgent.h"
+#include "core/followup/KVRFollowUp.h"
+#include "core/followup/KVRFollowUpPost.h"
+#include "core/outreach/KVROutreachActivity.h"
+#include "platform/codec/JSON.h"
 #include "unit/OddSerialNumbers.h"
-#include "unit/followup/OfferWorld.h"
+#include "unit/OfferWorld.h"
 
 namespace kvr {
 namespace {
@@ -56,7 +56,7 @@ TEST_F(AnySerialNumber, IsMigratedLookedUpPostedRefreshedAndDismissedAsItIs) {
     start<KVROutreachActivity>();
     world.queues.run();
     EXPECT_TRUE(world.log.contains("serialNumber: " + serialNumber + " success: 1 -- Conversion: 0"));
-    start<KVRFollowUpPost>();
+    start<KVRFollowUpPost>(newAgentQuery(world.platform));
     world.queues.run();
     EXPECT_THAT(asked, ElementsAre(serialNumber));
     EXPECT_THAT(pendingSerials(), ElementsAre(serialNumber));
@@ -65,7 +65,7 @@ TEST_F(AnySerialNumber, IsMigratedLookedUpPostedRefreshedAndDismissedAsItIs) {
     lookUp(serialNumber, LookupPolicy::kDefault);
     EXPECT_EQ(world.log.count("Updated follow-up: success"), 1U);
     dismiss(serialNumber);
-    start<KVRFollowUpPost>();
+    start<KVRFollowUpPost>(newAgentQuery(world.platform));
     world.queues.run();
     EXPECT_THAT(pending(), IsEmpty());
     EXPECT_THAT(hashes(preference::kFollowUpDismissedHashes), Contains(Value(sha256Hash(serialNumber))));

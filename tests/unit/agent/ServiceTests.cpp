@@ -1,6 +1,7 @@
-#include "agent/AgentKeys.h"
-#include "agent/KVRAgentProtocol.h"
-#include "agent/StartUp.h"
+#include "core/agent/AgentKeys.h"
+#include "core/agent/KVRAgentProtocol.h"
+#include "core/agent/StartUp.h"
+#include "platform/names/Names.h"
 #include "unit/CoverageWorld.h"
 
 namespace kvr {
@@ -8,7 +9,7 @@ namespace {
 
 struct TheService : SimulatedTest {
   auto connect() {
-    auto client = world.services.connect(kServiceName, {{{kRequiredEntitlement, true}}, 1234});
+    auto client = world.services.connect(names::kAgent, {{{names::kEntitlement, true}}, 1234});
     world.queues.run();
     return client;
   }

@@ -1,6 +1,7 @@
-#include "agent/AgentKeys.h"
-#include "agent/StartUp.h"
-#include "unit/followup/OfferWorld.h"
+#include "core/agent/AgentKeys.h"
+#include "core/agent/StartUp.h"
+#include "platform/names/Names.h"
+#include "unit/OfferWorld.h"
 
 #include <cerrno>
 
@@ -47,7 +48,7 @@ TEST_F(AStart, ServesTheBootBeforeTheUpgradeAndHasThatStoredInBetween) {
 }
 
 TEST_F(AStart, RunsNoActivityBeforeItIsThrough) {
-  world.preferences.setObject(inDays(-1), std::string(activity::kOutreach) + preference::kTargetDateSuffix);
+  world.preferences.setObject(inDays(-1), std::string(names::kOutreach) + names::kTargetDateSuffix);
   // What other threads would do while migration asks for the device.
   world.deviceProperties.whenAsked = [this] { world.queues.run(); };
   const StartUp startUp(world.platform);
@@ -61,10 +62,10 @@ TEST_F(AStart, GivesAMigratedFollowUpARefreshThatDoesNotComeTooSoon) {
   const Date change = inDays(0.5);
   world.files.putPropertyList("/home/user/Library/Application Support/com.tarsil.Kavrel/Warranty.plist",
                               due(2.5));
-  pend(kFollowUpClientIdentifier);
+  pend(names::kFollowUpClient);
   const StartUp startUp(world.platform);
   world.queues.advance(3600);
-  EXPECT_EQ(target(activity::kFollowUpRefresh), change);
+  EXPECT_EQ(target(names::kFollowUpRefresh), change);
   EXPECT_THAT(pending(), SizeIs(1)) << "though its warranty is not valid until it has been downloaded";
 }
 
@@ -88,7 +89,7 @@ TEST_F(AStart, PerformsAnUpgradeWhoseRecordIsLostAndOnlyOnce) {
 
 TEST_F(AStart, RunsEveryOutreachThatAClientAsksForAndNoneTooSoon) {
   const StartUp startUp(world.platform);
-  const auto client = world.services.connect(kServiceName, {{{kRequiredEntitlement, true}}, 1234});
+  const auto client = world.services.connect(names::kAgent, {{{names::kEntitlement, true}}, 1234});
   const auto runs = [&] {
     return world.log.count(
         "-[KVROutreachActivity performActivityForScheduler:withCompletionHandler:]: for "

@@ -1,5 +1,5 @@
-#include "devices/KVRDeviceInfo.h"
-#include "devices/KVRDevicesManager.h"
+#include "core/devices/KVRDeviceInfo.h"
+#include "core/devices/KVRDevicesManager.h"
 #include "unit/CoverageWorld.h"
 
 namespace kvr {

@@ -1,7 +1,8 @@
-#include "followup/FollowUpDates.h"
-#include "followup/KVRFollowUpPost.h"
-#include "followup/KVRFollowUpRefresh.h"
-#include "unit/followup/OfferWorld.h"
+#include "core/followup/FollowUpDates.h"
+#include "core/followup/KVRFollowUpPost.h"
+#include "core/followup/KVRFollowUpRefresh.h"
+#include "platform/names/Names.h"
+#include "unit/OfferWorld.h"
 
 namespace kvr {
 namespace {
@@ -17,7 +18,7 @@ struct AFollowUpActivity : AnOfferTest {
   template <class Activity>
   std::optional<ActivityResult> runWith(const std::optional<KVRDeviceInfoList>& list) {
     policy = 0;
-    return start<Activity>([this, list](std::uint64_t asked, const DeviceInfosAnswer& answer) {
+    return start<Activity>([this, list](std::uint64_t asked, bool, const DeviceInfosAnswer& answer) {
       policy = asked;
       answer(list);
     });
@@ -89,8 +90,8 @@ TEST_F(AFollowUpActivity, PostsAndSchedulesWhatFollows) {
     world.log.clear();
     EXPECT_EQ(runWith<KVRFollowUpPost>(list), list ? ActivityResult::Finished : ActivityResult::Deferred);
     EXPECT_EQ(policy, 2U);
-    EXPECT_EQ(targetDays(activity::kFollowUpPost), post);
-    EXPECT_EQ(targetDays(activity::kFollowUpRefresh), refresh);
+    EXPECT_EQ(targetDays(names::kFollowUpPost), post);
+    EXPECT_EQ(targetDays(names::kFollowUpRefresh), refresh);
     EXPECT_EQ(world.log.count(perform + " -> " + describe(list)), 1U);
     EXPECT_EQ(world.log.count("Unable to load devices info, defer"), list ? 0U : 1U);
     EXPECT_EQ(world.log.contains(perform + ": Re-schedule followUp post for: "), post.has_value());
@@ -106,13 +107,13 @@ TEST_F(AFollowUpActivity, SchedulesWhatComesDueWhileOthersArePosted) {
   });
   runWith<KVRFollowUpPost>(list);
   EXPECT_THAT(pendingSerials(), ElementsAre("A"));
-  EXPECT_EQ(target(activity::kFollowUpPost), displayDate);
+  EXPECT_EQ(target(names::kFollowUpPost), displayDate);
 }
 
 TEST_F(AFollowUpActivity, DropsTheAnswerOfAPostRunThatWasDeferredMeanwhile) {
   std::vector<DeviceInfosAnswer> held;
   const auto post = std::make_shared<KVRFollowUpPost>(
-      world.platform, [&](std::uint64_t, const DeviceInfosAnswer& answer) { held.push_back(answer); });
+      world.platform, [&](std::uint64_t, bool, const DeviceInfosAnswer& answer) { held.push_back(answer); });
   KVRScheduler::newSchedulerWithActivityDelegate(world.platform, post)->scheduleActivityForDate(inDays(-1));
   world.queues.run();
   ASSERT_EQ(held.size(), 1U);
@@ -144,7 +145,7 @@ TEST_F(AFollowUpActivity, ShowsEveryCountOfShortDaysFromItsMomentOn) {
   const KVRDeviceInfoList list{info("A", due((end - world.clock.now()) / kDay), old)};
   runWith<KVRFollowUpPost>(list);
   const auto refresh = std::make_shared<KVRFollowUpRefresh>(
-      world.platform, [list](std::uint64_t, const DeviceInfosAnswer& answer) { answer(list); });
+      world.platform, [list](std::uint64_t, bool, const DeviceInfosAnswer& answer) { answer(list); });
   KVRScheduler::newSchedulerWithActivityDelegate(world.platform, refresh)
       ->scheduleActivityForDate(world.clock.now());
   for (int left = 20; left > 0; --left) {
@@ -157,7 +158,7 @@ TEST_F(AFollowUpActivity, ShowsEveryCountOfShortDaysFromItsMomentOn) {
 TEST_F(AFollowUpActivity, RefreshesForAsLongAsAnythingIsShown) {
   EXPECT_EQ(runWith<KVRFollowUpRefresh>({{info("A", due(2.5))}}), ActivityResult::Finished);
   EXPECT_EQ(world.log.count("No followups present, don't schedule another refresh"), 1U);
-  EXPECT_EQ(targetDays(activity::kFollowUpRefresh), std::nullopt);
+  EXPECT_EQ(targetDays(names::kFollowUpRefresh), std::nullopt);
 
   const KVRDeviceInfoList shown{info("A", due(2.5), inDays(-9))};
   runWith<KVRFollowUpPost>(shown);
@@ -165,7 +166,7 @@ TEST_F(AFollowUpActivity, RefreshesForAsLongAsAnythingIsShown) {
     world.preferences.setObject(day, preference::kOneDayInterval);
     EXPECT_EQ(runWith<KVRFollowUpRefresh>(shown), ActivityResult::Finished);
     EXPECT_EQ(policy, 1U);
-    EXPECT_GE(targetDays(activity::kFollowUpRefresh), day > 60 ? 0.5 : std::round(60 / kDay * 1000) / 1000);
+    EXPECT_GE(targetDays(names::kFollowUpRefresh), day > 60 ? 0.5 : std::round(60 / kDay * 1000) / 1000);
   }
   EXPECT_TRUE(world.log.contains("Schedule next refresh for " + describe(inDays(0.5))));
   EXPECT_EQ(runWith<KVRFollowUpRefresh>(std::nullopt), ActivityResult::Deferred);

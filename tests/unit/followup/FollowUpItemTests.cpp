@@ -1,5 +1,5 @@
-#include "followup/KVRFollowUp.h"
-#include "unit/followup/OfferWorld.h"
+#include "core/followup/KVRFollowUp.h"
+#include "unit/OfferWorld.h"
 
 namespace kvr {
 namespace {

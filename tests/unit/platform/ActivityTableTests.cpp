@@ -1,5 +1,5 @@
 #include "Prelude.h"
-#include "platform/ActivityTable.h"
+#include "platform/stores/ActivityTable.h"
 
 namespace kvr {
 namespace {

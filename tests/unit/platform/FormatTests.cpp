@@ -1,5 +1,5 @@
 #include "Prelude.h"
-#include "platform/Format.h"
+#include "platform/log/Format.h"
 
 namespace kvr {
 namespace {

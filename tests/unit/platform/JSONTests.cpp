@@ -1,5 +1,5 @@
-#include "platform/JSON.h"
-#include "unit/platform/Trees.h"
+#include "Trees.h"
+#include "platform/codec/JSON.h"
 
 namespace kvr {
 namespace {

@@ -1,5 +1,5 @@
-#include "platform/BinaryPropertyList.h"
-#include "unit/platform/Trees.h"
+#include "Trees.h"
+#include "platform/codec/BinaryPropertyList.h"
 
 namespace kvr {
 namespace {

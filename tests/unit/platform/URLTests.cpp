@@ -1,5 +1,5 @@
 #include "Prelude.h"
-#include "platform/URL.h"
+#include "platform/text/URL.h"
 
 namespace kvr {
 namespace {

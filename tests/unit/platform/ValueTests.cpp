@@ -1,5 +1,5 @@
 #include "Prelude.h"
-#include "platform/Value.h"
+#include "platform/value/Value.h"
 
 namespace kvr {
 namespace {

@@ -1,4 +1,4 @@
-#include "scheduling/KVRScheduler.h"
+#include "core/scheduling/KVRScheduler.h"
 #include "unit/SimulatedTest.h"
 
 namespace kvr {

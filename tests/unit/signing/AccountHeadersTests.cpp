@@ -1,4 +1,4 @@
-#include "signing/AccountHeaders.h"
+#include "core/signing/AccountHeaders.h"
 #include "unit/CoverageWorld.h"
 
 namespace kvr {

@@ -1,7 +1,6 @@
-#include "platform/Base64.h"
-#include "signing/Base64.h"
-#include "signing/KestHeaders.h"
-#include "signing/SHA256Hash.h"
+#include "core/signing/KestHeaders.h"
+#include "platform/text/Base64.h"
+#include "platform/text/SHA256Hash.h"
 #include "unit/SimulatedTest.h"
 
 #include <random>
@@ -43,7 +42,7 @@ TEST_F(DeviceAttestationHeaders, CarryTheSignatureOfTheBodyAndTheChain) {
   addKestAuthenticationHeadersWithBody(world.platform, request, request.body);
 
   EXPECT_THAT(world.attestation.key->messages, ElementsAre(request.body));
-  EXPECT_EQ(signature(), base64Encoded("signature"));
+  EXPECT_EQ(signature(), base64Encode("signature"));
   ASSERT_TRUE(chainHeader());
   EXPECT_THAT(world.log.texts(LogLevel::Default),
               ElementsAre(kBegin, kSupported, kGenerated,
@@ -165,9 +164,9 @@ TEST(ASerialHash, IsTheSHA256OfTheTextUpToItsFirstNUL) {
 }
 
 TEST(Base64, IsOnOneLineHoweverLong) {
-  EXPECT_EQ(base64Encoded(std::string_view("\xfb\xff\0\xfb", 4)), "+/8A+w==");
+  EXPECT_EQ(base64Encode(std::string_view("\xfb\xff\0\xfb", 4)), "+/8A+w==");
   const std::string large(7'000'001, 'x');
-  const auto decoded = base64Decode(base64Encoded(large));
+  const auto decoded = base64Decode(base64Encode(large));
   EXPECT_TRUE(decoded && std::string(decoded->begin(), decoded->end()) == large);
 }
 

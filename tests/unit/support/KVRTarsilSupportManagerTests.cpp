@@ -1,5 +1,5 @@
-#include "support/KVRTarsilSupportManager.h"
-#include "support/SupportKeys.h"
+#include "core/support/KVRTarsilSupportManager.h"
+#include "core/support/SupportKeys.h"
 #include "unit/SimulatedTest.h"
 
 namespace kvr {
@@ -11,7 +11,7 @@ struct TheSupportApplication : SimulatedTest {
   /// What the whole answer, or the store's part, holds besides the bundle.
   Value answer(bool storeOnly = false) {
     Array answers;
-    const DictionaryReply reply(world.log, "test", [&](const Value& it) { answers.push_back(it); });
+    const AvailabilityReply reply(world.log, "test", [&](const Value& it) { answers.push_back(it); });
     world.queues.concurrentQueue(Priority::Default)->async([this, reply, storeOnly] {
       const KVRTarsilSupportManager manager(world.platform);
       storeOnly ? manager.checkIsAvailableInStore(kBundle, reply)

@@ -1,6 +1,6 @@
+#include "core/warranty/KVRServerVersionUtilities.h"
+#include "core/warranty/WarrantyKeys.h"
 #include "unit/SimulatedTest.h"
-#include "warranty/KVRServerVersionUtilities.h"
-#include "warranty/WarrantyKeys.h"
 
 namespace kvr {
 namespace {
@@ -55,7 +55,7 @@ TEST(TheVersionNegotiation, SharesTheVersionsThatBothSidesSpeak) {
     client.preferences.setObject(server, preference::kServerVersionOverride);
     EXPECT_EQ(client.supported(), supported);
     EXPECT_EQ(client.log.texts(LogLevel::Error), errors);
-    EXPECT_EQ(client.highEnabled(Utilities::kDefault), high);
+    EXPECT_EQ(client.highEnabled(ServerLookupPolicy::kDefault), high);
     EXPECT_EQ(Utilities::isHighServerVersionFeaturesetEnabled(client.platform), high);
     EXPECT_EQ(client.cache(), server);
     EXPECT_THAT(client.http.requests(), IsEmpty());
@@ -69,16 +69,16 @@ TEST(TheVersionNegotiation, TakesTheServersPairFromThePolicysSources) {
   const Value cached = pairOf(1, 2);
   const Value published = pairOf(3, 9);
   const std::tuple<std::uint64_t, bool, bool, bool, std::size_t, Value> cases[] = {
-      {Utilities::kDefault, true, true, false, 0, cached},
-      {Utilities::kDefault, false, true, true, 1, published},
-      {Utilities::kDefault, false, false, true, 1, {}},
+      {ServerLookupPolicy::kDefault, true, true, false, 0, cached},
+      {ServerLookupPolicy::kDefault, false, true, true, 1, published},
+      {ServerLookupPolicy::kDefault, false, false, true, 1, {}},
       {7, true, true, false, 0, cached},
       {7, false, true, true, 1, published},
-      {Utilities::kCacheOnly, true, true, false, 0, cached},
-      {Utilities::kCacheOnly, false, true, true, 0, {}},
-      {Utilities::kRefresh, true, true, true, 1, published},
-      {Utilities::kRefresh, true, false, false, 1, cached},
-      {Utilities::kRefresh, false, false, true, 1, pairOf(2, 3)}};
+      {ServerLookupPolicy::kCacheOnly, true, true, false, 0, cached},
+      {ServerLookupPolicy::kCacheOnly, false, true, true, 0, {}},
+      {ServerLookupPolicy::kRefresh, true, true, true, 1, published},
+      {ServerLookupPolicy::kRefresh, true, false, false, 1, cached},
+      {ServerLookupPolicy::kRefresh, false, false, true, 1, pairOf(2, 3)}};
   for (const auto& [policy, hasCache, hasAsset, high, requests, cacheAfter] : cases) {
     SCOPED_TRACE(format("%d %d %d", policy, hasCache, hasAsset));
     Client client;

@@ -1,8 +1,9 @@
-#include "platform/JSON.h"
-#include "scheduling/SchedulingKeys.h"
+#include "core/outreach/WarrantyDownloads.h"
+#include "core/scheduling/SchedulingKeys.h"
+#include "core/warranty/CacheMetadata.h"
+#include "platform/codec/JSON.h"
+#include "platform/names/Names.h"
 #include "unit/CoverageWorld.h"
-#include "warranty/CacheMetadata.h"
-#include "warranty/KVRWarrantyDownloader.h"
 
 namespace kvr {
 namespace {
@@ -17,7 +18,7 @@ struct ADownload : CoverageTest {
     const DownloadCompletion completion(world.log, "test", [&](bool success, const KVRWarrantyRef& warranty) {
       answers.push_back({success, warranty});
     });
-    std::make_shared<KVRWarrantyDownloader>(world.platform, "com.example.client")
+    newWarrantyDownloader(world.platform, "com.example.client")
         ->downloadWarrantyForSerialNumber(serialNumber, completion);
     world.queues.runUntil([&] { return !answers.empty(); });
     EXPECT_EQ(answers.size(), 1U);
@@ -192,11 +193,10 @@ TEST_F(ADownload, StoresAConversionDateThatCouldNotBeStoredBefore) {
     // What a killed agent finds, with that by which the run is taken up again.
     const auto registered =
         world.files.getPropertyList("/home/user/Library/Activities/com.tarsil.kvragent.plist");
-    EXPECT_TRUE(registered["activities"].contains(activity::kConversionOutreach));
+    EXPECT_TRUE(registered["activities"].contains(names::kConversionOutreach));
     const auto stored = world.files.getPropertyList(preferences);
     EXPECT_EQ(stored[preference::kConversionOutreachScheduledDate], Value(date));
-    EXPECT_EQ(stored[std::string(activity::kConversionOutreach) + preference::kTargetDateSuffix],
-              Value(date));
+    EXPECT_EQ(stored[std::string(names::kConversionOutreach) + names::kTargetDateSuffix], Value(date));
   }
 }
 

@@ -1,6 +1,6 @@
+#include "core/warranty/KVRWarranty.h"
+#include "core/warranty/WarrantyKeys.h"
 #include "unit/SimulatedTest.h"
-#include "warranty/KVRWarranty.h"
-#include "warranty/WarrantyKeys.h"
 
 namespace kvr {
 namespace {

@@ -1,0 +1,19 @@
+#pragma once
+
+#include "core/devices/KVRDeviceInfo.h"
+#include "core/followup/FollowUpDates.h"
+#include "core/followup/FollowUpRules.h"
+
+#include <optional>
+#include <string>
+
+namespace kvr {
+
+std::optional<std::string> serialNumberOf(const KVRDeviceInfo& deviceInfo);
+/// The serial number's hash, under which follow-ups are remembered.
+std::optional<std::string> serialHashOf(const KVRDeviceInfo& deviceInfo);
+/// What the rules need to know, as it is now.
+OfferFacts offerFactsOf(const KVRDeviceInfo& deviceInfo);
+std::vector<FollowUpDateFacts> dateFactsOf(Platform& platform, const KVRDeviceInfoList& deviceInfos);
+
+}  // namespace kvr

@@ -1,0 +1,105 @@
+#pragma once
+
+#include "platform/value/Date.h"
+
+#include <optional>
+
+namespace kvr {
+
+/// What the rules know of one device and its warranty.
+struct OfferFacts {
+  bool hasWarranty = false;
+  bool isOffered = false;  ///< the warranty says that the offer may be displayed
+  std::optional<Date> eligibleUntil;
+  std::optional<Date> displayDate;  ///< from when the follow-up is to be displayed
+  double durationBeforeEnd = 0;     ///< seconds before the end from which it is, without a display date
+  std::optional<Date> activationDate;
+};
+
+/// Whether there is an offer to follow up: the first reason against it, in this order.
+enum class OfferState { NoWarranty, NotOffered, Ended, Open };
+
+constexpr OfferState offerState(const OfferFacts& facts, Date now) {
+  if (!facts.hasWarranty) return OfferState::NoWarranty;
+  if (!facts.isOffered) return OfferState::NotOffered;
+  if (!(facts.eligibleUntil && *facts.eligibleUntil > now)) return OfferState::Ended;
+  return OfferState::Open;
+}
+
+/// What becomes of one device's follow-up in the posting decision, before its date is looked at.
+enum class PostingOutcome { NoWarranty, NotOffered, Ended, Dismissed, Eligible };
+
+/// `convertsAgain` tells whether the offer has begun anew since the dismissal. It is asked only where the
+/// answer decides, because asking it changes what is recorded.
+template <class ConvertsAgain>
+constexpr PostingOutcome postingOutcome(const OfferFacts& facts, Date now, bool isDismissed,
+                                        bool repostAllowed, const ConvertsAgain& convertsAgain) {
+  switch (offerState(facts, now)) {
+    case OfferState::NoWarranty:
+      return PostingOutcome::NoWarranty;
+    case OfferState::NotOffered:
+      return PostingOutcome::NotOffered;
+    case OfferState::Ended:
+      return PostingOutcome::Ended;
+    case OfferState::Open:
+      break;
+  }
+  if (isDismissed && !repostAllowed && !convertsAgain()) return PostingOutcome::Dismissed;
+  return PostingOutcome::Eligible;
+}
+
+struct PostDate {
+  std::optional<Date> date;       ///< nothing counts as now
+  bool isActivationDate = false;  ///< the device was activated only after the display date
+
+  bool isInFuture(Date now) const { return date && *date > now; }
+};
+
+/// From when an offered follow-up may be posted.
+constexpr PostDate postDate(const OfferFacts& facts) {
+  auto date = facts.displayDate;
+  if (!date && facts.eligibleUntil) date = *facts.eligibleUntil - facts.durationBeforeEnd;
+  if (facts.activationDate && date && *facts.activationDate > *date) return {facts.activationDate, true};
+  return {date, false};
+}
+
+/// What a refresh does with one device's follow-up.
+enum class RefreshOutcome { NoWarranty, NotOffered, Ended, Update, Repost, LeaveAlone };
+
+constexpr RefreshOutcome refreshOutcome(const OfferFacts& facts, Date now, bool isPending,
+                                        bool allowForcePost) {
+  switch (offerState(facts, now)) {
+    case OfferState::NoWarranty:
+      return RefreshOutcome::NoWarranty;
+    case OfferState::NotOffered:
+      return RefreshOutcome::NotOffered;
+    case OfferState::Ended:
+      return RefreshOutcome::Ended;
+    case OfferState::Open:
+      break;
+  }
+  if (isPending) return RefreshOutcome::Update;
+  if (allowForcePost) return RefreshOutcome::Repost;
+  return RefreshOutcome::LeaveAlone;
+}
+
+/// Whether a follow-up that was dismissed is offered anew.
+enum class ConversionOutcome { NeverDismissed, NoDisplayDate, DismissedSince, DismissedBefore };
+
+constexpr ConversionOutcome conversionOutcome(std::optional<Date> dismissed,
+                                              std::optional<Date> displayDate) {
+  if (!dismissed) return ConversionOutcome::NeverDismissed;
+  if (!displayDate) return ConversionOutcome::NoDisplayDate;
+  if (*dismissed >= *displayDate) return ConversionOutcome::DismissedSince;
+  return ConversionOutcome::DismissedBefore;
+}
+
+/// Whether a row carries a badge: the warranty wants one, the end is near enough, and has not come.
+constexpr bool showsRowBadge(bool isWanted, std::optional<Date> eligibleUntil, double durationBeforeEnd,
+                             Date now) {
+  if (!isWanted || !eligibleUntil) return false;
+  const bool isNearEnough = *eligibleUntil - durationBeforeEnd < now;
+  return isNearEnough && now < *eligibleUntil;
+}
+
+}  // namespace kvr

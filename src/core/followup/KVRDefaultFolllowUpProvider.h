@@ -1,0 +1,26 @@
+#pragma once
+
+#include "core/followup/KVRFollowUpProvider.h"
+#include "platform/Platform.h"
+
+#include <memory>
+
+namespace kvr {
+
+/// The platform's follow-up centre: every call is a new client's. Keeps nothing.
+class KVRDefaultFolllowUpProvider : public KVRFollowUpProvider {
+ public:
+  explicit KVRDefaultFolllowUpProvider(Platform& platform) : platform_(platform) {}
+
+  std::optional<Error> postFollowUpItem(const FollowUpItem& item) override;
+  std::optional<Error> clearPendingFollowUpItemsWithUniqueIdentifiers(
+      const std::vector<std::string>& uniqueIdentifiers) override;
+  Result<std::vector<FollowUpItem>> pendingFollowUpItems() override;
+
+ private:
+  std::unique_ptr<FollowUpCenterClient> newClient() const;
+
+  Platform& platform_;
+};
+
+}  // namespace kvr

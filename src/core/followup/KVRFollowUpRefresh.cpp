@@ -1,0 +1,63 @@
+#include "core/followup/KVRFollowUpRefresh.h"
+
+#include "core/followup/DeviceFacts.h"
+#include "core/followup/FollowUpKeys.h"
+#include "core/followup/KVRFollowUp.h"
+#include "core/scheduling/KVRScheduler.h"
+#include "core/warranty/LookupPolicy.h"
+#include "core/warranty/WarrantyKeys.h"
+#include "platform/names/Names.h"
+
+namespace kvr {
+
+std::string KVRFollowUpRefresh::identifier() const { return names::kFollowUpRefresh; }
+
+void KVRFollowUpRefresh::performActivityForScheduler(const std::shared_ptr<KVRScheduler>& /*scheduler*/,
+                                                     ActivityHandler withCompletionHandler) {
+  deviceInfosQuery_(
+      LookupPolicy::kCacheOnly, false,
+      DeviceInfosAnswer(
+          platform_.log, "KVRFollowUpRefresh",
+          [self = shared_from_this(), withCompletionHandler](const std::optional<KVRDeviceInfoList>& list) {
+            if (list) {
+              self->refreshAndSchedule(*list);
+              withCompletionHandler(ActivityResult::Finished);
+            } else {
+              self->platform_.log.standard("Unable to load device info for followup refresh, defer");
+              withCompletionHandler(ActivityResult::Deferred);
+            }
+          }));
+}
+
+void KVRFollowUpRefresh::refreshAndSchedule(const KVRDeviceInfoList& devicesInfo) {
+  auto& log = platform_.log;
+  const auto shown = KVRFollowUp(platform_).refreshFollowupWithDeviceInfos(devicesInfo);
+  if (shown.empty()) {
+    log.standard("No followups present, don't schedule another refresh");
+    return;
+  }
+  log.standard("Followup present, schedule refresh for %@", shown);
+  const auto now = platform_.clock.now();
+  const auto next = _refreshDateWithDevicesInfo(platform_, shown);
+  const auto date =
+      followingRefreshDate(next, now, platform_.preferences.doubleForKey(preference::kOneDayInterval));
+  if (date != next) log.standard("Next refresh for %@ would come too soon, put off", next);
+  log.standard("Schedule next refresh for %@", date);
+  // What the calendar says is to come at its moment, however soon.
+  KVRScheduler::newSchedulerWithActivityDelegate(platform_, shared_from_this())
+      ->scheduleActivityForDate(date, date == next ? RegistrationCause::Demand : RegistrationCause::Reaction);
+}
+
+std::optional<Date> KVRFollowUpRefresh::nextFollowUpRefreshDateWithDevicesInfo(
+    Platform& platform, const KVRDeviceInfoList& devicesInfo, bool isInitialCall) {
+  return nextRefreshDate(dateFactsOf(platform, devicesInfo), platform.clock.now(),
+                         platform.preferences.doubleForKey(preference::kOneDayInterval), isInitialCall);
+}
+
+Date KVRFollowUpRefresh::_refreshDateWithDevicesInfo(Platform& platform,
+                                                     const KVRDeviceInfoList& devicesInfo) {
+  const auto date = nextFollowUpRefreshDateWithDevicesInfo(platform, devicesInfo, true);
+  return date ? *date : *nextFollowUpRefreshDateWithDevicesInfo(platform, devicesInfo, false);
+}
+
+}  // namespace kvr

@@ -1,0 +1,33 @@
+#pragma once
+
+#include "core/scheduling/KVRSchedulerActivityDelegate.h"
+#include "platform/Platform.h"
+
+namespace kvr {
+
+/// Runs after the first start and after every upgrade of the operating system. The first run clears all
+/// target dates and schedules the first outreach; every later one forces a conversion outreach when the OS
+/// version has gone up since the run before.
+class KVRPostUpgradeActivity : public KVRSchedulerActivityDelegate {
+ public:
+  explicit KVRPostUpgradeActivity(Platform& platform) : platform_(platform) {}
+
+  std::string identifier() const override;
+  bool requiresNetwork() const override { return false; }
+  /// Until the first run: also when the preferences have been lost.
+  bool isOwed() const override;
+  void performActivityForScheduler(const std::shared_ptr<KVRScheduler>& scheduler,
+                                   ActivityHandler withCompletionHandler) override;
+
+  /// Whether the OS version has gone up (or none is recorded) while no outreach is pending.
+  bool shouldTriggerWarrantyDownload() const;
+
+ private:
+  void performFirstRun();
+  void performLaterRun();
+  void recordOSVersion();
+
+  Platform& platform_;
+};
+
+}  // namespace kvr

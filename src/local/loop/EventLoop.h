@@ -1,0 +1,79 @@
+#pragma once
+
+#include "platform/services/WorkQueues.h"
+
+#include <cstddef>
+#include <cstdint>
+#include <deque>
+#include <functional>
+#include <map>
+#include <mutex>
+#include <string>
+#include <utility>
+
+struct sd_event;
+struct sd_event_source;
+
+namespace kvr {
+
+/// One thread's event loop: what is posted from any thread, timers, and whatever is attached to `event()`.
+///
+/// Built, run and destroyed on one thread. With nothing posted and no timer due it does not wake up. An
+/// exception that leaves a piece of work ends that piece only and goes to the failure handler.
+class EventLoop {
+ public:
+  /// Names one delayed piece of work: boot time due in microseconds, and a number of its own.
+  using TimerKey = std::pair<std::uint64_t, std::uint64_t>;
+
+  EventLoop();
+  ~EventLoop();
+  EventLoop(const EventLoop&) = delete;
+  EventLoop& operator=(const EventLoop&) = delete;
+
+  /// For attaching sources; only on the loop's own thread.
+  sd_event* event() const { return event_; }
+  /// Takes what exceptions say that left a piece of work; without a handler the process terminates. Only on
+  /// the loop's own thread.
+  void setFailureHandler(std::function<void(const std::string& what)> handler);
+  /// Runs `work` on the loop's thread, in the order posted. Any thread.
+  void post(Work work);
+  /// Runs `work` on the loop's thread after `delay` seconds of boot time (suspend included). A delay of more
+  /// than 10^13 seconds never ends. Any thread.
+  TimerKey after(double delay, Work work);
+  /// Releases delayed work that has not begun; no effect on other. Any thread.
+  void cancel(const TimerKey& key);
+  /// How much delayed work has not begun. Any thread.
+  std::size_t delayed() const;
+  /// How much posted work has not begun. Any thread.
+  std::size_t pending() const;
+  /// Runs until `exit`; returns its status. What was posted or delayed and has not run is released then, and
+  /// what is handed over later is released at once. Throws std::system_error when the kernel refuses.
+  int run();
+  /// Ends `run` once everything posted before has run. Any thread.
+  void exit(int status);
+
+ private:
+  void wake();
+  void runPosted();
+  void runDue();
+  void runGuarded(Work& work) noexcept;
+  void armTimer();
+  void releaseAll();
+  void close();
+
+  sd_event* event_ = nullptr;
+  sd_event_source* wakeSource_ = nullptr;
+  sd_event_source* timerSource_ = nullptr;
+  int wakeDescriptor_ = -1;
+  bool exiting_ = false;
+  std::function<void(const std::string&)> failed_;
+
+  mutable std::mutex mutex_;  ///< guards what follows
+  std::deque<Work> posted_;
+  std::map<TimerKey, Work> timers_;
+  std::uint64_t lastTimer_ = 0;
+  bool woken_ = false;
+  bool closed_ = false;
+};
+
+}  // namespace kvr

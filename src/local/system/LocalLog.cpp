@@ -1,0 +1,198 @@
+#include "local/system/LocalLog.h"
+
+#include "local/system/Descriptor.h"
+
+#define SD_JOURNAL_SUPPRESS_LOCATION
+#include <poll.h>
+#include <sys/stat.h>
+#include <sys/sysmacros.h>
+#include <sys/uio.h>
+#include <systemd/sd-journal.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <charconv>
+#include <climits>
+#include <cstdlib>
+#include <cstring>
+#include <ctime>
+
+namespace kvr {
+namespace {
+
+using namespace std::chrono_literals;
+
+constexpr auto kPatience = 1s;
+/// What a pipe that is ready takes without waiting for its reader.
+constexpr std::size_t kMostAtOnce = PIPE_BUF;
+
+std::string_view environment(const char* name) {
+  const char* value = std::getenv(name);
+  return value == nullptr ? std::string_view() : std::string_view(value);
+}
+
+LogLevel levelNamed(std::string_view name) {
+  if (name == "debug") return LogLevel::Debug;
+  return name == "error" ? LogLevel::Error : LogLevel::Default;
+}
+
+const char* nameOf(LogLevel level) {
+  switch (level) {
+    case LogLevel::Debug:
+      return "debug";
+    case LogLevel::Error:
+      return "error";
+    default:
+      return "default";
+  }
+}
+
+const char* priorityOf(LogLevel level) {
+  switch (level) {
+    case LogLevel::Debug:
+      return "PRIORITY=7";
+    case LogLevel::Error:
+      return "PRIORITY=3";
+    default:
+      return "PRIORITY=5";
+  }
+}
+
+/// Whether standard error is the very stream to the journal that the service manager set up.
+bool leadsToJournal(int descriptor) {
+  struct stat status {};
+  if (::fstat(descriptor, &status) != 0) return false;
+  return environment("JOURNAL_STREAM") == std::to_string(status.st_dev) + ":" + std::to_string(status.st_ino);
+}
+
+/// A line waits for the reader of a terminal, a pipe or a socket; a file and the null device take it at once.
+bool mayBlock(int descriptor) {
+  struct stat status {};
+  if (::fstat(descriptor, &status) != 0) return true;
+  const bool isNull = S_ISCHR(status.st_mode) && ::major(status.st_rdev) == 1 && ::minor(status.st_rdev) == 3;
+  return !S_ISREG(status.st_mode) && !isNull;
+}
+
+void appendNumber(std::string& text, long long number, std::size_t width) {
+  std::array<char, 24> digits{};
+  auto* const end = std::to_chars(digits.data(), digits.data() + digits.size(), number).ptr;
+  const auto count = static_cast<std::size_t>(end - digits.data());
+  if (count < width) text.append(width - count, '0');
+  text.append(digits.data(), count);
+}
+
+/// "2026-11-24T16:04:43.012345Z"
+void appendTimestamp(std::string& line) {
+  timespec now{};
+  ::clock_gettime(CLOCK_REALTIME, &now);
+  const auto time = calendarTime(now.tv_sec);
+  appendNumber(line, time.year, 4);
+  appendNumber(line += '-', time.month, 2);
+  appendNumber(line += '-', time.day, 2);
+  appendNumber(line += 'T', time.hour, 2);
+  appendNumber(line += ':', time.minute, 2);
+  appendNumber(line += ':', time.second, 2);
+  appendNumber(line += '.', now.tv_nsec / 1000, 6);
+  line += 'Z';
+}
+
+/// Line breaks as \n and \r; other control characters, and Unicode's own line breaks, as \xNN a byte.
+void appendEscaped(std::string& line, std::string_view message) {
+  const auto appendHex = [&line](char c) {
+    static constexpr char kDigits[] = "0123456789abcdef";
+    const auto byte = static_cast<unsigned char>(c);
+    line += "\\x";
+    line += kDigits[byte >> 4U];
+    line += kDigits[byte & 0xFU];
+  };
+  const auto isPlain = [](char c) { return c >= ' ' && c <= '~'; };
+  for (std::size_t at = 0; at < message.size(); ++at) {
+    const auto* const run = message.data() + at;
+    const auto* const end = std::find_if_not(run, message.data() + message.size(), isPlain);
+    line.append(run, end);
+    at += static_cast<std::size_t>(end - run);
+    if (at == message.size()) break;
+    const char c = message[at];
+    const auto rest = message.substr(at);
+    if (c == '\n') {
+      line += "\\n";
+    } else if (c == '\r') {
+      line += "\\r";
+    } else if ((c >= 0 && c < ' ' && c != '\t') || c == '\x7f') {
+      appendHex(c);
+    } else if (c == '\xc2' && rest.size() > 1 && static_cast<unsigned char>(rest[1]) < 0xa0) {
+      appendHex(c);
+      appendHex(message[++at]);
+    } else if (rest.starts_with("\xe2\x80\xa8") || rest.starts_with("\xe2\x80\xa9")) {
+      appendHex(c);
+      appendHex(message[++at]);
+      appendHex(message[++at]);
+    } else {
+      line += c;
+    }
+  }
+}
+
+bool sendToJournal(LogLevel level, const std::string& message) {
+  const std::string text = "MESSAGE=" + message;
+  const std::string subsystem = "SUBSYSTEM=" + std::string(Log::kSubsystem);
+  const std::string category = "CATEGORY=" + std::string(Log::kCategory);
+  const auto field = [](std::string_view line) {
+    return iovec{const_cast<char*>(line.data()), line.size()};  // NOLINT: the journal only reads it
+  };
+  const std::array fields{field(text), field(priorityOf(level)), field("SYSLOG_IDENTIFIER=kvragent"),
+                          field(subsystem), field(category)};
+  return ::sd_journal_sendv(fields.data(), static_cast<int>(fields.size())) == 0;
+}
+
+}  // namespace
+
+std::unique_ptr<LocalLog> LocalLog::fromEnvironment() {
+  return std::make_unique<LocalLog>(
+      levelNamed(environment("KVR_LOG_LEVEL")), environment("KVR_LOG_PRIVATE") == "1",
+      leadsToJournal(STDERR_FILENO) ? Sink::Journal : Sink::Lines, STDERR_FILENO);
+}
+
+LocalLog::LocalLog(LogLevel least, bool revealPrivate, Sink sink, int descriptor)
+    : Log(least, revealPrivate), sink_(sink), descriptor_(descriptor), mayBlock_(mayBlock(descriptor)) {}
+
+void LocalLog::write(LogLevel level, const std::string& message) {
+  if (sink_ == Sink::Journal && sendToJournal(level, message)) return;
+  writeLine(level, message);
+}
+
+void LocalLog::writeLine(LogLevel level, const std::string& message) {
+  std::string line;
+  line.reserve(message.size() + 96);
+  appendTimestamp(line);
+  line.append(" ").append(nameOf(level)).append(" ");
+  line.append(kSubsystem).append(":").append(kCategory).append(" ");
+  appendEscaped(line, message);
+  line += '\n';
+  if (!mayBlock_) {
+    writeAll(descriptor_, line);
+    return;
+  }
+  const std::lock_guard lock(mutex_);
+  if (torn_) line.insert(0, "\n");
+  const auto deadline = std::chrono::steady_clock::now() + (stuck_ ? 0s : kPatience);
+  std::string_view rest = line;
+  while (!rest.empty() && isReady(deadline) && writeAll(descriptor_, rest.substr(0, kMostAtOnce))) {
+    rest.remove_prefix(std::min(kMostAtOnce, rest.size()));
+  }
+  stuck_ = !rest.empty();
+  if (rest.size() < line.size()) torn_ = stuck_;
+}
+
+/// Whether the reader takes as much as is written at once. One that takes nothing for a while costs lines,
+/// not the agent's time: it is waited for again only after it has taken a whole one.
+bool LocalLog::isReady(std::chrono::steady_clock::time_point deadline) {
+  using std::chrono::milliseconds;
+  const auto left = std::chrono::ceil<milliseconds>(deadline - std::chrono::steady_clock::now()).count();
+  pollfd state{descriptor_, POLLOUT, 0};
+  return ::poll(&state, 1, static_cast<int>(std::max<milliseconds::rep>(left, 0))) != 0;
+}
+
+}  // namespace kvr

@@ -1,0 +1,18 @@
+#pragma once
+
+#include "platform/value/Error.h"
+
+#include <cstddef>
+#include <string>
+#include <utility>
+
+namespace kvr {
+
+// What the codecs of property lists have in common.
+
+/// How many values a tree may hold, one that is shared counting wherever it stands; keys do not count.
+inline constexpr std::size_t kMaximumValues = std::size_t{1} << 20U;
+
+inline Error plistError(std::string message) { return {"plist", 0, std::move(message)}; }
+
+}  // namespace kvr

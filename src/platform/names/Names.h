@@ -1,0 +1,67 @@
+#pragma once
+
+#include <string>
+#include <string_view>
+
+// What the agent, its clients and the host call the same things. Others build on these names: to change one is to
+// change an interface.
+namespace kvr::names {
+
+/// The agent's main bundle identifier, also its name on the bus and its preference domain.
+inline constexpr const char* kAgent = "com.tarsil.kvragent";
+
+// --- the bus ------------------------------------------------------------------------------------------------
+
+inline constexpr const char* kObjectPath = "/com/tarsil/kvragent";
+inline constexpr const char* kInterface = "com.tarsil.kvragent.KVRAgentProtocol";
+/// A true boolean, without which a client is not served.
+inline constexpr const char* kEntitlement = "com.tarsil.private.kvragent";
+
+/// System-wide notifications are a signal with the notification's name, sent by anyone.
+inline constexpr const char* kNotificationPath = "/com/tarsil/NotificationCenter";
+inline constexpr const char* kNotificationInterface = "com.tarsil.NotificationCenter";
+inline constexpr const char* kNotificationMember = "Posted";
+inline constexpr const char* kLanguageChanged = "com.tarsil.language.changed";
+inline constexpr const char* kDeviceDidPair = "com.tarsil.pairedregistry.device-did-pair";
+inline constexpr const char* kDeviceDidUnpair = "com.tarsil.pairedregistry.device-did-unpair";
+
+// --- background activities ----------------------------------------------------------------------------------
+
+inline constexpr const char* kPostUpgrade = "com.tarsil.kvragent.upgrade";
+inline constexpr const char* kPostBoot = "com.tarsil.kvragent.boot";
+inline constexpr const char* kOutreach = "com.tarsil.kvragent.outreach";
+inline constexpr const char* kConversionOutreach = "com.tarsil.kvragent.conversionoutreach";
+inline constexpr const char* kFollowUpPost = "com.tarsil.kvragent.followuppost";
+inline constexpr const char* kFollowUpRefresh = "com.tarsil.kvragent.followuprefresh";
+
+// --- files, below the home directory ------------------------------------------------------------------------
+
+/// The agent at the follow-up centre, and the folder of its warranty cache.
+inline constexpr const char* kFollowUpClient = "com.tarsil.Kavrel";
+
+inline constexpr std::string_view kPreferencesFolder = "Library/Preferences";
+inline constexpr std::string_view kFollowUpsFolder = "Library/FollowUps";
+inline constexpr std::string_view kActivitiesFolder = "Library/Activities";
+inline constexpr std::string_view kKeysFolder = "Library/Keys";
+inline constexpr std::string_view kCacheFolder = "Library/Application Support/com.tarsil.Kavrel";
+
+/// The property list of one domain or client in one of these folders.
+inline std::string listIn(std::string_view folder, std::string_view name) {
+  return std::string(folder) + "/" + std::string(name) + ".plist";
+}
+inline std::string preferencesFile() { return listIn(kPreferencesFolder, kAgent); }
+inline std::string activitiesFile() { return listIn(kActivitiesFolder, kAgent); }
+inline std::string followUpsFile() { return listIn(kFollowUpsFolder, kFollowUpClient); }
+
+// --- entries of those files that clients read ---------------------------------------------------------------
+
+/// Behind an activity's identifier, in the preferences: the date before which it does not run.
+inline constexpr const char* kTargetDateSuffix = ".TargetDate";
+/// Behind a serial hash and "_", in the preferences: when the device's warranty was downloaded.
+inline constexpr const char* kLastUpdatedDate = "CachedWarrantyLastUpdatedDate";
+/// Behind a serial hash, in the preferences: the date of the latest dismissal.
+inline constexpr const char* kDismissedSuffix = ".dismissed";
+/// In a follow-up's user info: the serial number of its device.
+inline constexpr const char* kFollowUpSerialNumber = "FollowupSerialNumber";
+
+}  // namespace kvr::names

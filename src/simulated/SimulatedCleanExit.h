@@ -1,0 +1,24 @@
+#pragma once
+
+#include "platform/services/CleanExit.h"
+#include "platform/services/Clock.h"
+#include "platform/value/Date.h"
+
+#include <vector>
+
+namespace kvr {
+
+/// Records the requests.
+class SimulatedCleanExit : public CleanExit {
+ public:
+  explicit SimulatedCleanExit(const Clock& clock) : clock_(clock) {}
+
+  void requestWhenIdle() override { requests.push_back(clock_.now()); }
+
+  std::vector<Date> requests;  ///< when it was asked for
+
+ private:
+  const Clock& clock_;
+};
+
+}  // namespace kvr

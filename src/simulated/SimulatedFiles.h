@@ -1,0 +1,126 @@
+#pragma once
+
+#include "platform/services/Clock.h"
+#include "platform/services/Files.h"
+#include "platform/value/Value.h"
+
+#include <functional>
+#include <map>
+#include <mutex>
+#include <random>
+#include <set>
+#include <vector>
+
+namespace kvr {
+
+/// Files in memory, with faults on demand.
+///
+/// They outlive whatever uses them, so a crash and a restart are: destroy the users, build them again on the
+/// same files. A file is replaced in the same steps as a real one; what was not synced when the power is lost
+/// may be lost with it. Thread-safe.
+class SimulatedFiles : public Files {
+ public:
+  static constexpr const char* kHomeDirectory = "/home/user";
+
+  explicit SimulatedFiles(const Clock& clock);
+
+  std::string homeDirectory() const override { return kHomeDirectory; }
+  Result<std::optional<FileContents>> read(const std::string& path, std::size_t limit) override;
+  Result<std::optional<FileStamp>> stamp(const std::string& path) override;
+  std::optional<Error> replace(const std::string& path, const std::string& bytes) override;
+  std::optional<Error> createDirectory(const std::string& path) override;
+  std::optional<Error> remove(const std::string& path) override;
+  std::optional<Error> rename(const std::string& from, const std::string& to) override;
+  std::optional<Error> renameToUnused(const std::string& from, const std::string& to) override;
+  std::unique_ptr<FileLock> lock(const std::string& directory) override;
+
+  // Changes and looks from outside: no fault stops them, and they count for nothing.
+  /// Puts a file, and its directories, in place.
+  void put(const std::string& path, std::string bytes);
+  /// As `put`, for a tree, in the binary encoding.
+  void putPropertyList(const std::string& path, const Value& tree);
+  std::optional<std::string> get(const std::string& path) const;
+  /// The tree that a file holds; null when there is no such file or it holds none.
+  Value getPropertyList(const std::string& path) const;
+  void erase(const std::string& path);
+  /// The paths of the files in `directory` and below it, in ascending order.
+  std::vector<std::string> list(const std::string& directory) const;
+
+  // Faults last until they are set to nothing. A file's own fault goes before that of all files.
+  void setReadFault(std::optional<Error> error);
+  void setReadFault(const std::string& path, std::optional<Error> error);
+  /// Of everything that changes a file or directory.
+  void setWriteFault(std::optional<Error> error);
+  void setWriteFault(const std::string& path, std::optional<Error> error);
+
+  /// What one step of a change is.
+  enum class Step { CreateTemporary, Write, Sync, Rename, SyncDirectory, Remove };
+  /// Asked before every step of a change, with the path that is to be changed: the error in its place, if
+  /// any.
+  using StepFault = std::function<std::optional<Error>(Step step, const std::string& path)>;
+  void setStepFault(StepFault fault);
+  using Changed = std::function<void(const std::string& path, bool isDone)>;
+  /// Told the path after every change that was tried, and whether it was done to the end.
+  void whenChanged(Changed changed);
+
+  /// The end of the process at a point between two steps: after `count` more, none reaches a file.
+  void killAfterSteps(std::size_t count);
+  bool isKilled() const;
+  /// The files as another instance has them, in the place of these.
+  void takeOver(const SimulatedFiles& other);
+  /// What was not synced is lost, as far as `random` has it: the latest changes of names, and the end of
+  /// contents.
+  void losePower(std::mt19937_64& random);
+
+  /// How often a file was read as a whole.
+  std::size_t readCount() const;
+
+ private:
+  class Replacement;
+  struct File {
+    std::string bytes;
+    FileStamp stamp;
+    bool isSynced = true;
+  };
+  /// A change of what a name leads to that is not durable yet.
+  struct Unsynced {
+    std::string path;
+    std::optional<File> before;
+  };
+  struct Faults {
+    std::optional<Error> all;
+    std::map<std::string, Error> byPath;
+
+    void set(const std::string& path, std::optional<Error> error);
+    std::optional<Error> of(const std::string& path) const;
+  };
+
+  std::optional<Error> writeFaultOf(const std::string& path) const;
+  std::optional<Error> begin(Step step, const std::string& path);
+  std::optional<Error> syncDirectoryOf(const std::string& path);
+  void store(const std::string& path, std::string bytes, bool isSynced);
+  void put(const std::string& path, std::optional<File> file);
+  void removeLeftovers(const std::string& directory);
+  bool hasEnded() const;
+  void tellChange(std::unique_lock<std::mutex>& lock, const std::string& path, bool isDone);
+  void addDirectories(std::string path);
+  std::optional<Error> move(const std::string& from, const std::string& to, bool replaces);
+
+  const Clock& clock_;
+  mutable std::mutex mutex_;  ///< guards what follows
+  std::map<std::string, File> files_;
+  std::set<std::string> directories_;
+  std::uint64_t lastInode_ = 0;
+  Faults readFaults_;
+  Faults writeFaults_;
+  StepFault stepFault_;
+  Changed changed_;
+  std::vector<Unsynced> unsynced_;  ///< the oldest first
+  std::set<std::string> swept_;     ///< directories without leftovers of earlier processes
+  std::optional<std::size_t> lastStep_;
+  std::size_t steps_ = 0;
+  std::size_t reads_ = 0;
+  std::map<std::string, std::recursive_mutex> locks_;
+};
+
+}  // namespace kvr

@@ -1,0 +1,361 @@
+#include "simulated/loop/SimulatedWorkQueues.h"
+
+#include <algorithm>
+#include <exception>
+#include <limits>
+#include <optional>
+#include <stdexcept>
+
+namespace kvr {
+
+namespace {
+
+constexpr double kNever = std::numeric_limits<double>::infinity();
+constexpr double kLongestDelay = 1e13;  // seconds; anything above never comes
+constexpr double kShortestInterval = 0.001;
+constexpr int kMostItemsAtOnce = 300'000;
+constexpr int kMostEvents = 20'000'000;
+
+double cleanDelay(double delay) {
+  if (!(delay > 0)) return 0;
+  if (delay > kLongestDelay) return kNever;
+  return delay;
+}
+
+template <class T>
+T takeAt(std::vector<T>& list, std::size_t index) {
+  T taken = std::move(list[index]);
+  if (index + 1 != list.size()) list[index] = std::move(list.back());
+  list.pop_back();
+  return taken;
+}
+
+}  // namespace
+
+class SimulatedWorkQueues::Queue : public WorkQueue, public std::enable_shared_from_this<Queue> {
+ public:
+  Queue(SimulatedWorkQueues& theQueues, bool serial) : queues(theQueues), isSerial(serial) {}
+  void async(Work work) override { queues.enqueue(shared_from_this(), std::move(work)); }
+
+  SimulatedWorkQueues& queues;
+  const bool isSerial;
+  bool isBusy = false;
+  std::deque<Work> items;  ///< of a serial queue
+};
+
+/// Runs items, one after the other, on a stack of its own.
+struct SimulatedWorkQueues::Runner {
+  explicit Runner(SimulatedWorkQueues& queues) : fiber([this, &queues] { queues.work(*this); }) {}
+
+  std::shared_ptr<Queue> queue;
+  Work item;
+  bool isDone = false;
+  bool isStopping = false;
+  Fiber fiber;
+};
+
+struct SimulatedWorkQueues::Waiter {
+  Runner* runner;
+  const SimulatedSignal* signal;
+  bool hasLimit;
+  EventKey timer;
+  Outcome outcome;
+};
+
+class SimulatedWorkQueues::SimulatedSignal : public Signal {
+ public:
+  explicit SimulatedSignal(SimulatedWorkQueues& queues) : queues_(queues) {}
+
+  void signal() override {
+    if (std::exchange(signalled_, true)) return;
+    const auto waiters = queues_.waiters_;
+    for (const auto& waiter : waiters) {
+      if (waiter->signal == this) queues_.wake(waiter, Outcome::Signalled);
+    }
+  }
+  bool wait(std::optional<double> limit) override { return signalled_ || queues_.wait(*this, limit); }
+  bool isSignalled() const { return signalled_; }
+
+ private:
+  SimulatedWorkQueues& queues_;
+  bool signalled_ = false;
+};
+
+class SimulatedWorkQueues::SimulatedTimer : public Timer {
+ public:
+  SimulatedTimer(SimulatedWorkQueues& queues, double interval, WorkQueueRef queue, Work work)
+      : queues_(queues),
+        interval_(std::max(cleanDelay(interval), kShortestInterval)),
+        queue_(std::move(queue)),
+        firing_(std::make_shared<Firing>(Firing{std::move(work)})) {
+    scheduleNext();
+  }
+  ~SimulatedTimer() override { end(); }
+  SimulatedTimer(const SimulatedTimer&) = delete;
+  SimulatedTimer& operator=(const SimulatedTimer&) = delete;
+
+  void invalidate() override { end(); }
+
+ private:
+  struct Firing {
+    Work work;
+    bool waits = false;  ///< handed to the queue, not begun
+  };
+
+  void end() {
+    if (!firing_) return;
+    queues_.cancel(next_);
+    queue_ = nullptr;
+    firing_ = nullptr;
+  }
+
+  void scheduleNext() {
+    next_ = queues_.schedule(interval_, [this] {
+      scheduleNext();
+      if (std::exchange(firing_->waits, true)) return;
+      queue_->async([firing = firing_] {
+        firing->waits = false;
+        firing->work();
+      });
+    });
+  }
+
+  SimulatedWorkQueues& queues_;
+  const double interval_;
+  WorkQueueRef queue_;
+  std::shared_ptr<Firing> firing_;
+  EventKey next_;
+};
+
+SimulatedWorkQueues::SimulatedWorkQueues(SimulatedClock& clock, std::uint64_t seed)
+    : clock_(clock),
+      random_(seed),
+      mainQueue_(std::make_shared<Queue>(*this, true)),
+      concurrentQueues_{std::make_shared<Queue>(*this, false), std::make_shared<Queue>(*this, false)} {}
+
+SimulatedWorkQueues::~SimulatedWorkQueues() {
+  end();
+  for (const auto& runner : runners_) {
+    runner->isStopping = true;
+    runner->fiber.resume();
+  }
+}
+
+WorkQueueRef SimulatedWorkQueues::mainQueue() { return mainQueue_; }
+
+WorkQueueRef SimulatedWorkQueues::newSerialQueue(std::string /*label*/) {
+  return std::make_shared<Queue>(*this, true);
+}
+
+WorkQueueRef SimulatedWorkQueues::concurrentQueue(Priority priority) {
+  return concurrentQueues_[priority == Priority::Default ? 0 : 1];
+}
+
+void SimulatedWorkQueues::after(double delay, WorkQueueRef queue, Work work) {
+  schedule(delay,
+           [queue = std::move(queue), work = std::move(work)]() mutable { queue->async(std::move(work)); });
+}
+
+std::shared_ptr<Timer> SimulatedWorkQueues::newRepeatingTimer(double interval, WorkQueueRef queue,
+                                                              Work work) {
+  return std::make_shared<SimulatedTimer>(*this, interval, std::move(queue), std::move(work));
+}
+
+std::shared_ptr<Signal> SimulatedWorkQueues::newSignal() { return std::make_shared<SimulatedSignal>(*this); }
+
+// Time.
+
+SimulatedWorkQueues::EventKey SimulatedWorkQueues::schedule(double delay, std::function<void()> event) {
+  const EventKey key{clock_.elapsed_ + cleanDelay(delay), scheduled_++};
+  if (!closed_) events_.emplace(key, std::move(event));
+  return key;
+}
+
+bool SimulatedWorkQueues::step(double limit) {
+  if (events_.empty()) return false;
+  const auto first = events_.begin();
+  const double due = first->first.first;
+  if (due > limit || due == kNever) return false;
+  clock_.elapsed_ = std::max(clock_.elapsed_, due);
+  const auto event = events_.extract(first);
+  event.mapped()();
+  return true;
+}
+
+bool SimulatedWorkQueues::hasFuture() const {
+  return !readyQueues_.empty() || !readyItems_.empty() || !readyRunners_.empty() ||
+         (!events_.empty() && events_.begin()->first.first != kNever);
+}
+
+void SimulatedWorkQueues::run() {
+  requireOutside();
+  for (int count = 0;; ++count) {
+    if (count == kMostItemsAtOnce) throw std::logic_error("work is handed over without end");
+    // Everything that is due now competes for being next.
+    while (step(clock_.elapsed_)) continue;
+    if (!runOne()) return;
+  }
+}
+
+void SimulatedWorkQueues::advance(double seconds) {
+  const double target = clock_.elapsed_ + seconds;
+  do run();
+  while (step(target));
+  clock_.elapsed_ = std::max(clock_.elapsed_, target);
+}
+
+bool SimulatedWorkQueues::runUntil(const std::function<bool()>& predicate) {
+  requireOutside();
+  for (int count = 0; !predicate(); ++count) {
+    if (count == kMostEvents) throw std::logic_error("events go on without end");
+    while (step(clock_.elapsed_)) continue;
+    if (runOne() || step(kNever)) continue;
+    wakeDeadlocked();
+    if (readyRunners_.empty()) return false;
+  }
+  return true;
+}
+
+// Work.
+
+void SimulatedWorkQueues::enqueue(const std::shared_ptr<Queue>& queue, Work work) {
+  if (closed_) return;
+  if (!queue->isSerial) {
+    readyItems_.push_back(std::move(work));
+    return;
+  }
+  queue->items.push_back(std::move(work));
+  if (!queue->isBusy && queue->items.size() == 1) readyQueues_.push_back(queue);
+}
+
+bool SimulatedWorkQueues::runOne() {
+  const auto count = readyQueues_.size() + readyItems_.size() + readyRunners_.size();
+  if (count == 0) return false;
+  auto choice = static_cast<std::size_t>(random_() % count);
+  if (choice < readyRunners_.size()) {
+    resume(*takeAt(readyRunners_, choice));
+    return true;
+  }
+  choice -= readyRunners_.size();
+  if (choice < readyItems_.size()) {
+    start(nullptr, takeAt(readyItems_, choice));
+    return true;
+  }
+  const auto queue = takeAt(readyQueues_, choice - readyItems_.size());
+  queue->isBusy = true;
+  Work item = std::move(queue->items.front());
+  queue->items.pop_front();
+  start(queue, std::move(item));
+  return true;
+}
+
+void SimulatedWorkQueues::start(std::shared_ptr<Queue> queue, Work work) {
+  if (idleRunners_.empty()) {
+    runners_.push_back(std::make_unique<Runner>(*this));
+    idleRunners_.push_back(runners_.back().get());
+  }
+  Runner& runner = *idleRunners_.back();
+  idleRunners_.pop_back();
+  runner.queue = std::move(queue);
+  runner.item = std::move(work);
+  runner.isDone = false;
+  resume(runner);
+}
+
+void SimulatedWorkQueues::resume(Runner& runner) {
+  current_ = &runner;
+  runner.fiber.resume();
+  current_ = nullptr;
+  if (runner.isDone) finish(runner);
+}
+
+void SimulatedWorkQueues::work(Runner& runner) {
+  while (!runner.isStopping) {
+    try {
+      runner.item();
+    } catch (const std::exception& error) {
+      faults_.push_back(std::string("work item failed: ") + error.what());
+    } catch (...) {
+      faults_.emplace_back("work item failed");
+    }
+    runner.item = nullptr;
+    runner.isDone = true;
+    runner.fiber.pause();
+  }
+}
+
+void SimulatedWorkQueues::finish(Runner& runner) {
+  idleRunners_.push_back(&runner);
+  const auto queue = std::exchange(runner.queue, nullptr);
+  if (!queue) return;
+  queue->isBusy = false;
+  if (!queue->items.empty()) readyQueues_.push_back(queue);
+}
+
+void SimulatedWorkQueues::requireOutside() const {
+  if (current_ != nullptr) throw std::logic_error("the simulation is driven from inside an item");
+}
+
+// Waiting.
+
+bool SimulatedWorkQueues::wait(SimulatedSignal& signal, std::optional<double> limit) {
+  if (limit && cleanDelay(*limit) == kNever) limit.reset();
+  return current_ == nullptr ? waitOutside(signal, limit) : waitInItem(signal, limit);
+}
+
+bool SimulatedWorkQueues::waitInItem(SimulatedSignal& signal, std::optional<double> limit) {
+  if (current_->queue == mainQueue_) throw std::logic_error("an item waits on the main queue");
+  if (ending_) return false;
+  const auto waiter =
+      std::make_shared<Waiter>(Waiter{current_, &signal, limit.has_value(), {}, Outcome::Over});
+  waiters_.push_back(waiter);
+  if (limit) waiter->timer = schedule(*limit, [this, waiter] { wake(waiter, Outcome::Over); });
+  current_->fiber.pause();
+  if (waiter->outcome == Outcome::Deadlocked) throw std::logic_error("deadlock: nothing can end this wait");
+  return waiter->outcome == Outcome::Signalled;
+}
+
+bool SimulatedWorkQueues::waitOutside(const SimulatedSignal& signal, std::optional<double> limit) {
+  const double deadline = limit ? clock_.elapsed_ + cleanDelay(*limit) : kNever;
+  while (!signal.isSignalled() && !ending_) {
+    while (step(clock_.elapsed_)) continue;
+    if (runOne() || step(deadline)) continue;
+    if (!limit) throw std::logic_error("deadlock: nothing can end this wait");
+    clock_.elapsed_ = std::max(clock_.elapsed_, deadline);
+    break;
+  }
+  return signal.isSignalled();
+}
+
+void SimulatedWorkQueues::wake(const std::shared_ptr<Waiter>& waiter, Outcome outcome) {
+  waiter->outcome = outcome;
+  if (waiter->hasLimit) cancel(waiter->timer);
+  std::erase(waiters_, waiter);
+  readyRunners_.push_back(waiter->runner);
+}
+
+void SimulatedWorkQueues::wakeDeadlocked() {
+  const auto waiters = waiters_;
+  for (const auto& waiter : waiters) wake(waiter, Outcome::Deadlocked);
+}
+
+void SimulatedWorkQueues::beginEnding() {
+  ending_ = true;
+  const auto waiters = waiters_;
+  for (const auto& waiter : waiters) wake(waiter, Outcome::Over);
+}
+
+void SimulatedWorkQueues::end() {
+  requireOutside();
+  beginEnding();
+  while (!readyRunners_.empty()) resume(*takeAt(readyRunners_, 0));
+  closed_ = true;
+  const auto queues = std::exchange(readyQueues_, {});
+  for (const auto& queue : queues) {
+    const auto items = std::exchange(queue->items, {});
+  }
+  const auto items = std::exchange(readyItems_, {});
+  const auto events = std::exchange(events_, {});
+}
+
+}  // namespace kvr

@@ -1,0 +1,125 @@
+#pragma once
+
+#include "platform/services/WorkQueues.h"
+#include "simulated/loop/Fiber.h"
+#include "simulated/loop/SimulatedClock.h"
+
+#include <cstdint>
+#include <deque>
+#include <functional>
+#include <map>
+#include <memory>
+#include <random>
+#include <string>
+#include <utility>
+#include <vector>
+
+namespace kvr {
+
+/// All work on one thread, in virtual time, in an order that the seed decides.
+///
+/// Nothing runs until the test says so with `run`, `advance` or `runUntil`. Whenever several items could run
+/// next, the seed picks one: the same seed gives the same order, another seed another one that real threads
+/// could give as well. An item that waits for a signal is set aside while others run; its serial queue stays
+/// busy meanwhile. Time passes only when nothing is runnable.
+///
+///     queues.mainQueue()->async([&] { ... });
+///     queues.run();                                // everything that can run without time passing
+///     queues.advance(60);                          // a minute
+///     EXPECT_TRUE(queues.runUntil([&] { return replied; }));  // however long it takes
+///
+/// An exception that leaves an item, a wait on the main queue, and a wait that nothing can end any more are
+/// faults, see `faults`. One thread only.
+class SimulatedWorkQueues : public WorkQueues {
+ public:
+  SimulatedWorkQueues(SimulatedClock& clock, std::uint64_t seed);
+  ~SimulatedWorkQueues() override;
+  SimulatedWorkQueues(const SimulatedWorkQueues&) = delete;
+  SimulatedWorkQueues& operator=(const SimulatedWorkQueues&) = delete;
+
+  WorkQueueRef mainQueue() override;
+  WorkQueueRef newSerialQueue(std::string label) override;
+  WorkQueueRef concurrentQueue(Priority priority) override;
+  void after(double delay, WorkQueueRef queue, Work work) override;
+  std::shared_ptr<Timer> newRepeatingTimer(double interval, WorkQueueRef queue, Work work) override;
+  std::shared_ptr<Signal> newSignal() override;
+
+  // For tests; not from inside an item. All of them throw std::logic_error when work keeps handing over work
+  // without end at one point in time.
+
+  /// Runs until nothing is runnable now. No time passes.
+  void run();
+  /// Lets `seconds` pass, running everything that becomes due, in the order of time.
+  void advance(double seconds);
+  /// Lets `seconds` pass in which nothing runs, as while a device is suspended; what became due meanwhile is
+  /// due at once.
+  void suspend(double seconds) { clock_.elapsed_ += seconds; }
+  /// Goes from event to event until `predicate` holds (true) or nothing is left to happen (false). Then no
+  /// wait without a limit can end any more: such waits throw std::logic_error inside their items.
+  bool runUntil(const std::function<bool()>& predicate);
+  /// From here on every wait returns false at once, those under way as well.
+  void beginEnding();
+  /// Ends every wait, lets the waiting items finish, releases all work that has not run and refuses further
+  /// work. The destructor does it too.
+  void end();
+
+  /// Items waiting inside `Signal::wait`.
+  std::size_t waiting() const { return waiters_.size(); }
+  /// Whether anything is runnable or will become due.
+  bool hasFuture() const;
+
+  const std::vector<std::string>& faults() const { return faults_; }
+  /// The faults so far, which are then no faults any more: for tests that provoke one.
+  std::vector<std::string> takeFaults() { return std::exchange(faults_, {}); }
+
+ private:
+  class Queue;
+  class SimulatedTimer;
+  class SimulatedSignal;
+  struct Runner;
+  struct Waiter;
+  using EventKey = std::pair<double, std::uint64_t>;  ///< virtual time due, then order of scheduling
+
+  EventKey schedule(double delay, std::function<void()> event);
+  void cancel(const EventKey& key) { events_.erase(key); }
+  /// Moves time on to the next event, if it is due by `limit`, and lets it happen.
+  bool step(double limit);
+
+  void enqueue(const std::shared_ptr<Queue>& queue, Work work);
+  bool runOne();
+  void start(std::shared_ptr<Queue> queue, Work work);
+  void resume(Runner& runner);
+  void work(Runner& runner);
+  void finish(Runner& runner);
+
+  bool wait(SimulatedSignal& signal, std::optional<double> limit);
+  bool waitInItem(SimulatedSignal& signal, std::optional<double> limit);
+  bool waitOutside(const SimulatedSignal& signal, std::optional<double> limit);
+  enum class Outcome { Signalled, Over, Deadlocked };
+  void wake(const std::shared_ptr<Waiter>& waiter, Outcome outcome);
+  void wakeDeadlocked();
+  void requireOutside() const;
+
+  SimulatedClock& clock_;
+  std::mt19937_64 random_;
+  std::uint64_t scheduled_ = 0;
+  std::map<EventKey, std::function<void()>> events_;
+
+  // What is runnable now.
+  std::vector<std::shared_ptr<Queue>> readyQueues_;  ///< serial queues that are not busy and hold an item
+  std::vector<Work> readyItems_;                     ///< of the concurrent queues
+  std::vector<Runner*> readyRunners_;                ///< items whose wait has ended
+
+  std::vector<std::unique_ptr<Runner>> runners_;
+  std::vector<Runner*> idleRunners_;
+  Runner* current_ = nullptr;
+  std::vector<std::shared_ptr<Waiter>> waiters_;
+
+  std::vector<std::string> faults_;
+  bool ending_ = false;
+  bool closed_ = false;
+  std::shared_ptr<Queue> mainQueue_;
+  std::shared_ptr<Queue> concurrentQueues_[2];
+};
+
+}  // namespace kvr
