@@ -145,13 +145,13 @@ ActivityBlock ActivityTable::checkIn(const std::string& identifier, ActivityBloc
   return std::exchange(entry.block, std::move(block));
 }
 
-bool ActivityTable::isRegisteredFor(const std::string& identifier, Date date, const Now& now) const {
+bool ActivityTable::isRegisteredFor(const std::string& identifier, Date date) const {
   const auto found = entries_.find(identifier);
   if (found == entries_.end() || !found->second.registration) return false;
   const Registration& registration = *found->second.registration;
   const Date opens = registration.registered + seconds(registration.criteria.delay);
   // A date that had passed when it was registered opened its window at once.
-  return opens <= std::max(date, now.date) + kRounding &&
+  return opens <= std::max(date, registration.registered) + kRounding &&
          registration.due <= opens + seconds(registration.criteria.gracePeriod);
 }
 

@@ -82,9 +82,10 @@ class ActivityTable {
   /// Brings a block for whatever the identifier is or will be due for; a registration that was made with a
   /// block keeps its own. Returns the block that is not needed.
   ActivityBlock checkIn(const std::string& identifier, ActivityBlock block);
-  /// Whether the activity is registered to run from `date` on (or earlier, or as of now), and within its
+  /// Whether the activity is registered to run from `date` on, or from when it was registered if the date had
+  /// passed then, and within its
   /// grace period.
-  bool isRegisteredFor(const std::string& identifier, Date date, const Now& now) const;
+  bool isRegisteredFor(const std::string& identifier, Date date) const;
 
   /// An occasion when none or another version is recorded, or when a run is owed. Nothing as the version (it
   /// cannot be found out) is no other one. The version is recorded once the run has finished.

@@ -127,7 +127,7 @@ void FileActivityScheduler::checkIn(const std::string& identifier, const Activit
   load();
   {
     const std::lock_guard lock(mutex_);
-    if (expected && !table_.isRegisteredFor(identifier, expected->date, now())) {
+    if (expected && !table_.isRegisteredFor(identifier, expected->date)) {
       replaced = table_
                      .add(identifier, expected->criteria, RegistrationCause::Demand, std::move(block), now(),
                           fraction)

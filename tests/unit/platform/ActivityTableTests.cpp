@@ -50,7 +50,7 @@ TEST_F(AnActivityTable, RunsAnActivityOnceAtThePointDrawnInItsWindow) {
     EXPECT_THAT(next(), ElementsAre("a"));
     EXPECT_TRUE(end("a", kFinished).changesTree);
     EXPECT_EQ(table.secondsToNext(now), std::nullopt);
-    EXPECT_FALSE(table.isRegisteredFor("a", now.date, now));
+    EXPECT_FALSE(table.isRegisteredFor("a", now.date));
   }
 }
 
@@ -130,7 +130,7 @@ TEST_F(AnActivityTable, KeepsARegistrationThatWasMadeDuringTheRun) {
     pass(20);
     EXPECT_THAT(started(), IsEmpty()) << "never twice at once";
     end("a", result);
-    EXPECT_TRUE(table.isRegisteredFor("a", now.date, now));
+    EXPECT_TRUE(table.isRegisteredFor("a", now.date));
     EXPECT_THAT(started(), ElementsAre("a"));
     const auto old = numbers["a"];
     end("a", kFinished);
@@ -193,7 +193,10 @@ TEST_F(AnActivityTable, TakesUpItsTreeAgainAndKeepsWhatNobodyChecksInFor) {
   EXPECT_EQ(next.secondsToNext(now), std::nullopt);
   next.checkIn("a", kBlock);
   EXPECT_THAT(next.secondsToNext(now), Optional(3780.0));
-  EXPECT_TRUE(next.isRegisteredFor("b", now.date + 60, now));
+  EXPECT_TRUE(next.isRegisteredFor("b", now.date + 60));
+  const Date earlier = now.date + 20;
+  pass(120);
+  EXPECT_FALSE(next.isRegisteredFor("b", earlier)) << "though both have passed";
 }
 
 TEST_F(AnActivityTable, ComplainsOfATreeThatIsNotItsOwn) {
