@@ -13,8 +13,8 @@ namespace kvr {
 using DeviceInfosAnswer = Completion<std::optional<KVRDeviceInfoList>>;
 
 /// How activities and monitors ask for all devices with their warranties, looked up by a policy
-/// (`LookupPolicy`). `updateFollowUps` also brings the follow-ups up to date with what was found. Answers once, on
-/// any thread.
+/// (`LookupPolicy`). `updateFollowUps` also brings the follow-ups up to date with what was found. Answers
+/// once, on any thread.
 using DeviceInfosQuery =
     std::function<void(std::uint64_t policy, bool updateFollowUps, DeviceInfosAnswer answer)>;
 

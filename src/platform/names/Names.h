@@ -3,14 +3,15 @@
 #include <string>
 #include <string_view>
 
-// What the agent, its clients and the host call the same things. Others build on these names: to change one is to
-// change an interface.
+// What the agent, its clients and the host call the same things. Others build on these names: to change one
+// is to change an interface.
 namespace kvr::names {
 
 /// The agent's main bundle identifier, also its name on the bus and its preference domain.
 inline constexpr const char* kAgent = "com.tarsil.kvragent";
 
-// --- the bus ------------------------------------------------------------------------------------------------
+// --- the bus
+// ------------------------------------------------------------------------------------------------
 
 inline constexpr const char* kObjectPath = "/com/tarsil/kvragent";
 inline constexpr const char* kInterface = "com.tarsil.kvragent.KVRAgentProtocol";
@@ -25,7 +26,8 @@ inline constexpr const char* kLanguageChanged = "com.tarsil.language.changed";
 inline constexpr const char* kDeviceDidPair = "com.tarsil.pairedregistry.device-did-pair";
 inline constexpr const char* kDeviceDidUnpair = "com.tarsil.pairedregistry.device-did-unpair";
 
-// --- background activities ----------------------------------------------------------------------------------
+// --- background activities
+// ----------------------------------------------------------------------------------
 
 inline constexpr const char* kPostUpgrade = "com.tarsil.kvragent.upgrade";
 inline constexpr const char* kPostBoot = "com.tarsil.kvragent.boot";
@@ -34,7 +36,8 @@ inline constexpr const char* kConversionOutreach = "com.tarsil.kvragent.conversi
 inline constexpr const char* kFollowUpPost = "com.tarsil.kvragent.followuppost";
 inline constexpr const char* kFollowUpRefresh = "com.tarsil.kvragent.followuprefresh";
 
-// --- files, below the home directory ------------------------------------------------------------------------
+// --- files, below the home directory
+// ------------------------------------------------------------------------
 
 /// The agent at the follow-up centre, and the folder of its warranty cache.
 inline constexpr const char* kFollowUpClient = "com.tarsil.Kavrel";
@@ -53,7 +56,8 @@ inline std::string preferencesFile() { return listIn(kPreferencesFolder, kAgent)
 inline std::string activitiesFile() { return listIn(kActivitiesFolder, kAgent); }
 inline std::string followUpsFile() { return listIn(kFollowUpsFolder, kFollowUpClient); }
 
-// --- entries of those files that clients read ---------------------------------------------------------------
+// --- entries of those files that clients read
+// ---------------------------------------------------------------
 
 /// Behind an activity's identifier, in the preferences: the date before which it does not run.
 inline constexpr const char* kTargetDateSuffix = ".TargetDate";
