@@ -1,5 +1,5 @@
-# What an installation holds, and the two Debian packages of it: the agent with its command line, and what other
-# programs are built with.
+# What is installed, and the two Debian packages: the agent with its command line, and the client library for building
+# other programs.
 set(KVR_LIBEXEC ${CMAKE_INSTALL_LIBEXECDIR}/kvragent)
 set(KVR_AGENT ${CMAKE_INSTALL_FULL_LIBEXECDIR}/kvragent/kvragent)
 configure_file(dbus/com.tarsil.kvragent.service.in com.tarsil.kvragent.service @ONLY)
@@ -7,7 +7,7 @@ configure_file(systemd/kvragent.service.in kvragent.service @ONLY)
 configure_file(cmake/kvragent-client.pc.in kvragent-client.pc @ONLY)
 
 set(CMAKE_INSTALL_DEFAULT_COMPONENT_NAME agent)
-# The parts that the agent loads at first use, and the waker, stand beside it.
+# The agent looks for the libraries that it loads at first use, and for kvragent-wake, in its own directory.
 install(TARGETS kvragent kvragent-wake RUNTIME DESTINATION ${KVR_LIBEXEC})
 install(TARGETS kvragent-http kvragent-locale LIBRARY DESTINATION ${KVR_LIBEXEC})
 install(TARGETS kvrctl RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})

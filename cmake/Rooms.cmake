@@ -1,20 +1,20 @@
-# A room is a folder with one responsibility, built as one target, that may use exactly the rooms it names:
+# A room is a folder with one responsibility. It is built as one target and may use only the rooms that it names:
 #
-#   kvr_room(core/followup                the folder, below src or in the project
+#   kvr_room(core/followup                the folder, below src or below the project
 #     USES core/scheduling platform/log   the rooms whose headers it includes and whose code it links
-#     SYSTEM <openssl/evp.h>              the headers of the system and of libraries that it includes, beside those of
-#                                         the C++ library that reach nothing outside the process
+#     SYSTEM <openssl/evp.h>              the headers of the system and of libraries that it includes; headers of the
+#                                         C++ library that do not reach outside the process need no entry
 #     LINKS OpenSSL::Crypto               libraries outside the project
-#     WITHOUT Module.cpp)                 files of the folder that are built otherwise
+#     WITHOUT Module.cpp)                 files of the folder that this target does not build
 #
-#   kvr_program(kvrctl client/kvrctl [FILE...] USES ...)          the same as an executable
-#   kvr_module(kvragent-http local/http [FILE...] USES ...)       the same as a library that is loaded at run time
-#   kvr_tests(tests/unit/followup USES ...)                       the same as objects of a test program
+#   kvr_program(kvrctl client/kvrctl [FILE...] USES ...)          the same, as an executable
+#   kvr_module(kvragent-http local/http [FILE...] USES ...)       the same, as a library that is loaded at run time
+#   kvr_tests(tests/unit/followup USES ...)                       the same, as objects of a test program
 #
-# Only rooms that have been declared before can be used, so no two use each other, however indirectly.
-# scripts/check-layers reads these calls and holds every include of the tree against them.
+# A room can use only rooms that are declared before it, so there are no circles.
+# scripts/check-layers reads these calls and checks every include of the tree against them.
 
-# The files of a folder, and how they are to be built.
+# Parses such a call: sets `sources` to the files to build and `used` to the targets of the rooms.
 macro(kvr_parse folder)
   cmake_parse_arguments(ROOM "" "" "USES;SYSTEM;LINKS;WITHOUT" ${ARGN})
   set(path ${PROJECT_SOURCE_DIR}/${folder})

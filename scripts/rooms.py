@@ -1,11 +1,11 @@
-"""The rooms of the tree, as the CMakeLists.txt files declare them, and the includes of its files."""
+"""Reads the rooms of the tree from the CMakeLists.txt files, and the includes of its files."""
 import pathlib
 import re
 import subprocess
 
 ROOT = pathlib.Path(__file__).resolve().parent.parent
 TREES = ("src", "tools", "tests", "bench", "fuzz")
-# Where includes in quotes are looked for, after the file's own folder.
+# Where to look for includes in quotes, after the file's own folder.
 INCLUDE_ROOTS = ("src", "tests", "tools")
 OPEN_TO_ALL = set(
     """algorithm array atomic bit cctype cerrno charconv climits cmath compare concepts cstddef cstdint 
@@ -31,7 +31,7 @@ class Room:
 
 
 def folder_of(room, folders):
-    """core/warranty stands below src; tests/unit does not."""
+    """The folder of a room from the root of the tree: core/warranty is below src, tests/unit is not."""
     return f"src/{room}".rstrip("/.") if room == "." or f"src/{room}" in folders else room
 
 
@@ -56,7 +56,7 @@ def read_rooms(texts, folders):
 
 
 def read_tree():
-    """Every source file's text by its name, and a function that reads the rooms afresh."""
+    """The text of every source file by its name, and a function that reads the rooms again."""
     sources = {name: (ROOT / name).read_text(errors="replace")
                for name in git_files(*TREES) if name.endswith((".h", ".cpp"))}
     folders = {name.rsplit("/", 1)[0] for name in sources}
@@ -65,6 +65,6 @@ def read_tree():
 
 
 def target_of(header, folder, sources):
-    """The file that an include in quotes names, from a file in `folder`; None for none."""
+    """The file that an include in quotes names when a file in `folder` has it; None if there is none."""
     candidates = [f"{folder}/{header}"] + [f"{root}/{header}" for root in INCLUDE_ROOTS]
     return next((file for file in candidates if file in sources), None)
