@@ -29,10 +29,10 @@
 
 namespace kvr {
 
-/// Everything the agent may know of the world, one reference an interface.
+/// Everything outside the agent that it uses, one reference per interface.
 ///
-/// Whatever needs the world takes `Platform&` first and keeps the reference; the platform outlives the agent.
-/// Two platforms can live in one process.
+/// Code that needs any of it takes `Platform&` as its first parameter and may keep the reference; the
+/// platform outlives the agent. Several platforms can exist in one process.
 struct Platform {
   Log& log;
   Clock& clock;

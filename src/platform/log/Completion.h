@@ -10,17 +10,17 @@
 
 namespace kvr {
 
-/// An answer that is given exactly once.
+/// A callback that must be called exactly once.
 ///
-/// Copies share one state, so an answer may be handed to whoever will finish the work. The function runs on
-/// the thread that answers, and what it captured is released right after. A second answer is refused and
-/// reported; so is an answer that was never given when the last copy goes. Both are error lines in the log.
+/// Copies share one state, so any copy can be used to answer. The function runs on the thread that answers,
+/// and its captures are released right after. A second answer is ignored. A second answer, and the
+/// destruction of the last copy without an answer, are logged as errors.
 template <class... A>
 class Completion {
  public:
   using Function = std::function<void(A...)>;
 
-  /// `name` is the operation that promised the answer; it must be a literal.
+  /// `name` is the operation that owes the answer; it must be a literal.
   Completion(Log& log, std::string_view name, Function function)
       : state_(std::make_shared<State>(log, name, std::move(function))) {}
 

@@ -17,7 +17,7 @@
 
 namespace kvr {
 
-// What `%@` prints: the description of anything that has one, "(null)" for what is absent.
+// What `%@` prints: the description of anything that has one, "(null)" for an absent value.
 
 inline std::string describe(const std::string& text) { return text; }
 inline std::string describe(std::string_view text) { return std::string(text); }
@@ -64,7 +64,7 @@ namespace format_detail {
 
 enum class Kind { Object, Text, Integer, Real };
 
-/// One argument, described only if its line is written.
+/// One argument; its description is made only if the line is written.
 struct Argument {
   Kind kind;
   const void* object;
@@ -112,7 +112,8 @@ Argument argument(const char (&text)[N]) {
           }};
 }
 
-/// Finds the next placeholder at or after `from`; `end` is one past it. An unknown one is not `known`.
+/// Finds the next placeholder at or after `from`; `end` is one past it. `known` is false for an unknown
+/// conversion.
 struct Placeholder {
   std::size_t begin;
   std::size_t end;

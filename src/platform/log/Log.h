@@ -37,7 +37,7 @@ class Log {
 
   bool isEnabled(LogLevel level) const { return level >= least_; }
 
-  /// From here on the process is ending: answers that will not come any more are no fault.
+  /// The process is ending: missing answers are expected from now on and not reported.
   void beginEnding() { ending_ = true; }
   /// Reports an answer that was never given, or given twice; nothing while the process is ending.
   virtual void reportMisusedCompletion(std::string_view what, std::string_view name) {

@@ -3,8 +3,8 @@
 #include <string>
 #include <string_view>
 
-// What the agent, its clients and the host call the same things. Others build on these names: to change one
-// is to change an interface.
+// Names that the agent shares with its clients and the host. They are an interface: changing one breaks
+// others.
 namespace kvr::names {
 
 /// The agent's main bundle identifier, also its name on the bus and its preference domain.
@@ -15,10 +15,10 @@ inline constexpr const char* kAgent = "com.tarsil.kvragent";
 
 inline constexpr const char* kObjectPath = "/com/tarsil/kvragent";
 inline constexpr const char* kInterface = "com.tarsil.kvragent.KVRAgentProtocol";
-/// A true boolean, without which a client is not served.
+/// Clients whose program lacks this entitlement (a true boolean) are not served.
 inline constexpr const char* kEntitlement = "com.tarsil.private.kvragent";
 
-/// System-wide notifications are a signal with the notification's name, sent by anyone.
+/// A system-wide notification is a signal whose argument is the notification's name. Any program may send it.
 inline constexpr const char* kNotificationPath = "/com/tarsil/NotificationCenter";
 inline constexpr const char* kNotificationInterface = "com.tarsil.NotificationCenter";
 inline constexpr const char* kNotificationMember = "Posted";
@@ -39,7 +39,7 @@ inline constexpr const char* kFollowUpRefresh = "com.tarsil.kvragent.followupref
 // --- files, below the home directory
 // ------------------------------------------------------------------------
 
-/// The agent at the follow-up centre, and the folder of its warranty cache.
+/// The agent's client identifier at the follow-up centre, also the name of its warranty cache's folder.
 inline constexpr const char* kFollowUpClient = "com.tarsil.Kavrel";
 
 inline constexpr std::string_view kPreferencesFolder = "Library/Preferences";
@@ -59,13 +59,13 @@ inline std::string followUpsFile() { return listIn(kFollowUpsFolder, kFollowUpCl
 // --- entries of those files that clients read
 // ---------------------------------------------------------------
 
-/// Behind an activity's identifier, in the preferences: the date before which it does not run.
+/// Preference key suffix after an activity's identifier: the date before which the activity does not run.
 inline constexpr const char* kTargetDateSuffix = ".TargetDate";
-/// Behind a serial hash and "_", in the preferences: when the device's warranty was downloaded.
+/// Preference key suffix after a serial hash and "_": when the device's warranty was downloaded.
 inline constexpr const char* kLastUpdatedDate = "CachedWarrantyLastUpdatedDate";
-/// Behind a serial hash, in the preferences: the date of the latest dismissal.
+/// Preference key suffix after a serial hash: the date of the latest dismissal.
 inline constexpr const char* kDismissedSuffix = ".dismissed";
-/// In a follow-up's user info: the serial number of its device.
+/// User-info key of a follow-up: the serial number of its device.
 inline constexpr const char* kFollowUpSerialNumber = "FollowupSerialNumber";
 
 }  // namespace kvr::names

@@ -31,7 +31,7 @@ struct RenewalOptions {
   std::vector<std::string> services;
 };
 
-/// The user's accounts and their credentials, as they are at the time of asking. Any thread.
+/// The user's accounts and their credentials, read afresh by each call. Any thread.
 class AccountStore {
  public:
   /// A result code of 0 means renewed.

@@ -24,27 +24,27 @@ struct ActivityCriteria {
 
 /// Why an activity is registered.
 enum class RegistrationCause {
-  /// A client asks for it, an occasion that comes once, or the calendar alone: each is run, however many.
+  /// Asked for by a client, by a one-time event (boot, upgrade), or by the calendar. Never throttled.
   Demand,
-  /// A run, an answer of the service or a notification leads to it, which it may lead to again: how often
-  /// such registrations are started is limited.
+  /// Caused by a run, an answer of the service or a notification, each of which can recur without end.
+  /// Throttled: see `ActivityScheduler`.
   Reaction
 };
 
-/// What a client that checks in knows of its activity.
+/// What a client tells the platform about its activity when it checks in.
 struct ActivityCheckIn {
-  /// What it holds the activity to be registered for.
+  /// The registration that the client believes to exist.
   struct Expectation {
-    Date date;                  ///< from when it may run
-    ActivityCriteria criteria;  ///< with which to register it now, if it is not registered for that date
+    Date date;                  ///< the earliest date of the run
+    ActivityCriteria criteria;  ///< for registering it now, if it is not registered for that date
   };
   std::optional<Expectation> expectation;
-  /// Whether the client has no record of a run that there should have been. An activity that the platform
-  /// runs after an upgrade is run then as after one.
+  /// Whether a run that should have happened is missing from the client's records. The platform then runs its
+  /// after-upgrade activity as after an upgrade; for other activities this has no effect.
   bool isOwed = false;
 };
 
-/// How an activity is registered anew.
+/// A new registration of an activity.
 struct ActivityRegistration {
   ActivityCriteria criteria;
   RegistrationCause cause = RegistrationCause::Reaction;
@@ -58,36 +58,36 @@ using ActivityBlock = std::function<void(ActivityHandler)>;
 /// One client's handle on a named background activity. Registrations are persistent; destroying the handle
 /// changes nothing. Any thread.
 ///
-/// The platform holds a run block until the activity has finished or is registered anew.
+/// The platform keeps a run block until the activity has finished or is registered again.
 class Activity {
  public:
   virtual ~Activity() = default;
   virtual const std::string& identifier() const = 0;
-  /// Installs the run block of an activity that the platform knows already: from an earlier start of the
-  /// process, or because the platform itself runs it on an occasion. Should the platform have lost the
-  /// registration that the client expects, or never got it, the activity is registered so.
+  /// Installs the run block of an activity that the platform already knows: from an earlier start of the
+  /// process, or because the platform itself runs it after a boot or an upgrade. If the registration that the
+  /// client expects is missing, the platform makes it.
   virtual void checkIn(const ActivityCheckIn& known, ActivityBlock block) = 0;
-  /// Registers the activity with these criteria, counted from now. An earlier registration of the identifier,
-  /// one whose run is under way included, is replaced, and the end of that run leaves the new one alone.
+  /// Registers the activity; the delay counts from now. Replaces any earlier registration of the identifier.
+  /// A run that is under way continues, and its end does not affect the new registration.
   virtual void registerAnew(const ActivityRegistration& registration, ActivityBlock block) = 0;
-  /// Tells the platform, during a run that is about to be deferred, the date before which running again is of
-  /// no use.
+  /// To be called during a run that is about to be deferred: running again before `date` would be of no use.
   virtual void setEarliestDate(Date date) = 0;
   /// Whether the platform asks the running activity to stop and defer: the network that it needs is gone, or
   /// the process is ending.
   virtual bool shouldDefer() const = 0;
 };
 
-/// The platform's scheduler of named background activities. It runs an activity once, no earlier than its
-/// delay, within its grace period where it can. A deferred run comes back by itself: within a second after
-/// the date it waits for, else after 10 s, doubling up to an hour. Activities never run twice at once. What
-/// reactions register is started six times in ten minutes at most.
+/// The platform's scheduler of named background activities. It runs each registration once, not before its
+/// delay has passed, and within its grace period if possible. A deferred run is started again: within a
+/// second after the date it waits for, or without such a date after 10 s, doubling up to an hour. Two runs of
+/// one activity never overlap. Runs registered with cause `Reaction` are throttled to six starts of an
+/// activity in ten minutes.
 class ActivityScheduler {
  public:
   virtual ~ActivityScheduler() = default;
   virtual std::unique_ptr<Activity> newActivity(std::string identifier) = 0;
-  /// From here on no run is started: check-ins and registrations are only taken in, until as many `resume`
-  /// follow. Any thread.
+  /// Starts no further runs until the matching `resume`; check-ins and registrations are still accepted.
+  /// Calls nest. Any thread.
   virtual void suspend() = 0;
   virtual void resume() = 0;
 };

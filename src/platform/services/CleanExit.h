@@ -8,13 +8,12 @@ namespace kvr {
 class CleanExit {
  public:
   virtual ~CleanExit() = default;
-  /// Has the process ended cleanly once it is idle; it is started again when it is needed. Returns at once.
-  /// Any thread.
+  /// Requests a clean exit of the process once it is idle; it is started again when it is needed. Returns at
+  /// once. Any thread.
   virtual void requestWhenIdle() = 0;
 
-  /// Whether the process is ending: what fails from here on, a download for one, says nothing about the
-  /// world. This is the one answer; what the platform's own parts keep of their ends is nobody else's
-  /// business. Any thread.
+  /// Whether the process is ending. Failures from then on, of a download for example, must not be taken as
+  /// facts. Ask only here; the end flags inside the platform's parts are private to them. Any thread.
   bool isEnding() const { return ending_; }
   void beginEnding() { ending_ = true; }
 

@@ -4,7 +4,7 @@
 
 namespace kvr {
 
-/// The wall clock. It may be moved, forward and back, at any time; waits are measured by `WorkQueues`.
+/// The wall clock. It can be set forward and back at any time; use `WorkQueues` to measure waits.
 class Clock {
  public:
   virtual ~Clock() = default;

@@ -6,7 +6,7 @@
 
 namespace kvr {
 
-/// Facts about the device the agent runs on, read afresh at every question. Any thread.
+/// Facts about the device the agent runs on, read afresh by every call. Any thread.
 class DeviceProperties {
  public:
   static constexpr std::string_view kSerialNumber = "SerialNumber";

@@ -4,7 +4,7 @@
 
 namespace kvr {
 
-/// The platform's feature switches; a switch nobody set is off. Any thread.
+/// The platform's feature switches; a switch that is not set is off. Any thread.
 class FeatureFlags {
  public:
   virtual ~FeatureFlags() = default;

@@ -12,7 +12,7 @@
 
 namespace kvr {
 
-/// Under which the follow-up centre addresses the settings application.
+/// The settings application's identifier at the follow-up centre.
 inline constexpr const char* kFollowUpSettingsBundleIdentifier = "com.tarsil.followup.settings";
 /// User-info keys from which the centre renders the days left until an item's expiration date: whether the
 /// count is rounded up (bool), the text for a single day, the format for several.
@@ -22,7 +22,7 @@ inline constexpr const char* kFollowUpRelativeDatePluralDaysFormatKey =
     "FollowUpRelativeDatePluralDaysFormat";
 
 struct FollowUpAction {
-  Value label;  ///< text, or whatever the service sent for one; null for none
+  Value label;  ///< text, or another kind of value if the service sent one; null for none
   std::optional<std::string> url;
 
   friend bool operator==(const FollowUpAction&, const FollowUpAction&) = default;
@@ -44,11 +44,11 @@ struct FollowUpItem {
   friend bool operator==(const FollowUpItem&, const FollowUpItem&) = default;
 };
 
-/// One client's view of the follow-up centre. Any thread; every operation is done when it returns.
+/// One client's view of the follow-up centre. Any thread; all operations are synchronous.
 class FollowUpCenterClient {
  public:
   virtual ~FollowUpCenterClient() = default;
-  /// Posts an item, in the place of a pending one with the same unique identifier. Nothing on success.
+  /// Posts an item; it replaces a pending one with the same unique identifier. Nothing on success.
   virtual std::optional<Error> postItem(const FollowUpItem& item) = 0;
   /// Clears pending items; an identifier that is not pending is no error. Nothing on success.
   virtual std::optional<Error> clearPendingItems(const std::vector<std::string>& uniqueIdentifiers) = 0;

@@ -25,7 +25,7 @@ std::optional<std::string> HTTPHeaders::objectionTo(std::string_view name, std::
   if (value.find_first_of(std::string_view("\r\n\0", 3)) != std::string_view::npos) {
     return "line break or NUL in the header " + text;
   }
-  // The length of the message is the transport's to say: a second opinion would split it in two.
+  // The transport sets the message length. A second, different length would let a receiver split the message.
   for (const auto* framing : {"Content-Length", "Transfer-Encoding"}) {
     if (isSameName(name, framing)) return text + " cannot be set";
   }

@@ -13,21 +13,21 @@
 
 namespace kvr {
 
-/// Whether the text is a token, which methods and header names are.
+/// Whether the text is an HTTP token, the form of methods and header names.
 bool isHTTPToken(std::string_view text);
 
-/// Header fields in the order in which they were first set; names compare without regard to case.
+/// Header fields in the order in which they were first set; names are case-insensitive.
 class HTTPHeaders {
  public:
   using Field = std::pair<std::string, std::string>;
 
-  /// Sets a field, in the place of one of the same name if there is one; no value takes such a field away.
+  /// Sets a field, replacing one of the same name; without a value, removes it.
   void set(std::string_view name, std::optional<std::string> value);
   std::optional<std::string> value(std::string_view name) const;
   const std::vector<Field>& fields() const { return fields_; }
 
-  /// Why no request can carry such a field, if so: no name of a header, a line break or NUL in the value, or
-  /// a field with which the transport says where the message ends.
+  /// Why a request cannot carry this field; nothing if it can. Refused are an invalid name, a line break or
+  /// NUL in the value, and the fields by which the transport gives the message length.
   static std::optional<std::string> objectionTo(std::string_view name, std::string_view value);
 
  private:
@@ -52,26 +52,25 @@ struct HTTPResponse {
 };
 
 /// Sends requests. TLS is required (TLS 1.2, certificate and host name verified) except towards a loopback
-/// address. A header that no request can carry (`HTTPHeaders::objectionTo`), or a URL that is no web address,
-/// fails the request. Of a request that may have been sent, in part even, a failure is final: nobody sends it
-/// again.
+/// address. A header that `HTTPHeaders::objectionTo` refuses, or a URL that is not a web address, fails the
+/// request. A request that may have been sent, even in part, is not sent again after a failure.
 class HTTPSession {
  public:
   using Reply = std::function<void(HTTPResponse)>;
 
   virtual ~HTTPSession() = default;
   /// Returns at once; `reply` is called exactly once, on a work queue where it may block, never on the
-  /// caller's thread. When the process ends first, it fails.
+  /// caller's thread. If the process ends first, the request fails.
   virtual void send(HTTPRequest request, Reply reply) = 0;
 };
 
 class HTTP {
  public:
   virtual ~HTTP() = default;
-  /// The process-wide session: connections are kept alive and shared. Lives as long as this.
+  /// The process-wide session: connections are kept alive and shared. Lives as long as this object.
   virtual HTTPSession& sharedSession() = 0;
-  /// A session whose answers come from the origin, past every cache on the way. It may go as soon as its
-  /// requests are sent.
+  /// A session that bypasses every cache on the way to the origin server. It may be destroyed as soon as
+  /// `send` has returned.
   virtual std::shared_ptr<HTTPSession> newUncachedSession() = 0;
 };
 

@@ -13,9 +13,10 @@ class Notifications {
   using Token = std::int32_t;
 
   virtual ~Notifications() = default;
-  /// Has `handler` run on the main queue whenever somebody posts the notification. 0 when that cannot be.
+  /// Runs `handler` on the main queue whenever the notification is posted. Returns 0 if it cannot be
+  /// registered.
   virtual Token registerFor(const std::string& name, std::function<void()> handler) = 0;
-  /// From here on the handler does not begin any more; it is let go.
+  /// The handler is not started any more, and is released.
   virtual void cancel(Token token) = 0;
 };
 

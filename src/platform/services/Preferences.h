@@ -10,11 +10,11 @@
 
 namespace kvr {
 
-/// The agent's own preference domain, the standard domain, and reading of other applications' domains.
+/// The agent's own preference domain (the standard domain); other applications' domains can be read.
 ///
-/// Reads see changes made from outside. A change is on disk when the operation returns; one that changes
-/// nothing writes nothing; one that cannot be stored is an error line and leaves everything as it was.
-/// Any thread. A key holds any `Value` but null.
+/// Reads see changes made by other processes. A change is on disk when the operation returns. A change to an
+/// equal value writes nothing; one that cannot be stored is logged as an error and has no effect. Any thread.
+/// A key can hold any `Value` but null.
 class Preferences {
  public:
   virtual ~Preferences() = default;
@@ -32,11 +32,13 @@ class Preferences {
   virtual void removeObject(std::string_view key) = 0;
   /// Every key that has a stored or a registered value, in ascending order.
   virtual std::vector<std::string> allKeys() const = 0;
-  /// Reads what is stored (null for nothing), hands it to `change` and stores what that returns (null
-  /// removes), with no other change of the domain in between, by whomever. `change` must not call back.
+  /// An atomic read-modify-write: passes the stored value (null for none) to `change` and stores what it
+  /// returns (null removes the key), with no change by another thread or process in between. `change` must
+  /// not call the preferences.
   virtual void update(std::string_view key, const std::function<Value(const Value&)>& change) = 0;
 
-  // Typed readings; a value of another kind counts as absent, or reads as a stored setting does.
+  // Typed reads. A value that is not a string or date counts as absent; the others convert as
+  // `Value::asBool`, `asDouble` and `asInteger` do.
   std::optional<std::string> stringForKey(std::string_view key) const {
     return objectForKey(key).stringIfAny();
   }

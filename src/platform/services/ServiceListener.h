@@ -18,7 +18,7 @@ struct ServiceArgument {
   const char* type;
 };
 
-/// One operation: what it takes, and the one value it replies.
+/// One operation: its arguments and its one reply value.
 struct ServiceMethod {
   const char* member;
   std::vector<ServiceArgument> in;
@@ -34,12 +34,12 @@ struct ServiceInterface {
 /// The reply to one call; a null value is sent as the type's empty value. May be given on any thread.
 using ServiceReply = Completion<Value>;
 
-/// What serves the calls of one connection.
+/// Serves the calls of one connection.
 class ServiceObject {
  public:
   virtual ~ServiceObject() = default;
   /// Serves one call of the interface's method number `method`. The arguments have been checked against the
-  /// method's types. Called on the connection's own queue, where it may block that connection only.
+  /// method's types. Called on the connection's own queue; blocking there delays that connection only.
   virtual void invoke(std::size_t method, const Value::Array& arguments, ServiceReply reply) = 0;
 };
 
@@ -53,7 +53,7 @@ class ServiceConnection {
   virtual void setExportedInterface(const ServiceInterface& interface) = 0;
   /// The connection holds the object for its whole life.
   virtual void setExportedObject(std::shared_ptr<ServiceObject> object) = 0;
-  /// Lets calls through.
+  /// Starts delivering calls.
   virtual void resume() = 0;
 };
 
@@ -71,8 +71,7 @@ class ServiceListener {
   virtual ~ServiceListener() = default;
   /// The delegate must outlive the listener.
   virtual void setDelegate(ServiceListenerDelegate& delegate) = 0;
-  /// Takes the name and lets connections arrive. The interface that is offered for introspection is
-  /// `interface`.
+  /// Takes the name and accepts connections. `interface` is what introspection shows.
   virtual void resume(const ServiceInterface& interface) = 0;
 };
 

@@ -7,10 +7,10 @@
 
 namespace kvr {
 
-/// The objects of which one platform has one each, made at their first use. Thread-safe.
+/// Holds the objects that exist once per platform, each made on first use. Thread-safe.
 class SharedObjects {
  public:
-  /// The one `T`, made by `make` (which must not ask for another shared object) if there is none yet.
+  /// The one `T`, made by `make` (which must not call `get`) if there is none yet.
   template <class T, class Make>
   std::shared_ptr<T> get(const Make& make) {
     const std::lock_guard lock(mutex_);

@@ -10,7 +10,7 @@
 
 namespace kvr {
 
-/// An application that an account has bought, or got for nothing.
+/// An application that an account has bought, or got for free.
 struct PurchasedApplication {
   std::string bundleIdentifier;
   std::optional<std::string> title;
@@ -31,12 +31,12 @@ struct CatalogueItem {
 class StoreLookup {
  public:
   using PurchasesReply = std::function<void(std::vector<PurchasedApplication>)>;
-  /// What was found, or nothing and why.
+  /// What was found, or nothing and the error.
   using CatalogueReply =
       std::function<void(std::optional<std::vector<CatalogueItem>>, std::optional<Error> error)>;
 
   virtual ~StoreLookup() = default;
-  /// What the account has bought among the applications named. 0 is no account.
+  /// Which of the named applications the account has bought. 0 means no account.
   virtual void purchaseHistory(std::int64_t storeAccountIdentifier,
                                std::vector<std::string> bundleIdentifiers, PurchasesReply reply) = 0;
   /// `caller` is the bundle on whose behalf the store is asked.

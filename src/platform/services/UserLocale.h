@@ -7,7 +7,7 @@
 
 namespace kvr {
 
-/// The user's language, number format and time zone, read afresh at every question. Any thread.
+/// The user's language, number format and time zone, read afresh by every call. Any thread.
 class UserLocale {
  public:
   virtual ~UserLocale() = default;

@@ -12,13 +12,13 @@ namespace kvr {
 
 using Work = std::function<void()>;
 
-/// Runs what it is handed, later. What it was handed is released right after it ran, on the thread it ran on.
-/// An exception that leaves a work item is logged and ends that item only.
+/// Runs work items asynchronously. An item is released right after it ran, on the same thread. An exception
+/// that leaves an item is logged and ends that item only.
 class WorkQueue {
  public:
   virtual ~WorkQueue() = default;
-  /// Hands over one item, from any thread. It never runs before `async` has returned on a queue that is the
-  /// caller's own.
+  /// Adds one item, from any thread. Called on this same queue, if it is serial, it returns before the item
+  /// runs.
   virtual void async(Work work) = 0;
 };
 
@@ -26,28 +26,28 @@ using WorkQueueRef = std::shared_ptr<WorkQueue>;
 
 enum class Priority { Default, Background };
 
-/// A repeating timer; destroying it, or `invalidate`, ends it. A firing already handed to its queue may still
-/// run; while it waits there, no further one is handed over.
+/// A repeating timer, stopped by `invalidate` or by destroying it. A firing that is already queued may still
+/// run. Firings do not pile up: while one is queued, no other is added.
 class Timer {
  public:
   virtual ~Timer() = default;
   virtual void invalidate() = 0;
 };
 
-/// One event that happens once and stays. Any thread may signal; any number may wait.
+/// A one-time event: once signalled, it stays signalled. Any thread may signal; any number may wait.
 class Signal {
  public:
   virtual ~Signal() = default;
   virtual void signal() = 0;
   /// Blocks until signalled (true), or until `limit` seconds have passed or the process is ending (false).
-  /// Nothing as the limit waits without one. Never called on the main queue.
+  /// Without a limit it waits for as long as it takes. Do not call it on the main queue.
   virtual bool wait(std::optional<double> limit) = 0;
 };
 
 /// The queues, timers and waits of one process.
 ///
 /// Serial queues (the main queue is one) run one item at a time in the order handed over. Concurrent queues
-/// run items side by side. However many items block, others go on: blocked threads are made up for.
+/// run items side by side. Blocked items do not stop others: further threads are started in their place.
 /// Delays are in seconds and count while the device sleeps; a negative or undefined delay counts as 0.
 class WorkQueues {
  public:
@@ -63,14 +63,14 @@ class WorkQueues {
   virtual std::shared_ptr<Signal> newSignal() = 0;
 };
 
-/// A count of outstanding work with notice when it is empty. Usable again after each emptying. Thread-safe.
+/// Counts outstanding work and notifies when the count reaches zero. Reusable. Thread-safe.
 class WorkGroup {
  public:
   void enter() {
     const std::lock_guard lock(mutex_);
     ++outstanding_;
   }
-  /// Ends one `enter`. The last one hands every waiting notice to its queue.
+  /// Ends one `enter`. The last one hands the work of every waiting `notify` to its queue.
   void leave();
   /// Hands `work` to `queue` when nothing is outstanding; at once if nothing is.
   void notify(WorkQueueRef queue, Work work);

@@ -23,10 +23,11 @@ constexpr const char* kHeldUntilDate = "heldUntilDate";
 constexpr const char* kResult = "result";
 constexpr const char* kEndedDate = "endedDate";
 
-/// A date that has come while its run was being deferred, in seconds since.
+/// How long ago, in seconds, a date may have passed while its run was being deferred, and still count.
 constexpr double kJustPassed = 1;
 
-/// What whole seconds, and the moments between a date's being stored and registered, may put between the two.
+/// Allowed difference in seconds between a stored date and its registration, which has whole seconds and is
+/// made slightly later.
 constexpr double kRounding = 2;
 
 /// The one priority at which activities run.
@@ -41,7 +42,7 @@ bool isRegistration(const Value& value) {
          isUsableDate(value[kRegisteredDate]) && isUsableDate(value[kDueDate]);
 }
 
-/// Whole seconds that are not negative.
+/// `count` seconds; a negative count is 0.
 double seconds(std::int64_t count) { return static_cast<double>(std::max<std::int64_t>(count, 0)); }
 
 }  // namespace
@@ -115,7 +116,7 @@ ActivityTable::Registered ActivityTable::add(const std::string& identifier, cons
   return registered;
 }
 
-/// Has a new registration wait for as long as the limit of starts says, if it would come before.
+/// Throttles a new registration by a reaction: delays it if it would run before the limit of starts allows.
 void ActivityTable::holdBack(Entry& entry, const Now& now) {
   Registration& registration = *entry.registration;
   entry.notBefore = 0;
@@ -128,8 +129,8 @@ void ActivityTable::holdBack(Entry& entry, const Now& now) {
   registration.heldUntil = date;
 }
 
-/// Takes back that a run was started which the activity's own date has deferred; whether that changes the
-/// tree.
+/// Removes a run that was deferred to the activity's own date from the counted starts, which can shorten the
+/// hold of a newer registration. Returns whether that changes the tree.
 bool ActivityTable::uncount(Entry& entry, const UnderWay& run, const Now& now) {
   if (!run.isCounted) return false;
   const auto start = std::ranges::find(entry.starts, run.started);
@@ -184,7 +185,7 @@ void ActivityTable::noticeOccasion(const std::string& identifier, OccasionKind k
   entries_[identifier].occasion = Occasion{kind, ++lastNumber_, std::move(fact)};
 }
 
-/// Whether the entry's occasion is the first of those that can be served, and no other is being served.
+/// Whether the entry's occasion is next: the first of those that have a block, and no other is being served.
 bool ActivityTable::isInTurn(const Entry& entry) const {
   return entry.occasion && std::ranges::none_of(entries_, [&entry](const auto& item) {
            const Entry& other = item.second;
@@ -194,8 +195,8 @@ bool ActivityTable::isInTurn(const Entry& entry) const {
          });
 }
 
-/// Whether some occasion's run is under way, or about to be. One that waits because its run failed holds up
-/// nothing but the occasion behind it.
+/// Whether a run for an occasion is under way or about to start. An occasion that waits after a deferred run
+/// holds up only the other occasions, not the registered activities.
 bool ActivityTable::isServingOccasions(const Now& now) const {
   return std::ranges::any_of(entries_, [this, &now](const auto& item) {
     const Entry& entry = item.second;
@@ -207,7 +208,7 @@ bool ActivityTable::isServingOccasions(const Now& now) const {
 
 // What is due.
 
-/// Whether nothing but its date can be in the way of a run.
+/// Whether the entry can run as soon as its date has come.
 bool ActivityTable::mayRun(const Entry& entry, const Now& now) const {
   if (!entry.block || entry.run || now.uptime < entry.notBefore) return false;
   if (isInTurn(entry)) return true;
@@ -215,7 +216,7 @@ bool ActivityTable::mayRun(const Entry& entry, const Now& now) const {
          !isServingOccasions(now);
 }
 
-/// The date of an entry that may run; nothing when it need not wait for one.
+/// The date that an entry which may run waits for; nothing if it can run at once.
 std::optional<Date> ActivityTable::dateOf(const Entry& entry) const {
   if (isInTurn(entry)) return entry.earliest;
   return std::max(entry.registration->due, entry.earliest.value_or(entry.registration->due));
@@ -250,7 +251,7 @@ std::vector<ActivityTable::Run> ActivityTable::takeDue(const Now& now) {
     entry.run = run;
     if (run.isCounted) {
       entry.starts.push_back(now.uptime);
-      // One more than the limit asks for: this one may not count in the end.
+      // Keep one more than the limit needs: this one is removed again if its run does not count.
       if (entry.starts.size() > kMostStarts + 1) entry.starts.pop_front();
     }
     runs.push_back({identifier, run.number, entry.block});
@@ -262,7 +263,7 @@ std::optional<double> ActivityTable::secondsToNext(const Now& now) const {
   std::optional<double> next;
   for (const auto& item : entries_) {
     const Entry& entry = item.second;
-    // The date and the uptime when nothing more is to be waited for.
+    // Asks for the moment at which `notBefore` has passed.
     if (!mayRun(entry, {now.date, std::max(now.uptime, entry.notBefore), now.networkReachable})) continue;
     double wait = std::max(entry.notBefore - now.uptime, 0.0);
     if (const auto date = dateOf(entry)) wait = std::max(wait, *date - now.date);
@@ -329,8 +330,8 @@ ActivityTable::Ending ActivityTable::end(const std::string& identifier, std::uin
   return ending;
 }
 
-/// Whether the result is news. The date alone is not: it is stored with the next change, so that an activity
-/// which is deferred again and again does not have the file written each time.
+/// Returns whether the result differs from the last one. A new date alone is stored with the next change, so
+/// that repeated deferrals do not rewrite the file each time.
 bool ActivityTable::recordRun(const std::string& identifier, ActivityResult result, const Now& now) {
   const char* const name = result == ActivityResult::Finished ? "finished" : "deferred";
   const Value before = std::exchange(records_[kLastRuns], Value());
@@ -347,7 +348,7 @@ void ActivityTable::defer(Entry& entry, const UnderWay& run, const Now& now) {
     entry.backOff = 0;
     return;
   }
-  // Whoever waits for the network is held back by its absence alone.
+  // A run that waits for the network needs no back-off: it starts when the network is back.
   if (run.needsNetwork && (run.lostNetwork || !now.networkReachable)) return;
   entry.backOff = entry.backOff == 0 ? kFirstBackOff : std::min(2 * entry.backOff, kLongestBackOff);
   entry.notBefore = now.uptime + entry.backOff;

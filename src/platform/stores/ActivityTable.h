@@ -11,26 +11,27 @@
 
 namespace kvr {
 
-/// The rules by which background activities run: what is registered, what is due, what a deferral leads to.
+/// The rules for running background activities: what is registered, what is due, and what follows a deferral.
 ///
-/// A *registration* is an activity's criteria and the dates that follow from them: its *window* opens `delay`
-/// seconds after it was registered and is `gracePeriod` seconds long; the *due date* is one point in it,
-/// drawn once. A *check-in* brings the block to run; without one a registration waits. An *occasion* is a
-/// reason of the platform's own to run an activity that has checked in: the system was started anew, or
-/// upgraded. Occasions are served one after the other, the boot before the upgrade whichever was noticed
-/// first, and before what is registered, so that none works on what another is about to change.
+/// A *registration* is an activity's criteria and its dates. Its *window* opens `delay` seconds after the
+/// registration and lasts `gracePeriod` seconds; the *due date* is a random point in the window, drawn once.
+/// A *check-in* supplies the block to run; a registration without a block waits for one. An *occasion* is the
+/// platform's own reason to run an activity that has checked in: a boot or a system upgrade. Occasions are
+/// served one at a time, always the boot before the upgrade, and before registered activities, so that no run
+/// works on data that another run is about to change.
 ///
-///     table.add("outreach", {.delay = 3600, .gracePeriod = 360}, RegistrationCause::Demand, block, now,
-///     0.5); const auto wait = table.secondsToNext(now);           // arm a timer for (auto& run :
-///     table.takeDue(later)) start(run); table.end(identifier, number, ActivityResult::Finished, later);
+///     table.add("outreach", {.delay = 3600}, RegistrationCause::Demand, block, now, 0.5);
+///     const auto wait = table.secondsToNext(now);  // arm a timer
+///     for (auto& run : table.takeDue(later)) start(run);
+///     table.end(identifier, number, ActivityResult::Finished, later);
 ///
-/// Facts in, decisions out: it reads no clock and starts nothing. Not thread-safe.
+/// It only decides: it reads no clock and starts nothing. Not thread-safe.
 class ActivityTable {
  public:
-  /// The moment at which a question is asked.
+  /// The current moment, as the caller sees it.
   struct Now {
     Date date;          ///< by the wall clock
-    double uptime = 0;  ///< seconds by a clock that nobody moves and that counts while suspended
+    double uptime = 0;  ///< seconds of a clock that is never set and also counts during suspend
     bool networkReachable = true;
   };
 
@@ -43,66 +44,66 @@ class ActivityTable {
 
   /// What the end of a run led to.
   struct Ending {
-    bool changesTree = false;     ///< whether what is persisted has changed
-    bool servesOccasion = false;  ///< which is to be stored before anything else is started
+    bool changesTree = false;     ///< whether the persisted tree has changed
+    bool servesOccasion = false;  ///< whether it served an occasion: store that before any start
     ActivityBlock released;       ///< a block that is not needed any more
   };
 
   /// What a registration led to.
   struct Registered {
     ActivityBlock replaced;         ///< a block that is not needed any more
-    std::optional<Date> heldUntil;  ///< it waits until then for the limit of starts, which was not known yet
+    std::optional<Date> heldUntil;  ///< throttled until then, and not reported before
   };
 
   static constexpr double kFirstBackOff = 10;      ///< seconds
   static constexpr double kLongestBackOff = 3600;  ///< seconds
-  /// Between the starts of two runs that are one registration's, in seconds.
+  /// Least time between the starts of two runs of one registration, in seconds.
   static constexpr double kShortestCycle = 0.5;
-  /// An activity that reactions had started so often within so many seconds waits when one more registers it
-  /// for before then. Nobody who can have it registered again and again (a service whose dates change with
-  /// each answer, whoever posts notifications) makes it run without a pause. A run that the activity's own
-  /// date deferred does not count.
+  /// The throttle: after `kMostStarts` starts caused by reactions within `kStartsPeriod` seconds, a further
+  /// registration by a reaction waits until the period is over. Otherwise a service whose dates change with
+  /// each answer, or a program that posts notifications, could make an activity run without a pause. A run
+  /// that was deferred to the activity's own date does not count.
   static constexpr std::size_t kMostStarts = 6;
   static constexpr double kStartsPeriod = 600;
 
   // What is persisted: registrations, the boot and system version whose occasions were served, and how each
   // activity's last run ended.
 
-  /// Why a tree is not one that `tree` gave, if it is not.
+  /// What is wrong with a stored tree; nothing if `adopt` can take it.
   static std::optional<Error> complaintAbout(const Value& tree);
-  /// Takes over the registrations of a sound tree, but for what is registered or recorded
-  /// already.
+  /// Takes over the registrations and records of a sound tree. What the table already has is kept.
   void adopt(const Value& tree);
   Value tree() const;
 
-  /// Registers an activity anew. `draw`, from 0 to below 1, decides the due date. A run that is under way
-  /// goes on and no longer concerns the registration.
+  /// Registers an activity, replacing an earlier registration. `draw`, at least 0 and below 1, places the due
+  /// date in the window. A run that is under way continues, and its end does not affect the new registration.
   Registered add(const std::string& identifier, const ActivityCriteria& criteria, RegistrationCause cause,
                  ActivityBlock block, const Now& now, double draw);
-  /// Brings a block for whatever the identifier is or will be due for; a registration that was made with a
-  /// block keeps its own. Returns the block that is not needed.
+  /// Installs the block to run, unless there is a registration that already has one. Returns the block that
+  /// is not needed.
   ActivityBlock checkIn(const std::string& identifier, ActivityBlock block);
-  /// Whether the activity is registered to run from `date` on, or from when it was registered if the date had
-  /// passed then, and within its
-  /// grace period.
+  /// Whether there is a registration whose window opens no later than `date` (or than the registration
+  /// itself, if the date had already passed then) and whose due date lies within that window.
   bool isRegisteredFor(const std::string& identifier, Date date) const;
 
-  /// An occasion when none or another version is recorded, or when a run is owed. Nothing as the version (it
-  /// cannot be found out) is no other one. The version is recorded once the run has finished.
+  /// Makes an upgrade occasion if no version or a different one is recorded, or if a run is owed. An unknown
+  /// version (nothing) does not count as different. The version is recorded once the run has finished.
   void noticeSystemVersion(const std::string& identifier, const std::optional<std::string>& version,
                            bool isOwed);
-  /// An occasion when another boot is recorded, or when `recordsLost`: then it may have been any. The first
-  /// boot ever is only recorded. Returns whether what is persisted has changed.
+  /// Makes a boot occasion if a different boot is recorded, or if none is recorded because of `recordsLost`.
+  /// The first boot ever is only recorded. Returns whether the persisted tree has changed.
   bool noticeBoot(const std::string& identifier, const std::string& boot, bool recordsLost);
 
-  /// The runs to start now; they count as under way. Whatever is in its window goes along with what is due.
+  /// Returns the runs to start now and counts them as under way. When anything is due, every activity whose
+  /// window is open runs along with it.
   std::vector<Run> takeDue(const Now& now);
-  /// Seconds until something will be due, the network staying as it is; nothing when nothing will.
+  /// Seconds until the next run is due if the network state stays the same; nothing if no run is expected.
   std::optional<double> secondsToNext(const Now& now) const;
 
-  /// The date that the run under way waits for; one that lies in the past tells nothing.
+  /// Sets the date that the run under way waits for. A date in the past is ignored.
   void setEarliestDate(const std::string& identifier, Date date, const Now& now);
-  /// To be called when the network has gone: runs that need it may be deferred for this reason.
+  /// Call this when the network is lost: runs that need it may be deferred for this reason, then without a
+  /// back-off.
   void noticeNetworkLoss();
   /// Whether a run is under way that needs the network.
   bool isRunThatNeedsNetwork(const std::string& identifier) const;
@@ -115,14 +116,14 @@ class ActivityTable {
     Date registered;
     Date due;
     RegistrationCause cause = RegistrationCause::Demand;
-    std::optional<Date> heldUntil;  ///< by the limit of starts
+    std::optional<Date> heldUntil;  ///< by the throttle
   };
   /// In the order in which they are served.
   enum class OccasionKind { Boot, Upgrade };
   struct Occasion {
     OccasionKind kind = OccasionKind::Boot;
     std::uint64_t number = 0;
-    std::string fact;  ///< is recorded once the occasion has been served
+    std::string fact;  ///< recorded once the occasion has been served
   };
   struct UnderWay {
     std::uint64_t number = 0;
@@ -140,13 +141,13 @@ class ActivityTable {
     std::optional<Occasion> occasion;
     ActivityBlock block;
     std::optional<UnderWay> run;
-    // What deferrals led to, since the last registration.
+    // The result of deferrals since the last registration.
     std::optional<Date> earliest;
     double notBefore = 0;  ///< uptime
     double backOff = 0;    ///< seconds of the last wait
     // These outlive registrations.
-    std::deque<double> starts;  ///< the last ones that reactions led to, in uptime
-    double knownHold = 0;       ///< the uptime until which a hold has been told
+    std::deque<double> starts;  ///< uptimes of the latest starts caused by reactions
+    double knownHold = 0;       ///< end (uptime) of the last throttling that was reported
   };
 
   static void holdBack(Entry& entry, const Now& now);
@@ -163,7 +164,7 @@ class ActivityTable {
   void defer(Entry& entry, const UnderWay& run, const Now& now);
 
   std::map<std::string, Entry, std::less<>> entries_;
-  Value::Dictionary records_;  ///< the tree's top level, but for the registrations
+  Value::Dictionary records_;  ///< the tree's top level, without the registrations
   std::uint64_t lastNumber_ = 0;
 };
 

@@ -7,11 +7,11 @@
 
 namespace kvr {
 
-/// The steps in which a file is replaced, as one file system does them. Each reports its own failure.
+/// The steps of replacing a file, implemented for one file system. Each reports its own failure.
 class ReplaceSteps {
  public:
   virtual ~ReplaceSteps() = default;
-  /// Makes an empty file beside the one to be replaced.
+  /// Creates an empty file beside the one to be replaced.
   virtual std::optional<Error> createTemporary() = 0;
   virtual std::optional<Error> write(const std::string& bytes) = 0;
   /// Makes what was written durable.
@@ -23,9 +23,9 @@ class ReplaceSteps {
   virtual void removeTemporary() = 0;
 };
 
-/// Replaces a file so that at every moment, after a loss of power too, its name leads to the old content or
-/// to the new one, whole; to the new one for good once this has returned without an error. After an error
-/// in any step but the last, the old file stays and nothing else is left behind.
+/// Replaces a file so that its name always leads to the complete old or the complete new content, even after
+/// a power loss, and to the new content once this has returned without an error. After an error in any step
+/// but the last, the old file stays and nothing else is left behind.
 std::optional<Error> replaceAtomically(ReplaceSteps& steps, const std::string& bytes);
 
 }  // namespace kvr

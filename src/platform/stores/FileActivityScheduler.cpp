@@ -35,7 +35,7 @@ class FileActivityScheduler::Handle : public Activity {
   const std::string identifier_;
 };
 
-/// The other end of a run's handler. A handler that goes without an answer defers its run.
+/// Receives the answer of one run. If it is destroyed without an answer, the run counts as deferred.
 class FileActivityScheduler::RunEnd {
  public:
   RunEnd(FileActivityScheduler& scheduler, std::string identifier, std::uint64_t number)
@@ -46,7 +46,7 @@ class FileActivityScheduler::RunEnd {
     try {
       tell(ActivityResult::Deferred);
     } catch (const std::exception&) {
-      // Without memory to go on with, the run counts as under way until the process ends.
+      // Out of memory: the run counts as under way until the process ends.
       told_ = true;
     }
   }
@@ -64,7 +64,7 @@ class FileActivityScheduler::RunEnd {
   bool told_ = false;
 };
 
-/// One `suspend`, which has been called; `resume` follows at its end, however that comes.
+/// Owns one `suspend` that was already called, and calls `resume` when it is destroyed.
 class FileActivityScheduler::Suspension {
  public:
   explicit Suspension(FileActivityScheduler& scheduler) : scheduler_(scheduler), life_(scheduler.life_) {}
@@ -216,7 +216,7 @@ void FileActivityScheduler::startDue() {
     runs = table_.takeDue(moment);
     arm(table_.secondsToNext(moment));
   }
-  // Whatever happens from here on, each run comes to its end.
+  // From here on an exception cannot lose a run: its `RunEnd` reports the end in any case.
   std::vector<std::shared_ptr<RunEnd>> ends;
   ends.reserve(runs.size());
   for (const auto& run : runs) ends.push_back(std::make_shared<RunEnd>(*this, run.identifier, run.number));
@@ -240,7 +240,7 @@ void FileActivityScheduler::end(const std::string& identifier, std::uint64_t num
   }
   const auto suspension = ending.servesOccasion ? std::make_shared<Suspension>(*this) : nullptr;
   if (ending.changesTree) {
-    // Whoever tells the end of a run, the main queue perhaps, is not made to wait for the disk.
+    // Save on another queue: the caller may be the main queue, which must not wait for the disk.
     queues_.concurrentQueue(Priority::Default)->async([this, alive = life(), suspension] {
       if (!alive.expired()) save();
     });
@@ -250,7 +250,8 @@ void FileActivityScheduler::end(const std::string& identifier, std::uint64_t num
 
 // The file.
 
-/// Without the mutex: a damaged file is set aside under the file's lock, and writing takes that one first.
+/// Must not be called with `mutex_` held: setting a damaged file aside takes the file lock, and `write` takes
+/// the file lock before `mutex_`.
 void FileActivityScheduler::load() {
   std::call_once(loaded_, [this] {
     const auto stamp = lists_.files().stamp(path_);
@@ -271,7 +272,7 @@ void FileActivityScheduler::save() {
   if (adopted) startDue();
 }
 
-/// With the file to itself; whether registrations have come to light that could not be read before.
+/// Writes the file under its lock. Returns whether registrations were adopted that could not be read before.
 bool FileActivityScheduler::write() {
   bool adopted = false;
   const auto fileLock = lists_.lock(directory_);
@@ -280,7 +281,7 @@ bool FileActivityScheduler::write() {
     const std::lock_guard lock(mutex_);
     if (unreadable_) {
       const auto found = lists_.read(path_, kDictionary, kSetAside, ActivityTable::complaintAbout);
-      if (!found) return false;  // which has been reported
+      if (!found) return false;  // `read` has logged it
       table_.adopt(*found);
       unreadable_ = false;
       adopted = true;

@@ -17,32 +17,33 @@
 
 namespace kvr {
 
-/// The activities that the platform itself has run.
+/// The activities that the platform runs on its own.
 struct ActivityOccasions {
   std::string afterUpgrade;  ///< once on a new device, when a run is owed, and when the version has changed
-  std::string afterBoot;     ///< whenever the device has been started anew
+  std::string afterBoot;     ///< after every boot but the first one recorded
 };
 
-/// A scheduler whose registrations are kept in a property list below "Library/Activities" of the home
-/// directory. The rules are `ActivityTable`'s; timer, boot and network are the derived class's.
+/// A scheduler that keeps its registrations in a property list below "Library/Activities" of the home
+/// directory. `ActivityTable` has the rules; the derived class provides timer, boot identifier and network
+/// state.
 ///
-/// The file is read at the first use. Registrations that are lost with a damaged file count as lost in a
-/// restart of the device: the post-boot activity is run, whose work it is to register what is pending; and a
-/// check-in that says the date it expects is registered for that date. A file that cannot be read is left
-/// alone; meanwhile registrations are held in memory.
+/// The file is read on first use. If registrations are lost with a damaged file, the post-boot activity runs
+/// as after a boot and registers what is pending, and a check-in that states an expected date is registered
+/// for that date. A file that exists but cannot be read is not overwritten; until it can be read,
+/// registrations are kept in memory only.
 ///
-/// Runs are started on the concurrent queue of default priority; after an occasion that has been served, only
-/// when the file says so: whoever is killed then must not have it come back after what followed it. Whoever
-/// destroys it has ended the queues.
+/// Runs start on the concurrent queue of default priority. After an occasion has been served, no run starts
+/// until that is stored: otherwise a process killed then would repeat the occasion after the runs that
+/// followed it. End the queues before you destroy the scheduler.
 class FileActivityScheduler : public ActivityScheduler {
  public:
   std::unique_ptr<Activity> newActivity(std::string identifier) override;
   void suspend() override;
   void resume() override;
 
-  /// From here on no run is started, and those under way are asked to defer. Any thread.
+  /// Starts no further runs, and asks those under way to defer. Any thread.
   void beginEnding();
-  /// Runs handed to the queue whose end has not been told. Any thread.
+  /// Number of runs that were handed to the queue and have not ended. Any thread.
   std::size_t runsUnderWay() const;
 
  protected:
@@ -50,16 +51,16 @@ class FileActivityScheduler : public ActivityScheduler {
                         const DeviceProperties& device, Log& log, const std::string& mainBundleIdentifier,
                         ActivityOccasions occasions);
 
-  /// Seconds by a clock that nobody moves and that counts while the device is suspended.
+  /// Seconds of a clock that is never set and also counts while the device is suspended.
   virtual double uptime() const = 0;
   virtual std::string bootIdentifier() const = 0;
-  /// Has `startDue` called after so many seconds and whenever the wall clock is moved before; nothing: never.
-  /// In the place of what was armed before. Called on any thread, one at a time.
+  /// Arranges a call of `startDue` after `wait` seconds, or earlier if the wall clock is set; without a
+  /// value, no call. Replaces the previous arrangement. Called on any thread, one call at a time.
   virtual void arm(std::optional<double> wait) = 0;
 
-  /// Starts what is due, and arms for what will be.
+  /// Starts what is due, and calls `arm` for the next run.
   void startDue();
-  /// Reachable until told otherwise.
+  /// The network counts as reachable until this is called.
   void setNetworkReachable(bool reachable);
   Log& log() const { return log_; }
   /// Expires with this object.
@@ -94,17 +95,17 @@ class FileActivityScheduler : public ActivityScheduler {
   const std::string path_;
   const ActivityOccasions occasions_;
 
-  std::once_flag loaded_;     ///< the file, before anything else is done with the table
+  std::once_flag loaded_;     ///< the file is loaded before the table is used
   std::mutex saving_;         ///< held while the file is written; taken before `mutex_`
   mutable std::mutex mutex_;  ///< guards what follows
   ActivityTable table_;
-  bool unreadable_ = false;  ///< the file, so far: nothing may be written in its place
+  bool unreadable_ = false;  ///< the file could not be read yet, so it must not be overwritten
   bool registrationsLost_ = false;
   bool networkReachable_ = true;
   int suspensions_ = 0;
   bool ending_ = false;
 
-  /// Ends first: what goes with the rest finds nobody to tell.
+  /// Destroyed first, so that nothing that is released with the other members calls back.
   const std::shared_ptr<const bool> life_ = std::make_shared<const bool>(true);
 };
 

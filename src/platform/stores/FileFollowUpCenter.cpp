@@ -148,7 +148,7 @@ class FileFollowUpCenter::Client : public FollowUpCenterClient {
 
   using Change = std::function<void(Value::Array&)>;
 
-  /// The content after a change, null when it changes nothing.
+  /// The tree after the change; null if nothing changes.
   Result<Value> changedBy(const Change& apply) const {
     const auto stored = read();
     if (!stored) return stored.error();
@@ -162,7 +162,7 @@ class FileFollowUpCenter::Client : public FollowUpCenterClient {
   }
 
   std::optional<Error> change(const Change& apply) {
-    // A change of nothing, such as clearing what is not there, needs no lock.
+    // A change without effect, such as clearing an item that is not pending, needs no lock.
     auto changed = changedBy(apply);
     if (changed && changed->isNull()) return std::nullopt;
     const auto lock = lists_.lock(directory_);

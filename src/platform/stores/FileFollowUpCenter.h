@@ -6,10 +6,10 @@
 
 namespace kvr {
 
-/// Pending items kept as one property list a client below "Library/FollowUps" of the home directory.
+/// Keeps pending items in one property list per client below "Library/FollowUps" of the home directory.
 ///
-/// Changes are made under the directory's lock, on what the file holds at that moment, so no two clients lose
-/// each other's items; an item that is not touched keeps whatever its entry holds.
+/// Changes are made under the directory's lock, on the file's current content, so concurrent clients do not
+/// lose each other's items. Entries of items that do not change are kept as they are, unknown keys included.
 class FileFollowUpCenter : public FollowUpCenter {
  public:
   FileFollowUpCenter(PropertyListFiles& lists, const Clock& clock) : lists_(lists), clock_(clock) {}

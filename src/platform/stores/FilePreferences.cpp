@@ -95,7 +95,7 @@ void FilePreferences::update(std::string_view key, const std::function<Value(con
   }
   const Value& before = (*stored)[key];
   Value after = change(before);
-  // Nulls are equal too: nothing stored, and nothing to store.
+  // Two nulls are equal too: nothing is stored, and nothing is to be stored.
   if (after == before) return;
   Value::Dictionary tree = stored->isDictionary() ? stored->dictionary() : Value::Dictionary();
   if (after.isNull()) {

@@ -5,11 +5,11 @@
 
 namespace kvr {
 
-/// Preferences kept as one property list a domain below "Library/Preferences" of the home directory.
+/// Keeps preferences in one property list per domain, below "Library/Preferences" of the home directory.
 ///
-/// A domain that cannot be read is left as it is: its keys read as their registered values, and a change of
-/// one is refused. Changes are made under the directory's lock, on what the file holds at that moment, so no
-/// two threads or processes lose each other's keys.
+/// A file that cannot be read is not overwritten: its keys then have their registered values, and changes are
+/// refused. Changes are made under the directory's lock, on the file's current content, so concurrent threads
+/// and processes do not lose each other's keys.
 class FilePreferences : public Preferences {
  public:
   FilePreferences(PropertyListFiles& lists, Log& log, const std::string& standardDomain);

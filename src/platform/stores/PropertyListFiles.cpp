@@ -9,10 +9,10 @@
 namespace kvr {
 namespace {
 
-/// How much of what was parsed is remembered, in bytes of the files.
+/// Size of the cache of parsed files, counted in bytes of the files.
 constexpr std::uint64_t kRememberedBytes = 4ULL * 1024 * 1024;
 constexpr std::size_t kMaximumReports = 256;
-/// How often a file is looked at again that was damaged and changed before it could be set aside.
+/// How often to read a damaged file that changes before it can be set aside.
 constexpr int kAttempts = 5;
 constexpr int kMaximumSameNames = 1000;
 
@@ -107,7 +107,7 @@ std::unique_ptr<FileLock> PropertyListFiles::lock(const std::string& directory) 
   return files_.lock(directory);
 }
 
-/// The file as it is now, or as this thread saw it before at the same look.
+/// The parsed file: from this thread's snapshot if it holds the file, otherwise from disk.
 Result<std::optional<PropertyListFiles::Parsed>> PropertyListFiles::parseOnce(const std::string& path) {
   auto* const look = Look::current;
   if (look == nullptr || &look->lists_ != this) return parse(path);
@@ -118,7 +118,7 @@ Result<std::optional<PropertyListFiles::Parsed>> PropertyListFiles::parseOnce(co
   return parsed;
 }
 
-/// The file as it is now, or nothing when there is none.
+/// The file as it is now, from the cache if it is unchanged; nothing when there is none.
 Result<std::optional<PropertyListFiles::Parsed>> PropertyListFiles::parse(const std::string& path) {
   if (const auto stamp = files_.stamp(path)) {
     if (!*stamp) return std::optional<Parsed>();
@@ -170,8 +170,9 @@ void PropertyListFiles::forgetWhileLocked(const std::string& path) {
   remembered_.erase(found);
 }
 
-/// Renames a damaged file beside itself. Nothing when it is no longer the file that was found damaged: under
-/// the lock no change by a careful writer can slip in between the look and the renaming.
+/// Renames a damaged file within its directory. Returns nothing if the file has changed since it was found
+/// damaged. The lock keeps other writers that use it from changing the file between this check and the
+/// renaming.
 std::optional<Result<Value>> PropertyListFiles::setAside(const std::string& path, const Error& reason,
                                                          const FileStamp& stamp) {
   const auto lock = files_.lock(directoryOf(path));
@@ -200,7 +201,7 @@ Error PropertyListFiles::reportUnreadable(const std::string& path, const Error& 
   return error;
 }
 
-/// Whether this complaint about a file was not the last one made.
+/// Whether this complaint about a file differs from the last one, so that each is logged once.
 bool PropertyListFiles::isNews(const std::string& path, const std::string& complaint,
                                const FileStamp& stamp) {
   const std::lock_guard lock(mutex_);

@@ -12,18 +12,18 @@
 
 namespace kvr {
 
-/// Property lists on disk, each read afresh when asked and replaced as a whole.
+/// Reads and replaces whole property lists on disk.
 ///
-/// Every reading is of the file as it is now; a file whose stamp shows that nothing changed is not parsed a
-/// second time. Thread-safe; a reader sees the old or the new content. The text of a file must be a
-/// dictionary or an array; `Expected` says which. Files of more than `kLimit` bytes are neither read nor
-/// written.
+/// Every read gives the file's current content (within a `Look`, the snapshot's); a parsed file is cached and
+/// reused while its stamp is unchanged. Thread-safe; a reader sees the complete old or new content. The top
+/// level must be a dictionary or an array, as `Expected` says. Files of more than `kLimit` bytes are neither
+/// read nor written.
 class PropertyListFiles {
  public:
   enum class Expected { Dictionary, Array };
-  /// What becomes of a file that is not what it should be. Either way it is reported once at error level.
+  /// What to do with a damaged file. Either way it is logged once as an error.
   enum class WhenDamaged {
-    SetAside,  ///< renamed beside itself to its name with ".damaged-" and a time
+    SetAside,  ///< renamed in its directory: ".damaged-" and the time are appended
     Leave,
   };
 
@@ -31,20 +31,21 @@ class PropertyListFiles {
 
   PropertyListFiles(Files& files, const Clock& clock, Log& log);
 
-  /// What a reader finds wrong with a tree of the expected kind, if anything.
+  /// A further check by the caller: what is wrong with a tree of the expected kind, or nothing.
   using Complaint = std::function<std::optional<Error>(const Value& tree)>;
 
-  /// The file's content; null when it is missing or damaged. An error when it is there but could not be read
-  /// (reported once): nothing may then be written in its place. A file of which `complaint` complains counts
-  /// as damaged.
+  /// The file's content; null when the file is missing or damaged. An error, logged once, when it exists but
+  /// cannot be read: then it must not be overwritten. A file that fails the `complaint` check counts as
+  /// damaged.
   Result<Value> read(const std::string& path, Expected expected, WhenDamaged whenDamaged,
                      const Complaint& complaint = nullptr);
 
-  /// Replaces the file; first creates its directory as needed, even for a tree that then cannot be written.
-  /// On failure the old file stays.
+  /// Replaces the file. First creates its directory if needed, even if the tree then cannot be written. On
+  /// failure the old file stays.
   std::optional<Error> write(const std::string& path, const Value& tree, PropertyListEncoding encoding);
 
-  /// As `Files::lock`, for a change that depends on what is read under it: from here on it is read anew.
+  /// As `Files::lock`. Also ends this thread's snapshot, so that reads under the lock give the current
+  /// content.
   std::unique_ptr<FileLock> lock(const std::string& directory);
 
   Files& files() { return files_; }
@@ -52,7 +53,7 @@ class PropertyListFiles {
   class Look;
 
  private:
-  /// What was made of a file: its tree, or why it is no property list.
+  /// The result of parsing a file: its tree, or the error.
   struct Parsed {
     FileStamp stamp;
     Result<Value> outcome;
@@ -80,17 +81,16 @@ class PropertyListFiles {
   Files& files_;
   const Clock& clock_;
   Log& log_;
-  std::mutex mutex_;  ///< guards what follows; never held while a file is touched
+  std::mutex mutex_;  ///< guards the members below; never held while a file is accessed
   std::map<std::string, Remembered> remembered_;
-  std::list<std::string> byAge_;  ///< paths of `remembered_`, the longest unused first
+  std::list<std::string> byAge_;  ///< paths of `remembered_`, least recently used first
   std::uint64_t rememberedBytes_ = 0;
-  std::map<std::string, Report> reported_;  ///< the last complaint about each file that is not sound
+  std::map<std::string, Report> reported_;  ///< the last logged complaint about each bad file
 };
 
-/// Makes what its thread reads be of one moment, for facts that are weighed together: a file that was read
-/// once is not looked at again, and later readings give what the first one found. It ends with its scope, or
-/// when its thread changes something. To be held while nothing is waited for; within another one it does
-/// nothing.
+/// A snapshot for the current thread, for decisions that need consistent facts: while it exists, a file is
+/// read once, and later reads on this thread return the same content. It ends with its scope, or when the
+/// thread takes a lock or writes. Do not wait while one is alive; a nested one has no effect.
 class PropertyListFiles::Look {
  public:
   explicit Look(const PropertyListFiles& lists);
@@ -101,7 +101,7 @@ class PropertyListFiles::Look {
  private:
   friend class PropertyListFiles;
 
-  static thread_local Look* current;  ///< the one that counts on this thread
+  static thread_local Look* current;  ///< the active snapshot of this thread
 
   const PropertyListFiles& lists_;
   std::map<std::string, std::optional<Parsed>> seen_;

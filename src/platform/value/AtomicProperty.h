@@ -5,7 +5,7 @@
 
 namespace kvr {
 
-/// A record's property: readable and writable from any thread, a reader sees the old or the new value whole.
+/// A record's property. Readable and writable from any thread; a reader sees the complete old or new value.
 /// Read it as `record->name()`, write it as `record->name = value`.
 template <class T>
 class AtomicProperty {

@@ -7,7 +7,7 @@
 
 namespace kvr {
 
-/// The date that a number of the coverage service means; nothing for what is no number.
+/// Converts a number from the coverage service to a date; nothing for a value that is not a number or bool.
 ///
 /// The number is read as an unsigned 64-bit integer: fractions are dropped, a negative number wraps around to
 /// the far future, and a real beyond the range is the nearest integer within it (NaN is 0). Up to

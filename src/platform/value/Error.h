@@ -7,16 +7,16 @@
 
 namespace kvr {
 
-/// What went wrong, in the words of whoever noticed it.
+/// An error, as described by the part that noticed it.
 struct Error {
-  std::string domain;     ///< who speaks, such as "files", "http", "json"
+  std::string domain;     ///< the part that reports it, such as "files", "http", "json"
   std::int64_t code = 0;  ///< the domain's own number: errno, a curl code, 0 when there is none
   std::string message;
 
   friend bool operator==(const Error&, const Error&) = default;
 };
 
-/// The form that stands in log lines.
+/// The form used in log lines.
 inline std::string describe(const Error& error) {
   return "Error Domain=" + error.domain + " Code=" + std::to_string(error.code) + " \"" + error.message +
          "\"";

@@ -118,7 +118,7 @@ void appendData(std::string& out, const Value::Bytes& bytes) {
   out += '>';
 }
 
-// Depth is bounded: every reader of trees refuses what is nested deeper than it allows.
+// The recursion is bounded: every reader refuses a tree that is nested deeper than its limit.
 void append(std::string& out, const Value& value, bool nested) {
   switch (value.kind()) {
     case Value::Kind::Null:

@@ -14,7 +14,7 @@
 
 namespace kvr {
 
-/// One tree of the property-list kind: what preferences, files, JSON and the bus all speak.
+/// A property-list tree: the common data type of preferences, files, JSON and the bus.
 ///
 /// A `Value` is immutable and cheap to copy: strings, data and containers are shared. It may be read from
 /// any number of threads. Text is UTF-8 and may hold NUL. Integers have one representation each: what fits
@@ -27,7 +27,7 @@ class Value {
   using Dictionary = std::map<std::string, Value, std::less<>>;
 
   Value() = default;
-  // NOLINTBEGIN(google-explicit-constructor): whatever a tree holds is one
+  // NOLINTBEGIN(google-explicit-constructor): every content of a tree converts to one
   Value(bool value) : state_(value) {}
   Value(int value) : state_(static_cast<std::int64_t>(value)) {}
   Value(unsigned value) : state_(static_cast<std::int64_t>(value)) {}
@@ -47,7 +47,7 @@ class Value {
   template <class T>
   Value(const std::optional<T>& value) : Value(value ? Value(*value) : Value()) {}
   // NOLINTEND(google-explicit-constructor)
-  /// No pointer becomes a bool by accident.
+  /// Keeps pointers from converting to bool by accident.
   template <class T>
   Value(T*) = delete;
 
@@ -62,8 +62,7 @@ class Value {
   bool isArray() const { return kind() == Kind::Array; }
   bool isDictionary() const { return kind() == Kind::Dictionary; }
 
-  // The content, for a value of just that kind; any other kind is the caller's error and throws
-  // std::bad_variant_access.
+  // The content of a value of exactly that kind; for any other kind throws std::bad_variant_access.
   bool boolean() const { return std::get<bool>(state_); }
   std::int64_t integer() const { return std::get<std::int64_t>(state_); }
   std::uint64_t unsignedInteger() const { return std::get<std::uint64_t>(state_); }
@@ -83,7 +82,7 @@ class Value {
   /// Whether this is a dictionary with an entry under `key`, a null one included.
   bool contains(std::string_view key) const;
 
-  // Readings of any kind as another, the way stored settings are read.
+  // Conversions from any kind, with the rules for stored settings.
   /// A number or bool: non-zero. A string: after blanks, signs and zeros, a first character Y, y, T, t or 1
   /// to 9.
   bool asBool() const;
@@ -104,7 +103,7 @@ class Value {
       state_;
 };
 
-/// The form that stands in log lines, on one line: `{covered = 1; items = (a, "b c"); }`.
+/// The form used in log lines, on one line: `{covered = 1; items = (a, "b c"); }`.
 std::string describe(const Value& value);
 
 }  // namespace kvr
