@@ -8,9 +8,9 @@
 
 namespace kvr {
 
-/// Asks this agent each time.
+/// Makes a query that asks this agent.
 DeviceInfosQuery deviceInfosQueryOf(std::shared_ptr<KVRAgentProtocol> agent, Log& log);
-/// Asks a new agent of the settings application each time.
+/// Makes a query that makes a new agent for the settings application each time and asks that one.
 DeviceInfosQuery newAgentQuery(Platform& platform);
 
 /// Puts every activity of the agent into the platform's registry.

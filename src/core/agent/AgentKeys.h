@@ -4,9 +4,10 @@ namespace kvr {
 
 namespace preference {
 
-/// Delay of the outreach after a cloud account was added: number, seconds. Registered.
+/// Delay of the outreach after a cloud account was added: number, seconds. Has a registered default.
 inline constexpr const char* kPostUpgradeOutreachDelay = "PostUpgradeOutreachDelay";
-/// Map from serial number to serial number for other accessories: dictionary of strings. Never written here.
+/// Serial numbers of accessories, each mapped to the one to look up instead: dictionary of strings. Never
+/// written by the agent.
 inline constexpr const char* kPairedBluetoothDevicesSerialNumbers = "PairedBluetoothDevicesSerialNumbers";
 
 }  // namespace preference

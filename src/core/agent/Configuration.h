@@ -4,12 +4,11 @@
 
 namespace kvr {
 
-/// The two hosts of the coverage service. An operator points the agent elsewhere by storing the URL
-/// preferences.
+/// The two hosts of the coverage service. An operator can store the URL preferences to use other servers.
 inline constexpr const char* kCoverageServiceHost = "coverage.tarsil.example";
 inline constexpr const char* kAssetHost = "assets.tarsil.example";
 
-/// Registers the configuration defaults: fallbacks that a stored value overrides.
+/// Registers the configuration defaults, which stored values override.
 void kvr_registerDefaults(Preferences& preferences);
 
 }  // namespace kvr

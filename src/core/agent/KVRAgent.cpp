@@ -17,7 +17,8 @@
 namespace kvr {
 namespace {
 
-/// The migration level of the present data layout; 1, and 0 for none stored, are that of a single device.
+/// The migration level of the current data layout. Levels 0 (none stored) and 1 mean the single-device
+/// layout.
 constexpr std::int32_t kCurrentLayout = 2;
 
 }  // namespace
@@ -131,7 +132,8 @@ void KVRAgent::getDefaultDeviceInfoUsingPolicy(std::uint64_t policy, DeviceInfoR
                     }));
 }
 
-/// A look-up that failed because the process is ending says nothing about an offer: what is shown stays.
+/// Does nothing while the process is ending: a look-up may then have failed for that reason alone, and the
+/// follow-up must not be removed for it.
 void KVRAgent::refreshFollowUp(const KVRDeviceInfoRef& info) {
   if (!platform_.cleanExit.isEnding()) warrantyProvider()->refreshFollowupWithDeviceInfo(info);
 }
@@ -181,7 +183,7 @@ void KVRAgent::getAllDeviceInfosUsingPolicy(std::uint64_t policy, bool updateFol
   const auto self = shared_from_this();
   for (const auto& entry : deviceProvider()->allDevices()) {
     group_.enter();
-    // Goes with the reply: a look-up that is dropped is waited for no longer.
+    // Owned by the reply, so the group is left even if a look-up drops its reply without an answer.
     const std::shared_ptr<void> entered(nullptr, [self](void*) { self->group_.leave(); });
     getWarrantyUsingPolicy(
         policy, entry.first,

@@ -15,10 +15,10 @@ namespace kvr {
 
 /// Does the work behind every client request.
 ///
-/// One agent serves one connection; start-up and activities have agents of their own. It asks its device
-/// provider for devices and its warranty provider for warranties, decides by the lookup policy between cache
-/// and download, and pairs device and warranty. Requests run side by side; an agent is kept alive by those
-/// under way. No state but its providers, its queue and its group.
+/// Each client connection has its own agent; so do start-up and activities. An agent gets devices from its
+/// device provider and warranties from its warranty provider, chooses between cache and download by the
+/// lookup policy, and pairs each device with its warranty. Requests run concurrently; a request under way
+/// keeps the agent alive. The only state is the two providers, a queue and a work group.
 class KVRAgent : public KVRAgentProtocol, public std::enable_shared_from_this<KVRAgent> {
  public:
   /// A warranty, or null.
@@ -45,13 +45,13 @@ class KVRAgent : public KVRAgentProtocol, public std::enable_shared_from_this<KV
                                     DeviceInfosReply withReply) override;
   void dismissFollowUpForSerialNumber(const std::string& serialNumber, BoolReply completion) override;
 
-  /// Brings a device from the single-device layout of earlier versions to the present one, once. Synchronous;
-  /// to be called before anything else reads the cache.
+  /// Migrates the cache and the follow-up of earlier versions, which knew a single device, to the current
+  /// layout, if that was not done before. Synchronous. Call it before anything else reads the cache.
   void performMigrationIfNeeded();
 
-  /// The lookup policy for one device. Replies before it returns when nothing is downloaded, else on the
-  /// thread on which the download finishes. Any text is a serial number; without one, the reply is nothing,
-  /// with an error line.
+  /// Looks up one device's warranty by the policy. Replies before it returns if nothing is downloaded,
+  /// otherwise on the thread on which the download finishes. Accepts any text as a serial number; without
+  /// one, replies with null and logs an error.
   void getWarrantyUsingPolicy(std::uint64_t policy, const std::optional<std::string>& serialNumber,
                               const WarrantyReply& withReply);
   /// The same for the local device.

@@ -4,8 +4,8 @@
 
 namespace kvr {
 
-/// Answers from the cache files and preferences of the moment, and downloads for the client that the agent
-/// serves. Holds no state but that client's bundle identifier.
+/// Reads cache files and preferences afresh for each call, and downloads on behalf of the client that the
+/// agent serves. The only state is that client's bundle identifier.
 class KVRAgentDefaultWarrantyProvider : public KVRAgentWarrantyProvider {
  public:
   KVRAgentDefaultWarrantyProvider(Platform& platform, std::string callingProcessBundleID);

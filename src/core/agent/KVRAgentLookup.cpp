@@ -33,7 +33,7 @@ void logValidity(Log& log, const std::string& serialNumber, const CacheFacts& fa
   }
 }
 
-/// What the default policy goes by.
+/// Logs what the default policy decides on: whether the cache is valid and still fresh.
 void logFreshness(Log& log, const CacheVerdict& verdict) {
   if (!verdict.isValid()) {
     log.standard("Default policy query: cached warranty is invalid, refresh it");
@@ -65,8 +65,8 @@ CacheFacts KVRAgent::cacheFacts(KVRAgentWarrantyProvider& provider, const std::s
   return facts;
 }
 
-/// What is made of the cache, from files as they are at one moment; and the warranty that may be answered
-/// when no download yields one.
+/// Decides from one snapshot of the files. Also returns the warranty to reply with when no download yields
+/// one, or null.
 std::pair<LookupDecision, KVRWarrantyRef> KVRAgent::decide(std::uint64_t policy,
                                                            KVRAgentWarrantyProvider& provider,
                                                            const std::string& serialNumber) {

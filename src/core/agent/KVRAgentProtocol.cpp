@@ -14,7 +14,7 @@ std::uint64_t unsignedFrom(const Value& number) {
                                             : static_cast<std::uint64_t>(number.asInteger());
 }
 
-// Replies as values of the bus: a plain value as it is, a record in its coded form.
+// Converts a reply to a bus value: a plain value stays as it is, a record becomes its coded form.
 
 Value coded(const Value& value) { return value; }
 
@@ -37,7 +37,7 @@ Completion<T> passOn(Log& log, const char* member, const ServiceReply& reply) {
   return Completion<T>(log, member, [reply](const T& answer) { reply(coded(answer)); });
 }
 
-/// One operation: how it looks on the bus, and the call behind it.
+/// One operation: its signature on the bus, and the call that serves it.
 struct Operation {
   ServiceMethod method;
   std::function<void(KVRAgentProtocol&, const Arguments&, Log&, const ServiceReply&)> call;

@@ -10,25 +10,25 @@
 
 namespace kvr {
 
-/// Where an agent learns about warranties and hands on what follows from them. Any thread.
+/// An agent's access to warranties (cache and download) and to follow-ups. Any thread.
 class KVRAgentWarrantyProvider {
  public:
   virtual ~KVRAgentWarrantyProvider() = default;
 
-  /// Brings the follow-ups of all devices up to date; returns the devices whose follow-ups are shown after
-  /// it.
+  /// Brings the follow-ups of all devices up to date; returns the devices whose follow-ups are shown
+  /// afterwards.
   virtual KVRDeviceInfoList refreshFollowupWithDeviceInfos(const KVRDeviceInfoList& deviceInfos) = 0;
   virtual KVRDeviceInfoList refreshFollowupWithDeviceInfo(const KVRDeviceInfoRef& deviceInfo) = 0;
   virtual void dismissFollowUpForSerialNumber(const std::string& serialNumber) = 0;
-  /// Answers once, on any thread.
+  /// Calls `completionHandler` once, on any thread.
   virtual void downloadWarrantyForSerialNumber(const std::string& serialNumber,
                                                DownloadCompletion completionHandler) = 0;
   virtual KVRWarrantyRef cachedWarrantyForSerialNumber(const std::string& serialNumber) = 0;
   /// When the cached warranty was downloaded.
   virtual std::optional<Date> lastUpdatedDateForSerialNumber(const std::string& serialNumber) = 0;
-  /// The format of the cached warranty: a string unless somebody else has stored what is none.
+  /// The format of the cached warranty. A string, unless another program has stored something else.
   virtual Value cachedWarrantyVersionForSerialNumber(const std::string& serialNumber) = 0;
-  /// The locale that the cached warranty was fetched for; likewise.
+  /// The locale that the cached warranty was fetched for. The same holds.
   virtual Value cachedWarrantyLocaleForSerialNumber(const std::string& serialNumber) = 0;
   virtual KVRWarrantyRef migrateLegacyCachedWarrantyIfNeededForSerialNumber(
       const std::string& serialNumber) = 0;

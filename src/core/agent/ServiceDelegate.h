@@ -7,13 +7,13 @@
 
 namespace kvr {
 
-/// Decides which connections are served and binds each to an agent of its own. Holds no state.
+/// Decides which connections are served, and gives each its own agent. No state.
 class ServiceDelegate : public ServiceListenerDelegate {
  public:
   explicit ServiceDelegate(Platform& platform) : platform_(platform) {}
 
-  /// Accepts a peer that holds the entitlement as a true number. One whose bundle cannot be told is served
-  /// too.
+  /// Accepts a peer whose program has the entitlement with a true value (bool or number). A peer whose bundle
+  /// cannot be determined is accepted too.
   bool shouldAcceptNewConnection(ServiceConnection& connection) override;
 
   /// The application bundle that contains the process's executable, or nothing.

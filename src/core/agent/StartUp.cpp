@@ -36,17 +36,17 @@ StartUp::StartUp(Platform& platform) : delegate_(platform) {
   platform.activities.resume();
 }
 
-/// The follow-up post activity is no long-lived one: it exists only while it is scheduled. What an earlier
-/// start scheduled has to come to its run in this one, or its follow-ups would be lost.
+/// Checks in for the follow-up post activity if an earlier start of the process scheduled it; otherwise its
+/// follow-ups would be lost. Unlike the other activities, it exists only while it is scheduled.
 void StartUp::resumePosts(Platform& platform) {
   const auto post = KVRScheduler::newSchedulerForActivity(platform, names::kFollowUpPost);
   if (post->scheduledActivityDate()) post->monitorForScheduledActivity();
 }
 
-/// What is shown has to have a refresh to come, which an earlier start may have died before scheduling. A
-/// follow-up of which no posting is known (it was migrated, or the preferences have been lost) has it as
-/// after its posting: what is cached of it may not be valid until it has been downloaded anew, and a refresh
-/// at once would take it away.
+/// Schedules a refresh if follow-ups are shown and none is scheduled: an earlier start may have been killed
+/// before it scheduled one. The refresh normally runs at once. If no posting is recorded (the follow-up was
+/// migrated, or the preferences were lost), it gets the date that it would get after a posting: the cached
+/// warranty may be invalid until the next download, and a refresh at once would remove the follow-up.
 void StartUp::resumeRefreshes(Platform& platform) {
   const auto refresh = KVRScheduler::newSchedulerForActivity(platform, names::kFollowUpRefresh);
   if (refresh->scheduledActivityDate() || KVRFollowUp(platform).pendingFollowUpCount() == 0) return;

@@ -12,15 +12,14 @@
 
 namespace kvr {
 
-/// Brings the agent up in its fixed order, on the main thread, and holds what lives until the process ends:
-/// defaults, activities, the settings application's agent, migration, monitors, and last the named service,
-/// so that no client is served before all else stands. No activity runs before: migration has the cache to
-/// itself, and of the occasions that have come none is served before all are known. The caller then runs the
-/// main loop.
+/// Starts the agent, on the main thread, and owns the objects that live until the process ends. The order is
+/// fixed: preference defaults, activities, the settings application's agent, migration, monitors, and the bus
+/// service last, so that clients are served only when everything else is ready. Activities are suspended
+/// until then: migration has the cache to itself, and a boot and an upgrade are both noticed before either is
+/// served. The caller then runs the main loop.
 class StartUp {
  public:
-  /// The first line of the log. The caller writes it before the platform is built, which may have something
-  /// to say.
+  /// Writes the first line of the log. Call it before building the platform, which may log too.
   static void announce(Log& log);
   explicit StartUp(Platform& platform);
 

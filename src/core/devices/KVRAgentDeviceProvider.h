@@ -10,7 +10,7 @@ namespace kvr {
 /// Devices by their serial numbers.
 using KVRDevices = std::map<std::string, KVRDeviceRef>;
 
-/// Where an agent learns which devices it looks after. Any thread.
+/// Provides the devices that an agent serves. Any thread.
 class KVRAgentDeviceProvider {
  public:
   virtual ~KVRAgentDeviceProvider() = default;

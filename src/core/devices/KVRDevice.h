@@ -32,7 +32,7 @@ class KVRDevice {
                                                    std::uint64_t deviceType);
 
   static constexpr bool supportsSecureCoding() { return true; }
-  /// A device from its coded form; a value of a wrong kind is an absent property.
+  /// A device from its coded form; a value of the wrong kind counts as an absent property.
   static std::shared_ptr<KVRDevice> initWithCoder(const Value& coded);
   /// The coded form; an absent property has no key.
   Value encodeWithCoder() const;

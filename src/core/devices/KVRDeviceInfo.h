@@ -23,7 +23,7 @@ class KVRDeviceInfo {
   static std::shared_ptr<KVRDeviceInfo> initWithCoder(Platform& platform, const Value& coded);
   Value encodeWithCoder() const;
 
-  /// The same device object and an equal warranty; a record without device or warranty equals none.
+  /// The same device object and an equal warranty; a record without device or warranty equals no other.
   bool isEqual(const KVRDeviceInfo& other) const;
   std::string description() const;
 

@@ -13,7 +13,7 @@ namespace kvr {
 class KVRDevicesManager : public KVRAgentDeviceProvider {
  public:
   explicit KVRDevicesManager(Platform& platform) : platform_(platform) {}
-  /// The platform's one manager, made at its first use.
+  /// The platform's one manager, made on first use.
   static std::shared_ptr<KVRDevicesManager> sharedManager(Platform& platform);
 
   KVRDeviceRef defaultDevice() override;

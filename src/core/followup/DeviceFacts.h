@@ -12,7 +12,7 @@ namespace kvr {
 std::optional<std::string> serialNumberOf(const KVRDeviceInfo& deviceInfo);
 /// The serial number's hash, under which follow-ups are remembered.
 std::optional<std::string> serialHashOf(const KVRDeviceInfo& deviceInfo);
-/// What the rules need to know, as it is now.
+/// The facts that the rules need, as of now.
 OfferFacts offerFactsOf(const KVRDeviceInfo& deviceInfo);
 std::vector<FollowUpDateFacts> dateFactsOf(Platform& platform, const KVRDeviceInfoList& deviceInfos);
 

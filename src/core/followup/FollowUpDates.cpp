@@ -8,21 +8,21 @@ namespace {
 
 constexpr double kLeastInterval = 60;  // seconds
 constexpr double kUsualDay = 86400;    // seconds
-constexpr double kShortestDay = 1;     // second; below, it is no length of a day
+constexpr double kShortestDay = 1;     // second; less does not count as a day
 constexpr double kLeastPause = 1;      // second
 
-/// `next` is the date found so far; while there is none, now stands in its place.
+/// Whether the date is before `next`, the date found so far, or before now if there is none yet.
 bool isEarlier(std::optional<Date> date, std::optional<Date> next, Date now) {
   return date && *date < next.value_or(now);
 }
 
-/// Whether a future date is to be taken: `next` none, or later.
+/// Whether the date is in the future, and before `next` if there is one.
 bool isNearer(std::optional<Date> date, std::optional<Date> next, Date now) {
   return date && *date > now && (!next || *date < *next);
 }
 
-/// The display date or a later activation; a device that does not know its activation is activated now, and
-/// then there is no date.
+/// The later of display date and activation date. A device without an activation date counts as activated
+/// now, so a display date in the past gives nothing.
 std::optional<Date> displayDateOf(const OfferFacts& offer, Date now) {
   if (offer.displayDate && offer.activationDate.value_or(now) <= *offer.displayDate) return offer.displayDate;
   return offer.activationDate;

@@ -14,24 +14,25 @@ struct FollowUpDateFacts {
 };
 
 /// The earliest moment at which a device that has not been posted yet reaches its post date, or the end of
-/// such a device's eligibility when that comes earlier. An end that has passed is the answer at once. Nothing
-/// when there is no such moment.
+/// such a device's eligibility when that comes earlier. An end that has already passed is returned without
+/// looking at further devices. Nothing if there is no such moment.
 std::optional<Date> nextPostDate(const std::vector<FollowUpDateFacts>& devices, Date now);
 
 /// The earliest moment at which a shown follow-up's day count drops, a follow-up is due to be shown, or an
-/// eligibility ends. `day` is the length of a day in seconds. The initial form takes only what the devices
-/// give, and may be nothing; the other starts from a day after now.
+/// eligibility ends. `day` is the length of a day in seconds. For an initial call the result comes from the
+/// devices alone and may be nothing; otherwise it is a day from now at the latest.
 std::optional<Date> nextRefreshDate(const std::vector<FollowUpDateFacts>& devices, Date now, double day,
                                     bool isInitialCall);
 
-/// The date for which an activity schedules itself again when `next` was computed at the end of a run: never
-/// one that would make it run back to back, whatever day length is stored.
+/// The date for which the post activity schedules itself again after a run that computed `next`. It never
+/// runs back to back, whatever day length is stored.
 ///
-/// When an offer's end has passed, the other devices' follow-ups are posted no later for it.
+/// A future date is kept. Otherwise it is a day from now, a minute at least, or the next post date of the
+/// devices whose eligibility has not ended if that is earlier.
 Date followingPostDate(Date next, const std::vector<FollowUpDateFacts>& devices, Date now, double day);
-/// A date that lies ahead is kept, for a count changes then. Any other is put off by a minute, or by the same
-/// share of a shorter day, a second at least. With a day of less than a second, whose counts nobody could
-/// follow, refreshes are a minute apart.
+/// The same for the refresh activity. A future date is kept, because a day count changes then. Any other
+/// becomes a minute from now, or proportionally less for a shorter day, but at least a second. With a day of
+/// less than a second, refreshes are at least a minute apart.
 Date followingRefreshDate(Date next, Date now, double day);
 
 }  // namespace kvr

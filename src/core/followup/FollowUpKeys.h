@@ -11,7 +11,7 @@ namespace preference {
 
 /// Serial hashes of the devices whose follow-up was posted: array of strings, each once. Written by posting.
 inline constexpr const char* kFollowUpPostedHashes = "FollowupPostedSerialNumberHashes";
-/// Serial hashes of dismissed follow-ups: array of strings, one a dismissal. Written by dismissing.
+/// Serial hashes of dismissed follow-ups: array of strings, one per dismissal. Written by dismissing.
 inline constexpr const char* kFollowUpDismissedHashes = "FollowupDismissedSerialNumberHashes";
 
 }  // namespace preference

@@ -6,17 +6,17 @@
 
 namespace kvr {
 
-/// What the rules know of one device and its warranty.
+/// The facts about one device and its warranty that the rules use.
 struct OfferFacts {
   bool hasWarranty = false;
   bool isOffered = false;  ///< the warranty says that the offer may be displayed
   std::optional<Date> eligibleUntil;
   std::optional<Date> displayDate;  ///< from when the follow-up is to be displayed
-  double durationBeforeEnd = 0;     ///< seconds before the end from which it is, without a display date
+  double durationBeforeEnd = 0;     ///< without a display date: display starts so many seconds before the end
   std::optional<Date> activationDate;
 };
 
-/// Whether there is an offer to follow up: the first reason against it, in this order.
+/// Whether there is an offer to follow up; if not, the first reason that applies, in this order.
 enum class OfferState { NoWarranty, NotOffered, Ended, Open };
 
 constexpr OfferState offerState(const OfferFacts& facts, Date now) {
@@ -26,11 +26,11 @@ constexpr OfferState offerState(const OfferFacts& facts, Date now) {
   return OfferState::Open;
 }
 
-/// What becomes of one device's follow-up in the posting decision, before its date is looked at.
+/// The posting decision for one device's follow-up, before its date is considered.
 enum class PostingOutcome { NoWarranty, NotOffered, Ended, Dismissed, Eligible };
 
-/// `convertsAgain` tells whether the offer has begun anew since the dismissal. It is asked only where the
-/// answer decides, because asking it changes what is recorded.
+/// `convertsAgain` tells whether the offer has started again since the dismissal. It is called only if its
+/// answer matters, because calling it changes the records.
 template <class ConvertsAgain>
 constexpr PostingOutcome postingOutcome(const OfferFacts& facts, Date now, bool isDismissed,
                                         bool repostAllowed, const ConvertsAgain& convertsAgain) {
@@ -55,7 +55,7 @@ struct PostDate {
   bool isInFuture(Date now) const { return date && *date > now; }
 };
 
-/// From when an offered follow-up may be posted.
+/// The date from which an offered follow-up may be posted.
 constexpr PostDate postDate(const OfferFacts& facts) {
   auto date = facts.displayDate;
   if (!date && facts.eligibleUntil) date = *facts.eligibleUntil - facts.durationBeforeEnd;
@@ -83,7 +83,7 @@ constexpr RefreshOutcome refreshOutcome(const OfferFacts& facts, Date now, bool 
   return RefreshOutcome::LeaveAlone;
 }
 
-/// Whether a follow-up that was dismissed is offered anew.
+/// Whether a dismissed follow-up may be offered again.
 enum class ConversionOutcome { NeverDismissed, NoDisplayDate, DismissedSince, DismissedBefore };
 
 constexpr ConversionOutcome conversionOutcome(std::optional<Date> dismissed,

@@ -7,8 +7,8 @@
 
 namespace kvr {
 
-/// One of the lists of serial hashes in the preferences. Every change reads, changes and writes in one go, so
-/// that changes from several threads lose nothing. What is no list counts as empty. Any thread.
+/// One of the lists of serial hashes in the preferences. Every change is one atomic read-modify-write, so
+/// concurrent changes are not lost. A stored value that is not a list counts as empty. Any thread.
 class HashList {
  public:
   HashList(Preferences& preferences, std::string_view key) : preferences_(preferences), key_(key) {}

@@ -7,7 +7,7 @@
 
 namespace kvr {
 
-/// The platform's follow-up centre: every call is a new client's. Keeps nothing.
+/// Uses the platform's follow-up centre, with a new client for each call. No state.
 class KVRDefaultFolllowUpProvider : public KVRFollowUpProvider {
  public:
   explicit KVRDefaultFolllowUpProvider(Platform& platform) : platform_(platform) {}

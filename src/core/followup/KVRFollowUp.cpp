@@ -1,4 +1,4 @@
-// Posting, dismissing, clearing, and the follow-up of earlier versions.
+// Posting, dismissing and clearing, and the migration of the follow-up of earlier versions.
 
 #include "core/followup/KVRFollowUp.h"
 
@@ -154,7 +154,7 @@ void KVRFollowUp::migrateLegacyFollowUpIfNeededWithDeviceInfo(const KVRDeviceInf
   auto& log = platform_.log;
   auto items = pendingItems();
   if (items.size() != 1 || items[0].uniqueIdentifier != names::kFollowUpClient) return;
-  // Without a serial number there is no device to give the follow-up to.
+  // Without a serial number the follow-up cannot be assigned to a device.
   const auto serialNumber = serialNumberOf(deviceInfo);
   if (deviceInfo.warranty() && serialNumber) {
     log.standard("Migrating legacy followup..");

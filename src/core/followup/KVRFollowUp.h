@@ -23,10 +23,9 @@ namespace kvr {
 ///
 ///     KVRFollowUp(platform).refreshFollowupWithDeviceInfos(infos);
 ///
-/// Made for one call; everything that lasts is elsewhere. Failures of the centre are logged and otherwise
-/// ignored; the preferences then stay as they are. Any thread, synchronously; operations of one platform take
-/// turns, so that what one decides on still holds when it acts: a dismissal comes before a refresh or after
-/// it, never in between, where the refresh would bring the item back.
+/// Make one for each call; it has no lasting state. Failures of the centre are logged and otherwise ignored;
+/// the preferences then stay as they are. Any thread, synchronous. A lock per platform serialises the
+/// operations: a dismissal in the middle of a refresh could otherwise be undone by it.
 class KVRFollowUp {
  public:
   explicit KVRFollowUp(Platform& platform);
@@ -34,13 +33,14 @@ class KVRFollowUp {
 
   static std::string uniqueIdentfierForSerialNumber(const std::optional<std::string>& serialNumber);
 
-  /// Posts what is due; whether anything was. A refused post counts as well.
+  /// Posts what is due. Returns whether anything was, even if the centre refused it.
   bool postFollowUpWithDevicesInfo(const KVRDeviceInfoList& devicesInfo);
-  /// The same; `repostAllowed` disregards dismissals.
+  /// The same; `repostAllowed` ignores dismissals.
   bool _postFollowUpWithDevicesInfo(const KVRDeviceInfoList& devicesInfo, bool repostAllowed);
   /// Builds and posts one device's follow-up, whatever its date.
   void postFollowUpWithDeviceInfo(const KVRDeviceInfo& deviceInfo);
-  /// Whether the offer has begun anew since its follow-up was dismissed; then it no longer counts as posted.
+  /// Whether the offer has started again since its follow-up was dismissed. If so, the follow-up no longer
+  /// counts as posted.
   bool _checkConversionEligibilityForDevice(const KVRDeviceInfo& deviceInfo);
 
   /// Clears the follow-up and remembers the dismissal.
@@ -48,14 +48,14 @@ class KVRFollowUp {
   void _clearFollowUpWithDevices(const std::vector<KVRDeviceRef>& devices);
 
   /// Updates what is pending, removes what no longer applies; returns the devices whose follow-ups are shown
-  /// after it. `clearUntrackedDeviceFollowups` also removes those of devices that are not in the list,
+  /// afterwards. `clearUntrackedDeviceFollowups` also removes those of devices that are not in the list,
   /// `allowForcePost` posts again what is not pending.
   KVRDeviceInfoList refreshFollowupWithDeviceInfos(const KVRDeviceInfoList& deviceInfos,
                                                    bool clearUntrackedDeviceFollowups, bool allowForcePost);
   KVRDeviceInfoList refreshFollowupWithDeviceInfos(const KVRDeviceInfoList& deviceInfos);
   KVRDeviceInfoList refreshFollowupWithDeviceInfo(const KVRDeviceInfoRef& deviceInfo, bool allowForcePost);
 
-  /// 0 when they cannot be listed.
+  /// How many are pending; 0 if they cannot be listed.
   std::size_t pendingFollowUpCount();
   /// Turns the single follow-up of earlier versions into the local device's; without a warranty clears it.
   void migrateLegacyFollowUpIfNeededWithDeviceInfo(const KVRDeviceInfo& deviceInfo);

@@ -60,7 +60,7 @@ void KVRFollowUpPost::handle(const std::optional<KVRDeviceInfoList>& devicesInfo
 }
 
 void KVRFollowUpPost::postAndSchedule(const KVRDeviceInfoList& devicesInfo) {
-  // Taken before: what comes due while others are posted is still to come.
+  // Taken before posting: a follow-up that comes due meanwhile then still counts as in the future.
   const auto now = platform_.clock.now();
   const bool hasPosted = KVRFollowUp(platform_).postFollowUpWithDevicesInfo(devicesInfo);
   const auto facts = dateFactsOf(platform_, devicesInfo);

@@ -30,9 +30,9 @@ class KVRFollowUpPost : public KVRSchedulerActivityDelegate,
   static std::optional<Date> nextFollowUpPostDateWithDevicesInfo(Platform& platform,
                                                                  const KVRDeviceInfoList& devicesInfo);
 
-  /// Looks, very rarely, whether the platform wants the run deferred.
+  /// Checks, very rarely, whether the platform asks to defer the run.
   AtomicProperty<std::shared_ptr<Timer>> followUpPostTimer;
-  /// From the start of a run until its devices are known.
+  /// True from the start of a run until its devices are known.
   std::atomic<bool> followUpPostInProgress{false};
 
  private:

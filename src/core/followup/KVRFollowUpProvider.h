@@ -8,11 +8,11 @@
 
 namespace kvr {
 
-/// Where follow-ups are kept. Any thread; every operation is done when it returns.
+/// Where follow-ups are kept. Any thread; all operations are synchronous.
 class KVRFollowUpProvider {
  public:
   virtual ~KVRFollowUpProvider() = default;
-  /// Posts an item, in the place of one with the same unique identifier. Nothing on success.
+  /// Posts an item; it replaces one with the same unique identifier. Nothing on success.
   virtual std::optional<Error> postFollowUpItem(const FollowUpItem& item) = 0;
   /// Nothing on success.
   virtual std::optional<Error> clearPendingFollowUpItemsWithUniqueIdentifiers(

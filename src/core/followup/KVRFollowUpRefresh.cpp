@@ -43,7 +43,7 @@ void KVRFollowUpRefresh::refreshAndSchedule(const KVRDeviceInfoList& devicesInfo
       followingRefreshDate(next, now, platform_.preferences.doubleForKey(preference::kOneDayInterval));
   if (date != next) log.standard("Next refresh for %@ would come too soon, put off", next);
   log.standard("Schedule next refresh for %@", date);
-  // What the calendar says is to come at its moment, however soon.
+  // A date that comes from the calendar is not throttled, however soon it is.
   KVRScheduler::newSchedulerWithActivityDelegate(platform_, shared_from_this())
       ->scheduleActivityForDate(date, date == next ? RegistrationCause::Demand : RegistrationCause::Reaction);
 }

@@ -22,12 +22,12 @@ class KVRFollowUpRefresh : public KVRSchedulerActivityDelegate,
   void performActivityForScheduler(const std::shared_ptr<KVRScheduler>& scheduler,
                                    ActivityHandler withCompletionHandler) override;
 
-  /// When the activity should run next. The initial form may be nothing; the other is a day from now at the
-  /// latest.
+  /// When the activity should run next. May be nothing for an initial call; otherwise it is a day from now at
+  /// the latest.
   static std::optional<Date> nextFollowUpRefreshDateWithDevicesInfo(Platform& platform,
                                                                     const KVRDeviceInfoList& devicesInfo,
                                                                     bool isInitialCall);
-  /// The initial form, or where that gives nothing although follow-ups are shown, the other.
+  /// The date for an initial call, or if that is nothing, a day from now at the latest.
   static Date _refreshDateWithDevicesInfo(Platform& platform, const KVRDeviceInfoList& devicesInfo);
 
  private:

@@ -16,7 +16,7 @@ namespace {
 constexpr const char* kRefresh =
     "-[KVRFollowUp refreshFollowupWithDeviceInfos:clearUntrackedDeviceFollowups:allowForcePost:]";
 
-/// By which the agent recognises an item as one device's; nothing for an item that is not.
+/// The serial number of the device that an item is for; nothing if the item names none.
 std::optional<std::string> serialNumberIn(const FollowUpItem& item) {
   const auto found = item.userInfo.find(names::kFollowUpSerialNumber);
   return found == item.userInfo.end() ? std::nullopt : found->second.stringIfAny();

@@ -16,20 +16,20 @@ struct RefreshPlan {
     RefreshOutcome outcome;
   };
 
-  std::vector<Step> steps;          ///< one a device, in the order of the list
+  std::vector<Step> steps;          ///< one per device, in the order of the list
   std::set<std::string> untracked;  ///< serial numbers of pending items whose devices are not in the list
 
-  /// The infos that come to this outcome, in order.
+  /// The infos with this outcome, in order.
   KVRDeviceInfoList infosWith(RefreshOutcome outcome) const;
-  /// The devices whose follow-ups go, in order, those without a step last.
+  /// The devices whose follow-ups are to be removed, in order, the untracked ones last.
   std::vector<KVRDeviceRef> devicesToRemove() const;
 };
 
-/// The device of an item whose owner is not known any more.
+/// A device record for an item whose device is no longer known.
 KVRDeviceRef untrackedDevice(const std::string& serialNumber);
 
-/// `pendingSerials` are those of the pending items. `allowForcePost` has what is not pending posted again,
-/// `clearUntracked` has the items removed whose devices are not in the list.
+/// `pendingSerials` are those of the pending items. `allowForcePost` posts again what is not pending;
+/// `clearUntracked` removes the items whose devices are not in the list.
 RefreshPlan planRefresh(const KVRDeviceInfoList& deviceInfos, const std::set<std::string>& pendingSerials,
                         Date now, bool clearUntracked, bool allowForcePost);
 

@@ -9,10 +9,10 @@
 
 namespace kvr {
 
-/// Keeps the texts of follow-ups in the user's language: 5 seconds after every change of it, the warranties
-/// are looked up anew while a follow-up is shown. Then, or when none is, the process may end once it is idle,
-/// so that its next start is in the new language altogether. Every notification counts for itself, unless too
-/// many look-ups are under way already.
+/// Keeps the texts of follow-ups in the user's language. 5 seconds after each change of the language, it
+/// looks up all warranties again if a follow-up is shown. After that, or at once if none is shown, it
+/// requests a clean exit, so that the next start uses the new language throughout. Each notification is
+/// handled on its own, unless too many look-ups are under way (`RefreshLimit`).
 class KVRLocaleMonitor : public std::enable_shared_from_this<KVRLocaleMonitor> {
  public:
   static std::shared_ptr<KVRLocaleMonitor> initWithAgent(Platform& platform, DeviceInfosQuery agent);
@@ -22,9 +22,9 @@ class KVRLocaleMonitor : public std::enable_shared_from_this<KVRLocaleMonitor> {
   KVRLocaleMonitor(const KVRLocaleMonitor&) = delete;
   KVRLocaleMonitor& operator=(const KVRLocaleMonitor&) = delete;
 
-  /// Once.
+  /// Call it once.
   void start();
-  /// The check. On the main queue.
+  /// The check after a change. Runs on the main queue.
   void localeDidChange();
 
   AtomicProperty<DeviceInfosQuery> agent;

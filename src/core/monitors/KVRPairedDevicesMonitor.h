@@ -10,12 +10,12 @@
 
 namespace kvr {
 
-/// Keeps the follow-ups in step with the watches that are paired: whenever one is paired or unpaired, all
-/// devices are looked up and their follow-ups refreshed, and the follow-up post activity is scheduled when
-/// one of them is waiting for its follow-up. Every notification counts for itself, unless too many look-ups
-/// are under way already.
+/// Keeps the follow-ups up to date with the paired watches. Whenever a watch is paired or unpaired, it looks
+/// up all devices and refreshes their follow-ups, and schedules the follow-up post activity if a device is
+/// waiting for its follow-up. Each notification is handled on its own, unless too many look-ups are under way
+/// (`RefreshLimit`).
 ///
-/// Its registrations keep it alive until they are let go.
+/// Its notification handlers keep it alive until they are cancelled.
 class KVRPairedDevicesMonitor : public std::enable_shared_from_this<KVRPairedDevicesMonitor> {
  public:
   static std::shared_ptr<KVRPairedDevicesMonitor> initWithAgent(Platform& platform, DeviceInfosQuery agent);
@@ -25,9 +25,9 @@ class KVRPairedDevicesMonitor : public std::enable_shared_from_this<KVRPairedDev
   KVRPairedDevicesMonitor(const KVRPairedDevicesMonitor&) = delete;
   KVRPairedDevicesMonitor& operator=(const KVRPairedDevicesMonitor&) = delete;
 
-  /// Once.
+  /// Call it once.
   void start();
-  /// On the main queue.
+  /// Runs on the main queue.
   void _pairedOrActiveDevicesDidChange();
   void _updatePariedDevicesFollowUp();
 

@@ -8,17 +8,17 @@
 
 namespace kvr {
 
-/// Bounds how many look-ups of all devices a monitor has under way. Anyone may post notifications, and a
-/// service may leave requests without an answer: beyond `kMost`, what is notified is made up for by one more,
-/// afterwards, which the log says. Any thread.
+/// Limits how many look-ups of all devices a monitor has under way: any program can post notifications, and a
+/// service may leave requests without an answer. Beyond `kMost`, further notifications are merged into one
+/// more look-up afterwards, with a log line. Any thread.
 class RefreshLimit {
  public:
   static constexpr int kMost = 16;
 
   RefreshLimit(Log& log, WorkQueueRef queue);
 
-  /// A token to be held while a look-up is under way. Nothing when there are too many: `again` then runs on
-  /// the queue when one of them has ended, once however often it was wanted.
+  /// Returns a token to hold while a look-up is under way, or null if there are too many. Then `again` runs
+  /// on the queue when one of them has ended: once, however many calls were refused.
   std::shared_ptr<void> begin(std::function<void()> again);
 
  private:
