@@ -9,7 +9,7 @@
 namespace kvr {
 
 /// Finds the local device and, while the feature flag and the service's version allow, the watches paired
-/// with it. Holds no state: every call asks the platform afresh and builds new records. Any thread.
+/// with it. No state: every call queries the platform and builds new records. Any thread.
 class KVRDevicesManager : public KVRAgentDeviceProvider {
  public:
   explicit KVRDevicesManager(Platform& platform) : platform_(platform) {}

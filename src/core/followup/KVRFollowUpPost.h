@@ -13,7 +13,7 @@
 namespace kvr {
 
 /// Posts the follow-ups that are due, then schedules itself for the next one and, when it posted, the refresh
-/// activity. Every run downloads all warranties anew.
+/// activity. Every run downloads all warranties.
 class KVRFollowUpPost : public KVRSchedulerActivityDelegate,
                         public std::enable_shared_from_this<KVRFollowUpPost> {
  public:

@@ -6,17 +6,17 @@
 
 namespace kvr {
 
-/// What is known when a warranty has been downloaded.
+/// The facts about a downloaded warranty that decide on the conversion outreach.
 struct ConversionFacts {
   std::optional<Date> date;        ///< its conversion date
   bool wasCached = false;          ///< whether a warranty of the device was cached before
   std::optional<Date> cachedDate;  ///< that one's conversion date
-  std::optional<Date> scheduled;   ///< for when the conversion outreach was scheduled last
+  std::optional<Date> scheduled;   ///< date of the last scheduled conversion outreach
 };
 
-/// What becomes of the conversion outreach.
+/// What to do about the conversion outreach.
 enum class ConversionScheduling {
-  NothingNew,  ///< the date was known before, or cannot be compared with what was
+  NothingNew,  ///< the date is the cached one, or one of the two is missing
   NoDate,
   NotEarlier,  ///< the schedule only ever moves earlier
   Earlier,     ///< schedule again, for the earlier date

@@ -5,7 +5,7 @@
 
 namespace kvr {
 
-/// Outreach for all devices when an offer begins anew, after an upgrade or at a warranty's conversion date.
+/// Outreach for all devices when an offer starts again: after an upgrade or at a warranty's conversion date.
 class KVRConversionOutreachActivity : public KVRSchedulerActivityDelegate {
  public:
   explicit KVRConversionOutreachActivity(Platform& platform) : platform_(platform) {}

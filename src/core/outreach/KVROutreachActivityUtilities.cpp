@@ -43,7 +43,7 @@ void KVROutreachActivityUtilities::performOutreachActivityForConversion(
   for (const auto& device : devices) {
     const auto serialNumber = device->serialNumber();
     downloads_.enter();
-    // Goes with the completion: whatever becomes of it, the run does not wait for this download any more.
+    // Owned by the completion, so the run stops waiting for this download even if it never answers.
     const std::shared_ptr<void> entered(nullptr, [self](void*) { self->downloads_.leave(); });
     downloader->downloadWarrantyForSerialNumber(
         serialNumber, DownloadCompletion(platform_.log, "performOutreachActivity",

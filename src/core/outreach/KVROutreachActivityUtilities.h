@@ -18,7 +18,8 @@ namespace kvr {
 /// posted, and schedules the follow-up post activity for it.
 ///
 /// A device counts when its download succeeds, its warranty shows an offer and none of the phone's carriers
-/// is excluded from it. A run finishes whatever fails. Made for one run, and kept alive by it.
+/// is excluded from it. A run finishes even if something fails. Make one for each run; the run keeps it
+/// alive.
 class KVROutreachActivityUtilities : public std::enable_shared_from_this<KVROutreachActivityUtilities> {
  public:
   explicit KVROutreachActivityUtilities(Platform& platform) : platform_(platform) {}
@@ -30,7 +31,7 @@ class KVROutreachActivityUtilities : public std::enable_shared_from_this<KVROutr
   /// False when one of this device's carriers is excluded from the offer.
   bool currentDeviceShouldReceiveOutreachForWarranty(const KVRWarranty& warranty) const;
 
-  /// Looks, very rarely, whether the platform wants the run deferred.
+  /// Checks, very rarely, whether the platform asks to defer the run.
   AtomicProperty<std::shared_ptr<Timer>> outReachTimer;
   std::atomic<bool> outreachInProgress{false};
 

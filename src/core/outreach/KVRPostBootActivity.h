@@ -5,8 +5,8 @@
 
 namespace kvr {
 
-/// Runs after every boot: registers outreach, conversion outreach and follow-up refresh again, each that has
-/// a target date, and for that same date.
+/// Runs after every boot. Registers outreach, conversion outreach and follow-up refresh again: each one that
+/// has a target date, for that date.
 class KVRPostBootActivity : public KVRSchedulerActivityDelegate {
  public:
   explicit KVRPostBootActivity(Platform& platform) : platform_(platform) {}

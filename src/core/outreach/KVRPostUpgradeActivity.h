@@ -14,7 +14,7 @@ class KVRPostUpgradeActivity : public KVRSchedulerActivityDelegate {
 
   std::string identifier() const override;
   bool requiresNetwork() const override { return false; }
-  /// Until the first run: also when the preferences have been lost.
+  /// True until the first run is recorded, so also after the preferences were lost.
   bool isOwed() const override;
   void performActivityForScheduler(const std::shared_ptr<KVRScheduler>& scheduler,
                                    ActivityHandler withCompletionHandler) override;

@@ -15,12 +15,12 @@ std::optional<std::string> carrierID(const Carrier& carrier);
 /// Whether an offer's list of excluded carriers holds this one.
 bool excludesCarrier(const Value& offerToggle, const std::optional<std::string>& carrierID);
 
-/// When an offer's follow-up is to be posted: the warranty's own display date, else so long before the
-/// eligibility ends as it says; nothing without either.
+/// The post date of an offer's follow-up: the warranty's display date, otherwise the end of eligibility minus
+/// the warranty's lead time; nothing if both dates are missing.
 std::optional<Date> outreachPostDate(const KVRWarranty& warranty);
 
-/// The earlier of two post dates, the held one when they are equal. Nothing held: the candidate. A missing
-/// candidate counts as `now`; when it wins, nothing is held any more.
+/// The earlier of two post dates: `held` if they are equal, `candidate` if nothing is held. A missing
+/// candidate counts as `now`; if that is earlier than `held`, the result is nothing.
 std::optional<Date> earlierPostDate(std::optional<Date> held, std::optional<Date> candidate, Date now);
 
 }  // namespace kvr

@@ -11,9 +11,9 @@
 namespace kvr {
 namespace {
 
-/// The conversion date that was scheduled and could not be stored, if the last one could not. It counts as
-/// stored, or the downloads of its own outreach would schedule it again, back to back for as long as the disk
-/// is full. Guarded by the turn.
+/// The last scheduled conversion date, if it could not be stored. It counts as stored: otherwise the
+/// downloads of its own outreach would schedule it again and again for as long as the disk is full. Guarded
+/// by the scheduling lock (`KVRScheduler::takeTurn`).
 struct UnstoredDate {
   std::optional<Date> date;
 };
@@ -26,13 +26,13 @@ std::shared_ptr<KVRScheduler> newConversionScheduler(Platform& platform) {
   return KVRScheduler::newSchedulerForActivity(platform, names::kConversionOutreach);
 }
 
-/// Whether the date was stored, whose fractions the file may round.
+/// Whether the date was stored; the file may round fractions of a second.
 bool isStored(const std::optional<Date>& stored, Date date) {
   constexpr double kRounding = 0.001;  // seconds
   return stored && std::abs(*stored - date) <= kRounding;
 }
 
-/// Stores for when the conversion outreach has been scheduled, or remembers that it could not.
+/// Stores the date for which the conversion outreach is scheduled, or remembers it if that fails.
 void storeScheduledDate(Platform& platform, Date date) {
   constexpr auto kKey = preference::kConversionOutreachScheduledDate;
   platform.preferences.setObject(date, kKey);
@@ -40,8 +40,8 @@ void storeScheduledDate(Platform& platform, Date date) {
   unstoredDate(platform)->date = isDone ? std::nullopt : std::optional(date);
 }
 
-/// Tries again to store a date that could not be stored. What was scheduled with it is lost with the process
-/// as well, so that is scheduled once more; but not before the disk takes its target date.
+/// Retries to store a date that could not be stored. If the activity's target date was not stored either, the
+/// outreach is scheduled again, but only once the disk accepts the target date.
 void makeUpForUnstoredDate(Platform& platform) {
   const auto date = unstoredDate(platform)->date;
   if (!date) return;
@@ -62,7 +62,7 @@ void makeUpForUnstoredDate(Platform& platform) {
   storeScheduledDate(platform, *date);
 }
 
-/// The dates that decide, as they are while the turn is held.
+/// The facts for the decision, valid while the scheduling lock is held.
 ConversionFacts conversionFacts(Platform& platform, const KVRWarranty& warranty,
                                 const KVRWarrantyRef& cached) {
   ConversionFacts facts;
@@ -92,7 +92,7 @@ std::shared_ptr<KVRWarrantyDownloader> newWarrantyDownloader(Platform& platform,
 void _scheduleConversionOutreachIfRequiredForWarranty(Platform& platform, const KVRWarrantyRef& warranty,
                                                       const KVRWarrantyRef& andCachedWarranty) {
   if (!warranty) return;
-  // Downloads of several devices come here at once; of two dates, the earlier one has to stay.
+  // Downloads of several devices get here concurrently. The lock makes sure that the earliest date wins.
   const auto turn = KVRScheduler::takeTurn(platform);
   makeUpForUnstoredDate(platform);
   const auto facts = conversionFacts(platform, *warranty, andCachedWarranty);

@@ -8,13 +8,14 @@
 
 namespace kvr {
 
-/// A downloader for the client with this bundle identifier. It takes the devices manager's default device for
-/// the local one, and what it downloads may schedule the conversion outreach.
+/// A downloader for the client with this bundle identifier. Its local device is the devices manager's default
+/// device, and each downloaded warranty may schedule the conversion outreach.
 std::shared_ptr<KVRWarrantyDownloader> newWarrantyDownloader(Platform& platform,
                                                              std::string callingProcessBundleID);
 
-/// Schedules the conversion outreach when a downloaded warranty brings a conversion date that the one cached
-/// before it (or null) did not have, and that is earlier than what is scheduled. Any thread.
+/// Schedules the conversion outreach if a downloaded warranty has a conversion date that differs from the
+/// cached one's and is earlier than the scheduled date. `andCachedWarranty` is the warranty cached so far, or
+/// null. Any thread.
 void _scheduleConversionOutreachIfRequiredForWarranty(Platform& platform, const KVRWarrantyRef& warranty,
                                                       const KVRWarrantyRef& andCachedWarranty);
 

@@ -11,7 +11,7 @@
 
 namespace kvr {
 
-/// Which activity has which name, so that whoever schedules one needs to know its name only.
+/// Maps names to activities, so that code can schedule an activity by its name alone.
 ///
 /// A platform has one registry. Start-up fills it before anything is scheduled:
 ///
@@ -26,7 +26,7 @@ class ActivityRegistry {
 
   static ActivityRegistry& of(Platform& platform);
 
-  /// A later factory of the same name takes the earlier one's place.
+  /// A later factory of the same name replaces the earlier one.
   void add(const std::string& identifier, Factory factory);
   /// A new activity of this name. Throws std::out_of_range for a name that was not added.
   std::shared_ptr<KVRSchedulerActivityDelegate> newActivity(const std::string& identifier) const;

@@ -13,9 +13,9 @@ namespace {
 
 constexpr double kHandBackDelay = 1;    // seconds
 constexpr double kLongestDelay = 1e15;  // seconds; the calendar's own limit
-constexpr double kGraceShare = 10;      // the grace period is this part of the delay
+constexpr double kGraceShare = 10;      // the grace period is the delay divided by this
 
-/// From `delay` in seconds; one below zero counts as none.
+/// The criteria for a delay in seconds; a negative one counts as 0.
 ActivityCriteria criteria(double delay, bool requiresNetwork) {
   delay = delay > 0 ? std::min(delay, kLongestDelay) : 0;
   ActivityCriteria criteria;
@@ -25,8 +25,8 @@ ActivityCriteria criteria(double delay, bool requiresNetwork) {
   return criteria;
 }
 
-/// A result on its way to the platform. The end of the process does not wait for its time, and still delivers
-/// it.
+/// Delivers a run's result to the platform: when `give` is called, or on destruction if the process ends
+/// before.
 class HandBack {
  public:
   HandBack(ActivityHandler handler, ActivityResult result) : handler_(std::move(handler)), result_(result) {}

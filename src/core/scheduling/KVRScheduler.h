@@ -15,8 +15,8 @@ namespace kvr {
 ///
 /// Scheduling stores the target date in the preferences and registers the activity with the platform.
 /// Whenever the platform runs the activity, the gate compares the stored date with the clock: before it, the
-/// run is deferred; from it on, and without a stored date, the delegate does the work. A delegate that
-/// reports `Finished` ends the date's life, unless the activity was scheduled for another date meanwhile. The
+/// run is deferred; from it on, and without a stored date, the delegate does the work. When the delegate
+/// reports `Finished`, the date is removed, unless the activity was scheduled for another date meanwhile. The
 /// platform learns the result a second later, on the main queue.
 ///
 ///     KVRScheduler::newSchedulerForActivity(platform, names::kOutreach)->scheduleActivityForDate(date);
@@ -34,17 +34,17 @@ class KVRScheduler : public std::enable_shared_from_this<KVRScheduler> {
   /// Removes the target date of every activity. What the platform has registered stays registered.
   static void clearScheduledActivities(Platform& platform);
 
-  /// Held while a date is stored and its activity registered, so that of two schedulings the later one has
-  /// both. Whoever decides by a stored date holds it from reading to scheduling; it may be taken again
-  /// meanwhile.
+  /// The scheduling lock, one per platform, recursive. It makes storing a date and registering its activity
+  /// one step, so that concurrent schedulings cannot mix. Code that decides by a stored date holds it from
+  /// reading the date until it has scheduled.
   static std::unique_lock<std::recursive_mutex> takeTurn(Platform& platform);
 
   /// Checks in for an activity that was scheduled by an earlier start, or that the platform runs by itself.
   void monitorForScheduledActivity();
-  /// `delay` in seconds; one below zero makes a target date in the past. Whoever passes on what a client
-  /// asked for says that it is a demand.
+  /// `delay` in seconds; a negative one gives a target date in the past. Pass `Demand` for a client's
+  /// request.
   void scheduleActivityWithDelay(double delay, RegistrationCause cause = RegistrationCause::Reaction);
-  /// A date in the past, and no date at all, run without delay; no date removes the stored one.
+  /// A date in the past, or no date, means no delay; no date also removes the stored one.
   void scheduleActivityForDate(std::optional<Date> date,
                                RegistrationCause cause = RegistrationCause::Reaction);
   /// The stored target date.

@@ -17,8 +17,7 @@ class KVRSchedulerActivityDelegate {
   virtual std::string identifier() const = 0;
   /// Whether the activity may run only while the network is reachable.
   virtual bool requiresNetwork() const = 0;
-  /// Whether there is no record of a run that there should have been: told to the platform at the check-in,
-  /// for an activity that it runs of its own accord.
+  /// Whether a run that should have happened is missing from the records. See `ActivityCheckIn::isOwed`.
   virtual bool isOwed() const { return false; }
   /// One run. Called on a thread of the platform's choosing; the handler is answered once, on any thread.
   virtual void performActivityForScheduler(const std::shared_ptr<KVRScheduler>& scheduler,

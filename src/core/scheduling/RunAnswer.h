@@ -13,8 +13,8 @@
 
 namespace kvr {
 
-/// The answer to an activity's run that may be deferred while its work is under way. The first one counts;
-/// the work's own, when it comes after, is dropped with a debug line. Any thread.
+/// The answer to a run that may be deferred while its work is still going on. The first answer counts; a
+/// later one, given when the work is done, is dropped with a debug log line. Any thread.
 class RunAnswer {
  public:
   RunAnswer(Log& log, ActivityHandler handler) : log_(log), handler_(std::move(handler)) {}
@@ -33,8 +33,8 @@ class RunAnswer {
   std::atomic<bool> isGiven_{false};
 };
 
-/// Looks, very rarely, whether the platform wants the run deferred; `defer` is then called on the main queue.
-/// Keeps nothing alive: a run whose answer is dropped on the way has come to its end.
+/// A timer that checks, very rarely, whether the platform asks to defer the run, and then calls `defer` on
+/// the main queue. It holds weak references only, so it does not keep a run alive whose answer was dropped.
 template <class Owner>
 std::shared_ptr<Timer> newDeferCheck(WorkQueues& queues, std::weak_ptr<Owner> owner,
                                      std::weak_ptr<RunAnswer> answer, std::weak_ptr<KVRScheduler> scheduler,

@@ -4,8 +4,8 @@ namespace kvr::preference {
 
 /// The OS version at the last post-upgrade run: string. Written by that activity.
 inline constexpr const char* kPostUpgradeOSVersion = "PostUpgradeOSVersionKey";
-/// For when the conversion outreach was last scheduled: date. Written by the outreach, which only ever
-/// moves it earlier, and after a boot.
+/// The date for which the conversion outreach was last scheduled: date. Written after warranty downloads,
+/// which only move it earlier, and by the post-boot activity.
 inline constexpr const char* kConversionOutreachScheduledDate = "ConversionOutreachScheduledDate";
 
 /// The post-upgrade activity has run: bool. Written by that activity.

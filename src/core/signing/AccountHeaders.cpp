@@ -20,7 +20,7 @@ std::uint64_t millisecondsSince1970(Date date) {
                                                                    : 0;
 }
 
-/// What a renewal answers, shared with its completion: an answer may come after the waiter has gone on.
+/// The result of a renewal, shared with its completion: the answer may come after the wait has timed out.
 struct Renewal {
   explicit Renewal(std::shared_ptr<Signal> signal) : answered(std::move(signal)) {}
 
@@ -34,8 +34,8 @@ void reportFailedRenewal(Log& log, std::int64_t resultCode, const std::optional<
             resultCode, error);
 }
 
-/// Renews the account's credentials and returns the token after that: the renewed one (which may be none), or
-/// the one held before when the renewal fails.
+/// Renews the account's credentials and returns the token: the new one (possibly none), or `held` if the
+/// renewal fails.
 std::optional<std::string> renewedToken(Platform& platform, AccountStore& store,
                                         const AuthenticationAccount& account,
                                         const std::optional<std::string>& held, bool avoidUI) {
@@ -63,8 +63,8 @@ std::optional<std::string> renewedToken(Platform& platform, AccountStore& store,
   return renewal->token;
 }
 
-/// The value of a header that the request can do without, or nothing when it cannot be sent: it would fail
-/// the whole request.
+/// The value of an optional header; nothing, with a log line, if it cannot be sent: an invalid header would
+/// fail the whole request.
 std::optional<std::string> sendable(Log& log, std::string_view name,
                                     const std::optional<std::string>& value) {
   const auto objection = value ? HTTPHeaders::objectionTo(name, *value) : std::nullopt;
@@ -88,8 +88,8 @@ void addSessionHeaders(Platform& platform, HTTPRequest& request) {
   }
 }
 
-/// The stored override, of whatever kind it is by its description; else the storefront of the store account
-/// linked to `account`. Sets the header.
+/// Sets the storefront header: the description of the stored override, of any kind, otherwise the storefront
+/// of the store account linked to `account`.
 void setStorefront(Platform& platform, HTTPRequest& request, const std::optional<CloudAccount>& account) {
   const auto override = platform.preferences.objectForKey(preference::kStorefrontLocale);
   auto storefront = override.isNull() ? std::nullopt : std::optional(describe(override));

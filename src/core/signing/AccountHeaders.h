@@ -7,9 +7,10 @@
 
 namespace kvr {
 
-// What the agent adds to a request for the coverage service. Each operation changes the request in place,
-// asks the platform afresh and keeps nothing. A coverage request is built in this order: account headers
-// (nothing is sent when that fails), body, attestation headers (KestHeaders.h), which sign the body.
+// The parts that the agent adds to a request for the coverage service. Each operation changes the request in
+// place, queries the platform each time and keeps no state. A coverage request is built in this order:
+// account headers (nothing is sent when that fails), body, attestation headers (KestHeaders.h), which sign
+// the body.
 
 /// Makes the request a POST with a JSON body that names the device's serial number and the client's locale
 /// and clock. Replaces any earlier body. Any thread.
@@ -17,9 +18,9 @@ void kvr_setCoverageRequestBodyWithSerialNumber(Platform& platform, HTTPRequest&
                                                 const std::optional<std::string>& serialNumber);
 
 /// Adds the account token and the account's headers; a header of the account session that cannot be sent is
-/// left out, with an error line. `force` renews the token even when one is held; a
-/// renewal blocks the calling thread for up to 60 s, so never on the thread that delivers renewals. False
-/// when the request cannot be signed; nothing has been added then.
+/// left out and logged as an error. `force` renews the token even if there is one. A renewal blocks the
+/// calling thread for up to 60 s, so do not call this on the thread that delivers renewals. Returns false,
+/// and adds nothing, if the request cannot be signed.
 bool kvr_signWithAccountHeaders(Platform& platform, HTTPRequest& request, bool force, bool avoidUI);
 /// The token part of signing: true when the token header was set.
 bool _addVornicHeadersForAccount(Platform& platform, HTTPRequest& request, const CloudAccount& account,

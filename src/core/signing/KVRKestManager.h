@@ -13,15 +13,14 @@
 
 namespace kvr {
 
-/// Proves that a request comes from this very device: a key that the attestation service bound to the device
-/// signs the request's body, and the certificate chain that attests the key goes with it.
+/// Proves that a request comes from this device: a key that the attestation service has bound to the device
+/// signs the request's body, and the certificate chain that attests the key is sent along.
 ///
 /// A manager serves one request, on one thread, which it blocks while the service works: first
 /// `generateKestCertficate`, then `addKestAuthenticationHeadersToRequest`. There are two kinds of
 /// certificate: the preferred one (WELD), and the fallback (HASP) for a device that lacks the former.
 ///
-/// An answer of the service that comes after the time limit still finds what it belongs to and harms nothing,
-/// whether the manager is still there or not.
+/// An answer of the service may safely come after the time limit, even if the manager no longer exists.
 class KVRKestManager {
  public:
   /// What the service answered: the chain and the key that the manager now holds, or the error. Called on the

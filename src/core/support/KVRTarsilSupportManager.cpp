@@ -21,7 +21,7 @@ std::string storeLink(const std::optional<std::string>& productURL) {
   return productURL && !productURL->empty() ? *productURL + kStoreQuery : std::string();
 }
 
-/// The text of the state, its key's own words when no table has it.
+/// The text for the installed state; the key itself if no table has a text.
 std::string installedText(const StringTables& tables) {
   auto text = tables.localizedString(kResourceBundle, kStringTable, kInstalledKey, "");
   return text.empty() ? kInstalledKey : text;
@@ -31,7 +31,7 @@ void addAll(Value::Dictionary& answer, const Value::Dictionary& entries) {
   for (const auto& [key, value] : entries) answer.insert_or_assign(key, value);
 }
 
-/// A purchase answer that may come after nobody waits for it any more.
+/// A purchase answer, shared with the store's reply because it may come after the wait has ended.
 struct Purchase {
   std::mutex mutex;  ///< guards what follows
   Value::Dictionary found{{availability::kType, availability::NotFound}};

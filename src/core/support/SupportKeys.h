@@ -15,7 +15,7 @@ inline constexpr const char* kType = "AppAvailabilityType";  ///< integer, the s
 inline constexpr const char* kLinkURL = "AppLinkURL";        ///< string, opens the store's page
 inline constexpr const char* kIconURL = "AppIconURL";        ///< string
 
-/// How an application stands on this device.
+/// The state of an application on this device.
 enum Type : std::int64_t { NotFound = 0, Installed = 1, Purchased = 2, InStore = 3 };
 
 }  // namespace availability

@@ -12,8 +12,8 @@ namespace kvr {
 namespace {
 
 constexpr std::size_t kLargestAsset = std::size_t{1} << 20U;  // bytes
-/// Half of what one store can hold, so that the preferences take an asset besides all they have. Only a
-/// binary list can hold more, by what it shares.
+/// Half of what a preferences file can hold, so that an asset fits in beside everything else. Only a binary
+/// list can exceed this, through sharing.
 constexpr TreeExtent kLargestKept{kMaximumValues / 2, PropertyListFiles::kLimit / 2};
 constexpr std::string_view kVersionKeys[] = {preference::kLowServerVersion, preference::kHighServerVersion};
 
@@ -28,7 +28,7 @@ Value clientVersions(Platform& platform) {
   };
 }
 
-/// The version under `key`, or null with a complaint.
+/// The version under `key`, or null and an error in the log.
 Value versionIn(Platform& platform, const Value& pair, const char* key) {
   auto version = asVersion(pair[key]);
   if (version.isNull()) platform.log.error("Server version dictionary missing key '%@'", key);
@@ -144,7 +144,7 @@ Value KVRServerVersionUtilities::_getValidServerVersionCache(Platform& platform)
 
 namespace {
 
-/// One negotiation: what is known before the sources are tried, and who waits.
+/// One negotiation: its inputs and its completion.
 struct Negotiation {
   Platform& platform;
   std::uint64_t policy;
@@ -209,10 +209,10 @@ namespace {
 
 using DictionaryCompletion = KVRServerVersionUtilities::DictionaryCompletion;
 
-/// What a fetch brought: the bytes, or why there are none.
+/// The result of a fetch: the bytes, or the error.
 using Fetched = Result<std::string>;
 
-/// What is kept of an asset that holds more than can be kept: the versions, as numbers.
+/// Reduces an asset that is too large to store to its versions, as numbers.
 Value versionsOf(Platform& platform, const Value& url, const Value& asset) {
   platform.log.error("The asset from URL '%@' holds more than can be kept: only its versions are", url);
   if (!asset.isDictionary()) return asset;

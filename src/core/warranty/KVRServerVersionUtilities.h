@@ -10,7 +10,7 @@
 
 namespace kvr {
 
-/// A set of service versions; numbers in it are equal by value.
+/// A set of service versions; numbers compare by value.
 class VersionSet {
  public:
   void insert(const Value& version);
@@ -38,22 +38,23 @@ class KVRServerVersionUtilities {
   /// Null when there is no dictionary.
   using DictionaryCompletion = Completion<Value>;
 
-  /// Whether client and service share a version, by the asset of this moment.
+  /// Whether client and service share a version, according to the asset as it is now.
   static void serverVersionSupported(Platform& platform, const BoolCompletion& completion);
-  /// Whether the shared versions hold the client's highest, whose feature set is the paired watches.
+  /// Whether the shared versions include the client's highest, which stands for support of paired watches.
   static void isHighServerVersionFeaturesetEnabled(Platform& platform, std::uint64_t policy,
                                                    const BoolCompletion& withCompletion);
   static void isHighServerVersionFeaturesetEnabled(Platform& platform, const BoolCompletion& completion);
-  /// The same by what is known already; never sends a request.
+  /// The same from what is already known; never sends a request.
   static bool isHighServerVersionFeaturesetEnabled(Platform& platform);
-  /// The "WebFlowURL" preference, of whatever kind it is.
+  /// The "WebFlowURL" preference, a value of any kind.
   static Value readWebURLOverride(Platform& platform);
 
   static void _supportedVersionsForClientAndServer(Platform& platform, std::uint64_t policy,
                                                    const VersionsCompletion& withCompletion);
   /// The cached pair, or null; a cache entry that is no dictionary is removed.
   static Value _getValidServerVersionCache(Platform& platform);
-  /// Fetches a dictionary; one that is not a dictionary is asked for once more, past every cache.
+  /// Fetches a dictionary. If the fetched property list is not one and `shouldRetry` is set, fetches once
+  /// more, bypassing every cache.
   static void _dictionaryFromURL(Platform& platform, const Value& url, bool shouldRetry,
                                  const DictionaryCompletion& withCompletion);
 };

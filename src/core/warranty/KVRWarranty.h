@@ -16,31 +16,32 @@ using KVRWarrantyRef = std::shared_ptr<const KVRWarranty>;
 
 /// The coverage and offer state of one device: a typed view over the warranty dictionary.
 ///
-/// The warranty dictionary is what the coverage service answers, what the cache file holds and what travels
-/// to clients. The record keeps it whole (`dictionaryRepresentation`) and copies, once, at construction, what
-/// the agent and its clients need into properties. Equality, description and coding are the dictionary's.
-/// Dates are epoch numbers there, durations day counts; texts, arrays and dictionaries are kept as they come,
-/// of whatever kind. A record is null only when there is no dictionary; wrong content is an absent property.
+/// The warranty dictionary is what the coverage service sends, what the cache file holds and what clients
+/// receive. The record keeps it whole (`dictionaryRepresentation`) and copies, once, at construction, what
+/// the agent and its clients need into properties. Equality, description and coding are the dictionary's. In
+/// it, dates are epoch numbers and durations are day counts. Texts, arrays and dictionaries are kept as they
+/// come, without a type check. A record is null only if there is no dictionary; a value of the wrong kind
+/// counts as an absent property.
 ///
 /// Read and written from any thread, property by property.
 class KVRWarranty {
  public:
   static constexpr const char* kCodingKey = "DictionaryRepresentation";
 
-  /// The designated way to a record: null without a dictionary. The serial number is accepted, not stored.
+  /// Makes a record; null without a dictionary. The serial number is accepted but not stored.
   static std::shared_ptr<KVRWarranty> initWithDictionary(Platform& platform, const Value& dictionary,
                                                          const std::optional<std::string>& serialNumber = {});
   /// The same, logged; for what came from the service or from a cache file.
   static std::shared_ptr<KVRWarranty> warrantyWithDictionary(
       Platform& platform, const Value& dictionary, const std::optional<std::string>& serialNumber = {});
   static constexpr bool supportsSecureCoding() { return true; }
-  /// A record from its coded form; null when it holds no dictionary of dictionaries, arrays, strings,
-  /// numbers, dates and nulls.
+  /// A record from its coded form; null unless it holds a dictionary that consists of dictionaries, arrays,
+  /// strings, numbers, dates and nulls only.
   static std::shared_ptr<KVRWarranty> initWithCoder(Platform& platform, const Value& coded);
   /// The coded form: one entry, the dictionary.
   Value encodeWithCoder() const;
 
-  // --- the cache: one property list a device, KVRWarrantyCache.cpp ---
+  // --- the cache: one property list per device, KVRWarrantyCache.cpp ---
 
   /// The cached record of a device (of the legacy file for no serial number), read afresh; null for none.
   static std::shared_ptr<KVRWarranty> cachedWarrantyForSerialNumber(
@@ -49,14 +50,15 @@ class KVRWarranty {
   /// reported.
   void cacheWarranty(const std::optional<std::string>& serial) const;
   void cache() const { cacheWarranty(std::nullopt); }
-  /// Moves the single cache of the earlier layout, its three preferences included, to the device's names.
+  /// Moves the single cache file of the earlier layout and its three preferences to the names for this
+  /// device.
   static std::shared_ptr<KVRWarranty> migrateLegacyCachedWarrantyIfNeededForSerialNumber(
       Platform& platform, const std::string& serialNumber);
   /// The per-device path, still holding its placeholder "%@" for the serial hash.
   static std::string _warrantyPathForSerialNumberFormat(Platform& platform);
   static std::string _legacyWarrantyPath(Platform& platform);
 
-  // --- computed at the moment of asking, from the clock and the "OneDayInterval" preference ---
+  // --- computed by each call, from the clock and the "OneDayInterval" preference ---
 
   /// Whole days until the eligibility ends, rounded up; 0 when it has ended or there is no end.
   std::uint32_t daysEligible() const;
@@ -70,7 +72,7 @@ class KVRWarranty {
   bool isEqual(const KVRWarranty& other) const;
   std::string description() const { return describe(dictionaryRepresentation()); }
 
-  // --- properties; a text is whatever stood under its key, null for nothing ---
+  // --- properties; a text is the value under its key, of any kind, or null ---
 
   AtomicProperty<bool> covered;
   AtomicProperty<std::optional<Date>> coverageEndDate;

@@ -1,4 +1,4 @@
-// The cache of KVRWarranty: one property-list file a device, named by the serial hash.
+// The cache of KVRWarranty: one property-list file per device, named by the serial hash.
 
 #include "core/warranty/CacheMetadata.h"
 #include "core/warranty/KVRWarranty.h"
@@ -9,7 +9,7 @@
 namespace kvr {
 namespace {
 
-/// Where the cache stands.
+/// The cache's directory, with a trailing slash.
 std::string directory(Platform& platform) {
   return platform.files.homeDirectory() + "/" + std::string(names::kCacheFolder) + "/";
 }
@@ -40,7 +40,7 @@ std::string KVRWarranty::_legacyWarrantyPath(Platform& platform) {
 void KVRWarranty::cacheWarranty(const std::optional<std::string>& serial) const {
   const auto path = pathFor(platform_, serial);
   platform_.log.standard("%s -> %@", "-[KVRWarranty cacheWarranty:]", path);
-  // A tree that the file cannot hold, or a full disk, costs a download later and nothing else.
+  // If this fails (unsuitable content, full disk), the only harm is another download later.
   (void)platform_.propertyLists.write(path, dictionaryRepresentation(), PropertyListEncoding::XML);
 }
 

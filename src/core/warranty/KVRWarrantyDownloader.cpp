@@ -18,8 +18,8 @@ constexpr double kAttemptTimeout = 30;  // seconds
 constexpr std::size_t kLargestFile = std::size_t{64} << 20U;
 constexpr std::size_t kLongestFileName = 255;
 
-/// "w.plist" for serial number ABC is "w.ABC.plist", and "w" is "w.ABC.": the old extension stands last, even
-/// an empty one. Nothing for a serial number that cannot be a part of a file name.
+/// The path of a file's variant for a serial number. For ABC, "w.plist" becomes "w.ABC.plist", and "w", whose
+/// extension is empty, becomes "w.ABC.". Nothing if the serial number cannot be part of a file name.
 std::optional<std::string> variantPath(const std::string& path, const std::string& serialNumber) {
   const auto nameStart = path.rfind('/') + 1;
   const auto dot = path.rfind('.');
@@ -32,8 +32,8 @@ std::optional<std::string> variantPath(const std::string& path, const std::strin
   return path.substr(0, nameStart) + name;
 }
 
-/// A file's content, nothing when there is none. What is there and cannot be read is reported: it counts as
-/// no content, but for a file that is too large, whose place nothing else may take.
+/// A file's content; nothing if the file is missing or, with an error in the log, cannot be read. A file that
+/// is too large is an error instead, so that no other file is used in its place.
 Result<std::optional<std::string>> contentOf(Platform& platform, const std::string& path) {
   auto contents = platform.files.read(path, kLargestFile);
   if (!contents) {
@@ -59,7 +59,7 @@ void KVRWarrantyDownloader::downloadWarrantyForSerialNumber(const std::optional<
   platform_.log.standard("%s: %{private}@",
                          "-[KVRWarrantyDownloader downloadWarrantyForSerialNumber:completionHandler:]",
                          serialNumber);
-  // So that the version check below always fetches the asset afresh.
+  // This makes the version check below fetch the asset again.
   platform_.preferences.removeObject(preference::kServerVersionCache);
   KVRServerVersionUtilities::serverVersionSupported(
       platform_, KVRServerVersionUtilities::BoolCompletion(

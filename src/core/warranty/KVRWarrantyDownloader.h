@@ -13,14 +13,13 @@
 
 namespace kvr {
 
-/// On whose behalf a downloader works, and what it has to be told of the rest of the agent. Any thread.
+/// The client that a downloader works for, and its connections to the rest of the agent. Any thread.
 struct DownloadCaller {
   /// The client for which requests are made.
   std::string bundleID;
   /// The serial number of the device that the agent runs on; nothing when it has none.
   std::function<std::optional<std::string>()> localSerialNumber;
-  /// Called with every warranty that has come, and with the one cached before it or null, before it is
-  /// cached.
+  /// Called with each downloaded warranty before it is cached, and with the one cached so far, or null.
   std::function<void(const KVRWarrantyRef& warranty, const KVRWarrantyRef& cachedWarranty)>
       warrantyDownloaded;
 };
@@ -29,11 +28,11 @@ struct DownloadCaller {
 ///
 /// A download goes through these steps: the version gate (does the service still speak a version that the
 /// agent speaks), up to three signed attempts (only status 401 is tried again, with the account token
-/// renewed) or a reading of a local file, then caching with metadata. A failure leaves the cache and its
-/// metadata as they were. Made for one download; kept alive by it. Any thread.
+/// renewed) or reading a local file, and then caching with metadata. A failure leaves the cache and its
+/// metadata as they were. Make one for each download; the download keeps it alive. Any thread.
 class KVRWarrantyDownloader : public std::enable_shared_from_this<KVRWarrantyDownloader> {
  public:
-  /// The dictionary that an attempt brought, or a value of any other kind.
+  /// The dictionary that an attempt returned; a value of any other kind is a failure.
   using AttemptCompletion = Completion<Value>;
 
   KVRWarrantyDownloader(Platform& platform, DownloadCaller caller);
@@ -46,10 +45,11 @@ class KVRWarrantyDownloader : public std::enable_shared_from_this<KVRWarrantyDow
   /// The download without the version gate.
   void _downloadWarrantyForSerialNumber(const std::optional<std::string>& serialNumber,
                                         const DownloadCompletion& withCompletion);
-  /// One attempt with `withRetries` more in reserve. Blocks while the request is signed.
+  /// One attempt, with `withRetries` more left. Blocks while the request is signed.
   void _downloadWarrantyFromServerURL(const URL& url, const std::optional<std::string>& serialNumber,
                                       std::int32_t withRetries, const AttemptCompletion& completionBlock);
-  /// What the file, or its variant for this serial number beside it, holds; null for nothing.
+  /// The property list in the file's variant for this serial number, or if there is none, in the file itself;
+  /// null if it is missing or cannot be read.
   Value dictionaryFromURL(const URL& url, const std::optional<std::string>& forSerialNumber) const;
 
  private:

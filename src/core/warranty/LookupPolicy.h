@@ -10,20 +10,19 @@
 
 namespace kvr {
 
-/// How a warranty is looked up. Clients send any number; what is neither `kDefault` nor `kRefresh` is
-/// `kCacheOnly`.
+/// How a warranty is looked up. Clients can send any number; others than these count as `kCacheOnly`.
 struct LookupPolicy {
   static constexpr std::uint64_t kDefault = 0;    ///< the cache while it is valid and fresh, else a download
   static constexpr std::uint64_t kCacheOnly = 1;  ///< never a download
   static constexpr std::uint64_t kRefresh = 2;    ///< always a download, and only its answer
 };
 
-/// What a cached warranty is worth.
+/// Whether a cached warranty may be used, and why not.
 enum class CacheValidity {
   None,             ///< there is no cached warranty
   OutdatedVersion,  ///< written in another cache format
   OtherLocale,      ///< fetched for another language than the user's present one
-  SignedOut,        ///< no primary cloud account: what was cached for one is not shown
+  SignedOut,        ///< no primary cloud account; a warranty cached for one is not shown
   Valid,
 };
 
@@ -38,8 +37,8 @@ struct CacheFacts {
   double validityDuration = 0;  ///< how long it stays fresh, in seconds
 };
 
-/// What the cache is worth. `secondsFresh` is how long a valid one stays fresh, 0 or less when it is stale;
-/// nothing when it is not valid, or not known to have been downloaded.
+/// The verdict on a cached warranty. `secondsFresh` is how long a valid one stays fresh, 0 or less when it is
+/// stale; nothing when it is not valid, or not known to have been downloaded.
 struct CacheVerdict {
   CacheValidity validity = CacheValidity::None;
   std::optional<double> secondsFresh;

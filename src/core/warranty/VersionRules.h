@@ -12,7 +12,7 @@ struct ServerLookupPolicy {
   static constexpr std::uint64_t kRefresh = 2;    ///< the asset, else the cache
 };
 
-/// Where the pair of versions comes from that stands for the service's.
+/// The sources for the service's version pair.
 enum class VersionSource {
   Override,  ///< of the operator; comes before all others under every policy
   Cache,

@@ -10,7 +10,7 @@
 namespace kvr {
 namespace {
 
-/// What an octal escape from \200 on stands for: the character set that the encoding was born with.
+/// The characters of octal escapes from \200 on, in the format's original 8-bit character set.
 constexpr char16_t kUpperCharacters[] = {
     0x00A0, 0x00C0, 0x00C1, 0x00C2, 0x00C3, 0x00C4, 0x00C5, 0x00C7, 0x00C8, 0x00C9, 0x00CA, 0x00CB, 0x00CC,
     0x00CD, 0x00CE, 0x00CF, 0x00D0, 0x00D1, 0x00D2, 0x00D3, 0x00D4, 0x00D5, 0x00D6, 0x00D9, 0x00DA, 0x00DB,
@@ -94,7 +94,7 @@ bool Reader::readTree() {
   return skipBlanks() && (at_ == text_.size() || fail("more text after the end of the value"));
 }
 
-/// A string at the start may be the tree, or the first key of a table of strings.
+/// A string at the start is either the whole tree or the first key of a table of strings.
 bool Reader::readFirstValue() {
   const char next = peek();
   if (next == '{' || next == '(' || next == '<') return startValue();
@@ -132,7 +132,7 @@ bool Reader::startValue() {
   return readString(text) && addLeaf(std::move(text));
 }
 
-/// What must stand behind a value in its container.
+/// Reads what must follow a value in its container.
 bool Reader::separator() {
   if (builder_.isComplete()) return true;
   if (!skipBlanks()) return false;

@@ -12,7 +12,7 @@ namespace kvr {
 /// and quoted strings, with `//` and `/* */` comments; or a table of strings, `"KEY" = "text";` without
 /// braces. UTF-8, or UTF-16 with a byte order mark. Every leaf is a string or data.
 Result<Value> readASCIIPropertyList(std::string_view bytes);
-/// The tree as far as the builder takes it.
+/// The same with a builder that may take only a part of the tree.
 Result<Value> readASCIIPropertyList(std::string_view bytes, TreeBuilder builder);
 
 }  // namespace kvr

@@ -11,8 +11,8 @@ namespace kvr {
 
 // The binary encoding of property lists; `PropertyList.h` is what others use.
 //
-// Eight bytes of header, the *objects* one after the other, a table of their offsets, and a trailer that says
-// where the table is. A container holds *references*, which are indices into the table, so objects can be
+// A file has eight bytes of header, the *objects* one after another, a table of their offsets, and a trailer
+// that locates the table. A container holds *references*, which are indices into the table, so objects can be
 // shared; all numbers are big-endian. An object starts with a marker: its kind in the high four bits, and in
 // the low four its length, where 15 means that an integer object with the length follows.
 
@@ -21,7 +21,7 @@ Result<Value> readBinaryPropertyList(std::string_view bytes);
 Result<PartialTree> readBinaryPropertyListWithin(const TreeExtent& most, std::string_view bytes,
                                                  EntryKeys keys);
 
-/// Equal leaves are written once, as far as a reader lets them be shared.
+/// Writes equal leaves once, within the sharing limit of the reader.
 Result<std::string> writeBinaryPropertyList(const Value& tree);
 
 namespace binary_property_list {
@@ -31,8 +31,8 @@ inline constexpr std::size_t kTrailerSize = 32;
 /// 2001-01-01 00:00 UTC, from which dates are counted, in seconds since 1970.
 inline constexpr double kReferenceDate = 978307200;
 
-/// How far the text and data of a tree may exceed those in the file, by being shared: many times what files
-/// of use share (their keys, above all), and little enough to hold in memory.
+/// By how many bytes shared text and data may make a tree larger than its file. Real files share far less
+/// (mostly keys), and so much still fits in memory.
 inline constexpr std::size_t kMaximumSharedBytes = std::size_t{1} << 26U;
 
 /// The high four bits of a marker.

@@ -13,7 +13,7 @@ namespace {
 
 using namespace binary_property_list;
 
-/// What a tree amounts to when whatever is shared in it is written out wherever it stands.
+/// The size of a tree, in which a shared object counts once for each use.
 struct Extent {
   std::uint64_t values = 0;
   std::uint64_t bytes = 0;  ///< of text and data as they are encoded, keys included
@@ -25,7 +25,7 @@ struct Extent {
   }
 };
 
-/// A small input can unfold to any size by sharing, so what it may unfold to depends on its size.
+/// By sharing, a small input could expand to any size, so the limit depends on the input's size.
 Extent largestExtentOf(std::size_t inputSize) {
   constexpr std::uint64_t kValuesOfAnyInput = 1U << 16U;
   constexpr std::uint64_t kValuesPerByte = 16;
@@ -33,7 +33,7 @@ Extent largestExtentOf(std::size_t inputSize) {
           std::uint64_t{kMaximumSharedBytes} + inputSize};
 }
 
-/// Reads from the top object on, depth first, each object once, with a stack of its own.
+/// Reads depth first from the top object, each object once, with an explicit stack instead of recursion.
 class Reader {
  public:
   Reader(std::string_view bytes, const Extent& most) : bytes_(bytes), limit_(most) {}
@@ -45,11 +45,10 @@ class Reader {
     }
     return std::move(objects_[top_].value);
   }
-  /// Whether the list was refused for what it unfolds to, or how deep, and for no damage that was found so
-  /// far.
+  /// Whether the list was refused for its expanded size or its depth, and not for damage.
   bool isTooMuch() const { return isTooMuch_; }
 
-  /// What stands at the top level: of a dictionary the entries under `keys`, each container as an empty one.
+  /// Reads the top level only: the entries of a dictionary under `keys`, with containers as empty ones.
   Result<Value> readTopLevel(EntryKeys keys);
 
  private:
@@ -73,7 +72,7 @@ class Reader {
     std::size_t references() const { return isDictionary ? 2 * count : count; }
   };
 
-  /// The content of an object that is being read: `at` and what is left before the table.
+  /// The unread content of an object: where it starts, and how many bytes are left before the table.
   struct Content {
     unsigned lengthBits;
     std::size_t at;
@@ -89,14 +88,14 @@ class Reader {
     return refuse(problem);
   }
 
-  /// `size` is 1 to 8; the bytes must be there.
+  /// `size` is 1 to 8; the bytes must lie within the input.
   std::uint64_t number(std::size_t at, std::size_t size) const {
     std::uint64_t value = 0;
     for (std::size_t i = 0; i < size; ++i) value = value << 8U | static_cast<unsigned char>(bytes_[at + i]);
     return value;
   }
 
-  /// The object a reference of `container` leads to; not yet checked to be one.
+  /// The object number in a reference of `container`, not yet checked.
   std::uint64_t reference(const Container& container, std::size_t index) const {
     return number(container.at + index * referenceSize_, referenceSize_);
   }
@@ -152,7 +151,7 @@ bool Reader::readTrailer() {
   return true;
 }
 
-/// Reads an object that was not read yet: a leaf as a whole, of a container the start.
+/// Reads an object for the first time: all of a leaf, or the start of a container.
 bool Reader::enter(std::uint64_t object) {
   const auto offset = number(table_ + object * offsetSize_, offsetSize_);
   if (offset < kHeader.size() || offset >= table_) return refuse("an offset outside the objects");
@@ -182,7 +181,7 @@ bool Reader::readObject(Object& object, std::size_t index, unsigned kind, Conten
   return refuse("an object of unknown kind");
 }
 
-/// Takes the length off the content; what it counts is for the caller to compare with what is left.
+/// Reads the length from the start of the content. The caller must compare it with the bytes left.
 bool Reader::readLength(Content& content, std::uint64_t& length) {
   length = content.lengthBits;
   if (length != kLengthFollows) return true;
@@ -204,8 +203,8 @@ bool Reader::finish(Object& object, Value value) {
   return true;
 }
 
-/// Asked before so many bytes are copied. A key is copied wherever it stands, and once more as the object
-/// that it is: beside what the tree unfolds to, that is no more than the input.
+/// Counts bytes before they are copied; refuses more than the limit. A key is copied for each use and once
+/// more as an object of its own; these extra copies are no larger than the input.
 bool Reader::mayCopy(std::uint64_t bytes) {
   copied_ += bytes;
   return copied_ <= limit_.bytes + bytes_.size() || refuseTooMuch("unfolds to too much text");
@@ -252,7 +251,7 @@ bool Reader::readDate(Object& object, const Content& content) {
   return finish(object, Date{std::bit_cast<double>(number(content.at, 8)) + kReferenceDate});
 }
 
-/// Many objects may claim the same bytes, so they count before they are copied.
+/// Many objects may refer to the same bytes, so bytes are counted before they are copied.
 bool Reader::readBytes(Object& object, Kind kind, Content content) {
   std::uint64_t length = 0;
   if (!readLength(content, length)) return false;
@@ -286,7 +285,7 @@ bool Reader::openContainer(std::size_t object, bool isDictionary, Content conten
   return true;
 }
 
-/// Follows the innermost container's references up to the next container, or ends it.
+/// Follows the innermost container's references up to the next container, or finishes it.
 bool Reader::step() {
   auto& container = open_.back();
   for (; container.next < container.references(); ++container.next) {
@@ -302,7 +301,7 @@ bool Reader::step() {
   return closeContainer(finished);
 }
 
-/// Sums up what the container's references lead to, which the limits bound before anything is copied.
+/// Adds up the sizes behind the container's references and checks the limits before anything is copied.
 bool Reader::measure(const Container& container) {
   auto& object = objects_[container.object];
   const auto keys = container.references() - container.count;
@@ -342,8 +341,8 @@ bool Reader::closeContainer(const Container& container) {
   return finish(objects_[container.object], std::move(array));
 }
 
-/// Whether the object is this string, of ASCII. It is compared where it stands: many objects may claim the
-/// same bytes.
+/// Whether the object is this ASCII string. Compares in place, because many objects may refer to the same
+/// bytes.
 bool Reader::isText(std::uint64_t object, std::string_view text) {
   if (object >= objects_.size()) return false;
   const auto offset = number(table_ + object * offsetSize_, offsetSize_);
@@ -381,7 +380,7 @@ Result<Value> Reader::readTopLevel(EntryKeys keys) {
   if (!top.isDictionary) return Value(Value::Array());
   Value::Dictionary entries;
   for (const auto key : keys) {
-    // Of equal keys the last counts.
+    // The last of equal keys wins.
     std::size_t at = top.count;
     while (at > 0 && !isText(reference(top, at - 1), key)) --at;
     if (at == 0) continue;
@@ -408,7 +407,8 @@ Result<PartialTree> readBinaryPropertyListWithin(const TreeExtent& most, std::st
     if (whole) return PartialTree{*std::move(whole), true};
     if (!reader.isTooMuch()) return whole.error();
   }
-  constexpr std::uint64_t kNoLimit = std::uint64_t{1} << 62U;  // no more than the input is looked at
+  constexpr std::uint64_t kNoLimit = std::uint64_t{1}
+                                     << 62U;  // reading the top level is bounded by the input
   auto part = Reader(bytes, {kNoLimit, kNoLimit}).readTopLevel(keys);
   if (!part) return part.error();
   return PartialTree{*std::move(part), false};

@@ -39,7 +39,7 @@ void appendInteger(std::string& out, std::uint64_t number) {
   appendNumber(out, number, size);
 }
 
-/// What lies above the signed numbers needs sixteen bytes.
+/// A number above the signed 64-bit range needs sixteen bytes.
 void appendLargeInteger(std::string& out, std::uint64_t number) {
   appendMarker(out, Kind::Int, 4);
   appendNumber(out, 0, 8);
@@ -57,8 +57,8 @@ void appendLength(std::string& out, Kind kind, std::size_t length) {
   appendInteger(out, length);
 }
 
-/// Numbers the objects first, which says how large references are, and then writes them.
-/// Recurses once a level, `kMaximumDepth` levels at most.
+/// Numbers the objects first, which gives the size of references, and then writes them. Recurses once per
+/// level, `kMaximumDepth` levels at most.
 class Writer {
  public:
   Result<std::string> write(const Value& tree) {
@@ -93,7 +93,7 @@ class Writer {
   std::string_view kept(std::string_view bytes);
   std::string writeObjects() const;
 
-  /// Holds what the objects are views of, and the table of leaves, until all is written.
+  /// Owns the bytes that the objects refer to, and the table of leaves, until everything is written.
   std::pmr::monotonic_buffer_resource memory_{kFirstBlock};
   std::vector<Object> objects_;
   std::pmr::unordered_map<std::string_view, Reference> leaves_{&memory_};

@@ -21,7 +21,7 @@ Error errorAt(std::size_t position, const char* problem) {
   return jsonError(std::string(problem) + " at byte " + std::to_string(position));
 }
 
-/// Takes the parser's events; `false` stops it. The names are the parser's.
+/// Handles the parser's events; returning false stops it. The parser prescribes the names.
 class Events {
  public:
   using Parser = nlohmann::json;
@@ -31,7 +31,7 @@ class Events {
   bool number_integer(Parser::number_integer_t value) { return builder_.add(value); }
   bool number_unsigned(Parser::number_unsigned_t value) { return builder_.add(value); }
   bool number_float(Parser::number_float_t value, const std::string& /*text*/) { return builder_.add(value); }
-  // Texts are copied: the parser goes on filling its buffer, which would have to grow anew for each of them.
+  // Copies the text: the parser reuses its buffer, which would have to grow again after a move.
   bool string(const std::string& value) { return builder_.add(Value(value)); }
   bool key(const std::string& value) { return builder_.setKey(value); }
   bool binary(const Parser::binary_t& /*value*/) { return false; }
@@ -56,7 +56,7 @@ class Events {
   std::optional<Error> failure_;
 };
 
-/// Recurses once a level, `kMaximumDepth` levels at most.
+/// Recurses once per level, `kMaximumDepth` levels at most.
 class Writer {
  public:
   explicit Writer(JSONSlashes slashes) : escapesSlashes_(slashes == JSONSlashes::Escaped) {}
@@ -195,7 +195,7 @@ class Writer {
 }  // namespace
 
 Result<Value> readJSON(std::string_view bytes) {
-  // No JSON holds a NUL, and the parser would take one for the end of the text.
+  // JSON cannot contain a NUL, and the parser would take one for the end of the text.
   if (const auto nul = bytes.find('\0'); nul != std::string_view::npos) return errorAt(nul, "NUL");
   try {
     Events events;

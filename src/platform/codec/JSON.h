@@ -10,7 +10,8 @@ namespace kvr {
 
 /// Reads one JSON text (RFC 8259, UTF-8). Whole numbers that fit 64 bits come back as integers, every other
 /// number as a real; the last of equal keys wins. Anything else, or nesting deeper than `kMaximumDepth` of
-/// PropertyList.h, is an error in domain "json"; short memory is std::bad_alloc. The caller bounds the size.
+/// PropertyList.h, is an error in domain "json"; running out of memory throws std::bad_alloc. The caller
+/// limits the size.
 Result<Value> readJSON(std::string_view bytes);
 
 enum class JSONSlashes { Plain, Escaped };

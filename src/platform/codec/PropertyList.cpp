@@ -12,7 +12,7 @@
 namespace kvr {
 namespace {
 
-/// How the characters of a text lie in its bytes.
+/// How the characters of a text are stored in its bytes.
 struct Layout {
   std::size_t mark;  ///< length of the byte order mark
   std::size_t unitSize;
@@ -29,7 +29,7 @@ Layout layoutOf(std::string_view bytes) {
   return {0, 1, 0};
 }
 
-/// The character at `at`; NUL behind the end and for what one byte does not hold.
+/// The character at `at`; NUL beyond the end and for a character that does not fit one byte.
 char characterAt(std::string_view bytes, std::size_t at, const Layout& layout) {
   if (bytes.size() - at < layout.unitSize) return '\0';
   if (layout.unitSize == 2 && bytes[at + 1 - layout.lowByte] != '\0') return '\0';
@@ -70,7 +70,7 @@ Result<PartialTree> readPropertyListWithin(const TreeExtent& most, std::string_v
   };
   auto whole = read(TreeBuilder(std::min(most.values, kMaximumValues)));
   if (whole) return PartialTree{*std::move(whole), true};
-  // A list that is damaged is so for this reading too.
+  // A damaged list fails this read too; then the first error is returned.
   auto part = read(TreeBuilder(keys));
   if (!part) return whole.error();
   return PartialTree{*std::move(part), false};

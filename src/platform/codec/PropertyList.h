@@ -17,13 +17,13 @@ inline constexpr std::size_t kMaximumDepth = 512;
 
 /// Reads a property list in any encoding: XML, binary, or the old ASCII form.
 ///
-/// Takes any bytes: what is no property list, is nested deeper than `kMaximumDepth`, or unfolds to more than
-/// a bounded number of values is an error in domain "plist". Short memory says nothing about the bytes: it is
-/// std::bad_alloc, never an error. Thread-safe, no state.
+/// Accepts any bytes. Input that is not a property list, is nested deeper than `kMaximumDepth`, or expands to
+/// too many values is an error in domain "plist". Running out of memory throws std::bad_alloc instead, so
+/// that good input is never taken for damaged. Thread-safe, no state.
 Result<Value> readPropertyList(std::string_view bytes);
 
-/// How much there may be of a tree. What a binary list shares counts wherever it stands; the text of the
-/// other encodings, which share nothing, is not counted.
+/// A limit on the size of a tree. What a binary list shares counts once for each use. For the other
+/// encodings, which cannot share, text is not counted.
 struct TreeExtent {
   std::size_t values;
   std::size_t textBytes;  ///< of text and data, keys included
@@ -37,15 +37,15 @@ struct PartialTree {
 
 using EntryKeys = std::span<const std::string_view>;
 
-/// As above, for what a stranger has sent and is kept or logged. Of a list that holds more than `most`, or is
-/// nested too deep, only what stands at the top level is read: of a dictionary the entries under `keys`, each
-/// container as an empty one. The rest may then be of any size; of a binary list it is not looked at.
+/// As `readPropertyList`, for untrusted input that is to be stored or logged. If a list exceeds `most` or is
+/// nested too deep, only its top level is read: the entries of a dictionary under `keys`, with containers as
+/// empty ones. The rest is skipped whatever its size; in a binary list it is not even checked.
 Result<PartialTree> readPropertyListWithin(const TreeExtent& most, std::string_view bytes, EntryKeys keys);
 
-/// Writes a tree. XML holds no null, no character that XML forbids and no date outside the calendar, and
-/// drops a date's fraction of a second; the binary encoding holds every tree (a date before 1985 to a tenth
-/// of a microsecond). A tree that does not fit, whose text is not UTF-8, or that `readPropertyList` would
-/// refuse for its depth or number of values is an error in domain "plist".
+/// Writes a tree. XML cannot hold a null, a character that XML forbids or a date outside the calendar, and
+/// drops a date's fraction of a second; the binary encoding can hold every tree (a date before 1985 to a
+/// tenth of a microsecond). It is an error in domain "plist" if the encoding cannot hold the tree, its text
+/// is not UTF-8, or `readPropertyList` would refuse it for its depth or number of values.
 Result<std::string> writePropertyList(const Value& tree, PropertyListEncoding encoding);
 
 }  // namespace kvr

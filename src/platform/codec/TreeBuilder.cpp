@@ -78,7 +78,7 @@ void TreeBuilder::place(Value&& value) {
     container.array.push_back(std::move(value));
     return;
   }
-  // Keys mostly come sorted, as every writer here leaves them; of equal ones the last counts.
+  // Keys mostly come sorted, as all our writers sort them, so the hint fits. The last of equal keys wins.
   auto& dictionary = container.dictionary;
   dictionary.emplace_hint(dictionary.end(), *std::move(container.key), Value())->second = std::move(value);
   container.key.reset();

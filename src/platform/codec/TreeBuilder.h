@@ -11,17 +11,17 @@
 
 namespace kvr {
 
-/// Puts a tree together from the events of a reader, without recursion.
+/// Builds a tree from the events of a reader, without recursion.
 ///
 /// A container is opened, filled with `add` or further containers, and closed; in a dictionary each value
-/// follows its key, and the last of equal keys wins. Every operation returns whether it was taken; one that
-/// was not leaves its reason in `problem()`, and the reader should give up.
+/// follows its key, and the last of equal keys wins. Every operation returns whether it succeeded. After a
+/// failure, `problem()` has the reason, and the reader should give up.
 class TreeBuilder {
  public:
-  /// The tree may hold so many values, containers included.
+  /// The tree may hold at most `maximumValues` values, containers included.
   explicit TreeBuilder(std::size_t maximumValues) : maximumValues_(maximumValues) { open_.reserve(8); }
-  /// Only what stands at the top level is kept: of a dictionary the entries under these keys, each container
-  /// as an empty one; of an array nothing. What is passed over may be of any size and depth.
+  /// Keeps the top level only: the entries of a dictionary under these keys, with containers as empty ones;
+  /// of an array, nothing. The skipped parts may have any size and depth.
   explicit TreeBuilder(EntryKeys only) : only_(only) {}
 
   bool openArray() { return open(false); }
@@ -41,7 +41,7 @@ class TreeBuilder {
   bool isComplete() const { return complete_; }
   /// The complete tree.
   Value take() { return std::move(tree_); }
-  /// Why the last operation was not taken.
+  /// Why the last operation failed.
   const char* problem() const { return problem_; }
 
  private:
@@ -51,7 +51,7 @@ class TreeBuilder {
     Value::Dictionary dictionary;
     std::optional<std::string> key;
   };
-  /// A container of which nothing is kept.
+  /// An open container that is skipped.
   struct PassedOver {
     bool isDictionary;
     bool hasKey;

@@ -11,13 +11,13 @@ namespace kvr {
 
 /// The XML encoding of property lists; `PropertyList.h` is what others use.
 ///
-/// Reads a document in any encoding that Expat knows, from its XML declaration, document type or root on. A
-/// document type may stand there but may declare nothing.
+/// Reads a document in any encoding that Expat knows, starting at its XML declaration, document type or root
+/// element. A document type is allowed but must not declare anything.
 Result<Value> readXMLPropertyList(std::string_view bytes);
-/// The tree as far as the builder takes it.
+/// The same with a builder that may take only a part of the tree.
 Result<Value> readXMLPropertyList(std::string_view bytes, TreeBuilder builder);
 
-/// Writes UTF-8 without document type, an element a line.
+/// Writes UTF-8 without a document type, one element per line.
 Result<std::string> writeXMLPropertyList(const Value& tree);
 
 }  // namespace kvr

@@ -25,7 +25,7 @@ std::string_view trimmed(std::string_view text) {
   return text;
 }
 
-/// Takes one sign off the text; whether it was a minus.
+/// Removes one sign from the start of the text. Returns whether it was a minus.
 bool takeSign(std::string_view& text) {
   const bool negative = text.starts_with('-');
   if (negative || text.starts_with('+')) text.remove_prefix(1);
@@ -89,7 +89,7 @@ std::optional<Value> dateFrom(std::string_view text) {
   if (negative) time.year = -time.year;
   const auto seconds = secondsSince1970(time);
   const Date date{static_cast<double>(seconds)};
-  // A day, hour, minute or second out of range comes back as another reading.
+  // A day, hour, minute or second out of range gives a different calendar time.
   if (!(calendarTime(seconds) == time) || !isInCalendar(date)) return std::nullopt;
   return Value(date);
 }
@@ -146,7 +146,7 @@ class Reader {
   TreeBuilder builder_;
   bool inDocument_ = false;
   Element leaf_ = Element::None;
-  std::string text_;  ///< of the open leaf, so far; copied from, so that it need not grow anew for each
+  std::string text_;  ///< of the open leaf so far; reused for the next leaf
   const char* problem_ = nullptr;
   bool isOutOfMemory_ = false;
 };
@@ -190,7 +190,7 @@ void Reader::installHandlers() {
   XML_SetCharacterDataHandler(parser, call<&Reader::characters, const XML_Char*, int>);
   XML_SetStartDoctypeDeclHandler(
       parser, call<&Reader::startDoctype, const XML_Char*, const XML_Char*, const XML_Char*, int>);
-  // With an external document type, which is never fetched, Expat takes unknown entities for declared there.
+  // With an external document type, which is never fetched, Expat assumes that it declares unknown entities.
   XML_SetSkippedEntityHandler(parser, call<&Reader::skippedEntity, const XML_Char*, int>);
 }
 

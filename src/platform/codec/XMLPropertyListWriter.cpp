@@ -18,7 +18,7 @@ bool isForbidden(char32_t codePoint) {
          codePoint == 0xFFFE || codePoint == 0xFFFF;
 }
 
-/// What must stand for a character in an element's text; empty for itself.
+/// The escape for a character in an element's text; empty if it needs none.
 std::string_view escapeOf(char c) {
   switch (c) {
     case '&':
@@ -28,13 +28,13 @@ std::string_view escapeOf(char c) {
     case '>':
       return "&gt;";
     case '\r':
-      return "&#13;";  // plain, a reader would make it a line feed
+      return "&#13;";  // unescaped, a reader would make it a line feed
     default:
       return {};
   }
 }
 
-/// Recurses once a level, `kMaximumDepth` levels at most.
+/// Recurses once per level, `kMaximumDepth` levels at most.
 class Writer {
  public:
   Result<std::string> write(const Value& tree) {
@@ -54,7 +54,7 @@ class Writer {
   void appendData(const Value::Bytes& bytes);
 
   bool appendContainer(std::string_view tag, bool empty, auto&& appendContent);
-  /// Not without end: deep trees would be mostly tabs.
+  /// Limited, because deep trees would be mostly tabs.
   void indent() {
     constexpr std::size_t kMostTabs = 16;
     out_.append(std::min(depth_, kMostTabs), '\t');

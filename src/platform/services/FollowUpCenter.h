@@ -52,7 +52,8 @@ class FollowUpCenterClient {
   virtual std::optional<Error> postItem(const FollowUpItem& item) = 0;
   /// Clears pending items; an identifier that is not pending is no error. Nothing on success.
   virtual std::optional<Error> clearPendingItems(const std::vector<std::string>& uniqueIdentifiers) = 0;
-  /// This client's pending items, in the order first posted. Items whose expiration date has passed are gone.
+  /// This client's pending items, in the order first posted. Items whose expiration date has passed are left
+  /// out.
   virtual Result<std::vector<FollowUpItem>> pendingItems() = 0;
 };
 

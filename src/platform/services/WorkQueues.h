@@ -53,7 +53,7 @@ class WorkQueues {
  public:
   virtual ~WorkQueues() = default;
   virtual WorkQueueRef mainQueue() = 0;
-  /// A fresh serial queue; it lives until the last reference is gone and its items have run.
+  /// A new serial queue; it lives until the last reference is gone and its items have run.
   virtual WorkQueueRef newSerialQueue(std::string label) = 0;
   virtual WorkQueueRef concurrentQueue(Priority priority) = 0;
   /// Hands `work` to `queue` once `delay` seconds have passed.

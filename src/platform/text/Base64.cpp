@@ -9,8 +9,8 @@ namespace kvr {
 namespace {
 
 constexpr std::string_view kAlphabet = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
-/// How much is encoded at once: a multiple of 3, so that only the last piece is padded, and far below what
-/// the library's int lengths hold.
+/// How many bytes are encoded at once: a multiple of 3, so that only the last piece is padded, and far below
+/// the limit of the library's int lengths.
 constexpr std::size_t kPiece = 3UL << 20U;
 constexpr std::uint8_t kNoDigit = 0xFF;
 constexpr std::uint8_t kBlank = 0xFE;

@@ -15,7 +15,7 @@ inline std::string base64Encode(std::span<const std::uint8_t> bytes) {
   return base64Encode(std::string_view(reinterpret_cast<const char*>(bytes.data()), bytes.size()));
 }
 
-/// Takes blanks and line breaks anywhere; nothing when the rest is not exactly what an encoder writes.
+/// Ignores blanks and line breaks; returns nothing unless the rest is exactly what an encoder writes.
 std::optional<std::vector<std::uint8_t>> base64Decode(std::string_view text);
 
 }  // namespace kvr

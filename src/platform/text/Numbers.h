@@ -6,9 +6,9 @@
 
 namespace kvr {
 
-/// Reads the decimal number at the start of `text` as std::from_chars does, whatever the locale; but a number
-/// too small to tell from zero is zero, of the number's sign. std::errc::result_out_of_range is left to
-/// numbers that are too large; they leave the infinity of their sign.
+/// Reads the decimal number at the start of `text` as std::from_chars does, in any locale, except at the ends
+/// of the range: a number too close to zero gives a zero of its sign and no error; one that is too large
+/// gives std::errc::result_out_of_range and sets `number` to the infinity of its sign.
 std::from_chars_result readReal(std::string_view text, double& number);
 
 /// The value of a hexadecimal digit in either case; -1 for any other character.

@@ -8,7 +8,7 @@
 namespace kvr {
 namespace {
 
-// The letters of URLs are ASCII ones, whatever the process's locale.
+// URLs have ASCII letters only, whatever the process's locale.
 bool isDigit(char c) { return c >= '0' && c <= '9'; }
 bool isLetter(char c) { return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z'); }
 bool isBlankOrControl(char c) { return (c >= '\0' && c <= ' ') || c == '\x7f'; }

@@ -19,7 +19,7 @@ class URL {
   const std::string& host() const { return host_; }      ///< lower case, without brackets; empty for a file
   bool isFile() const { return scheme_ == "file"; }
   bool isWeb() const { return scheme_ == "https" || scheme_ == "http"; }
-  /// Whether the host is this machine by its very name: "localhost", 127.x.x.x or ::1.
+  /// Whether the host is written as "localhost", 127.x.x.x or ::1. No name is resolved.
   bool isLoopback() const;
   /// The path of a file URL, percent escapes resolved.
   const std::string& filePath() const { return filePath_; }

@@ -5,7 +5,7 @@ namespace {
 
 char32_t byteAt(std::string_view text, std::size_t at) { return static_cast<unsigned char>(text[at]); }
 
-/// The least code point that needs so many bytes; a smaller one in them is an overlong form.
+/// The smallest code point for each encoded length; a smaller one of that length is an overlong form.
 constexpr char32_t kLeast[] = {0, 0, 0x80, 0x800, 0x10000};
 
 void appendUnit(std::string& out, char32_t unit) {

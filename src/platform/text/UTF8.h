@@ -10,7 +10,7 @@ namespace kvr {
 /// What `nextCodePoint` gives in place of a code point for bytes that are not UTF-8.
 inline constexpr char32_t kNoCodePoint = 0xFFFFFFFF;
 
-/// Reads the code point at `at`, which must be below the size, and moves `at` behind it. Bytes that are not
+/// Reads the code point at `at`, which must be below the size, and moves `at` past it. Bytes that are not
 /// well-formed (surrogates, overlong and truncated forms included) give `kNoCodePoint` and leave `at` in
 /// place.
 char32_t nextCodePoint(std::string_view text, std::size_t& at);
@@ -29,7 +29,7 @@ constexpr char32_t joinSurrogates(char32_t high, char32_t low) {
 
 enum class ByteOrder { Big, Little };
 
-/// UTF-16 without byte order mark as UTF-8; nothing when a surrogate stands alone or half a unit is left
+/// UTF-16 without byte order mark as UTF-8; nothing if there is an unpaired surrogate or half a unit is left
 /// over.
 std::optional<std::string> utf8FromUTF16(std::string_view bytes, ByteOrder order);
 

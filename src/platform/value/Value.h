@@ -91,8 +91,8 @@ class Value {
   /// A number or bool truncated toward zero and saturated, a string by its leading decimal digits; else 0.
   std::int64_t asInteger() const;
 
-  /// Deep equality. Numbers compare by value whatever their kind, exactly; a bool equals bools only; a NaN
-  /// equals a NaN, so that a tree always equals itself.
+  /// Deep equality. Numbers of any kind compare by their exact value. A bool equals only a bool. A NaN equals
+  /// a NaN, so that a tree always equals itself.
   friend bool operator==(const Value& left, const Value& right);
 
  private:
