@@ -9,12 +9,11 @@
 
 namespace kvr {
 
-/// All devices with their warranties; nothing when they could not be listed.
+/// All devices with their warranties; nothing if they could not be listed.
 using DeviceInfosAnswer = Completion<std::optional<KVRDeviceInfoList>>;
 
-/// How activities and monitors ask for all devices with their warranties, looked up by a policy
-/// (`LookupPolicy`). `updateFollowUps` also brings the follow-ups up to date with what was found. Answers
-/// once, on any thread.
+/// Looks up all devices with their warranties, for activities and monitors. `policy` is a `LookupPolicy`;
+/// `updateFollowUps` also updates the follow-ups from the result. Answers once, on any thread.
 using DeviceInfosQuery =
     std::function<void(std::uint64_t policy, bool updateFollowUps, DeviceInfosAnswer answer)>;
 

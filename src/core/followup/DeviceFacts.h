@@ -10,7 +10,7 @@
 namespace kvr {
 
 std::optional<std::string> serialNumberOf(const KVRDeviceInfo& deviceInfo);
-/// The serial number's hash, under which follow-ups are remembered.
+/// The hash of the serial number, the key for what is stored about follow-ups.
 std::optional<std::string> serialHashOf(const KVRDeviceInfo& deviceInfo);
 /// The facts that the rules need, as of now.
 OfferFacts offerFactsOf(const KVRDeviceInfo& deviceInfo);

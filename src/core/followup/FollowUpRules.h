@@ -94,7 +94,7 @@ constexpr ConversionOutcome conversionOutcome(std::optional<Date> dismissed,
   return ConversionOutcome::DismissedBefore;
 }
 
-/// Whether a row carries a badge: the warranty wants one, the end is near enough, and has not come.
+/// Whether a row carries a badge: the warranty wants one, and the end is near enough but has not passed.
 constexpr bool showsRowBadge(bool isWanted, std::optional<Date> eligibleUntil, double durationBeforeEnd,
                              Date now) {
   if (!isWanted || !eligibleUntil) return false;

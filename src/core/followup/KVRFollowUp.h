@@ -17,9 +17,9 @@ namespace kvr {
 /// Decides, device by device, whether an offer's follow-up is posted, kept up to date, removed or left alone.
 ///
 /// A follow-up is *pending* while the follow-up centre shows it, *posted* once it has been posted, and
-/// *dismissed* once the owner dismissed it; the last two are remembered in the preferences by serial hash.
-/// New follow-ups come from posting only; a refresh updates and clears. A dismissed one is posted again only
-/// when its display date has moved past the dismissal.
+/// *dismissed* once the owner dismissed it; the last two are stored in the preferences by serial hash. New
+/// follow-ups come from posting only; a refresh updates and clears. A dismissed one is posted again only when
+/// its display date has moved past the dismissal.
 ///
 ///     KVRFollowUp(platform).refreshFollowupWithDeviceInfos(infos);
 ///
@@ -57,7 +57,8 @@ class KVRFollowUp {
 
   /// How many are pending; 0 if they cannot be listed.
   std::size_t pendingFollowUpCount();
-  /// Turns the single follow-up of earlier versions into the local device's; without a warranty clears it.
+  /// Migrates the single follow-up of earlier versions to the local device; clears it if there is no
+  /// warranty.
   void migrateLegacyFollowUpIfNeededWithDeviceInfo(const KVRDeviceInfo& deviceInfo);
 
   /// Rewrites an item's texts, expiration, badge, user info and action. The device info must carry a warranty

@@ -25,8 +25,8 @@ class KVRFollowUpPost : public KVRSchedulerActivityDelegate,
   void performActivityForScheduler(const std::shared_ptr<KVRScheduler>& scheduler,
                                    ActivityHandler withCompletionHandler) override;
 
-  /// When the activity should run next; nothing when no device is waiting for its follow-up, a date in the
-  /// past when one missed it.
+  /// When the activity should run next; nothing if no device is waiting for its follow-up, a date in the past
+  /// if a device's eligibility ended without one.
   static std::optional<Date> nextFollowUpPostDateWithDevicesInfo(Platform& platform,
                                                                  const KVRDeviceInfoList& devicesInfo);
 

@@ -18,7 +18,7 @@ struct RefreshLimit::State {
 
   Log& log;
   const WorkQueueRef queue;
-  std::mutex mutex;  ///< guards what follows
+  std::mutex mutex;  ///< guards the members below
   int underWay = 0;
   std::function<void()> owed;
 };

@@ -44,7 +44,7 @@ class KVROutreachActivityUtilities : public std::enable_shared_from_this<KVROutr
 
   Platform& platform_;
   WorkGroup downloads_;
-  std::mutex mutex_;  ///< guards what follows
+  std::mutex mutex_;  ///< guards the members below
   std::optional<Date> earliestPostDate_;
 };
 

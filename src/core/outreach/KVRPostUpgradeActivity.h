@@ -6,8 +6,9 @@
 namespace kvr {
 
 /// Runs after the first start and after every upgrade of the operating system. The first run clears all
-/// target dates and schedules the first outreach; every later one forces a conversion outreach when the OS
-/// version has gone up since the run before.
+/// target dates and, if there is a primary cloud account, schedules the first outreach. Every later run
+/// schedules a conversion outreach at once if the OS version has gone up since the run before and no outreach
+/// is pending.
 class KVRPostUpgradeActivity : public KVRSchedulerActivityDelegate {
  public:
   explicit KVRPostUpgradeActivity(Platform& platform) : platform_(platform) {}

@@ -15,9 +15,8 @@ namespace kvr {
 ///
 /// A platform has one registry. Start-up fills it before anything is scheduled:
 ///
-///     ActivityRegistry::of(platform).add(names::kOutreach,
-///                                        [&platform] { return
-///                                        std::make_shared<KVROutreachActivity>(platform); });
+///     ActivityRegistry::of(platform).add(
+///         names::kOutreach, [&platform] { return std::make_shared<KVROutreachActivity>(platform); });
 ///
 /// Any thread.
 class ActivityRegistry {

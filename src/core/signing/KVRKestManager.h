@@ -73,7 +73,7 @@ class KVRKestManager {
  private:
   /// What the service issued; shared with answers still to come.
   struct Credentials {
-    mutable std::mutex mutex;  ///< guards what follows
+    mutable std::mutex mutex;  ///< guards the members below
     std::optional<CertificateChain> clientCertArray;
     AttestedKeyRef privateKey;
   };

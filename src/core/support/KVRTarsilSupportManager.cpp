@@ -33,7 +33,7 @@ void addAll(Value::Dictionary& answer, const Value::Dictionary& entries) {
 
 /// A purchase answer, shared with the store's reply because it may come after the wait has ended.
 struct Purchase {
-  std::mutex mutex;  ///< guards what follows
+  std::mutex mutex;  ///< guards the members below
   Value::Dictionary found{{availability::kType, availability::NotFound}};
 };
 

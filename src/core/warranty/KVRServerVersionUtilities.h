@@ -26,7 +26,7 @@ class VersionSet {
 /// Negotiates which versions of the coverage service client and service share.
 ///
 /// A version pair is a dictionary with "LowServerVersion" and "HighServerVersion", the two versions that one
-/// side speaks. The service publishes its pair as a property-list asset; what was learned is kept in the
+/// side speaks. The service publishes its pair as a property-list asset; the pair last used is kept in the
 /// "ServerVersionCache" preference. A lookup policy (`ServerLookupPolicy`) says where the service's pair
 /// comes from; the "ServerVersionOverride" preference comes before all else. Completions run before the
 /// operation returns when nothing is fetched, else on a work queue of the HTTP session. Any thread; no state.
@@ -51,7 +51,7 @@ class KVRServerVersionUtilities {
 
   static void _supportedVersionsForClientAndServer(Platform& platform, std::uint64_t policy,
                                                    const VersionsCompletion& withCompletion);
-  /// The cached pair, or null; a cache entry that is no dictionary is removed.
+  /// The cached pair, or null; a cache entry that is not a dictionary is removed.
   static Value _getValidServerVersionCache(Platform& platform);
   /// Fetches a dictionary. If the fetched property list is not one and `shouldRetry` is set, fetches once
   /// more, bypassing every cache.

@@ -31,8 +31,8 @@ inline constexpr std::size_t kTrailerSize = 32;
 /// 2001-01-01 00:00 UTC, from which dates are counted, in seconds since 1970.
 inline constexpr double kReferenceDate = 978307200;
 
-/// By how many bytes shared text and data may make a tree larger than its file. Real files share far less
-/// (mostly keys), and so much still fits in memory.
+/// By how many bytes shared text and data may make a tree larger than its file. Real files share far less,
+/// mostly keys, and this much still fits in memory.
 inline constexpr std::size_t kMaximumSharedBytes = std::size_t{1} << 26U;
 
 /// The high four bits of a marker.

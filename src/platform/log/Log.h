@@ -37,7 +37,7 @@ class Log {
 
   bool isEnabled(LogLevel level) const { return level >= least_; }
 
-  /// The process is ending: missing answers are expected from now on and not reported.
+  /// Call it when the process begins to end: from then on misused completions are not reported.
   void beginEnding() { ending_ = true; }
   /// Reports an answer that was never given, or given twice; nothing while the process is ending.
   virtual void reportMisusedCompletion(std::string_view what, std::string_view name) {

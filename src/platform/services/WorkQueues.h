@@ -39,16 +39,16 @@ class Signal {
  public:
   virtual ~Signal() = default;
   virtual void signal() = 0;
-  /// Blocks until signalled (true), or until `limit` seconds have passed or the process is ending (false).
-  /// Without a limit it waits for as long as it takes. Do not call it on the main queue.
+  /// Blocks until signalled (true), or until `limit` seconds (if given) have passed or the process is ending
+  /// (false). Do not call it on the main queue.
   virtual bool wait(std::optional<double> limit) = 0;
 };
 
 /// The queues, timers and waits of one process.
 ///
-/// Serial queues (the main queue is one) run one item at a time in the order handed over. Concurrent queues
-/// run items side by side. Blocked items do not stop others: further threads are started in their place.
-/// Delays are in seconds and count while the device sleeps; a negative or undefined delay counts as 0.
+/// Serial queues (the main queue is one) run one item at a time, in the order added. Concurrent queues run
+/// items in parallel. Blocked items do not stop others: further threads are started in their place. Delays
+/// are in seconds and count while the device sleeps; a negative or undefined delay counts as 0.
 class WorkQueues {
  public:
   virtual ~WorkQueues() = default;

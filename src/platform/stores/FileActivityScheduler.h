@@ -97,7 +97,7 @@ class FileActivityScheduler : public ActivityScheduler {
 
   std::once_flag loaded_;     ///< the file is loaded before the table is used
   std::mutex saving_;         ///< held while the file is written; taken before `mutex_`
-  mutable std::mutex mutex_;  ///< guards what follows
+  mutable std::mutex mutex_;  ///< guards the members below
   ActivityTable table_;
   bool unreadable_ = false;  ///< the file could not be read yet, so it must not be overwritten
   bool registrationsLost_ = false;
