@@ -26,10 +26,11 @@ class VersionSet {
 /// Negotiates which versions of the coverage service client and service share.
 ///
 /// A version pair is a dictionary with "LowServerVersion" and "HighServerVersion", the two versions that one
-/// side speaks. The service publishes its pair as a property-list asset; the pair last used is kept in the
-/// "ServerVersionCache" preference. A lookup policy (`ServerLookupPolicy`) says where the service's pair
-/// comes from; the "ServerVersionOverride" preference comes before all else. Completions run before the
-/// operation returns when nothing is fetched, else on a work queue of the HTTP session. Any thread; no state.
+/// side speaks. The service publishes its pair as a property-list asset; `storesPair` tells when a pair is
+/// cached in the "ServerVersionCache" preference. A lookup policy (`ServerLookupPolicy`) says where the
+/// service's pair comes from; the "ServerVersionOverride" preference comes before all else. Completions run
+/// before the operation returns when nothing is fetched, else on a work queue of the HTTP session. Any
+/// thread; no state.
 class KVRServerVersionUtilities {
  public:
   using BoolCompletion = Completion<bool>;

@@ -61,8 +61,9 @@ class Files {
   /// As `rename`, but replaces nothing: if the new name is taken, the error has code EEXIST.
   virtual std::optional<Error> renameToUnused(const std::string& from, const std::string& to) = 0;
   /// Takes the lock for changing files in `directory`, which is created if it is missing. Waits for other
-  /// holders, but only for some seconds: a holder that hangs must not hang the agent. The lock is recursive;
-  /// release it on the thread that took it.
+  /// threads, but for other processes only some seconds: a process that hangs must not hang the agent, so
+  /// after that the lock holds within this process only, which is logged. The lock is recursive; release it
+  /// on the thread that took it.
   virtual std::unique_ptr<FileLock> lock(const std::string& directory) = 0;
 };
 
