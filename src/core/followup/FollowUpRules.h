@@ -12,7 +12,7 @@ struct OfferFacts {
   bool isOffered = false;  ///< the warranty says that the offer may be displayed
   std::optional<Date> eligibleUntil;
   std::optional<Date> displayDate;  ///< from when the follow-up is to be displayed
-  double durationBeforeEnd = 0;  ///< seconds; without a display date, display starts so long before the end
+  double durationBeforeEnd = 0;     ///< seconds before the end; used without a display date
   std::optional<Date> activationDate;
 };
 

@@ -19,7 +19,7 @@ constexpr std::string_view kAddHeaders =
 constexpr std::string_view kSerialize = "-[KVRKestManager serializeCertificateChain:]";
 constexpr std::string_view kWriteCerts = "-[KVRKestManager writeCertsToDevice:]";
 
-constexpr int kTimeLimit = 60;             ///< seconds, for both issues together
+constexpr int kTimeLimit = 60;             ///< seconds, for both certificate requests together
 constexpr std::int64_t kValidity = 43200;  ///< minutes: 30 days
 
 /// The two ways in which the attestation service says that the device has no certificate of the preferred

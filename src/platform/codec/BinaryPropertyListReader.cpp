@@ -126,7 +126,7 @@ class Reader {
   std::size_t top_ = 0;
   std::vector<Object> objects_;
   std::vector<Container> open_;
-  std::uint64_t values_ = 0;  ///< in all containers so far, no more than what the tree unfolds to
+  std::uint64_t values_ = 0;  ///< in all containers so far, at most those of the expanded tree
   std::uint64_t copied_ = 0;  ///< bytes of text and data
   const char* problem_ = "";
   bool isTooMuch_ = false;
@@ -407,8 +407,7 @@ Result<PartialTree> readBinaryPropertyListWithin(const TreeExtent& most, std::st
     if (whole) return PartialTree{*std::move(whole), true};
     if (!reader.isTooMuch()) return whole.error();
   }
-  constexpr std::uint64_t kNoLimit = std::uint64_t{1}
-                                     << 62U;  // reading the top level is bounded by the input
+  constexpr std::uint64_t kNoLimit = std::uint64_t{1} << 62U;  // reads the top level only
   auto part = Reader(bytes, {kNoLimit, kNoLimit}).readTopLevel(keys);
   if (!part) return part.error();
   return PartialTree{*std::move(part), false};

@@ -71,7 +71,7 @@ class Writer {
   static constexpr std::size_t kFirstBlock = 16384;  ///< bytes: enough for the answer about one device
 
   struct Object {
-    std::string_view bytes;           ///< all of a leaf; of a container what comes before its references
+    std::string_view bytes;           ///< all of a leaf; the part of a container before its references
     std::span<Reference> references;  ///< of a container
   };
 
@@ -97,7 +97,7 @@ class Writer {
   std::pmr::monotonic_buffer_resource memory_{kFirstBlock};
   std::vector<Object> objects_;
   std::pmr::unordered_map<std::string_view, Reference> leaves_{&memory_};
-  std::string leaf_;  ///< the bytes of the one that is added
+  std::string leaf_;  ///< the bytes of the leaf that is being added
   Reference added_ = 0;
   std::size_t sharedBytes_ = 0;
   std::size_t depth_ = 0;

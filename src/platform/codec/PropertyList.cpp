@@ -16,7 +16,7 @@ namespace {
 struct Layout {
   std::size_t mark;  ///< length of the byte order mark
   std::size_t unitSize;
-  std::size_t lowByte;  ///< place of the low byte in a unit
+  std::size_t lowByte;  ///< position of the low byte in a unit
 };
 
 Layout layoutOf(std::string_view bytes) {

@@ -164,7 +164,7 @@ void ActivityTable::noticeSystemVersion(const std::string& identifier,
   const bool isRecorded = found != records_.end();
   const bool isAnother = version && isRecorded && found->second != Value(*version);
   if (isRecorded && !isAnother && !isOwed) return;
-  // A version that cannot be found out leaves an empty record, so that the occasion does not come back.
+  // An unknown version is recorded as the previous one, or as empty, so that the occasion does not come back.
   const std::string recorded = isRecorded ? found->second.stringIfAny().value_or("") : "";
   noticeOccasion(identifier, OccasionKind::Upgrade, version.value_or(recorded));
 }
