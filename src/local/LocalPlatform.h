@@ -38,19 +38,19 @@ namespace kvr {
 
 /// The platform on this machine, as the environment describes it.
 ///
-/// Built on the main thread, before the main loop runs. At the end, after the loop: `end`, then destroy.
+/// Build it on the main thread before the main loop runs. After the loop: call `end`, then destroy.
 struct LocalPlatform {
-  /// `busLost` is called on the bus thread, see `LocalServiceListeners`.
+  /// `busLost` is called on the bus thread; see `LocalServiceListeners`.
   LocalPlatform(EventLoop& mainLoop, std::unique_ptr<LocalLog> log, std::function<void()> busLost);
 
-  /// From here on nothing new is begun of the agent's own accord. To be called before the loop is left, which
-  /// lets go of what was delayed.
+  /// From here on the agent starts nothing new of its own accord. Call it before leaving the loop, which
+  /// drops delayed work.
   void beginEnding();
-  /// Fails what waits for remote answers, lets running work finish and send its replies. False when some work
-  /// did not finish within `limit` seconds; nothing must be destroyed then.
+  /// Fails open requests, waits until running work has finished and sends the replies. False when some work
+  /// did not finish within `limit` seconds; then destroy nothing.
   bool end(double limit);
 
-  // In this order: what stands further down uses what stands above.
+  // The order matters: a member uses only those above it.
   const std::unique_ptr<LocalLog> log;
   LocalClock clock;
   LocalRandom random;

@@ -7,25 +7,25 @@
 
 namespace kvr {
 
-// Names of errors that a call is answered with.
+// The D-Bus error names that calls are answered with.
 inline constexpr const char* kBusErrorFailed = SD_BUS_ERROR_FAILED;
 inline constexpr const char* kBusErrorRefused = SD_BUS_ERROR_ACCESS_DENIED;
 inline constexpr const char* kBusErrorTooMany = SD_BUS_ERROR_LIMITS_EXCEEDED;
 
-/// One call of an interface, checked against it.
+/// One call of an interface; its signature and arguments have been checked.
 struct BusCall {
   BusMessageRef message;
   std::size_t index = 0;  ///< of the method in its interface
   std::shared_ptr<const Value::Array> arguments;
-  std::size_t bytes = 0;  ///< of the texts among the arguments
+  std::size_t bytes = 0;  ///< total length of the text arguments
 };
 
-/// Takes a call apart. An error's domain is the bus error's name to answer with. All that is kept of the
-/// message is bounded: no argument of this interface needs a long text.
+/// Parses and checks a call. The error's domain is the D-Bus error name to answer with. Texts are limited to
+/// 1 MiB, since no method of this interface needs a longer one.
 Result<BusCall> readBusCall(sd_bus_message* message, const ServiceInterface& interface);
 
-/// Answers with a value of one of the types of BusCodec.h; when it cannot be sent, with an error, which is
-/// also returned. Nothing is sent to a caller who expects no reply.
+/// Answers with a value of one of the types of BusCodec.h. If that cannot be sent, the caller gets an error,
+/// which is also returned. Sends nothing to a caller that expects no reply.
 std::optional<Error> replyToBusCall(sd_bus_message* call, const char* type, const Value& value);
 void failBusCall(sd_bus_message* call, const char* errorName, const std::string& message);
 

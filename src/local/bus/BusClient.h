@@ -20,7 +20,8 @@
 
 namespace kvr {
 
-/// Stands between the connections and the delegate, which may go while one is being decided.
+/// Lets connections ask the delegate, which may be removed on another thread at any time; removing it waits
+/// for a decision under way.
 class DelegateGate {
  public:
   void set(ServiceListenerDelegate* delegate) {
@@ -40,16 +41,15 @@ class DelegateGate {
 
 /// One connection to the bus that has called the service.
 ///
-/// Its first call starts its admission, and until that is decided its calls wait:
+/// Its first call starts the admission. Until that is decided, its calls wait:
 ///
-///   1. its going is watched, and the bus is asked for its user and process;
-///   2. on the listener's queue, the process is held, its program is looked up and the delegate is asked; a
-///   peer of another user, or one of whom that cannot be told, holds no entitlement;
-///   3. if the process still lives then, and the bus, asked once more, still knows the connection, it is
-///   admitted.
+///   1. the bus is asked to report when the connection leaves, and for its user and process;
+///   2. on the listener's queue, a handle on the process is opened, its program is looked up and the delegate
+///      is asked. A peer of another user, or one whose identity cannot be established, has no entitlements;
+///   3. if the process is still alive and the bus, asked again, still knows the connection, it is admitted.
 ///
-/// An admitted client's calls are handed in their order to a queue of its own. A refused one's are answered
-/// with an error until it goes. Everything runs on the bus thread but what says otherwise.
+/// The calls of an admitted client go in order to its own serial queue. The calls of a refused client are
+/// answered with an error until it leaves. Everything runs on the bus thread unless noted otherwise.
 class BusClient : public ServiceConnection, public std::enable_shared_from_this<BusClient> {
  public:
   /// What all clients of a service share.
@@ -61,28 +61,28 @@ class BusClient : public ServiceConnection, public std::enable_shared_from_this<
     WorkQueueRef listenerQueue;
     std::shared_ptr<DelegateGate> delegate;
     ServiceInterface interface;
-    /// Calls that wait or are being served. Any thread.
+    /// Calls that wait or are being served, of all clients. Any thread.
     std::shared_ptr<std::atomic<std::size_t>> openCalls;
-    /// Lets go of a client that has left the bus. On the bus thread.
+    /// Drops a client that has left the bus. On the bus thread.
     std::function<void(const std::string& uniqueName)> forget;
-    /// The bytes of the open calls' arguments. On the bus thread, as is what follows.
+    /// The bytes of the open calls' arguments, of all clients. This and what follows: on the bus thread.
     std::shared_ptr<std::size_t> openBytes = std::make_shared<std::size_t>(0);
     std::shared_ptr<UnreadReplies> unread = nullptr;
   };
 
   BusClient(std::shared_ptr<const Context> context, std::string uniqueName);
 
-  /// Starts the admission; an error when the bus is not there to be asked.
+  /// Starts the admission. An error when the bus cannot be asked.
   std::optional<Error> begin(sd_bus* bus);
   /// Takes one call of the service's interface.
   void receive(sd_bus_message* call);
-  /// The client has gone: nothing of it is kept, and what is answered from now on is dropped.
+  /// The client has left: drops its calls and ignores answers from now on.
   void close();
-  /// The answer to call number `call`, or nothing when there will be none.
+  /// Answers call number `call`; without a value, with an error that says that no answer came.
   void answer(std::uint64_t call, const std::optional<Value>& value);
 
-  // For the delegate, on the listener's queue and only while it decides, `resume` at any time. The one
-  // interface that can be exported is the listener's.
+  // For the delegate: on the listener's queue and only while it decides; `resume` at any time. Only the
+  // listener's interface can be exported.
   Value valueForEntitlement(std::string_view entitlement) const override;
   std::int32_t processIdentifier() const override { return process_; }
   void setExportedInterface(const ServiceInterface& interface) override;
@@ -114,17 +114,17 @@ class BusClient : public ServiceConnection, public std::enable_shared_from_this<
   std::string refusal_;
   std::deque<BusCall> waiting_;
   std::map<std::uint64_t, BusCall> open_;  ///< by number
-  std::size_t bytes_ = 0;                  ///< of both
+  std::size_t bytes_ = 0;                  ///< of the arguments in both
   std::uint64_t lastCall_ = 0;
   BusSlotRef watch_;
   BusSlotRef question_;
   bool isDeciding_ = false;
   bool isResumed_ = false;
 
-  // While `isDeciding_`, the listener queue's; else the bus thread's.
+  // Used on the listener's queue while `isDeciding_`, else on the bus thread.
   std::int32_t process_ = 0;
   std::optional<FileIdentity> executable_;
-  std::string distrust_;  ///< why the peer is not known for certain
+  std::string distrust_;  ///< why the peer's identity is in doubt; empty if it is not
   mutable std::string missingEntitlement_;
   bool isExported_ = false;
   std::shared_ptr<ServiceObject> object_;

@@ -14,11 +14,11 @@ namespace kvr {
 
 class EventLoop;
 
-/// The way to a bus thread, for whoever may outlive it.
+/// Posts work to a bus thread; may outlive it.
 class BusThread {
  public:
-  /// Runs `work` on the bus thread, in the order posted; once that thread has ended, it is let go where it
-  /// is. Any thread.
+  /// Runs `work` on the bus thread, in the order posted. Once that thread has ended, `work` is dropped. Any
+  /// thread.
   void post(Work work);
 
  private:
@@ -29,21 +29,21 @@ class BusThread {
   EventLoop* loop_ = nullptr;
 };
 
-/// A connection to the session bus on a thread of its own, the only one that touches it.
+/// A connection to the session bus with its own thread, the only one that uses it.
 ///
-/// The thread sleeps until something is posted or a message arrives. What lives on the bus (slots, messages)
-/// must be let go before the connection ends.
+/// The thread sleeps until something is posted or a message arrives. Release every slot and message before
+/// the connection is destroyed.
 class BusConnection {
  public:
-  /// Starts the thread. `lost` is called on it, once, when the bus cannot be reached or goes away.
+  /// Starts the thread. `lost` is called once, on that thread, when the bus cannot be reached or goes away.
   BusConnection(Log& log, std::function<void(const Error&)> lost);
-  /// Runs what was posted, sends what waits to be sent (for some seconds at most) and ends the thread.
+  /// Runs posted work, sends queued messages (for at most 2 seconds) and ends the thread.
   ~BusConnection();
   BusConnection(const BusConnection&) = delete;
   BusConnection& operator=(const BusConnection&) = delete;
 
   const std::shared_ptr<BusThread>& thread() const { return thread_; }
-  /// The bus, connected at the first use; null once it is lost. On the bus thread only.
+  /// The bus; connects on first use. Null once the bus is lost. On the bus thread only.
   sd_bus* bus();
 
  private:

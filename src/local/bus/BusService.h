@@ -8,7 +8,7 @@
 
 namespace kvr {
 
-/// A service on the bus: a well-known name, the object of the same path, and whoever has called it.
+/// A service on the bus: a well-known name, the object at the matching path, and its clients.
 ///
 /// Everything happens on the bus thread.
 class BusService : public std::enable_shared_from_this<BusService> {
@@ -17,18 +17,17 @@ class BusService : public std::enable_shared_from_this<BusService> {
     BusConnection& connection;
     Log& log;
     std::string name;
-    /// The name could not be had, or is lost.
+    /// Called when the name cannot be acquired or is lost.
     std::function<void(const Error&)> failed;
   };
 
   BusService(Settings settings, BusClient::Context context);
 
-  /// Offers the object and takes the name.
+  /// Exports the object and requests the name.
   void open();
-  /// Gives the name up. When no call can come through it any more, later ones are answered with an error and
-  /// `done` is run.
+  /// Releases the name. Once no more calls can arrive through it, runs `done`; later calls get an error.
   void beginEnding(Work done);
-  /// Lets go of every client and of all that is on the bus.
+  /// Drops every client and releases everything on the bus.
   void close();
 
  private:

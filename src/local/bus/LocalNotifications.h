@@ -17,15 +17,16 @@ namespace kvr {
 /// Notifications as signals on the session bus, which anyone on it may send:
 /// `com.tarsil.NotificationCenter.Posted` from `/com/tarsil/NotificationCenter`, with the name.
 ///
-/// The bus is asked for those that somebody has registered for. A handler is called for each one at once. Of
-/// a *row*, notifications without a second's pause, this holds for the first sixteen. What comes on top of
-/// them within half a second of the last call is a flood: one call then stands for all of it. So the last
-/// notification is always followed by a call, and a flood costs two a second.
+/// Only the notifications that somebody has registered for are subscribed to on the bus. A handler is called
+/// at once for each. A *row* is a series of notifications with no pause of a second: its first sixteen are
+/// handled one by one. Any further one within half a second of the last call counts as a flood, and one call
+/// stands for all of it. So a flood costs two calls a second, and a call always follows the last
+/// notification.
 class LocalNotifications : public Notifications {
  public:
-  static constexpr std::size_t kMostInARow = 16;  ///< that are surely handled each on its own
-  static constexpr double kPause = 1;             ///< seconds, after which a new row begins
-  static constexpr double kInterval = 0.5;        ///< seconds, from one call of a flood to the next
+  static constexpr std::size_t kMostInARow = 16;  ///< notifications of a row, each handled on its own
+  static constexpr double kPause = 1;             ///< seconds without one, after which a new row begins
+  static constexpr double kInterval = 0.5;        ///< seconds from one call to the next during a flood
 
   /// The bus must outlive this.
   LocalNotifications(BusConnection& bus, WorkQueues& queues, Log& log);
@@ -35,9 +36,9 @@ class LocalNotifications : public Notifications {
 
   Token registerFor(const std::string& name, std::function<void()> handler) override;
   void cancel(Token token) override;
-  /// Sends a notification to everyone on the bus, registrations here included.
+  /// Sends a notification to everyone on the bus, including the registrations of this process.
   void post(const std::string& name);
-  /// Lets all handlers go.
+  /// Drops all handlers.
   void beginEnding();
 
  private:

@@ -16,32 +16,33 @@ namespace kvr {
 
 class BusService;
 
-/// Services on the session bus: a listener's name is a well-known name, its object has the path that the name
-/// spells, and a connection is a unique name on the bus.
+/// Services on the session bus. A listener's name is a well-known name, its object has the path that the name
+/// spells, and each unique name on the bus is one connection.
 ///
-/// All of it shares one connection to the bus, which has a thread of its own and is opened when the first
-/// listener is resumed. Listeners must be gone before this is.
+/// All listeners share one connection to the bus, with its own thread, opened when the first listener is
+/// resumed. Destroy the listeners first.
 class LocalServiceListeners : public ServiceListeners {
  public:
-  /// `busLost` is called once, on the bus thread, when the bus cannot be reached, is lost, or does not give
-  /// or leave a listener its name; an error line has said so then. It must not wait for this object.
+  /// `busLost` is called once, on the bus thread, when the bus cannot be reached, is lost, or refuses a
+  /// listener its name or takes it away; an error line has been logged by then. It must not wait for this
+  /// object.
   LocalServiceListeners(WorkQueues& queues, Log& log, const LocalEntitlements& entitlements,
                         std::function<void()> busLost);
-  /// What has been answered is sent, if the bus takes it within some seconds.
+  /// Sends the replies already given, for as long as the bus takes them within 2 seconds.
   ~LocalServiceListeners() override;
 
   std::unique_ptr<ServiceListener> newListener(std::string name) override;
 
-  /// Gives the names up, so that a new call starts or finds another agent, and returns when every call that
-  /// came through them is on its way; later ones are answered with an error. Waits for the bus some seconds
-  /// at most. Not on the bus thread.
+  /// Releases the names, so that a new call starts or reaches another agent. Returns once every call that
+  /// came through them has been taken in; later calls get an error. Waits for the bus a few seconds at most.
+  /// Not on the bus thread.
   void beginEnding();
-  /// The connection that all of it shares, for others that live on the bus and end before this does.
+  /// The shared connection, for other users of the bus; they must be destroyed before this object.
   BusConnection& connection() { return connection_; }
   /// Whether the bus, or the service manager behind it, starts an agent when somebody calls this name. Waits
-  /// for the bus some seconds at most. Not on the bus thread.
+  /// for the bus a few seconds at most. Not on the bus thread.
   bool isActivatable(const std::string& name);
-  /// How many calls have come and are not answered yet. Any thread.
+  /// How many calls have not been answered yet. Any thread.
   std::size_t openCalls() const { return *openCalls_; }
 
  private:
@@ -56,8 +57,8 @@ class LocalServiceListeners : public ServiceListeners {
   const LocalEntitlements& entitlements_;
   std::function<void()> busLost_;
   const std::shared_ptr<std::atomic<std::size_t>> openCalls_ = std::make_shared<std::atomic<std::size_t>>(0);
-  std::vector<std::shared_ptr<BusService>> services_;  ///< the bus thread's
-  BusConnection connection_;                           ///< ends before the rest
+  std::vector<std::shared_ptr<BusService>> services_;  ///< used on the bus thread
+  BusConnection connection_;                           ///< destroyed first
 };
 
 }  // namespace kvr

@@ -8,14 +8,15 @@
 
 namespace kvr {
 
-/// Which program a process runs, held to the very process: its number may be taken by another once it has
-/// ended.
+/// Which program a process runs, bound to that very process rather than to its number, which another process
+/// may get once this one has ended.
 ///
-/// The process is held before its executable is looked up, so as long as `isAlive`, everything that was
-/// learnt by its number in between was learnt of this process.
+/// The process handle (pidfd) is opened before the executable is looked up. So while `isAlive` is true,
+/// everything learnt by the number in between is about this process.
 class PeerIdentity {
  public:
-  /// An error in domain "process" when there is no such process or its program cannot be told. Any thread.
+  /// An error in domain "process" when there is no such process or its program cannot be determined. Any
+  /// thread.
   static Result<PeerIdentity> of(std::int32_t process);
 
   const FileIdentity& executable() const { return executable_; }

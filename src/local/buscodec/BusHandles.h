@@ -12,7 +12,7 @@
 
 namespace kvr {
 
-// Owners of sd-bus objects. None of them is thread-safe: a bus and everything of it stays on one thread.
+// Owning handles of sd-bus objects. None is thread-safe: use a bus and everything of it on one thread.
 
 struct BusRelease {
   void operator()(sd_bus* bus) const { sd_bus_close_unref(bus); }
@@ -22,15 +22,15 @@ struct BusRelease {
 
 using BusRef = std::unique_ptr<sd_bus, BusRelease>;
 using BusMessageRef = std::unique_ptr<sd_bus_message, BusRelease>;
-/// A match, filter, object or pending call; letting it go cancels it.
+/// A match, filter, object or pending call; destroying it cancels it.
 using BusSlotRef = std::unique_ptr<sd_bus_slot, BusRelease>;
 
 inline constexpr const char* kBusName = "org.freedesktop.DBus";
 inline constexpr const char* kBusPath = "/org/freedesktop/DBus";
 
-/// Whether a reply is the bus's own, or this process's about a bus that is gone. Many buses hand on replies
-/// that nobody asked for, and replies are told apart by a number that is easily guessed: whoever asks the bus
-/// must not take another peer's word for it.
+/// Whether a reply comes from the bus itself, or from this process about a bus that is gone. Many buses
+/// forward unrequested replies, and a reply is matched to its call by an easily guessed number. So the answer
+/// to a question to the bus must not be believed from any other peer.
 inline bool isFromBus(sd_bus_message* reply) {
   const char* const sender = sd_bus_message_get_sender(reply);
   return sender == nullptr || std::string_view(sender) == kBusName;
@@ -52,7 +52,7 @@ class BusError {
   sd_bus_error error_{};
 };
 
-/// Runs what a callback of sd-bus is there for and returns its result; nothing may leave such a callback.
+/// Runs the body of an sd-bus callback and returns its result; no exception may leave such a callback.
 template <class Do>
 int guardedBusCallback(const Do& work) {
   try {
@@ -62,7 +62,7 @@ int guardedBusCallback(const Do& work) {
   }
 }
 
-/// What a negative result of sd-bus means; `what` could not be done.
+/// Describes a negative result of sd-bus; `what` says what failed.
 inline Error busError(int result, const std::string& what) {
   return {"bus", -result, what + ": " + std::generic_category().message(-result)};
 }

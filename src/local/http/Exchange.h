@@ -54,8 +54,8 @@ inline bool isLoopback(const sockaddr& address) {
   return false;
 }
 
-/// Whether a hop that ended so may have been turned away: by who has too many connections already, or by this
-/// process, which has no descriptor left for another one.
+/// Whether a hop that failed in this way may have been refused for lack of resources: by a server with too
+/// many connections, or by this process, which has no descriptor left.
 inline bool mayBeTurnedAway(CURLcode code) {
   return code == CURLE_COULDNT_CONNECT || code == CURLE_SSL_CONNECT_ERROR || code == CURLE_GOT_NOTHING ||
          code == CURLE_SEND_ERROR || code == CURLE_RECV_ERROR;
@@ -65,14 +65,14 @@ inline bool isRedirect(long status) {
   return status == 301 || status == 302 || status == 303 || status == 307 || status == 308;
 }
 
-/// One request and what has come of it so far; with its redirects it may take several hops.
+/// One request and its state; following redirects takes several hops.
 class Exchange {
  public:
   Exchange(HTTPRequest request, HTTPTransfers::Done done)
       : request_(std::move(request)), done_(std::move(done)), deadline_(deadlineAfter(request_.timeout)) {}
   Exchange(const Exchange&) = delete;
   Exchange& operator=(const Exchange&) = delete;
-  /// However it ends, it is answered.
+  /// Fails the exchange if it has not been answered.
   ~Exchange() {
     try {
       fail(CURLE_OUT_OF_MEMORY, "given up");
@@ -83,19 +83,18 @@ class Exchange {
   Clock::time_point deadline() const { return deadline_; }
   CURL* handle() const { return handle_.get(); }
 
-  /// Makes the handle ready for the next hop. Throws when memory is short.
+  /// Sets the handle up for the next hop. Throws when memory is short.
   void prepare();
-  /// Takes in how a hop went. True when there is to be another one; otherwise the exchange has been answered.
+  /// Handles the end of a hop. True when another hop follows; otherwise the exchange has been answered.
   bool goOn(CURLcode code);
-  /// Whether a hop that was turned away may be made again, which is so once, and only if nothing of the
-  /// request was sent.
+  /// Whether a refused hop may be repeated: once only, and only if nothing of the request was sent.
   bool takeSecondTry();
   void fail(CURLcode code, std::string message) {
     answer({0, std::nullopt, failure(code, std::move(message))});
   }
 
  private:
-  // What libcurl calls.
+  // Callbacks for libcurl.
   static std::size_t takeBody(char* bytes, std::size_t one, std::size_t size, void* exchange) noexcept;
   static std::size_t takeHeader(char* bytes, std::size_t one, std::size_t size, void* exchange) noexcept;
   static curl_socket_t openSocket(void* exchange, curlsocktype purpose, curl_sockaddr* address) noexcept;
@@ -128,9 +127,9 @@ class Exchange {
   int redirects_ = 0;
   bool hadSecondTry_ = false;
   std::string body_;
-  std::optional<long> writtenBefore_;  ///< bytes for a proxy, before the request; once it begins
+  std::optional<long> writtenBefore_;  ///< bytes written (to a proxy) before the request; set at its start
   std::size_t headerBytes_ = 0;
-  std::optional<Error> refusal_;  ///< why we broke the hop off
+  std::optional<Error> refusal_;  ///< why this side ended the hop
   bool isBodyTooLarge_ = false;
   std::array<char, CURL_ERROR_SIZE> errorText_{};
 };
@@ -158,7 +157,7 @@ inline void Exchange::prepare() {
 
 inline void Exchange::setSafety() {
   set(CURLOPT_NOSIGNAL, 1L);
-  // A name server that hangs holds up nobody but who asked it.
+  // Cleaning up does not wait for a name server that hangs.
   set(CURLOPT_QUICK_EXIT, 1L);
   set(CURLOPT_PROTOCOLS_STR, url_.scheme().c_str());
   set(CURLOPT_SSLVERSION, static_cast<long>(CURL_SSLVERSION_TLSv1_2));
@@ -195,7 +194,7 @@ inline void Exchange::setHeaders() {
     static_cast<void>(headers_.release());
     headers_.reset(longer);
   };
-  // Without a value, a name and a colon take a header of libcurl's own away.
+  // A name and a colon without a value remove one of libcurl's own headers.
   for (const auto* unasked : {"Accept", "Content-Type", "Expect"}) {
     if (!request_.headers.value(unasked)) append(std::string(unasked) + ":");
   }
@@ -225,7 +224,7 @@ inline std::size_t Exchange::takeBody(char* bytes, std::size_t, std::size_t size
 inline std::size_t Exchange::takeHeader(char*, std::size_t, std::size_t size, void* exchange) noexcept {
   auto& self = *static_cast<Exchange*>(exchange);
   try {
-    // Informational responses, trailers and a proxy's answers count too.
+    // Informational responses, trailers and a proxy's responses count too.
     self.headerBytes_ += size;
     if (self.headerBytes_ <= kMaximumHeaders) return size;
     self.refusal_ = failure(CURLE_FILESIZE_EXCEEDED, "the headers are larger than 256 KiB");
@@ -241,9 +240,9 @@ inline long Exchange::bytesWritten() const {
   return count;
 }
 
-// On a connection that was kept alive and breaks before an answer, libcurl sends a request once more of its
-// own accord, over another connection. The service may have had it already, so it is stopped wherever it
-// takes one up; what was not sent at all may go on.
+// When a kept-alive connection breaks before an answer, libcurl sends the request again over another one. The
+// service may already have received it. So both callbacks below stop libcurl if anything was sent; a request
+// of which nothing was sent may go on.
 
 inline curl_socket_t Exchange::openSocket(void* exchange, curlsocktype, curl_sockaddr* address) noexcept {
   auto& self = *static_cast<Exchange*>(exchange);
@@ -277,7 +276,7 @@ inline int Exchange::beginRequest(void* exchange, char*, char*, int, int) noexce
   }
 }
 
-/// Plain http is for loopback addresses, and nobody elsewhere says what is asked there.
+/// Plain http is allowed for loopback addresses only, and no other host may redirect there.
 inline bool Exchange::mayGoTo(const URL& target) const {
   return target.scheme() == "https" ||
          (target.scheme() == "http" && target.isLoopback() && url_.isLoopback());
@@ -319,7 +318,7 @@ inline void Exchange::follow(long status, const char* location) {
   const bool becomesGet =
       (status == 303 && request_.method != "HEAD") || (status < 303 && request_.method == "POST");
   if (leavesHost) {
-    // What identifies the user is for the host that was asked.
+    // Headers that identify the user go only to the host that was asked.
     HTTPHeaders kept;
     for (const auto* harmless : {"Accept", "Cache-Control", "Pragma", "User-Agent"}) {
       kept.set(harmless, request_.headers.value(harmless));

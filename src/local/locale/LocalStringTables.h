@@ -8,8 +8,8 @@
 
 namespace kvr {
 
-/// Tables below "Resources" of the device root, BUNDLE/LANGUAGE/TABLE.plist; those installed with the agent
-/// stand in for the ones that are missing there.
+/// Tables below "Resources" of the device root, BUNDLE/LANGUAGE/TABLE.plist. Tables missing there are taken
+/// from those installed with the agent.
 class LocalStringTables : public StringTables {
  public:
   LocalStringTables(const DeviceRoot& root, const UserLocale& locale,
@@ -18,8 +18,8 @@ class LocalStringTables : public StringTables {
   std::string localizedString(const std::string& bundle, const std::string& table, const std::string& key,
                               const std::string& defaultValue) const override;
 
-  /// Where this program's resources are, by where it is itself: share/kvragent/Resources of the installation,
-  /// or of the build.
+  /// Where this program's resources are, relative to the program itself: share/kvragent/Resources of the
+  /// installation or of the build.
   static std::string directoryOfThisProgram();
 
  private:

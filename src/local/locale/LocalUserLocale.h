@@ -9,17 +9,17 @@
 
 namespace kvr {
 
-/// The locale of "Locale.plist", else that of the environment (LC_ALL, LC_MESSAGES, LANG); the time zone of
-/// the environment (TZ) or the system.
+/// The locale from "Locale.plist", or else from the environment (LC_ALL, LC_MESSAGES, LANG); the time zone
+/// from the environment (TZ) or the system.
 class LocalUserLocale : public UserLocale {
  public:
   LocalUserLocale(const DeviceRoot& root, Log& log) : root_(root), log_(log) {}
 
   std::string preferredIdentifier() const override;
-  /// Whether it is "Locale.plist" that names the locale.
+  /// Whether "Locale.plist" names the locale.
   bool isStatedByDevice() const { return statedByDevice().has_value(); }
   long secondsFromGMT(Date date) const override;
-  /// Plain digits when the library that knows the locales cannot be had, which is one error line.
+  /// Returns plain digits if the locale library cannot be loaded, which is logged once as an error.
   std::string decimalString(std::uint64_t number) const override;
 
  private:

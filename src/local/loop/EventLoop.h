@@ -16,13 +16,13 @@ struct sd_event_source;
 
 namespace kvr {
 
-/// One thread's event loop: what is posted from any thread, timers, and whatever is attached to `event()`.
+/// The event loop of one thread: runs posted work, timers and whatever is attached to `event()`.
 ///
-/// Built, run and destroyed on one thread. With nothing posted and no timer due it does not wake up. An
-/// exception that leaves a piece of work ends that piece only and goes to the failure handler.
+/// Built, run and destroyed on one thread. It sleeps while nothing is posted and no timer is due. An
+/// exception that leaves a piece of work ends only that piece and goes to the failure handler.
 class EventLoop {
  public:
-  /// Names one delayed piece of work: boot time due in microseconds, and a number of its own.
+  /// Identifies one delayed piece of work: the boot time in microseconds when it is due, and a unique number.
   using TimerKey = std::pair<std::uint64_t, std::uint64_t>;
 
   EventLoop();
@@ -30,24 +30,24 @@ class EventLoop {
   EventLoop(const EventLoop&) = delete;
   EventLoop& operator=(const EventLoop&) = delete;
 
-  /// For attaching sources; only on the loop's own thread.
+  /// For attaching event sources; only on the loop's own thread.
   sd_event* event() const { return event_; }
-  /// Takes what exceptions say that left a piece of work; without a handler the process terminates. Only on
-  /// the loop's own thread.
+  /// Called with the text of an exception that left a piece of work. Without a handler the process
+  /// terminates. Only on the loop's own thread.
   void setFailureHandler(std::function<void(const std::string& what)> handler);
   /// Runs `work` on the loop's thread, in the order posted. Any thread.
   void post(Work work);
-  /// Runs `work` on the loop's thread after `delay` seconds of boot time (suspend included). A delay of more
-  /// than 10^13 seconds never ends. Any thread.
+  /// Runs `work` on the loop's thread after `delay` seconds of boot time (time in suspend counts). A delay of
+  /// more than 10^13 seconds never ends. Any thread.
   TimerKey after(double delay, Work work);
-  /// Releases delayed work that has not begun; no effect on other. Any thread.
+  /// Drops delayed work that has not begun; no effect otherwise. Any thread.
   void cancel(const TimerKey& key);
-  /// How much delayed work has not begun. Any thread.
+  /// Number of delayed pieces of work that have not begun. Any thread.
   std::size_t delayed() const;
-  /// How much posted work has not begun. Any thread.
+  /// Number of posted pieces of work that have not begun. Any thread.
   std::size_t pending() const;
-  /// Runs until `exit`; returns its status. What was posted or delayed and has not run is released then, and
-  /// what is handed over later is released at once. Throws std::system_error when the kernel refuses.
+  /// Runs until `exit` and returns its status. Posted or delayed work that has not run is dropped then, and
+  /// later work is dropped at once. Throws std::system_error when the kernel refuses.
   int run();
   /// Ends `run` once everything posted before has run. Any thread.
   void exit(int status);

@@ -11,19 +11,19 @@
 
 namespace kvr {
 
-/// Notices that a file may have changed, come or gone.
+/// Reports that a file may have changed, appeared or gone.
 ///
-/// The file's directory is watched, not asked again and again; one that does not exist yet is waited for in
-/// the nearest one that does. A file that is written in place counts once it is closed. Built and destroyed
-/// on the loop's thread.
+/// Watches the file's directory with inotify, without polling. If that directory does not exist yet, the
+/// nearest existing one above it is watched. A file that is written in place counts once it is closed. Built
+/// and destroyed on the loop's thread.
 class FileWatch {
  public:
-  /// Told how often the file has been written, or put in place, meanwhile: 0 when it has gone, or may be
-  /// about to be written.
+  /// `writes`: how often the file has been written or moved into place since the last call; 0 when it has
+  /// gone or may be about to be written.
   using Changed = std::function<void(std::size_t writes)>;
 
-  /// `changed` is posted to the loop; it may be called without a change. Where the kernel refuses, which is
-  /// one error line, nothing is noticed.
+  /// `changed` is posted to the loop; it may be called without a change. If the kernel refuses the watch, one
+  /// error line is logged and no change is reported.
   FileWatch(EventLoop& loop, Log& log, std::filesystem::path path, Changed changed);
   ~FileWatch();
   FileWatch(const FileWatch&) = delete;
@@ -39,7 +39,7 @@ class FileWatch {
   Descriptor inotify_;
   sd_event_source* source_ = nullptr;
   int watch_ = -1;
-  std::filesystem::path awaited_;  ///< the file, or the missing directory that leads to it
+  std::filesystem::path awaited_;  ///< the file, or the missing directory on the way to it
 };
 
 }  // namespace kvr

@@ -11,15 +11,15 @@
 
 namespace kvr {
 
-/// The queues on real threads: the main queue on the main event loop, all others on one pool of threads.
-/// Delays are timers of the main event loop. With nothing to do, nothing wakes up.
+/// Work queues on real threads: the main queue runs on the main event loop, all others share one thread pool.
+/// Delays are timers of the main event loop. Nothing wakes up while there is nothing to do.
 ///
-/// At the end: `beginEnding`, leave the loop, `drain`, destroy.
+/// To end: `beginEnding`, leave the loop, `drain`, destroy.
 class LocalWorkQueues : public WorkQueues {
  public:
-  /// On the loop's thread. Loop and log must outlive this.
+  /// On the loop's thread. The loop and the log must outlive this.
   LocalWorkQueues(EventLoop& main, Log& log);
-  /// Lets running items finish, joins all threads and releases queued work. On the loop's thread.
+  /// Lets running items finish, joins all threads and drops queued work. On the loop's thread.
   ~LocalWorkQueues() override;
   LocalWorkQueues(const LocalWorkQueues&) = delete;
   LocalWorkQueues& operator=(const LocalWorkQueues&) = delete;
@@ -31,13 +31,13 @@ class LocalWorkQueues : public WorkQueues {
   std::shared_ptr<Timer> newRepeatingTimer(double interval, WorkQueueRef queue, Work work) override;
   std::shared_ptr<Signal> newSignal() override;
 
-  /// Items queued or running, but for the one that runs on the main thread (which may be the one that asks).
-  /// Delayed ones do not count until they are due.
+  /// Items queued or running, except the one running on the main thread (which may be the caller). Delayed
+  /// items do not count until they are due.
   std::size_t outstanding() const;
-  /// Ends all waits, and every later one at once.
+  /// Ends all waits for signals; later waits end at once.
   void beginEnding();
-  /// Waits until no item of any queue but the main one is queued or running, and joins the threads then:
-  /// true. False when `limitSeconds` was too short; everything goes on as it was.
+  /// Waits until no item is queued or running on any queue but the main one, then joins the threads. False
+  /// when that takes more than `limitSeconds`; then everything goes on as before.
   bool drain(double limitSeconds);
 
  private:

@@ -18,16 +18,15 @@ namespace kvr {
 
 /// The threads that run all queues but the main one.
 ///
-/// At most `kBusyThreads` (or one a core, if there are more) run items; a thread that waits inside an item
-/// does not count, another takes its place, however many wait. A thread with nothing to do ends, but for
-/// `kIdleThreads` that sleep until they are needed. Any thread may call any operation.
+/// At most `kBusyThreads` (or one per core, if that is more) run items. A thread that waits inside an item
+/// does not count: another one takes its place, however many wait. A thread with nothing to do ends, except
+/// for `kIdleThreads` that sleep until needed. All operations can be called from any thread.
 class WorkPool : public std::enable_shared_from_this<WorkPool> {
  public:
   static constexpr std::size_t kBusyThreads = 4;
   static constexpr std::size_t kIdleThreads = 2;
 
-  /// Hands `retry` work that should be run on some other thread after a moment; used when no thread could be
-  /// made.
+  /// Runs the given work on a thread outside the pool after a moment; used when no thread could be created.
   using Retry = std::function<void(Work)>;
 
   WorkPool(Log& log, Retry retry);
@@ -38,20 +37,20 @@ class WorkPool : public std::enable_shared_from_this<WorkPool> {
 
   WorkQueueRef newSerialQueue();
   WorkQueueRef newConcurrentQueue(Priority priority);
-  /// A signal that can be waited for on the pool's threads and others. `alarm` calls its work after so many
-  /// seconds of boot time, and what it returns takes that back.
+  /// A signal that can be waited for on the pool's threads and others. `alarm` runs the work after `delay`
+  /// seconds of boot time and returns a function that cancels it.
   using Alarm = std::function<std::function<void()>(double delay, Work work)>;
   std::shared_ptr<Signal> newSignal(Alarm alarm);
 
   /// Items queued or running.
   std::size_t outstanding() const;
-  /// Ends all waits, and every later one at once.
+  /// Ends all waits; later waits end at once.
   void beginEnding();
-  /// Waits until no item is queued or running and stops then; false when that took longer than `limit`
-  /// seconds.
+  /// Waits until no item is queued or running, then stops. False, without stopping, when that takes more than
+  /// `limit` seconds.
   bool drain(double limit);
-  /// Ends all waits, lets running items finish, joins the threads and releases what is queued. What is handed
-  /// over later is released at once. Not on one of the pool's own threads.
+  /// Ends all waits, lets running items finish, joins the threads and drops queued items. Later items are
+  /// dropped at once. Not on one of the pool's own threads.
   void stop();
 
  private:
@@ -88,8 +87,8 @@ class WorkPool : public std::enable_shared_from_this<WorkPool> {
   std::size_t outstanding_ = 0;
 
   std::size_t threads_ = 0;
-  std::size_t idle_ = 0;            ///< threads that sleep and have not been called
-  std::size_t called_ = 0;          ///< threads that have been called and not woken up yet
+  std::size_t idle_ = 0;            ///< sleeping threads that have not been notified
+  std::size_t called_ = 0;          ///< notified threads that have not woken up yet
   std::size_t blocked_ = 0;         ///< threads that wait inside an item
   std::optional<pthread_t> ended_;  ///< the thread that ended last; the next one to end joins it
   bool retrying_ = false;
@@ -97,7 +96,7 @@ class WorkPool : public std::enable_shared_from_this<WorkPool> {
   std::condition_variable drained_;
   std::condition_variable allEnded_;
 
-  std::vector<std::condition_variable*> waits_;  ///< those under way
+  std::vector<std::condition_variable*> waits_;  ///< the waits under way
   bool ending_ = false;
   bool closed_ = false;
 };

@@ -5,16 +5,16 @@ namespace kvr {
 /// How far a requested clean exit has come.
 enum class ExitPhase {
   NotRequested,
-  WaitingForIdle,  ///< everything is served as before
-  WakerWatches,    ///< a waker has been left behind and listens for what only this process would have noticed
-  NameGivenUp,     ///< what came through the name is still served; later calls start the next agent
+  WaitingForIdle,  ///< everything is served as usual
+  WakerWatches,    ///< `kvragent-wake` has been started and watches in this agent's place
+  NameGivenUp,     ///< calls that came through the name are still served; later calls start the next agent
 };
 
-/// What a look at it leads to.
+/// What to do after a check of the state.
 enum class ExitStep { Wait, LeaveWaker, GiveUpName, Leave };
 
-/// `startedAgainByManager`: a service manager starts the next agent at once, so that no waker is needed. One
-/// step a look: in between the loop takes in what has come meanwhile.
+/// `startedAgainByManager`: a service manager starts the next agent at once, so no waker is needed. Only one
+/// step is taken per check; in between, the loop handles what has arrived meanwhile.
 ///
 /// | phase            | idle | started again by its manager | step         |
 /// |------------------|------|------------------------------|--------------|

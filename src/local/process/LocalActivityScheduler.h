@@ -8,12 +8,12 @@ namespace kvr {
 
 /// Background activities on this machine.
 ///
-/// One timer of the wall clock, which the kernel ends early when that clock is set; it is armed for the next
-/// activity only. The wait of a deferral is boot time: it is worked out afresh whenever the timer ends. Built
-/// and destroyed on the loop's thread.
+/// Uses one wall-clock timer, set for the next activity only; the kernel ends it early when the clock is set.
+/// A deferral waits in boot time, which is recomputed whenever the timer ends. Built and destroyed on the
+/// loop's thread.
 class LocalActivityScheduler : public FileActivityScheduler {
  public:
-  /// Where the host tells its own facts.
+  /// The files in which the host publishes its state.
   struct HostFiles {
     std::string bootIdentifier = "/proc/sys/kernel/random/boot_id";
     std::string networkState = LocalNetwork::kHostState;

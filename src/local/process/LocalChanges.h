@@ -15,11 +15,12 @@
 
 namespace kvr {
 
-/// Posts the notifications of what is changed by editing a file: another locale in "Locale.plist", or in the
-/// host's own setting where that file names none; a watch that has come to or gone from
-/// "PairedDevices.plist". One for each edit, also of several that are seen at once. A file that is gone, or
-/// cannot be read, may be about to be replaced: it is looked at again before that counts. Built and destroyed
-/// on the loop's thread.
+/// Posts notifications for changes made by editing files: another locale in "Locale.plist", or in the host's
+/// own setting if that file names none; a watch added to or removed from "PairedDevices.plist".
+///
+/// Posts one notification for each edit, even if several edits are noticed at once. A file that is missing or
+/// unreadable may be about to be replaced, so it is checked again a moment later. Built and destroyed on the
+/// loop's thread.
 class LocalChanges {
  public:
   /// Where hosts keep their locale.
@@ -31,19 +32,19 @@ class LocalChanges {
 
  private:
   using Clock = std::chrono::steady_clock;
-  /// What the language in use depends on.
+  /// Everything that the language in use depends on.
   std::string languageNow() const;
   std::set<std::string> watchesNow() const;
-  /// One file of the device root, and how it is looked at.
+  /// One file of the device root and the state of watching it.
   struct Subject {
     const char* file;
-    /// Tells of so many edits, or finds nothing to tell. One that changes nothing counts only if it is
-    /// certain that it was one.
+    /// Posts for `edits` edits; false if there was nothing to post. A single edit without a visible change
+    /// counts only when `isCertain`.
     bool (LocalChanges::*tell)(std::size_t edits, bool isCertain);
-    std::size_t edits = 0;          ///< not told of
-    std::optional<FileStamp> seen;  ///< of the version that was looked at last
+    std::size_t edits = 0;          ///< not posted yet
+    std::optional<FileStamp> seen;  ///< of the version checked last
     Clock::time_point lastEdit{};
-    bool isLookToCome = false;
+    bool isLookToCome = false;  ///< a check is scheduled
   };
   std::optional<FileStamp> stampOf(const char* file) const;
   void handleEdit(Subject& subject, std::size_t writes, bool isWhole);

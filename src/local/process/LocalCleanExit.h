@@ -16,15 +16,15 @@
 
 namespace kvr {
 
-/// Ends the main loop, with status 0, once nothing is under way: no call, request, activity run or delayed
+/// Ends the main loop with status 0 once nothing is under way: no call, request, activity run or delayed
 /// work.
 ///
-/// The name on the bus is given up first; calls that have come through it are still served, later ones start
-/// the next agent. An agent that nothing would start again stays: whatever it knows of its surroundings is
-/// read afresh at every question anyhow.
+/// The name on the bus is released first; calls that came through it are still served, later ones start the
+/// next agent. An agent that nothing would start again does not exit. It can stay, because it reads the state
+/// of the device anew for each request.
 class LocalCleanExit : public CleanExit {
  public:
-  /// `name` is the agent's on the bus. All must outlive this; on the loop's thread.
+  /// `name` is the agent's name on the bus. All arguments must outlive this. On the loop's thread.
   LocalCleanExit(EventLoop& loop, LocalWorkQueues& queues, LocalActivityScheduler& activities,
                  const LocalHTTP& http, LocalServiceListeners& services, Log& log, std::string name)
       : loop_(loop),
@@ -36,7 +36,7 @@ class LocalCleanExit : public CleanExit {
         name_(std::move(name)) {}
 
   void requestWhenIdle() override;
-  /// Takes back what was left behind for the next agent: this one was told to end. On the loop's thread.
+  /// Ends the waker again, because this agent was told to end. On the loop's thread.
   void abandon();
 
  private:
@@ -56,7 +56,7 @@ class LocalCleanExit : public CleanExit {
   const std::string name_;
   ExitPhase phase_ = ExitPhase::NotRequested;
   pid_t waker_ = 0;
-  Descriptor wakerInput_;  ///< ends with this process
+  Descriptor wakerInput_;  ///< closed when this process ends
 };
 
 }  // namespace kvr

@@ -6,8 +6,8 @@
 
 namespace kvr {
 
-/// The moment `seconds` from now on the clock that nobody can set, rounded up. Below zero is now, as is what
-/// is no number; more than a human life is one.
+/// The time `seconds` from now on the monotonic clock, rounded up. Negative values and NaN count as 0; values
+/// are limited to about a century.
 inline std::chrono::steady_clock::time_point deadlineAfter(double seconds) {
   using Clock = std::chrono::steady_clock;
   constexpr double kLife = 3e9;

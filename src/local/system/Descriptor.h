@@ -32,7 +32,7 @@ class Descriptor {
   int descriptor_ = -1;
 };
 
-/// Writes all of it, for as long as that takes; whether that succeeded.
+/// Writes everything, however long that takes; false on an error.
 inline bool writeAll(int descriptor, std::string_view bytes) {
   while (!bytes.empty()) {
     const auto count = ::write(descriptor, bytes.data(), bytes.size());

@@ -4,9 +4,9 @@
 
 namespace kvr {
 
-/// Loads one of the agent's own libraries, which stand beside the running program or where they are installed
-/// relative to it ("../lib/kvragent"), and finds a symbol in it. The library stays loaded. An error, in
-/// domain "loading", names every place that was tried.
+/// Loads one of the agent's own libraries and finds a symbol in it. The library is looked for beside the
+/// running program and in "../lib/kvragent" relative to it, and stays loaded. An error (domain "loading")
+/// names every path that was tried.
 Result<void*> loadSymbol(const char* library, const char* symbol);
 
 }  // namespace kvr

@@ -13,17 +13,16 @@ namespace kvr {
 
 /// The files of this machine.
 ///
-/// A new content is written to a temporary file beside its target, ".NAME.kvr-XXXXXX", which then takes the
-/// target's place. A temporary file is locked (flock) by its writer for as long as it is one; the first
-/// change that this object makes in a directory removes those that nobody holds, which are what a killed
-/// process left behind. The lock on a directory is a lock in this process and, for other processes, one on
-/// the directory itself (flock).
+/// A file is replaced by writing a temporary file beside it, ".NAME.kvr-XXXXXX", and renaming that. The
+/// writer holds a lock (flock) on its temporary file. The first `replace` in a directory removes the
+/// temporary files there that nobody has locked: a killed process has left them behind. A directory is locked
+/// within this process by a lock of its own, and against other processes by flock on the directory.
 class LocalFiles : public Files {
  public:
-  /// The home directory of the user: HOME, or as the system has it.
+  /// The user's home directory: HOME, or else from the user database.
   static std::string homeDirectoryOfUser();
 
-  /// `lockPatience`: seconds that a lock waits for other processes.
+  /// `lockPatience`: how long to wait for other processes' locks, in seconds.
   explicit LocalFiles(Log& log, std::string homeDirectory = homeDirectoryOfUser(), double lockPatience = 5);
 
   std::string homeDirectory() const override { return homeDirectory_; }
@@ -34,8 +33,7 @@ class LocalFiles : public Files {
   std::optional<Error> remove(const std::string& path) override;
   std::optional<Error> rename(const std::string& from, const std::string& to) override;
   std::optional<Error> renameToUnused(const std::string& from, const std::string& to) override;
-  /// When its patience is at an end it goes on without the other processes' consent, and says so in an error
-  /// line.
+  /// When the wait for other processes times out, goes on without their lock; an error is logged once.
   std::unique_ptr<FileLock> lock(const std::string& directory) override;
 
  private:
@@ -44,7 +42,7 @@ class LocalFiles : public Files {
     std::thread::id owner;
     int depth = 0;  ///< how often the owner holds it; 0: free
     int descriptor = -1;
-    bool gaveUp = false;  ///< the last wait for other processes was in vain
+    bool gaveUp = false;  ///< the last wait for other processes timed out
   };
 
   void removeLeftovers(const std::string& directory);
@@ -57,7 +55,7 @@ class LocalFiles : public Files {
   std::mutex mutex_;  ///< guards what follows
   std::condition_variable released_;
   std::map<std::string, DirectoryLock> locks_;
-  std::set<std::string> swept_;  ///< directories without leftovers
+  std::set<std::string> swept_;  ///< directories already cleared of leftovers
 };
 
 }  // namespace kvr

@@ -10,17 +10,17 @@ namespace kvr {
 
 /// The log of this machine: the journal, or lines on a file descriptor.
 ///
-/// A line is `TIMESTAMP LEVEL com.tarsil.Kavrel:core MESSAGE` and is written by one call. Whatever in a
-/// message could be taken for the end of a line, or for a command to a terminal, is written as an escape.
+/// A line is `TIMESTAMP LEVEL com.tarsil.Kavrel:core MESSAGE`, written with one call. Characters of a message
+/// that could end the line, or control a terminal, are escaped.
 class LocalLog : public Log {
  public:
   enum class Sink { Journal, Lines };
 
-  /// As the environment has it: the journal if standard error leads there (JOURNAL_STREAM), else lines on
-  /// standard error; KVR_LOG_LEVEL names the least level written, KVR_LOG_PRIVATE=1 reveals private values.
+  /// Configured by the environment: the journal if standard error leads there (JOURNAL_STREAM), else lines on
+  /// standard error. KVR_LOG_LEVEL is the lowest level written; KVR_LOG_PRIVATE=1 reveals private values.
   static std::unique_ptr<LocalLog> fromEnvironment();
 
-  /// `descriptor` takes lines, and also those that the journal does not take. It stays the caller's.
+  /// `descriptor` receives the lines, and those that the journal does not accept. The caller keeps ownership.
   LocalLog(LogLevel least, bool revealPrivate, Sink sink, int descriptor);
 
  protected:
@@ -34,8 +34,8 @@ class LocalLog : public Log {
   const int descriptor_;
   const bool mayBlock_;
   std::mutex mutex_;    ///< guards what follows, and the order of lines whose writing may block
-  bool stuck_ = false;  ///< nobody took the last line, or all of it
-  bool torn_ = false;   ///< it has been begun
+  bool stuck_ = false;  ///< the last line was not accepted, or not all of it
+  bool torn_ = false;   ///< a part of it was written
 };
 
 }  // namespace kvr
