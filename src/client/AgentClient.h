@@ -14,32 +14,32 @@ struct sd_bus;
 
 namespace kvr::client {
 
-/// How a warranty is looked up.
+/// When a look-up uses the cache and when it downloads.
 enum class Policy : std::uint64_t {
-  Default = 0,    ///< the cache where it is good enough, else a download
+  Default = 0,    ///< the cache if it is good enough, else a download
   CacheOnly = 1,  ///< never a download
   Refresh = 2,    ///< always a download
 };
 
-/// Who speaks in a client's errors, and what their codes mean.
+/// The domain and the codes of a client's errors.
 inline constexpr std::string_view kErrorDomain = "kvragent.client";
 enum Failure : std::int64_t {
-  NoBus = 1,             ///< there is no session bus to speak through
-  AgentUnreachable = 2,  ///< no agent is there, or it went away before it had answered
-  Refused = 3,           ///< the agent does not serve this program; the message says what it is missing
-  OtherFailure = 4,      ///< anything else, in the message's words
+  NoBus = 1,             ///< there is no session bus
+  AgentUnreachable = 2,  ///< no agent is running, or it ended before it answered
+  Refused = 3,           ///< the agent refuses this program; the message names the missing entitlement
+  OtherFailure = 4,      ///< anything else; see the message
 };
 
-/// A connection to the agent. One call after the other, on one thread:
+/// A connection to the agent. Use it on one thread, one call at a time:
 ///
 ///     Result<AgentClient> agent = AgentClient::connect();
 ///     if (agent) { auto info = agent->defaultDeviceInfo(Policy::Default); … }
 ///
-/// A call waits for its answer, which may take as long as a download with all its retries does. An agent that
-/// is not running is started by the bus. Errors are in domain `kErrorDomain`; no exception but that of memory
-/// running out leaves an operation.
+/// A call blocks until it is answered, which can take as long as a download with all its retries. The bus
+/// starts an agent that is not running. Errors are in domain `kErrorDomain`; no operation throws, except when
+/// memory runs out.
 ///
-/// Of the records, a warranty's dictionary has the service's own keys; `Coverage::from` reads the usual ones.
+/// A warranty's dictionary has the service's own keys; `Coverage::from` reads the usual ones.
 class AgentClient {
  public:
   struct Argument {
@@ -58,25 +58,25 @@ class AgentClient {
   Result<bool> dismissFollowUp(const std::string& serialNumber) const;
   /// `delay` in seconds.
   Result<bool> scheduleOutreach(double delay) const;
-  /// Answered only when the agent has looked into it, which may be an hour later.
+  /// Answered when the agent has dealt with the new account, which may take an hour.
   Result<bool> accountAdded() const;
-  /// How an application stands on this device; the keys are the agent's.
+  /// How the application stands on this device; the keys are the agent's.
   Result<Value> supportApplication(const std::string& bundleIdentifier) const;
   /// Nothing when no override is set.
   Result<std::optional<std::string>> webURLOverride() const;
 
-  /// How long an answer is waited for, in seconds; a day at first.
+  /// How long to wait for an answer, in seconds; one day by default.
   void setPatience(int seconds) { patience_ = seconds; }
-  /// What is to be done about once a second while an answer is waited for, with the seconds so far.
+  /// Called about once a second while a call waits, with the number of seconds so far.
   void setWaiting(std::function<void(int seconds)> waiting) { waiting_ = std::move(waiting); }
 
-  /// Whether an agent is running now; asking starts none.
+  /// Whether an agent is running. Does not start one.
   bool isAgentRunning() const;
-  /// Calls a member without arguments, and does not wait for its reply.
+  /// Calls a method without arguments and does not wait for the reply.
   std::optional<Error> tell(const char* member) const;
   /// Posts a notification to everyone on the bus.
   std::optional<Error> post(const std::string& notification) const;
-  /// Any operation, by its member's name and the type of what it replies.
+  /// Calls any method, by its member name and the type of its reply.
   Result<Value> call(const char* member, const std::vector<Argument>& arguments, const char* replyType) const;
 
  private:

@@ -12,9 +12,9 @@
 
 namespace kvr::client {
 
-/// An item that the follow-up centre shows.
+/// An item shown in the follow-up centre.
 struct FollowUp {
-  std::optional<std::string> serialNumber;  ///< of the device that it is about
+  std::optional<std::string> serialNumber;  ///< of the device it is about
   std::optional<std::string> title;
   std::optional<std::string> text;
   std::optional<std::string> targetBundleIdentifier;  ///< of the application that shows it
@@ -27,41 +27,41 @@ struct FollowUp {
 /// A background activity.
 struct Activity {
   std::string identifier;
-  std::optional<Date> targetDate;  ///< before which it does nothing
-  std::optional<Date> dueDate;     ///< when the platform runs it
-  std::optional<Date> heldUntil;   ///< because it was started too often
+  std::optional<Date> targetDate;  ///< it does nothing before this date
+  std::optional<Date> dueDate;     ///< when the scheduler runs it
+  std::optional<Date> heldUntil;   ///< it was started too often and waits until then
   bool requiresNetwork = false;
   std::optional<std::string> lastResult;  ///< "finished" or "deferred"
   std::optional<Date> lastEnd;            ///< when its last run ended
 
-  /// Whether it is to come; else it has only run.
+  /// Whether a run is planned; otherwise it only has a last run.
   bool isToCome() const { return targetDate || dueDate; }
-  /// Before which nothing can be expected of it.
+  /// The earliest date at which it can do anything.
   Date date() const {
     return std::max({targetDate.value_or(Date{}), dueDate.value_or(Date{}), heldUntil.value_or(Date{})});
   }
 };
 
-/// What the agent's files below the home directory say. Looking changes nothing, and needs no agent.
+/// What the agent's files below the home directory contain. Only reads, and needs no running agent.
 ///
-/// A file that is missing is an empty answer; one that cannot be read, or is damaged, an error.
+/// A missing file is an empty answer; an unreadable or damaged one is an error.
 class LocalState {
  public:
   /// The home directory of the user by default.
   explicit LocalState(std::string homeDirectory = homeDirectoryOfUser());
 
   Result<std::vector<FollowUp>> followUps() const;
-  /// In the order in which they come, those with an earlier date first; then those that have only run.
+  /// In order of their dates; those without a planned run come last.
   Result<std::vector<Activity>> activities() const;
 
-  /// When the device's warranty was downloaded last.
+  /// When the device's warranty was last downloaded.
   Result<std::optional<Date>> downloadedDate(const std::string& serialNumber) const;
-  /// When each device's was, by the hash under which the agent keeps what it knows of the device.
+  /// The last download of each device, by the hash of its serial number.
   Result<std::map<std::string, Date>> downloads() const;
-  /// Whether the owner has dismissed a follow-up of the device; an unreadable file says no.
+  /// Whether the owner has dismissed a follow-up of the device; false if the file cannot be read.
   bool isDismissed(const std::string& serialNumber) const;
 
-  /// HOME, or as the system has it.
+  /// HOME, or else from the user database.
   static std::string homeDirectoryOfUser();
 
  private:

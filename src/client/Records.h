@@ -10,8 +10,8 @@
 
 namespace kvr::client {
 
-// The agent's records as a client sees them. A property that is missing, or of another kind than it should
-// be, is absent; no record fails as a whole for that.
+// The agent's records as a client sees them. A property that is missing or of the wrong type is absent; it
+// never makes the whole record fail.
 
 struct Device {
   enum Type : std::uint64_t { Default = 0, Watch = 1, Other = 2 };
@@ -19,20 +19,20 @@ struct Device {
   std::optional<std::string> name;
   std::optional<std::string> serialNumber;
   std::optional<Date> activationDate;
-  std::uint64_t deviceType = Default;  ///< any number is possible
+  std::uint64_t deviceType = Default;  ///< may be any number
 
   static Device from(const Value& record);
 };
 
-/// What a warranty's dictionary says to its owner.
+/// What a warranty's dictionary tells its owner.
 struct Coverage {
   bool isCovered = false;
   std::optional<std::string> label;
   std::optional<std::string> description;
   std::optional<Date> end;
-  bool isOfferShown = false;  ///< whether an offer's follow-up may be shown
+  bool isOfferShown = false;  ///< whether a follow-up about the offer may be shown
   std::optional<std::string> offerLabel;
-  std::optional<Date> offerFrom;  ///< from when the follow-up is due
+  std::optional<Date> offerFrom;  ///< from when the follow-up may be shown
   std::optional<Date> offerEnd;
 
   static Coverage from(const Value& warranty);
@@ -40,7 +40,7 @@ struct Coverage {
 
 struct DeviceInfo {
   Device device;
-  Value warranty;  ///< the warranty's dictionary, null when none is known
+  Value warranty;  ///< the warranty's dictionary; null when none is known
 
   static DeviceInfo from(const Value& record);
 };

@@ -9,11 +9,11 @@
 
 namespace kvr::client {
 
-/// What the command line says.
+/// The parsed command line.
 struct Options {
   std::string text;  ///< a command's one argument: a bundle identifier, a name
   std::optional<std::string> serialNumber;
-  std::string file;  ///< to draw into
+  std::string file;  ///< the file to draw into
   double seconds = 0;
   bool noWait = false;
   Policy policy = Policy::Default;
@@ -24,9 +24,9 @@ struct Options {
   Report report() const { return Report(showSerial ? Report::Serials::Whole : Report::Serials::Shortened); }
 };
 
-// The commands. Each writes its answer to standard output, or says on standard error why there is none.
-// Any text is a serial number. One may be given as it is shown, "…1234", if only one device of this phone
-// ends so.
+// The commands. Each writes its answer to standard output, or the reason why there is none to standard error.
+// Any text is a serial number. It may be given in its shortened form, "…1234", if only one device ends in
+// that.
 
 using AgentCommand = Status (*)(const AgentClient&, const Options&);
 

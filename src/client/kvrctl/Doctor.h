@@ -5,7 +5,7 @@
 
 namespace kvr::client {
 
-/// One thing that was looked at.
+/// The result of one check.
 struct Verdict {
   enum State { Fine, Doubtful, Broken };
 
@@ -15,8 +15,8 @@ struct Verdict {
   std::string cure;  ///< empty when there is nothing to do
 };
 
-/// Looks at all that the agent and its clients need: bus, agent, entitlement, device root, files, clock, and
-/// the endpoints, which are connected to and asked for nothing. Changes nothing; takes some seconds at most.
+/// Checks everything that the agent and its clients need: bus, agent, entitlement, device root, files, clock
+/// and endpoints; to an endpoint it only connects. Changes nothing; takes a few seconds at most.
 std::vector<Verdict> examine();
 
 }  // namespace kvr::client

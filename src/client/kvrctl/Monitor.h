@@ -5,9 +5,9 @@
 
 namespace kvr::client {
 
-/// Tells what changes as it happens, a line each: notifications on the bus, agents that come and go,
-/// follow-ups, activities, downloads. In JSON each line is a document. Sleeps in between. Ends with SIGINT or
-/// SIGTERM, or when the bus does.
+/// Prints each change as it happens, one line each (a JSON document if `inJSON`): notifications on the bus,
+/// agents starting and ending, follow-ups, activities, downloads. Ends on SIGINT or SIGTERM, or when the bus
+/// goes away.
 Status monitor(const Report& report, bool inJSON);
 
 }  // namespace kvr::client

@@ -6,20 +6,20 @@
 
 namespace kvr::client {
 
-/// What the program ends with.
+/// The program's exit statuses.
 enum Status { kFine = 0, kFailed = 1, kNothingKnown = 2, kUnreachable = 3, kRefused = 4 };
 
-/// One line on standard error, under the program's name.
+/// Writes one line to standard error, prefixed with the program's name.
 void say(const std::string& message);
 
-/// Says what went wrong and what helps; the status that goes with it.
+/// Reports the error and what can be done about it; returns the matching exit status.
 Status fail(const Error& error);
 
-/// Writes all of a text to standard output; `status`, or what a failure of that makes of it.
+/// Writes a text to standard output. Returns `status`, or the status of a failure to write.
 Status print(const std::string& text, Status status);
 Status print(const Result<std::string>& text, Status status);
 
-/// What a person can do about an error of the client; empty when nothing is known to help.
+/// What the user can do about an error of the client; empty when no help is known.
 std::string cureFor(const Error& error);
 
 }  // namespace kvr::client

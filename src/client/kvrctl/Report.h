@@ -11,14 +11,14 @@
 
 namespace kvr::client {
 
-/// Where one device stands, in all.
+/// Everything known about one device.
 struct DeviceStatus {
   Device device;
   std::optional<Coverage> coverage;  ///< nothing when none is known
   bool hasFollowUp = false;          ///< whether its offer is being shown
-  bool isDismissed = false;          ///< whether the owner has dismissed it before
-  std::optional<Date> downloaded;    ///< when the service was asked last
-  Date now;                          ///< what the rest is compared with
+  bool isDismissed = false;          ///< whether the owner has dismissed one before
+  std::optional<Date> downloaded;    ///< the last download
+  Date now;                          ///< the date to compare the others with
 };
 
 /// What an activity's run depends on, besides its dates.
@@ -28,44 +28,44 @@ struct Circumstances {
   bool isNetworkReachable = true;
 };
 
-/// What an activity that is to come waits for, in words; empty when it is not to come.
+/// What a planned activity is waiting for, in words; empty when none is planned.
 std::string waitsFor(const Activity& activity, const Circumstances& circumstances);
 
-/// A device's type in a word.
+/// A one-word name for a device type.
 const char* nameOf(std::uint64_t deviceType);
 
-/// What a person, or a program, is shown of the agent's answers.
+/// Formats the agent's answers for people and for programs.
 ///
-/// The text comes from servers and paired devices, so whatever could command a terminal is written as an
-/// escape, `\u001b`, in both forms. Serial numbers are shortened to their end unless asked for whole.
+/// The texts come from servers and paired devices. So characters that could control a terminal are written as
+/// escapes, `\u001b`, in both formats. Serial numbers are shortened to their end unless `Serials::Whole`.
 class Report {
  public:
   enum class Serials { Shortened, Whole };
 
   explicit Report(Serials serials) : serials_(serials) {}
 
-  /// A serial number as it is shown.
+  /// A serial number in the form in which it is shown.
   std::string serial(const std::string& whole) const;
 
-  // For people, with dates in the user's form and zone: lines of a name and a value, records set apart by an
-  // empty line; or a table. Empty when there are none.
+  // For people, with dates in the user's format and time zone: lines of name and value, with an empty line
+  // between records, or a table. Empty when there are no records.
   std::string text(const std::vector<Device>& devices) const;
   std::string text(const std::vector<DeviceInfo>& infos) const;
   std::string text(const std::vector<FollowUp>& followUps) const;
 
-  /// Any dictionary, a line an entry.
+  /// Any dictionary, one line per entry.
   static std::string text(const Value& dictionary);
-  /// A table of one line an activity.
+  /// A table, one line per activity.
   static std::string text(const std::vector<Activity>& activities, const Circumstances& circumstances);
-  /// A table of one line a device.
+  /// A table, one line per device.
   std::string text(const std::vector<DeviceStatus>& statuses, const Style& style) const;
 
-  // For programs: one JSON document on one line, with its format's version under "version". Dates are ISO
+  // For programs: one JSON document on one line, with the format's version under "version". Dates are ISO
   // 8601 in UTC, data is base64; a number that is not finite and a date outside the calendar are null.
   Result<std::string> json(const Device& device) const;
   Result<std::string> json(const std::vector<Device>& devices) const;
   Result<std::string> json(const std::vector<DeviceInfo>& infos) const;
-  /// Any tree, under a name.
+  /// Any tree, under the given name.
   static Result<std::string> json(std::string_view name, const Value& tree);
   Result<std::string> json(const std::vector<DeviceStatus>& statuses) const;
   Result<std::string> json(const std::vector<FollowUp>& followUps) const;

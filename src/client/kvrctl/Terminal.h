@@ -8,31 +8,31 @@
 
 namespace kvr::client {
 
-/// How text looks to a person: with colours on a terminal that shows them, dates in the user's own form and
-/// zone.
+/// How text is formatted for people: with colours on a terminal that shows them, dates in the user's format
+/// and time zone.
 class Style {
  public:
   enum Paint { Good, Bad, Notice, Faint };
 
-  /// For standard output: coloured when that is a terminal and NO_COLOR is not set.
+  /// The style for standard output: coloured when that is a terminal and NO_COLOR is not set.
   static Style ofOutput();
   explicit Style(bool isColoured) : isColoured_(isColoured) {}
 
   bool isColoured() const { return isColoured_; }
   std::string paint(Paint paint, const std::string& text) const;
-  /// A date's day as the user's locale writes it (`std::setlocale` must have been called).
+  /// The day of a date as the user's locale writes it (`std::setlocale` must have been called).
   static std::string day(Date date);
-  /// Its day and time of day, likewise.
+  /// The day and time of a date as the user's locale writes them.
   static std::string moment(Date date);
 
  private:
   bool isColoured_;
 };
 
-/// The text with control characters, and others that change how their surroundings look, as escapes.
+/// Escapes control characters and others that affect the display of the text around them.
 std::string printable(std::string_view text);
 
-/// Columns as wide as what stands in them. Text may be coloured.
+/// A table whose columns are as wide as their contents. Cells may be coloured.
 class Table {
  public:
   explicit Table(std::vector<std::string> headings) : rows_{std::move(headings)} {}
@@ -43,7 +43,7 @@ class Table {
   std::vector<std::vector<std::string>> rows_;
 };
 
-/// How many columns a terminal needs for it, colours aside: one a character.
+/// How many terminal columns the text takes, colours not counted: one per character.
 std::size_t columnsOf(std::string_view text);
 
 }  // namespace kvr::client

@@ -8,16 +8,16 @@
 
 namespace kvr::client {
 
-/// For every device, on one axis of dates: its coverage, the window of its offer, the follow-up that is shown
-/// or to come, and when the shown one's text changes next; and the activities to come.
+/// Shows on one axis of dates, for each device: its coverage, the period of its offer, the follow-up that is
+/// shown or planned, and when the text of the shown one changes next; and the planned activities.
 class Timeline {
  public:
   Timeline(const std::vector<DeviceStatus>& devices, const std::vector<FollowUp>& followUps,
            const std::vector<Activity>& activities, Date now);
 
-  /// With block characters, `columns` wide in all.
+  /// With block characters, `columns` wide in total.
   std::string text(const Style& style, std::size_t columns) const;
-  /// A document of its own that is legible on light and dark ground.
+  /// A complete SVG document, legible on light and dark backgrounds.
   std::string svg() const;
   /// The rows with their spans and marks.
   Value tree() const;
@@ -38,9 +38,9 @@ class Timeline {
   void addDevice(const DeviceStatus& status, const std::vector<FollowUp>& followUps,
                  std::optional<Date> change);
   void add(const std::string& label, Kind kind, std::optional<Date> from, std::optional<Date> until);
-  /// Has the axis reach a date, within reason.
+  /// Extends the axis to a date, within limits.
   void reach(Date date);
-  /// Where a date stands on the axis, from 0 to 1.
+  /// The position of a date on the axis, from 0 to 1.
   double place(Date date) const;
 
   std::vector<Row> rows_;

@@ -11,14 +11,14 @@
 
 namespace kvr {
 
-/// Answers that are given after a delay, on one thread of their own.
+/// Gives answers after a delay, on one thread of its own.
 ///
 /// The thread starts with the first answer and sleeps until the next one is due. Answers due at the same time
-/// are given in the order in which they were promised. An answer should be short: the others wait for it.
-/// The end gives every answer that is still owed, as `ending`, and returns once all are given.
+/// are given in the order in which they were added. An answer should be short, because the others wait for
+/// it. `end` gives every outstanding answer at once, with `ending` set, and returns once all are given.
 class DelayedAnswers {
  public:
-  /// Called exactly once. `ending`: the time was not waited for, because these answers come to their end.
+  /// Called exactly once. `ending`: the delay was cut short, because the object is ending.
   using Answer = std::function<void(bool ending)>;
 
   explicit DelayedAnswers(Log& log) : log_(log) {}
@@ -26,10 +26,10 @@ class DelayedAnswers {
   DelayedAnswers(const DelayedAnswers&) = delete;
   DelayedAnswers& operator=(const DelayedAnswers&) = delete;
 
-  /// Gives `answer` after `delay` seconds. A negative or undefined delay is none; one of more than some
+  /// Gives `answer` after `delay` seconds. A negative delay or NaN counts as 0; a delay of more than a few
   /// thousand years lasts until the end. Any thread.
   void after(double delay, Answer answer);
-  /// Later answers are given at once. Not on the thread of the answers.
+  /// Later answers are given at once. Not on the thread that gives the answers.
   void end();
 
  private:

@@ -10,13 +10,13 @@
 
 namespace kvr {
 
-/// The directory that describes the device: one property list a subject, read afresh at every question.
+/// The directory that describes the device: one property list per subject, read anew for each request.
 ///
-/// A file that is missing or cannot be read as what it should be is an absent answer: null. What is wrong
-/// with a file is reported once at error level, not by the one who asks. Any thread.
+/// A file that is missing, unreadable or of the wrong type reads as null. A fault of a file is logged once at
+/// error level, so callers need not log it. Any thread.
 class DeviceRoot {
  public:
-  /// KVR_DEVICE_ROOT, or where a device is described by default.
+  /// KVR_DEVICE_ROOT, or the default directory.
   static std::string directoryFromEnvironment();
 
   DeviceRoot(PropertyListFiles& lists, Log& log, const std::string& directory = directoryFromEnvironment());
@@ -24,13 +24,13 @@ class DeviceRoot {
   Value dictionary(std::string_view file) const;
   Value array(std::string_view file) const;
   /// As `dictionary`, but null for a file that anyone but root and the agent's own user could have written:
-  /// it, the directory it stands in and the device root must belong to one of the two, and neither group nor
-  /// others may write them. The modes are looked at just before the file is read; who could exchange it in
-  /// between could have passed the look as well.
+  /// the file, its directory and the device root must belong to one of the two, and neither group nor others
+  /// may have write access. This is checked just before the file is read; whoever could replace it in between
+  /// could have passed the check too.
   Value trustedDictionary(std::string_view file) const;
 
   std::string pathOf(std::string_view file) const { return directory_ + "/" + std::string(file); }
-  /// The stamp of a file as it is now, or nothing when it cannot be had.
+  /// The present stamp of a file, or nothing when it cannot be determined.
   std::optional<FileStamp> stamp(std::string_view file) const {
     const auto stamp = lists_.files().stamp(pathOf(file));
     return stamp ? *stamp : std::nullopt;
@@ -45,8 +45,9 @@ class DeviceRoot {
   Log& log_;
   const std::string directory_;
   mutable std::mutex mutex_;
-  mutable std::map<std::string, std::string> resolved_;  ///< by path as given
-  mutable std::map<std::string, std::string> distrust_;  ///< why, by the path of each file that is ignored
+  mutable std::map<std::string, std::string> resolved_;  ///< by the path as given
+  mutable std::map<std::string, std::string>
+      distrust_;  ///< the reason, by the path of each file that is ignored
 };
 
 }  // namespace kvr

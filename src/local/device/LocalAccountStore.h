@@ -9,10 +9,10 @@
 
 namespace kvr {
 
-/// The account of "Accounts.plist", and the renewal of its credentials as scripted there.
+/// The account in "Accounts.plist", and renewals of its credentials as scripted there.
 ///
-/// What is asked of another account than the present one has no answer. The tokens of a renewal that
-/// succeeded are held in memory, in the place of the file's, until the file changes.
+/// Requests about any account but the present one have no answer. After a successful renewal, the new tokens
+/// replace those of the file, in memory, until the file changes.
 class LocalAccountStore : public AccountStore {
  public:
   LocalAccountStore(const DeviceRoot& root, Log& log) : root_(root), answers_(log) {}
@@ -22,8 +22,8 @@ class LocalAccountStore : public AccountStore {
   std::optional<StoreAccount> storeAccountFor(const CloudAccount& account) const override;
   std::optional<std::string> tokenFor(const AuthenticationAccount& account,
                                       std::string_view service) const override;
-  /// Result codes: that of the script, which is 0 where it names none; `kNotRenewable` when there is no
-  /// script or no such account; `kEnding` when the store ends before the answer is due.
+  /// Result codes: the one in the script, or 0 if it has none; `kNotRenewable` when there is no script or no
+  /// such account; `kEnding` when the store ends before the answer is due.
   void renewCredentialsFor(const AuthenticationAccount& account, const RenewalOptions& options,
                            RenewalReply reply) override;
 
@@ -40,8 +40,8 @@ class LocalAccountStore : public AccountStore {
   const DeviceRoot& root_;
   mutable std::mutex mutex_;            ///< guards the next two
   Tokens renewed_;                      ///< by service
-  std::optional<FileStamp> renewedIn_;  ///< the file that `renewed_` goes with
-  DelayedAnswers answers_;              ///< the last member: its answers use the others
+  std::optional<FileStamp> renewedIn_;  ///< the stamp of the file that `renewed_` belongs to
+  DelayedAnswers answers_;              ///< last: its answers use the other members
 };
 
 }  // namespace kvr

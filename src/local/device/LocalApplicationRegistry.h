@@ -5,7 +5,7 @@
 
 namespace kvr {
 
-/// The applications of "Applications.plist": listed is installed.
+/// The applications listed in "Applications.plist" are the installed ones.
 class LocalApplicationRegistry : public ApplicationRegistry {
  public:
   explicit LocalApplicationRegistry(const DeviceRoot& root) : root_(root) {}

@@ -5,7 +5,7 @@
 
 namespace kvr {
 
-/// The subscriptions of "Carriers.plist", each under its index there as text.
+/// The subscriptions in "Carriers.plist"; the key of each is its index in the file, as text.
 class LocalCarrierInfo : public CarrierInfo {
  public:
   explicit LocalCarrierInfo(const DeviceRoot& root) : root_(root) {}

@@ -5,10 +5,10 @@
 
 namespace kvr {
 
-/// The facts of "DeviceProperties.plist", and the host system's own where it does not state them.
+/// The properties in "DeviceProperties.plist"; those missing there are read from the host system.
 class LocalDeviceProperties : public DeviceProperties {
  public:
-  /// `systemRoot` is the root directory of the host system's own facts.
+  /// `systemRoot` is prefixed to the paths of the host system's files.
   explicit LocalDeviceProperties(const DeviceRoot& root, std::string systemRoot = "")
       : root_(root), systemRoot_(std::move(systemRoot)) {}
 

@@ -8,20 +8,20 @@
 
 namespace kvr {
 
-/// Whether the network can be reached: as "Network.plist" says, else as the host's network service does, else
-/// it can. Built and destroyed on the loop's thread.
+/// Whether the network is reachable: as stated in "Network.plist", else by the host's network service, else
+/// yes. Built and destroyed on the loop's thread.
 class LocalNetwork {
  public:
-  /// Where systemd-networkd publishes the state of all links together.
+  /// Where systemd-networkd publishes the combined state of all links.
   static constexpr const char* kHostState = "/run/systemd/netif/state";
 
-  /// `changed` is called on the loop's thread, with the answer, when it may have changed.
+  /// `changed` is called on the loop's thread with the present state, when it may have changed.
   LocalNetwork(EventLoop& loop, Log& log, const DeviceRoot& root,
                const std::function<void(bool reachable)>& changed, std::string hostState = kHostState);
 
-  /// The answer now. Any thread.
+  /// The present state. Any thread.
   bool isReachable() const;
-  /// The answer by what "Network.plist" holds, or null, and by the host's state. Any thread.
+  /// The state by the contents of "Network.plist" (null if there are none) and the host's state. Any thread.
   static bool isReachable(const Value& described, const std::string& hostState = kHostState);
 
  private:

@@ -6,7 +6,7 @@
 
 namespace kvr {
 
-/// The store that "Store.plist" describes. Its purchases are those of whatever account is asked about.
+/// The store that "Store.plist" describes. The purchases are the same for every account.
 class LocalStore : public StoreLookup {
  public:
   LocalStore(const DeviceRoot& root, Log& log) : root_(root), answers_(log) {}
@@ -15,12 +15,12 @@ class LocalStore : public StoreLookup {
                        PurchasesReply reply) override;
   void lookUp(std::vector<std::string> bundleIdentifiers, const std::string& caller,
               CatalogueReply reply) override;
-  /// Gives every answer that is still owed, and every later one, at once.
+  /// Gives every outstanding answer, and every later one, at once.
   void beginEnding() { answers_.end(); }
 
  private:
   const DeviceRoot& root_;
-  DelayedAnswers answers_;  ///< ends before the rest
+  DelayedAnswers answers_;  ///< destroyed first
 };
 
 }  // namespace kvr

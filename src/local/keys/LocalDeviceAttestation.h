@@ -8,13 +8,13 @@
 
 namespace kvr {
 
-/// Attests this device by certificates of a local authority (see `LocalKeyStore`).
+/// Attests this device with certificates of a local authority (see `LocalKeyStore`).
 ///
-/// "Attestation.plist" of the device root tells, at every question, how the service behaves: `Supported`;
-/// `PreferredError` and `FallbackError`, the code with which a request for that kind of certificate fails (0
-/// for none); `Delay` in seconds before an answer; `OmitChain` for a key that comes without its chain.
+/// "Attestation.plist" of the device root, read for each request, controls the behaviour: `Supported`;
+/// `PreferredError` and `FallbackError`, the error code of requests for that kind of certificate (0 for
+/// none); `Delay` before an answer, in seconds; `OmitChain` to deliver a key without its chain.
 ///
-/// Destruction fails every request under way and returns when all have been answered.
+/// The destructor fails all open requests and returns once all have been answered.
 class LocalDeviceAttestation : public DeviceAttestation {
  public:
   LocalDeviceAttestation(const DeviceRoot& root, const DeviceProperties& properties, Files& files,
@@ -31,7 +31,7 @@ class LocalDeviceAttestation : public DeviceAttestation {
   const DeviceRoot& root_;
   const DeviceProperties& properties_;
   LocalKeyStore keys_;
-  DelayedAnswers answers_;  ///< last: its answers use what stands above
+  DelayedAnswers answers_;  ///< last: its answers use the members above
 };
 
 }  // namespace kvr

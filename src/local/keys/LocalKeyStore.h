@@ -15,43 +15,42 @@
 
 namespace kvr {
 
-/// A private key of the user and what attests it.
+/// A private key of the user and the certificates that attest it.
 struct AttestedCredentials {
   AttestedKeyRef key;
   std::string leaf;    ///< DER
   std::string issuer;  ///< DER
 };
 
-/// Keys with certificates of a local authority, kept below "Library/Keys/LABEL" of the home directory:
-/// the authority as "authority.key" and "authority.pem", and for each kind of certificate KIND.key and
-/// KIND.pem (the leaf, then the authority).
+/// Keys with certificates of a local authority, stored below "Library/Keys/LABEL" of the home directory: the
+/// authority as "authority.key" and "authority.pem", and for each kind of certificate KIND.key and KIND.pem
+/// (the leaf, then the authority).
 ///
-/// What is asked for is issued once and answered from there until it is out of date or the device is no
-/// longer what it attests. A file that is missing is made anew; so is one that is damaged or does not match
-/// the others, after it was reported once at error level. What was read and verified is held, and answered
-/// without reading it again, for as long as none of its files has changed. Any thread, and any number of
-/// processes.
+/// Credentials are issued once and then answered from the files, until they are out of date or no longer
+/// describe the device. A missing file is created again; so is one that is damaged or does not match the
+/// others, after one error line about it. Verified credentials are cached in memory while their files are
+/// unchanged. Any thread; several processes may share the files.
 class LocalKeyStore {
  public:
   struct Request {
-    std::string label;          ///< becomes a directory's name
-    std::string kind;           ///< becomes files' names
-    DistinguishedName subject;  ///< what the certificate says of the device
+    std::string label;          ///< becomes a directory name
+    std::string kind;           ///< becomes part of file names
+    DistinguishedName subject;  ///< how the certificate describes the device
     std::int64_t validity = 0;  ///< minutes, above 0
   };
 
   LocalKeyStore(Files& files, const Clock& clock, Log& log);
 
-  /// What is kept or newly issued. An error when the files can be neither read nor written.
+  /// The stored credentials, or newly issued ones. An error when the files can be neither read nor written.
   Result<AttestedCredentials> credentialsFor(const Request& request);
 
  private:
-  /// A key and the certificates of its file: its own, then that of who issued it.
+  /// A key and the certificates in its file: its own, then the issuer's.
   struct KeyPair {
     openssl::Key key;
     std::vector<openssl::Certificate> certificates;
   };
-  /// What was answered from files, and the stamps they had.
+  /// Credentials answered from files, and the stamps of those files.
   struct Held {
     std::vector<FileStamp> stamps;
     AttestedCredentials credentials;
@@ -64,7 +63,7 @@ class LocalKeyStore {
   };
 
   std::optional<AttestedCredentials> heldCredentials(const std::string& directory, const Request& request);
-  /// The stamps of all files that belong to a key; nothing while one is missing or too young.
+  /// The stamps of all files of a key; nothing while one is missing or too recent to be trusted.
   std::optional<std::vector<FileStamp>> stampsOf(const std::string& directory, const std::string& base);
   Result<Authority> authorityIn(const std::string& directory);
   Result<std::optional<CertifiedKey>> keptLeaf(const std::string& base, const Request& request,
@@ -82,7 +81,7 @@ class LocalKeyStore {
   Log& log_;
   std::mutex mutex_;  ///< guards what follows
   std::map<std::string, FileStamp> reported_;
-  std::map<std::string, Held> held_;  ///< by the path of the key's files
+  std::map<std::string, Held> held_;  ///< by the path of the key's files, without suffix
 };
 
 }  // namespace kvr

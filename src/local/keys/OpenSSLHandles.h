@@ -33,14 +33,14 @@ using NameHandle = Handle<X509_NAME, X509_NAME_free>;
 using StoreHandle = Handle<X509_STORE, X509_STORE_free>;
 using StoreContextHandle = Handle<X509_STORE_CTX, X509_STORE_CTX_free>;
 
-// Immutable once made, and then shared between threads.
+// Never changed once created, so that threads may share them.
 using Key = std::shared_ptr<EVP_PKEY>;
 using Certificate = std::shared_ptr<X509>;
 
 inline Key adoptKey(EVP_PKEY* key) { return {key, Freeing<EVP_PKEY_free>{}}; }
 inline Certificate adoptCertificate(X509* certificate) { return {certificate, Freeing<X509_free>{}}; }
 
-/// What the library says of the failure that just happened on this thread, which is forgotten with it.
+/// OpenSSL's description of the latest failure on this thread; also clears OpenSSL's error queue.
 inline Error lastError(std::string message) {
   const unsigned long code = ERR_peek_last_error();
   if (const char* reason = code == 0 ? nullptr : ERR_reason_error_string(code))
