@@ -1,4 +1,4 @@
-// The agent's program: builds the platform of this machine, starts the agent on it, and runs the main loop.
+// The agent's program: builds the platform of this machine, starts the agent on it and runs the main loop.
 
 #include "core/agent/StartUp.h"
 #include "local/LocalPlatform.h"
@@ -17,7 +17,7 @@ namespace {
 
 constexpr double kEndingLimit = 10;  // seconds
 
-/// Termination signals, blocked before any thread starts so that the loop gets them.
+/// Blocks the termination signals before any thread starts, so that only the loop receives them.
 void blockSignals() {
   std::signal(SIGPIPE, SIG_IGN);
   sigset_t signals;
@@ -27,7 +27,7 @@ void blockSignals() {
   pthread_sigmask(SIG_BLOCK, &signals, nullptr);
 }
 
-/// What a termination signal ends.
+/// Handles termination signals by ending the agent.
 struct Ending {
   kvr::EventLoop& loop;
   kvr::LocalPlatform& local;
@@ -46,7 +46,7 @@ struct Ending {
   }
 };
 
-/// Nothing may be destroyed while work that uses it does not come to its end.
+/// If work does not finish in time, exits without destroying anything it may use.
 void finish(kvr::LocalPlatform& local) {
   if (local.end(kEndingLimit)) return;
   local.log->error("Work did not finish within %d seconds of the end", static_cast<int>(kEndingLimit));

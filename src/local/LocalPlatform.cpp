@@ -31,7 +31,7 @@ bool LocalPlatform::end(double limit) {
   http.beginEnding();
   store.beginEnding();
   queues.beginEnding();
-  // The last answers first: what they lead to is work of the queues.
+  // First wait for the last answers: handling them adds work to the queues.
   if (!http.drain(limit)) return false;
   return queues.drain(limit -
                       std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count());

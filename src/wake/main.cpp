@@ -1,10 +1,10 @@
-// kvragent-wake: stands in for an agent that has ended cleanly on a bus without a service manager, until
-// there is something to do for it.
+// kvragent-wake: takes the place of an agent that has exited cleanly on a bus without a service manager,
+// until the next agent is needed.
 //
-// Started by the agent before it gives its name up. Writes one byte to its standard output once it is
-// watching; its standard input ends with the agent, and from then on it acts: it has the bus start the next
-// agent when a notification has been posted, which it then posts again, or when an activity is due. It leaves
-// when there is an agent.
+// The agent starts it before it releases its name. It writes one byte to its standard output once it is
+// watching. Its standard input is closed when the agent ends; from then on it acts: it has the bus start the
+// next agent when an activity is due or when a notification was posted, which it then posts again. It exits
+// once there is an agent.
 
 #include "local/bus/BusConnection.h"
 #include "local/buscodec/BusHandles.h"
@@ -31,8 +31,8 @@ namespace {
 
 constexpr const char* kBus = "org.freedesktop.DBus";
 constexpr const char* kBusPath = "/org/freedesktop/DBus";
-constexpr double kLongestWait = 86400;  // seconds; between two looks at a clock that may have been set
-constexpr double kRetry = 60;           // seconds; after a start that failed
+constexpr double kLongestWait = 86400;  // seconds; the clock may be set, so check it at least this often
+constexpr double kRetry = 60;           // seconds until the next try after a failed start
 
 class Waker {
  public:
@@ -59,7 +59,7 @@ class Waker {
   }
 
  private:
-  /// On the bus thread: whether the agent has a successor, and that this is being watched.
+  /// On the bus thread: watches for the next agent and reports that it is watching.
   void watchForAgent() {
     sd_bus* const bus = bus_.bus();
     sd_bus_slot* slot = nullptr;
@@ -88,7 +88,7 @@ class Waker {
     look();
   }
 
-  /// When the next activity is due, by what the agent has left on disk.
+  /// When the next activity is due, according to the agent's file.
   std::optional<Date> dueDate() {
     const auto tree =
         lists_.read(files_.homeDirectory() + "/" + names::activitiesFile(),
@@ -110,7 +110,7 @@ class Waker {
     loop_.after(std::min(wait, kLongestWait), [this] { look(); });
   }
 
-  /// Nothing is missed meanwhile: what is heard goes to the next agent as well.
+  /// Notifications that arrive meanwhile are kept and posted to the next agent too.
   void start() {
     isStarting_ = true;
     bus_.thread()->post([this] {
@@ -132,9 +132,10 @@ class Waker {
     bus_.thread()->post([this] { loop_.exit(EXIT_SUCCESS); });
   }
 
-  bool isActing_ = false;                ///< since the agent has ended
-  bool isStarting_ = false;              ///< the next one
-  std::vector<std::string_view> heard_;  ///< in this order, as many of a name as are handled each on its own
+  bool isActing_ = false;    ///< the agent has ended
+  bool isStarting_ = false;  ///< the next agent is being started
+  std::vector<std::string_view>
+      heard_;  ///< in order; of each name at most as many as are handled individually
   EventLoop loop_;
   const std::unique_ptr<LocalLog> log_ = LocalLog::fromEnvironment();
   LocalClock clock_;
@@ -144,7 +145,7 @@ class Waker {
   LocalUserLocale locale_{root_, *log_};
   LocalPairedDeviceRegistry pairedDevices_{root_};
   LocalWorkQueues queues_{loop_, *log_};
-  BusSlotRef ownerWatch_;  ///< the bus thread's
+  BusSlotRef ownerWatch_;  ///< used on the bus thread
   BusConnection bus_{*log_, [this](const Error&) { loop_.exit(EXIT_SUCCESS); }};
   LocalNotifications notifications_{bus_, queues_, *log_};
   LocalChanges changes_{loop_, *log_, root_, locale_, pairedDevices_, notifications_};

@@ -72,8 +72,8 @@ std::optional<Error> replyToBusCall(sd_bus_message* call, const char* type, cons
 }
 
 void failBusCall(sd_bus_message* call, const char* errorName, const std::string& message) {
-  // Fails only when the bus is gone, or the memory; the caller notices the one, and has no way to learn of
-  // the other.
+  // Sending the error fails only when the bus is gone, which the caller notices anyway, or when memory is
+  // short, which cannot be reported to it.
   sd_bus_reply_method_errorf(call, errorName, "%s", message.c_str());
 }
 

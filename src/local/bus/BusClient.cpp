@@ -11,11 +11,13 @@
 namespace kvr {
 namespace {
 
-/// Calls of one client that wait or are being served, and the bytes of their arguments; more are turned away.
+/// The open calls of one client (waiting or being served), and the bytes of their arguments; beyond that,
+/// calls get an error.
 constexpr FairLimit kCalls{1024, 8192, 16};
 constexpr FairLimit kBytes{std::size_t{4} << 20, std::size_t{32} << 20, std::size_t{16} << 10};
 
-/// The way back of one call. It may be given on any thread, and if it is let go without, the caller is told.
+/// Delivers the answer of one call, from any thread. If destroyed without an answer, the caller gets an
+/// error.
 class CallReply {
  public:
   CallReply(std::shared_ptr<BusThread> thread, std::weak_ptr<BusClient> client, std::uint64_t call)
@@ -43,7 +45,7 @@ class CallReply {
   bool given_ = false;
 };
 
-/// Runs `work` on the client that a callback is for, which stays alive meanwhile.
+/// Runs `work` on the client that a callback belongs to and keeps the client alive meanwhile.
 template <class Do>
 int onClient(void* userdata, const Do& work) {
   return guardedBusCallback([&] {
@@ -58,7 +60,7 @@ BusClient::BusClient(std::shared_ptr<const Context> context, std::string uniqueN
     : context_(std::move(context)), name_(std::move(uniqueName)) {}
 
 std::optional<Error> BusClient::begin(sd_bus* bus) {
-  // The watch is asked for first, so no going is missed after the bus has answered about the client.
+  // Watch first, so that a client that leaves after the bus has answered about it is noticed.
   const std::string rule =
       "type='signal',sender='org.freedesktop.DBus',interface='org.freedesktop.DBus',member='NameOwnerChanged'"
       ",arg0='" +
@@ -83,7 +85,7 @@ int BusClient::handleWatched(sd_bus_message* message, void* userdata, sd_bus_err
   return onClient(userdata, [message](BusClient& self) {
     if (!isFromBus(message) || !sd_bus_message_is_method_error(message, nullptr)) return;
     if (self.state_ == State::Gone) return;
-    // It could never be let go again.
+    // Without the watch, the client could never be dropped.
     self.refuse("it cannot be watched");
     self.context_->forget(self.name_);
   });
@@ -111,7 +113,7 @@ int BusClient::handleStillThere(sd_bus_message* message, void* userdata, sd_bus_
   });
 }
 
-/// Whether the answer is the bus's; if somebody else has given it, the bus is asked once more.
+/// Whether the answer comes from the bus. If not, asks the bus again.
 bool BusClient::isBusAnswer(sd_bus_message* reply, const char* member, sd_bus_message_handler_t handler) {
   if (isFromBus(reply)) return true;
   if (state_ == State::Identifying && ask(sd_bus_message_get_bus(reply), member, handler) < 0) {
@@ -145,7 +147,8 @@ void BusClient::decide() {
   } else if (distrust_.empty()) {
     distrust_ = describe(peer.error());
   }
-  // A peer that is not known for certain holds nothing; the delegate is asked all the same, to tell what of.
+  // A peer whose identity is in doubt has no entitlements. The delegate is asked all the same, because it
+  // logs the missing one.
   bool accepted = context_->delegate->accepts(*this);
   if (accepted && distrust_.empty() && !peer->isAlive()) distrust_ = "its process has ended";
   accepted = accepted && distrust_.empty();
@@ -173,7 +176,8 @@ void BusClient::confirmed(sd_bus_message* reply) {
   serveWaiting();
 }
 
-/// Why is for the log; an empty text when the delegate has said it. The peer learns what it lacks.
+/// `why` is logged; empty if the delegate has already logged the reason. The peer is told which entitlement
+/// it lacks.
 void BusClient::refuse(const std::string& why) {
   if (!why.empty()) context_->log.error("Refusing connection %@: %@", name_, why);
   state_ = State::Refused;
@@ -214,7 +218,7 @@ void BusClient::serveWaiting() {
   }
 }
 
-/// The call is not open any more.
+/// Removes the call from the counts of open calls.
 void BusClient::settle(const BusCall& call) {
   --*context_->openCalls;
   bytes_ -= call.bytes;
@@ -227,7 +231,7 @@ void BusClient::serve(BusCall call) {
   const auto reply = std::make_shared<CallReply>(context_->thread, weak_from_this(), number);
   const ServiceReply completion(context_->log, context_->interface.methods[index].member,
                                 [reply](Value value) { reply->give(std::move(value)); });
-  // What still waits behind another call when the client leaves is not done any more.
+  // A call that is still queued when the client leaves is not carried out.
   queue_->async([object = object_, index, arguments = std::weak_ptr(call.arguments), completion] {
     const auto held = arguments.lock();
     if (!held) return completion({});
@@ -268,7 +272,7 @@ void BusClient::close() {
 }
 
 void BusClient::release() {
-  // What the client was given may take its time to end; the bus thread has none.
+  // Destroying the exported object may take a while, so it happens off the bus thread.
   if (queue_ && object_) queue_->async([object = std::exchange(object_, nullptr)] {});
   queue_.reset();
 }

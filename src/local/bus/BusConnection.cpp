@@ -15,10 +15,10 @@
 namespace kvr {
 namespace {
 
-/// How long an ending process waits for a bus that takes nothing.
+/// How long an ending process waits for a bus that accepts nothing.
 constexpr std::chrono::seconds kSendLimit{2};
 
-/// Where the session says its bus is, or else where a session has it.
+/// The session's stated bus address, or else the default one.
 std::string sessionBusAddress() {
   if (const char* const stated = ::secure_getenv("DBUS_SESSION_BUS_ADDRESS")) return stated;
   const char* const directory = ::secure_getenv("XDG_RUNTIME_DIR");
@@ -41,7 +41,8 @@ std::string sessionBusAddress() {
 }  // namespace
 
 void BusThread::post(Work work) {
-  // Let go after the lock, should the loop not take it: what it holds may post as well.
+  // The loop may not accept `work`. It must then be destroyed after the lock is released, because its
+  // destruction may post as well.
   const auto held = std::make_shared<Work>(std::move(work));
   const std::lock_guard lock(mutex_);
   if (loop_) loop_->post([held] { (*held)(); });
@@ -94,7 +95,7 @@ int BusConnection::connect() {
   r = sd_bus_set_description(opened, "kvragent");
   if (r >= 0) r = sd_bus_set_address(opened, sessionBusAddress().c_str());
   if (r >= 0) r = sd_bus_set_bus_client(opened, 1);
-  // No call has use for a descriptor, and so nobody can use up this process's.
+  // No call needs a descriptor; without this, peers could use up this process's descriptors.
   if (r >= 0) r = sd_bus_negotiate_fds(opened, 0);
   if (r >= 0) r = sd_bus_set_exit_on_disconnect(opened, 0);
   if (r >= 0) r = sd_bus_start(opened);
@@ -109,7 +110,7 @@ int BusConnection::connect() {
 
 int BusConnection::handleDisconnected(sd_bus_message*, void* userdata, sd_bus_error*) {
   return guardedBusCallback([&] {
-    // Not from within the bus's own processing.
+    // Not while the bus is processing messages.
     auto* const self = static_cast<BusConnection*>(userdata);
     self->loop_->post([self] { self->lose({"bus", 0, "the session bus closed the connection"}); });
     return 0;

@@ -9,10 +9,10 @@
 namespace kvr {
 namespace {
 
-/// Connections that have called and not left; more are turned away.
+/// The most connections that have called and not left; further ones get an error.
 constexpr std::size_t kMostClients = 4096;
 
-// What the bus answers to a request for a name.
+// The bus's answers to a request for a name.
 constexpr std::uint32_t kIsOwner = 1;
 constexpr std::uint32_t kWasOwner = 4;
 
@@ -95,7 +95,7 @@ int BusService::handleCall(sd_bus_message* message, void* userdata, sd_bus_error
   });
 }
 
-/// Whether the call was for the service; what is not, the bus library answers.
+/// Whether the call was for the service; the bus library answers the others.
 bool BusService::take(sd_bus_message* message) {
   if (sd_bus_message_is_method_call(message, "org.freedesktop.DBus.Introspectable", "Introspect")) {
     const Value document = introspectionDocument(context_->interface);

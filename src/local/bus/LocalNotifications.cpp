@@ -18,25 +18,25 @@ double secondsBetween(Clock::time_point from, Clock::time_point until) {
 
 }  // namespace
 
-/// What the bus thread and the main queue use as well.
+/// State shared by the bus thread and the main queue.
 struct LocalNotifications::State : std::enable_shared_from_this<State> {
   struct Registration {
     std::string name;
     std::shared_ptr<const std::function<void()>> handler;
-    std::size_t inARow = 0;       ///< notifications up to the last one
-    Clock::time_point last;       ///< of them
-    Clock::time_point called;     ///< the handler, the last time
-    std::size_t callsToCome = 0;  ///< which the main queue has
-    bool isFlooded = false;       ///< one of them stands for all that comes before it
-    bool isFloodTold = false;     ///< that the row has become a flood
+    std::size_t inARow = 0;       ///< notifications in the present row
+    Clock::time_point last;       ///< when the last one arrived
+    Clock::time_point called;     ///< when the handler was last called
+    std::size_t callsToCome = 0;  ///< calls handed to the main queue
+    bool isFlooded = false;       ///< one of those calls stands for all notifications before it
+    bool isFloodTold = false;     ///< the flood of this row has been logged
   };
   using Registrations = std::map<Token, Registration>;
-  /// A call to be made, in so many seconds.
+  /// A call of a handler after `delay` seconds.
   struct Call {
     Token token;
     double delay;
     bool isOfFlood;
-    bool isNews;  ///< that there is a flood
+    bool isNews;  ///< the first call of a flood, to be logged
   };
 
   State(WorkQueues& theQueues, Log& theLog) : queues(theQueues), log(theLog) {}
@@ -66,7 +66,7 @@ struct LocalNotifications::State : std::enable_shared_from_this<State> {
     }
   }
 
-  /// Nothing when a call is to come that stands for this notification as well.
+  /// Nothing when a call already under way stands for this notification too.
   static std::optional<Call> callFor(Token token, Registration& registration, Clock::time_point now) {
     if (secondsBetween(registration.last, now) > kPause) {
       registration.inARow = 0;
@@ -99,7 +99,7 @@ struct LocalNotifications::State : std::enable_shared_from_this<State> {
 
   WorkQueues& queues;
   Log& log;
-  std::map<std::string, BusSlotRef> slots;  ///< by name; the bus thread's
+  std::map<std::string, BusSlotRef> slots;  ///< by name; used on the bus thread
   std::mutex mutex;                         ///< guards what follows
   Registrations registrations;
   Token last = 0;
@@ -147,7 +147,7 @@ LocalNotifications::Token LocalNotifications::registerFor(const std::string& nam
 }
 
 void LocalNotifications::cancel(Token token) {
-  // Let go outside the lock: a handler's end may cancel another.
+  // Destroyed after the lock is released: a handler's destructor may cancel another registration.
   State::Registrations::node_type cancelled;
   const std::lock_guard lock(state_->mutex);
   cancelled = state_->registrations.extract(token);

@@ -12,7 +12,7 @@ namespace {
 constexpr std::size_t kAskAfter = std::size_t{256} << 10;
 constexpr std::size_t kMostPeers = 8192;
 
-/// What a value takes on the bus, roughly.
+/// A rough estimate of a value's size on the bus, in bytes.
 std::size_t footprint(const Value& value) {
   constexpr std::size_t kNode = 16;
   switch (value.kind()) {
@@ -83,7 +83,8 @@ UnreadReplies::Peer& UnreadReplies::peerNamed(const char* name) {
   return peer;
 }
 
-/// Nobody watches the peers that have only asked what everybody may ask: those of little weight go.
+/// No watch tells when these peers leave (not all of them have clients here), so those with few unread bytes
+/// are dropped.
 void UnreadReplies::makeRoom() {
   std::erase_if(peers_, [this](const auto& entry) {
     const Peer& peer = entry.second;

@@ -10,7 +10,7 @@
 namespace kvr {
 namespace {
 
-/// The one property of a record whose integer is unsigned on the bus whatever its value.
+/// The one property of a record that is always sent as an unsigned integer.
 constexpr std::string_view kUnsignedProperty = "deviceType";
 
 // ---- writing; every function returns a negative errno on failure
@@ -150,7 +150,8 @@ class Reader {
     }
   }
 
-  /// `containers` stand around the dictionary; at `level` kBusRecordLevels and above it is a plain tree.
+  /// `containers` is the number of containers around the dictionary; from `level` kBusRecordLevels on, it is
+  /// a plain tree.
   int dictionary(int containers, int level, Value& value) {
     Value::Dictionary result;
     const int r = each('a', "{sv}", [&] {
@@ -182,7 +183,7 @@ class Reader {
     return r;
   }
 
-  /// Enters a container and reads what is in it: the one content, or every element of an array.
+  /// Enters a container and reads its contents: the single value, or every element of an array.
   template <class Content>
   int each(char type, const char* contents, const Content& content) {
     int r = sd_bus_message_enter_container(message_, type, contents);
@@ -229,7 +230,7 @@ class Reader {
     return r;
   }
 
-  /// Data; directly under a key of a record, the tree that was packed into it.
+  /// Reads data. Directly under a key of a record, unpacks a tree that was packed into it.
   int data(int level, Value& value) {
     const void* bytes = nullptr;
     std::size_t size = 0;

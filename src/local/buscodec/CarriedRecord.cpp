@@ -10,10 +10,12 @@
 namespace kvr {
 namespace {
 
-/// So many containers are used at most; the rest is left to what else stands between here and a client.
+/// The most containers that are used; the rest of the bus's limit is left to programs between here and a
+/// client.
 constexpr int kUsedContainers = 56;
 
-// What stands around a tree inside of a container: the array and the variant; for a dictionary its entry too.
+// The containers added around an element: for an array the array and the variant; for a dictionary its entry
+// too.
 constexpr int kAroundElement = 2;
 constexpr int kAroundEntry = 3;
 
@@ -24,7 +26,7 @@ bool canCarryKeys(const Value::Dictionary& dictionary) {
   return true;
 }
 
-/// Whether a tree can stand in a variant, which is the innermost of so many containers.
+/// Whether a tree can be sent in a variant that is the innermost of `containers` containers.
 bool canCarry(const Value& tree, int containers) {
   if (containers > kUsedContainers) return false;
   switch (tree.kind()) {
@@ -63,7 +65,7 @@ Result<Value> packed(const Value& tree) {
   return Value(Value::Bytes(bytes->begin(), bytes->end()));
 }
 
-/// `level` is 0 for the value's own dictionary. What travels as it stands is shared, not copied.
+/// `level` is 0 for the value's own dictionary. Unchanged parts are shared, not copied.
 Result<Value> carriedRecordAt(int level, const Value& record, int containers) {
   std::optional<Value::Dictionary> changed;
   for (const auto& [key, value] : record.dictionary()) {
@@ -88,7 +90,8 @@ std::size_t endOfText(std::size_t offset, std::string_view text) {
   return aligned(offset, 4) + 4 + text.size() + 1;
 }
 
-/// Where a variant ends that begins at `offset`. Its signature has a length byte and a NUL around it.
+/// The end of a variant that begins at `offset`. Its signature has a length byte before it and a NUL after
+/// it.
 std::size_t endOfVariant(std::size_t offset, const Value& tree) {
   const auto content = [offset](std::string_view signature, std::size_t alignment) {
     return aligned(offset + signature.size() + 2, alignment);
@@ -127,7 +130,7 @@ bool busCanCarryText(std::string_view text) {
       ++at;
       continue;
     }
-    // Code points that are no characters pass the daemon, but sd-bus refuses them.
+    // sd-bus refuses noncharacters, although the daemon lets them pass.
     const char32_t point = nextCodePoint(text, at);
     const bool isNoCharacter = (point >= 0xFDD0 && point <= 0xFDEF) || (point & 0xFFFEU) == 0xFFFE;
     if (point == 0 || point == kNoCodePoint || isNoCharacter) return false;

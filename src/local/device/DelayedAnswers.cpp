@@ -53,7 +53,7 @@ void DelayedAnswers::run() {
       changed_.wait_until(lock, due);
       continue;
     }
-    // What an answer holds is released before the next one is waited for.
+    // Destroy an answer, and what it captures, before waiting for the next one.
     auto node = owed_.extract(owed_.begin());
     const bool ending = ending_;
     lock.unlock();

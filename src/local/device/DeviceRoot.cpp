@@ -22,7 +22,7 @@ std::string absolute(const std::string& directory) {
   return path;
 }
 
-/// Why something could have been written by another user, if it could. What does not exist could not.
+/// Why another user could have written a file or directory, if one could; nothing if it does not exist.
 std::optional<std::string> distrustOf(const std::string& path) {
   struct stat status {};
   if (::stat(path.c_str(), &status) != 0) {
@@ -38,7 +38,7 @@ std::optional<std::string> distrustOf(const std::string& path) {
   return std::nullopt;
 }
 
-/// Whether `resolved` is the file, not a link, that `given` leads to.
+/// Whether `resolved` is the file that `given` leads to, and not a link.
 bool isSameFile(const std::string& given, const std::string& resolved) {
   struct stat one {};
   struct stat other {};
@@ -68,17 +68,17 @@ Value DeviceRoot::array(std::string_view file) const {
 }
 
 Value DeviceRoot::trustedDictionary(std::string_view file) const {
-  // A symbolic link is followed first, so that what is examined is what is read.
+  // Follow symbolic links first, so that the file that is checked is the one that is read.
   std::error_code error;
   const auto path = resolved(file, error);
   if (error == std::errc::no_such_file_or_directory) return {};
-  if (error) return dictionary(file);  // which cannot be read either, and says why
+  if (error) return dictionary(file);  // it cannot be read either, and the error is logged there
   if (!isTrusted(path)) return {};
   auto tree = lists_.read(path, PropertyListFiles::Expected::Dictionary, kLeave);
   return tree ? *std::move(tree) : Value();
 }
 
-/// The file's path without symbolic links. A path found earlier holds as long as it is no link itself and
+/// The file's path without symbolic links. An earlier result stays valid while it is not a link itself and
 /// leads to the same file.
 std::string DeviceRoot::resolved(std::string_view file, std::error_code& error) const {
   const auto given = pathOf(file);

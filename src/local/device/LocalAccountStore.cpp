@@ -9,7 +9,7 @@ constexpr std::string_view kFile = "Accounts.plist";
 
 Error failure(std::int64_t code, std::string message) { return {"accounts", code, std::move(message)}; }
 
-/// Whether two stamps are of the same content. A stamp that settles is still the same.
+/// Whether two stamps belong to the same contents; `settled` does not count.
 bool sameContent(std::optional<FileStamp> left, std::optional<FileStamp> right) {
   if (!left || !right) return false;
   left->settled = right->settled = true;
@@ -60,7 +60,7 @@ std::optional<std::string> LocalAccountStore::tokenFor(const AuthenticationAccou
 
 void LocalAccountStore::renewCredentialsFor(const AuthenticationAccount& account,
                                             const RenewalOptions& /*options*/, RenewalReply reply) {
-  // The stamp is the older of the two: tokens never go with a content that was not looked at.
+  // Take the stamp before reading, so that the tokens are never assigned to contents that were not read.
   const auto stamp = root_.stamp(kFile);
   Value script = authenticationTree(account)["renewal"];
   const auto delay = secondsIn(script["delay"]);
@@ -76,7 +76,7 @@ void LocalAccountStore::renewCredentialsFor(const AuthenticationAccount& account
   });
 }
 
-/// What the file says of a cloud account; null when that is not the primary one any more.
+/// The entry of a cloud account; null when it is no longer the primary one.
 Value LocalAccountStore::cloudTree(const CloudAccount& account) const {
   const auto tree = root_.trustedDictionary(kFile);
   const auto& cloud = tree["primaryAccount"];

@@ -19,7 +19,7 @@ std::string_view trimmed(std::string_view text) {
   return text.substr(first, text.find_last_not_of(kBlanks) - first + 1);
 }
 
-/// A fact as firmware states it, unless it is one of the texts that makers leave there instead of one.
+/// A text from the firmware, unless it is one of the placeholders that manufacturers leave in.
 std::optional<std::string> factIn(std::string_view text) {
   static constexpr std::array kFillers{"none",
                                        "default string",
@@ -87,7 +87,7 @@ std::optional<std::string> LocalDeviceProperties::hostAnswer(std::string_view qu
     return firstFact({"/sys/class/dmi/id/product_name", "/proc/device-tree/model"});
   }
   if (question == kUserAssignedDeviceName) return hostName();
-  // The first of the two files counts, whatever it holds.
+  // Only the first of the two files that exists counts, whatever it contains.
   auto release = textOf("/etc/os-release");
   if (!release) release = textOf("/usr/lib/os-release");
   return release ? variable(*release, "VERSION_ID") : std::nullopt;

@@ -12,7 +12,7 @@ namespace {
 constexpr const char* kFile = "Network.plist";
 
 constexpr std::string_view kOperationalState = "OPER_STATE=";
-/// The operational states in which no link has an address of its own.
+/// The operational states in which no link has an address.
 constexpr std::array<std::string_view, 6> kUnreachable{"missing", "off",     "no-carrier",
                                                        "dormant", "carrier", "degraded-carrier"};
 

@@ -8,7 +8,7 @@ namespace {
 
 constexpr const char* kFile = "Store.plist";
 
-/// The dictionaries of a list that are about one of the bundles.
+/// The dictionaries in a list that belong to one of the bundles.
 std::vector<Value> entriesAbout(const std::vector<std::string>& bundleIdentifiers, const Value& list) {
   std::vector<Value> entries;
   if (!list.isArray()) return entries;

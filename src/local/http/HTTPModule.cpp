@@ -18,16 +18,16 @@ namespace {
 using std::chrono::milliseconds;
 
 constexpr long kConnectionsPerHost = 64;
-/// To a host, once a service has turned connections away.
+/// Connections to a host after a service has refused some.
 constexpr long kFewConnections = 6;
 constexpr long kIdleConnections = kConnectionsPerHost;
-/// Without a transfer for so long, connections are closed.
+/// Connections are closed when no transfer has run for this long.
 constexpr std::chrono::seconds kIdleTime{5};
-/// While a transfer is under way; should libcurl forget one, it is found again after this time.
+/// The longest wait while a transfer is under way: if libcurl forgets one, this finds it again.
 constexpr milliseconds kLongestWait{1000};
 constexpr char kEnding[] = "the process is ending";
 
-/// Many exchanges on one thread, which sleeps for as long as nothing is under way.
+/// Carries out many exchanges on one thread, which sleeps while nothing is under way.
 class CurlTransfers : public HTTPTransfers {
  public:
   CurlTransfers();
@@ -44,10 +44,10 @@ class CurlTransfers : public HTTPTransfers {
   /// Null when memory is short.
   static MultiHandle newMultiHandle();
   void run() noexcept;
-  /// The exchanges handed over meanwhile, after a wait for one if none is under way; nothing at the end.
+  /// The exchanges that were added meanwhile; waits for one if none is under way. Nothing when ending.
   std::optional<std::vector<ExchangeRef>> nextExchanges();
   void begin(ExchangeRef exchange);
-  /// Moves everything as far as it goes, then waits until there is more to do.
+  /// Advances all transfers as far as possible, then waits until there is more to do.
   void step();
   void collectFinished();
   bool yields(Exchange& exchange, CURLcode code);
@@ -62,11 +62,11 @@ class CurlTransfers : public HTTPTransfers {
   std::vector<ExchangeRef> incoming_;
   bool ending_ = false;
 
-  // The thread's own.
+  // Used on the thread only.
   std::map<Exchange*, ExchangeRef> underWay_;
   std::set<std::pair<Clock::time_point, Exchange*>> deadlines_;
-  bool hasChanged_ = false;  ///< since the last pass, some transfer began or ended
-  bool wereMany_ = false;    ///< under way at once, more than go over few connections: since all was quiet
+  bool hasChanged_ = false;  ///< a transfer began or ended since the last pass
+  bool wereMany_ = false;    ///< since the last idle time, more exchanges than `kFewConnections` ran at once
   std::thread thread_;
 };
 
@@ -81,8 +81,8 @@ MultiHandle CurlTransfers::newMultiHandle() {
 
 CurlTransfers::CurlTransfers() {
   if (!multi_) throw std::bad_alloc();
-  // The thread, and those it starts to resolve names, inherit the mask: signals are for the main thread, and
-  // a connection that breaks raises none.
+  // The thread, and those it starts to resolve names, inherit the signal mask: signals go to the main thread,
+  // and a broken connection raises none here.
   sigset_t all;
   sigset_t before;
   sigfillset(&all);
@@ -141,7 +141,7 @@ std::optional<std::vector<CurlTransfers::ExchangeRef>> CurlTransfers::nextExchan
   std::unique_lock lock(mutex_);
   const auto isCalled = [this] { return ending_ || !incoming_.empty(); };
   if (underWay_.empty() && !changed_.wait_for(lock, kIdleTime, isCalled)) {
-    // The connections are the handle's.
+    // The multi handle owns the connections, so replacing it closes them.
     if (auto fresh = newMultiHandle()) multi_ = std::move(fresh);
     wereMany_ = false;
     changed_.wait(lock, isCalled);
@@ -171,8 +171,8 @@ void CurlTransfers::step() {
   const auto check = [](CURLMcode code) {
     if (code != CURLM_OK) throw std::runtime_error(curl_multi_strerror(code));
   };
-  // When a transfer begins, libcurl 7.88 may forget that another one asked to go on at once: after a pass in
-  // which any began or ended comes another pass.
+  // When a transfer begins, libcurl 7.88 may forget that another one asked to continue at once. So another
+  // pass follows each one in which a transfer began or ended.
   bool isQuiet = false;
   while (!isQuiet || hasChanged_) {
     isQuiet = !std::exchange(hasChanged_, false);
@@ -200,7 +200,8 @@ void CurlTransfers::collectFinished() {
   }
 }
 
-/// When a service takes no more of many connections, the rest is left to fewer of them: until all is quiet.
+/// When a service refuses one of many connections, uses fewer of them until all is idle. True when the
+/// exchange may be tried again.
 bool CurlTransfers::yields(Exchange& exchange, CURLcode code) {
   if (!mayBeTurnedAway(code) || !wereMany_) return false;
   curl_multi_setopt(multi_.get(), CURLMOPT_MAX_HOST_CONNECTIONS, kFewConnections);
@@ -229,7 +230,7 @@ void CurlTransfers::failAll(CURLcode code, const char* text) {
 
 extern "C" __attribute__((visibility("default"))) HTTPTransfers* kvrNewHTTPTransfers() noexcept {
   try {
-    // Never undone: the library stays loaded.
+    // Never undone, because the library stays loaded.
     static const CURLcode initialised = curl_global_init(CURL_GLOBAL_DEFAULT);
     return initialised == CURLE_OK ? new http_module::CurlTransfers : nullptr;
   } catch (...) {

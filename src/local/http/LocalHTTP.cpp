@@ -11,7 +11,7 @@
 namespace kvr {
 namespace {
 
-// libcurl's numbers for what is refused before libcurl is there.
+// libcurl's error codes, for requests that are refused before libcurl is loaded.
 constexpr int kUnsupportedProtocol = 1;
 constexpr int kFailedInitialisation = 2;
 constexpr int kMalformedURL = 3;
@@ -20,7 +20,7 @@ constexpr int kBadArgument = 43;
 
 Error failure(int code, std::string message) { return {"http", code, std::move(message)}; }
 
-/// Why a request must not be sent, if so.
+/// The reason why a request must not be sent, if there is one.
 std::optional<Error> faultOf(const HTTPRequest& request) {
   const auto url = URL::parse(request.url);
   if (!url) return failure(kMalformedURL, "malformed URL");
@@ -39,7 +39,7 @@ std::optional<Error> faultOf(const HTTPRequest& request) {
 
 }  // namespace
 
-/// How many requests have no answer yet, or one that is being handled.
+/// Counts the requests without an answer or whose answer is being handled.
 class LocalHTTP::OpenRequests {
  public:
   void begin() {
@@ -65,7 +65,7 @@ class LocalHTTP::OpenRequests {
   std::size_t count_ = 0;
 };
 
-/// What every session sends through; it lives as long as any of them.
+/// Sends for all sessions; lives as long as any of them.
 class LocalHTTP::Transport {
  public:
   using Transfers = std::shared_ptr<HTTPTransfers>;
@@ -73,7 +73,7 @@ class LocalHTTP::Transport {
   Transport(WorkQueues& queues, Log& log) : queues_(queues), log_(log) {}
 
   void send(HTTPRequest request, HTTPSession::Reply reply) {
-    // Counts for as long as the reply is there.
+    // The request counts until its reply has been handled and destroyed.
     openRequests_->begin();
     const std::shared_ptr<void> counted(nullptr, [open = openRequests_](void*) { open->end(); });
     HTTPTransfers::Done done = [queue = queues_.concurrentQueue(Priority::Default), counted,
@@ -100,7 +100,7 @@ class LocalHTTP::Transport {
     if (transfers) transfers->beginEnding();
   }
 
-  /// As `beginEnding`, and waits until nothing is under way.
+  /// Calls `beginEnding` and waits until nothing is under way.
   void end() {
     beginEnding();
     Transfers last;
@@ -131,7 +131,7 @@ class LocalHTTP::Transport {
   const std::shared_ptr<OpenRequests> openRequests_ = std::make_shared<OpenRequests>();
   std::mutex mutex_;  ///< guards what follows
   Transfers transfers_;
-  std::optional<Error> fault_;  ///< why there are no transfers, once that is known
+  std::optional<Error> fault_;  ///< why the transfers could not be started, once that has failed
   bool ending_ = false;
 };
 

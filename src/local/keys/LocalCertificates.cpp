@@ -16,7 +16,7 @@ namespace {
 
 constexpr std::string_view kCurve = "prime256v1";
 constexpr std::time_t kToleratedSetback = 300;  ///< seconds
-/// The last second that a certificate can name; it stands for "no end".
+/// The last second that a certificate can express; it means "never expires".
 constexpr double kEndOfTime = 253402300799.0;  // 9999-12-31 23:59:59 UTC
 
 std::time_t secondsOf(Date date) {
@@ -51,7 +51,7 @@ bool addExtension(X509* certificate, X509* issuer, int identifier, const char* v
   return extension && X509_add_ext(certificate, extension.get(), -1) == 1;
 }
 
-/// What both kinds of certificate begin with; the extensions and the signature are the caller's.
+/// The common part of both kinds of certificate; the caller adds the extensions and the signature.
 Certificate newCertificate(const Key& key, X509_NAME* subject, const X509_NAME* issuer, std::time_t begin,
                            std::time_t end) {
   auto certificate = adoptCertificate(X509_new());
@@ -78,7 +78,7 @@ Result<std::string> written(const Write& write) {
   return std::string(bytes, static_cast<std::size_t>(length));
 }
 
-/// Nobody is asked for a passphrase: an encrypted key is a damaged one.
+/// There is nobody to ask for a passphrase, so an encrypted key counts as damaged.
 int refusePassphrase(char*, int, int, void*) { return -1; }
 
 }  // namespace
@@ -147,7 +147,7 @@ Verdict verify(const Certificate& certificate, const Certificate& authority, Dat
   }
   auto* const parameters = X509_STORE_CTX_get0_param(context.get());
   X509_VERIFY_PARAM_set_time(parameters, secondsOf(now));
-  // The authority's own signature as well: it tells whether its certificate is as it was made.
+  // Also check the authority's own signature, to detect a damaged authority certificate.
   X509_VERIFY_PARAM_set_flags(parameters, X509_V_FLAG_X509_STRICT | X509_V_FLAG_CHECK_SS_SIGNATURE);
   const bool verified = X509_verify_cert(context.get()) == 1;
   ERR_clear_error();

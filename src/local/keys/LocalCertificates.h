@@ -12,8 +12,8 @@
 
 namespace kvr {
 
-// Keys and X.509 certificates as the local authority makes them: P-256 keys, certificates signed by ECDSA
-// with SHA-256. Errors are in domain "openssl". Any thread.
+// Keys and X.509 certificates of the local authority: P-256 keys, certificates signed with ECDSA and SHA-256.
+// Errors are in domain "openssl". Any thread.
 
 /// A key pair with its certificate.
 struct CertifiedKey {
@@ -21,18 +21,18 @@ struct CertifiedKey {
   openssl::Certificate certificate;
 };
 
-/// The parts of a distinguished name by OpenSSL's numbers for them, in order. A text that cannot stand in a
-/// certificate (empty, too long for its part, not UTF-8) is left out.
+/// The attributes of a distinguished name, keyed by OpenSSL's NIDs, in order. A text that is not allowed in a
+/// certificate (empty, too long for its attribute, not UTF-8) is left out.
 using DistinguishedName = std::vector<std::pair<int, std::string>>;
 
 Result<openssl::Key> newPrivateKey();
 
-/// A self-signed authority. It is valid at all times, so that a clock gone astray never ends it: it is
-/// trusted for the place where it lies.
+/// A self-signed authority. It never expires, so that a wrong clock cannot invalidate it; it is trusted
+/// because of the directory it is stored in.
 Result<openssl::Certificate> newAuthorityCertificate(const openssl::Key& key);
 
-/// A leaf that may sign, issued by `authority`. It is valid for `validity` minutes from `now`, and for a few
-/// minutes before, so that a clock set back a little does not void it.
+/// A leaf certificate for signing, issued by `authority`. Valid for `validity` minutes from `now`, and from a
+/// few minutes before `now`, so that it survives a clock set back a little.
 Result<openssl::Certificate> newLeafCertificate(const openssl::Key& key, const DistinguishedName& subject,
                                                 const CertifiedKey& authority, Date now,
                                                 std::int64_t validity);
@@ -42,10 +42,10 @@ bool isSameCertificate(const openssl::Certificate& left, const openssl::Certific
 bool belongTogether(const CertifiedKey& pair);
 
 enum class Verdict { Good, OutOfDate, Bad };
-/// Whether `authority` (trusted) issued `certificate` for signing, as of `now`.
+/// Checks that the trusted `authority` issued `certificate` for signing, as of `now`.
 Verdict verify(const openssl::Certificate& certificate, const openssl::Certificate& authority, Date now);
 
-/// Whether a certificate that was verified once is within its dates as of `now`.
+/// Whether an already verified certificate is within its validity dates at `now`.
 bool isInDate(const openssl::Certificate& certificate, Date now);
 
 /// The signature of a message: ECDSA with SHA-256, in DER form.
@@ -55,9 +55,9 @@ Result<std::string> derOf(const openssl::Certificate& certificate);
 Result<std::string> pemOf(const openssl::Certificate& certificate);
 /// Unencrypted PKCS #8.
 Result<std::string> pemOf(const openssl::Key& key);
-/// All certificates of a PEM text; none when any of them is damaged.
+/// All certificates in a PEM text; none if any of them is damaged.
 std::vector<openssl::Certificate> certificatesInPEM(std::string_view text);
-/// The P-256 private key of a PEM text; null when there is none.
+/// The P-256 private key in a PEM text; null when there is none.
 openssl::Key privateKeyInPEM(std::string_view text);
 
 }  // namespace kvr

@@ -15,8 +15,8 @@ namespace {
 
 constexpr std::string_view kFile = "Attestation.plist";
 
-/// Keys of this service lie in files that only the user's own processes can read, on this device: there is
-/// nothing more to grant.
+/// Empty: the keys are files on this device that only the user's own processes can read, so there is no
+/// access to grant.
 class LocalKeyAccessControl : public KeyAccessControl {};
 
 double secondsIn(const Value& value) { return value.isNumber() ? value.asDouble() : 0; }
@@ -79,14 +79,14 @@ void LocalDeviceAttestation::answer(const AttestationOptions& options, const Val
   reply(credentials->key, std::move(chain), std::nullopt);
 }
 
-/// What the certificate says of the device: no more than was asked for, and nothing that changes with an
+/// How the certificate describes the device: only by what was asked for, and by nothing that changes with an
 /// update of the operating system.
 DistinguishedName LocalDeviceAttestation::subjectFor(const AttestationOptions& options) const {
   DistinguishedName subject = {{NID_commonName, options.label},
                                {NID_organizationalUnitName, options.usesFallbackKind ? "HASP" : "WELD"}};
   if (includes(options, kDeviceIdentifiers)) {
     if (const auto serialNumber = properties_.answer(DeviceProperties::kSerialNumber)) {
-      // In this form only: a certificate goes further than the request it is sent with.
+      // Only the hash, because a certificate is passed on further than the request it is sent with.
       subject.emplace_back(NID_serialNumber, sha256Digits(*serialNumber));
     }
   }

@@ -181,7 +181,7 @@ std::optional<Error> LocalKeyStore::writePair(const std::string& base, const Key
   return files_.replace(certificatePath(base), chain);
 }
 
-/// Nothing when the file is missing or larger than any key or chain.
+/// Nothing when the file is missing or larger than any key or chain could be.
 Result<std::optional<std::string>> LocalKeyStore::contentOf(const std::string& path) {
   const auto contents = files_.read(path, kLargestFile);
   if (!contents) {

@@ -22,7 +22,8 @@ std::string LocalStringTables::directoryOfThisProgram() {
 std::string LocalStringTables::localizedString(const std::string& bundle, const std::string& table,
                                                const std::string& key,
                                                const std::string& defaultValue) const {
-  // Letters, digits and a few marks between them: the identifier names a directory and leads nowhere else.
+  // Only letters, digits and a few marks, because the identifier becomes a directory name and must not lead
+  // elsewhere.
   const auto identifier = locale_.preferredIdentifier();
   const std::array<std::string, 3> languages{identifier,
                                              identifier.substr(0, identifier.find_first_of("_-@;=")), "en"};

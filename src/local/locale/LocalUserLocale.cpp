@@ -15,7 +15,7 @@ namespace {
 
 constexpr std::string_view kDefaultIdentifier = "en_US";
 
-/// Whether a text is made like a locale's identifier. It becomes part of paths and of headers.
+/// Whether a text has the form of a locale identifier. It is used in paths and headers.
 bool isIdentifier(std::string_view text) {
   constexpr std::size_t kLongest = 128;
   return !text.empty() && text.size() <= kLongest && std::ranges::all_of(text, [](char c) {
@@ -24,7 +24,7 @@ bool isIdentifier(std::string_view text) {
   });
 }
 
-/// The first variable that is set decides, without its encoding and modifier.
+/// Taken from the first variable that is set, without encoding and modifier.
 std::string identifierFromEnvironment() {
   for (const auto* name : {"LC_ALL", "LC_MESSAGES", "LANG"}) {
     const char* const value = std::getenv(name);
@@ -51,11 +51,11 @@ std::string LocalUserLocale::preferredIdentifier() const {
 }
 
 long LocalUserLocale::secondsFromGMT(Date date) const {
-  constexpr double kLast = 1e14;  // seconds; no zone's rules look further
+  constexpr double kLast = 1e14;  // seconds; far beyond the rules of any time zone
   const double seconds =
       std::isnan(date.secondsSince1970) ? 0 : std::clamp(date.secondsSince1970, -kLast, kLast);
   const auto time = static_cast<std::time_t>(std::floor(seconds));
-  // The C library's zone is the process's.
+  // The C library's time zone is global to the process.
   static std::mutex zoneMutex;
   const std::lock_guard lock(zoneMutex);
   ::tzset();

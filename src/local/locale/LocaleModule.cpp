@@ -7,7 +7,7 @@
 #include <charconv>
 #include <memory>
 
-// The name that `kDecimalStringSymbol` asks for.
+// Exported under the name in `kDecimalStringSymbol`.
 extern "C" __attribute__((visibility("default"))) int kvr_decimal_string(const char* locale,
                                                                          std::uint64_t number, char* buffer,
                                                                          std::size_t size) {
@@ -15,7 +15,7 @@ extern "C" __attribute__((visibility("default"))) int kvr_decimal_string(const c
   const std::unique_ptr<UNumberFormat, decltype(&unum_close)> format(
       unum_open(UNUM_DECIMAL, nullptr, 0, locale, nullptr, &status), &unum_close);
   if (U_FAILURE(status)) return -1;
-  // As digits: the number may lie above the integers that the library takes.
+  // Passed as digits, because the number may exceed the library's integer types.
   std::array<char, 24> digits{};
   const auto end = std::to_chars(digits.data(), digits.data() + digits.size(), number).ptr;
   std::array<UChar, 128> text{};

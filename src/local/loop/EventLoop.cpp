@@ -15,9 +15,9 @@ namespace kvr {
 
 namespace {
 
-constexpr double kLongestDelay = 1e13;  // seconds; the loop's microseconds end soon after
+constexpr double kLongestDelay = 1e13;  // seconds; the loop's clock in microseconds overflows soon after
 constexpr std::uint64_t kNever = std::numeric_limits<std::uint64_t>::max();
-constexpr std::uint64_t kAccuracy = 1;  // microsecond; left alone, the loop would bundle timers by 250 ms
+constexpr std::uint64_t kAccuracy = 1;  // microsecond; by default the loop would bundle timers within 250 ms
 
 std::uint64_t bootTime() {
   timespec now{};
@@ -69,7 +69,7 @@ void EventLoop::setFailureHandler(std::function<void(const std::string&)> handle
 
 void EventLoop::post(Work work) {
   const std::lock_guard lock(mutex_);
-  if (closed_) return;  // the caller's argument goes after the lock
+  if (closed_) return;  // the caller's argument is destroyed after the lock is released
   posted_.push_back(std::move(work));
   wake();
 }
@@ -120,7 +120,7 @@ void EventLoop::wake() {
   ::eventfd_write(wakeDescriptor_, 1);
 }
 
-/// What is posted meanwhile has its turn after the loop's other sources.
+/// Work posted meanwhile runs after the loop's other sources had their turn.
 void EventLoop::runPosted() {
   eventfd_t count = 0;
   ::eventfd_read(wakeDescriptor_, &count);
@@ -148,7 +148,7 @@ void EventLoop::runDue() {
   armTimer();
 }
 
-/// Runs and releases.
+/// Runs the work and destroys it.
 void EventLoop::runGuarded(Work& work) noexcept {
   const auto failed = [this](const char* what) {
     if (!failed_) std::terminate();
@@ -175,7 +175,7 @@ void EventLoop::armTimer() {
 }
 
 void EventLoop::releaseAll() {
-  // Declared before the lock: what goes may hand over more.
+  // Declared before the lock, so destroyed after it: destroying work may post more.
   std::deque<Work> posted;
   std::map<TimerKey, Work> timers;
   const std::lock_guard lock(mutex_);

@@ -29,7 +29,7 @@ FileWatch::FileWatch(EventLoop& loop, Log& log, std::filesystem::path path, Chan
     try {
       static_cast<FileWatch*>(self)->readEvents();
     } catch (const std::exception&) {
-      return 0;  // without memory for it, this change goes unnoticed
+      return 0;  // out of memory: this change is missed
     }
     return 0;
   };
@@ -57,7 +57,7 @@ void FileWatch::watch() {
            awaited_.parent_path().has_relative_path()) {
       awaited_ = awaited_.parent_path();
     }
-    // A directory that has come before its own was watched would never be noticed.
+    // If the directory appeared before its parent was watched, no event would report it.
   } while (watch_ >= 0 && awaited_ != path_ && std::filesystem::is_directory(awaited_, unknown));
 }
 
@@ -74,7 +74,7 @@ void FileWatch::readEvents() {
       inotify_event event{};
       std::memcpy(&event, buffer.data() + at, sizeof event);
       const char* const name = buffer.data() + at + sizeof event;
-      // An older watch's last words concern nobody; a lost event (which names none) may be any.
+      // Events of an earlier watch do not count. A queue overflow (wd -1) may have lost any event.
       if (event.wd == watch_ || event.wd == -1) {
         if (event.len == 0 || awaited == name) concerns = true;
         if (event.len != 0 && awaited == name && (event.mask & kWrites) != 0) ++writes;

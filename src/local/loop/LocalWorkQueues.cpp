@@ -48,7 +48,7 @@ class LocalWorkQueues::RepeatingTimer : public Timer, public std::enable_shared_
  private:
   struct Firing {
     Work work;
-    std::atomic<bool> waits{false};  ///< handed to the queue, not begun
+    std::atomic<bool> waits{false};  ///< handed to the queue and not begun
   };
 
   void end() {
@@ -69,7 +69,7 @@ class LocalWorkQueues::RepeatingTimer : public Timer, public std::enable_shared_
       queue = queue_;
       firing = firing_;
     }
-    // A queue that is behind is not flooded.
+    // At most one firing waits in a queue that is behind.
     if (!firing || firing->waits.exchange(true)) return;
     queue->async([firing = std::move(firing)] {
       firing->waits = false;
@@ -79,7 +79,7 @@ class LocalWorkQueues::RepeatingTimer : public Timer, public std::enable_shared_
 
   EventLoop& main_;
   const double interval_;
-  std::mutex mutex_;  ///< guards what follows; nothing once invalidated
+  std::mutex mutex_;  ///< guards what follows, which is empty once invalidated
   std::shared_ptr<Firing> firing_;
   WorkQueueRef queue_;
   EventLoop::TimerKey next_;

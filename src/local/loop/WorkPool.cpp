@@ -15,12 +15,12 @@ namespace kvr {
 
 namespace {
 
-/// Enough to let go of, compare and write the deepest tree in any build; only what is used costs memory.
+/// Enough to destroy, compare and write the deepest tree in any build; only the part in use takes memory.
 constexpr std::size_t kStackSize = std::size_t{4} << 20;
 constexpr unsigned kMostPassedOver = 16;
-constexpr double kLongestWait = 1e9;  // seconds; a longer wait is one without a limit
+constexpr double kLongestWait = 1e9;  // seconds; a longer wait has no limit
 
-/// The pool whose thread this is.
+/// The pool that the present thread belongs to.
 thread_local const WorkPool* threadsPool = nullptr;
 
 }  // namespace
@@ -39,7 +39,7 @@ class WorkPool::SerialQueue : public WorkQueue, public std::enable_shared_from_t
 
   // Guarded by the pool's mutex.
   std::deque<Work> items;
-  bool hasTurn = false;  ///< among the ready ones, or one of its items runs
+  bool hasTurn = false;  ///< it is in the ready list, or one of its items runs
 
  private:
   const std::shared_ptr<WorkPool> pool_;
@@ -85,7 +85,7 @@ class WorkPool::PoolSignal : public Signal, public std::enable_shared_from_this<
     if (signalled_ || pool_->ending_ || (limit && !(*limit > 0))) return signalled_;
     if (limit) {
       lock.unlock();
-      // The condition's clock stands still while the device sleeps, the alarm's does not.
+      // The condition variable's clock stops while the device is suspended; the alarm's clock does not.
       cancelAlarm = alarm_(*limit, [self = shared_from_this(), expired] {
         const Lock alarmLock(self->pool_->mutex_);
         *expired = true;
@@ -158,8 +158,8 @@ void WorkPool::submit(Lock& lock, std::deque<Turn>& turns, Turn turn) {
   if (calls) wakeUp_.notify_one();
 }
 
-/// Sees to it that what is ready is taken up, if need be by one more thread. True when a sleeping one has
-/// been chosen: the caller must notify `wakeUp_`.
+/// Makes sure that a thread takes up the ready work; starts one if needed. True when a sleeping thread was
+/// chosen: the caller must notify `wakeUp_`. With the mutex held.
 bool WorkPool::provideThread() {
   if (ready_.empty() && readyInBackground_.empty()) return false;
   if (idle_ > 0) {
@@ -201,7 +201,7 @@ void* WorkPool::threadMain(void* self) noexcept {
 void WorkPool::runThread() {
   threadsPool = this;
   Lock lock(mutex_);
-  // A thread that is one too many after a wait leaves the rest to the others.
+  // After a wait ends, more threads than allowed may be running; the surplus one ends.
   while (busy() <= mostBusy_) {
     if (Turn turn; takeTurn(turn)) {
       lock.unlock();
@@ -217,7 +217,7 @@ void WorkPool::runThread() {
   if (previous) ::pthread_join(*previous, nullptr);
 }
 
-/// Sleeps until called; false when enough others do so already.
+/// Sleeps until notified; false when enough other threads already sleep.
 bool WorkPool::restsAwhile(Lock& lock) {
   if (idle_ >= kIdleThreads) return false;
   ++idle_;
@@ -241,10 +241,10 @@ bool WorkPool::takeTurn(Turn& turn) {
   return true;
 }
 
-/// Runs an item and lets its queue have a next turn.
+/// Runs an item and queues its serial queue for the next one.
 void WorkPool::runTurn(Turn& turn) {
   runItem(turn.work);
-  // Declared before the lock: what goes may hand over more.
+  // Declared before the lock, so destroyed after it: destroying work may hand over more.
   const auto queue = std::move(turn.queue);
   std::deque<Work> released;
   const Lock lock(mutex_);
@@ -268,7 +268,7 @@ void WorkPool::runItem(Work& work) noexcept {
   work = nullptr;
 }
 
-// The end.
+// Ending.
 
 void WorkPool::beginEnding() {
   const Lock lock(mutex_);

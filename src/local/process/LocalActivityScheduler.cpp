@@ -16,9 +16,9 @@
 namespace kvr {
 namespace {
 
-/// What rounding of a date may take from a wait, in seconds.
+/// The most that rounding a date may shorten a wait by, in seconds.
 constexpr double kMargin = 0.001;
-/// Seconds; the kernel's own limit lies not far above. What lies further ahead is looked at on the way.
+/// Seconds; the kernel's own limit is not far above. A longer wait is split.
 constexpr double kLongestWait = 1e8;
 
 double secondsOf(clockid_t clock) {
@@ -59,7 +59,7 @@ LocalActivityScheduler::~LocalActivityScheduler() { ::sd_event_source_disable_un
 
 double LocalActivityScheduler::uptime() const { return secondsOf(CLOCK_BOOTTIME); }
 
-/// Empty when the kernel does not tell, which then is one boot for ever.
+/// Empty when the kernel does not tell; then it never looks like another boot.
 std::string LocalActivityScheduler::bootIdentifier() const {
   std::ifstream file(host_.bootIdentifier);
   std::string identifier;
@@ -76,7 +76,7 @@ void LocalActivityScheduler::arm(std::optional<double> wait) {
   }
   constexpr int kFlags = TFD_TIMER_ABSTIME | TFD_TIMER_CANCEL_ON_SET;
   if (::timerfd_settime(timer_.get(), kFlags, &time, nullptr) < 0 && errno == ECANCELED) {
-    // The clock was set since the wait was worked out: look again at once.
+    // The clock was set after the wait was computed: fire at once.
     time.it_value = {0, 1};
     ::timerfd_settime(timer_.get(), kFlags, &time, nullptr);
   }
@@ -84,7 +84,7 @@ void LocalActivityScheduler::arm(std::optional<double> wait) {
 
 void LocalActivityScheduler::timerEnded() noexcept {
   std::uint64_t count = 0;
-  // An error here says that the clock was set: another reason to look.
+  // A read error means that the clock was set, which is a reason to check as well.
   [[maybe_unused]] const auto size = ::read(timer_.get(), &count, sizeof count);
   try {
     startDue();

@@ -14,7 +14,7 @@ namespace {
 using namespace std::chrono_literals;
 
 constexpr double kSettling = 0.1;  // seconds
-constexpr auto kBurst = 1s;        // between edits that come in a row
+constexpr auto kBurst = 1s;        // the longest time between edits that belong together
 constexpr const char* kLocale = "Locale.plist";
 constexpr const char* kPairedDevices = "PairedDevices.plist";
 
@@ -72,12 +72,12 @@ std::set<std::string> LocalChanges::watchesNow() const {
 
 std::optional<FileStamp> LocalChanges::stampOf(const char* file) const {
   auto stamp = root_.stamp(file);
-  if (stamp) stamp->settled = false;  // which comes with time alone
+  if (stamp) stamp->settled = false;  // it changes by the passing of time alone
   return stamp;
 }
 
-/// The file may have been written once more by the time it is looked at. Of two edits in a row the first look
-/// then sees both, and the second one the version that was seen before.
+/// The file may have been written again before it is read. The first of two quick edits then reads both, and
+/// the second reads the same version again.
 void LocalChanges::handleEdit(Subject& subject, std::size_t writes, bool isWhole) {
   const auto now = Clock::now();
   if (now - std::exchange(subject.lastEdit, now) > kBurst) subject.edits = 0;
@@ -113,7 +113,7 @@ bool LocalChanges::tellWatches(std::size_t edits, bool isCertain) {
   const bool areUnpaired = !containsAll(watches_, watches);
   const bool isChanged = arePaired || areUnpaired;
   if (!isChanged && !isCertain && edits < 2) return false;
-  // Edits that have undone one another have paired and unpaired.
+  // Edits that cancel each other out are pairings and unpairings in equal parts.
   const std::size_t pairings = isChanged ? (arePaired ? edits : 0) : edits / 2;
   const std::size_t unpairings = isChanged ? (areUnpaired ? edits : 0) : edits - pairings;
   post(names::kDeviceDidPair, pairings);

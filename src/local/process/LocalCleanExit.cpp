@@ -19,17 +19,17 @@ namespace {
 
 constexpr int kWakerLimit = 5000;  // milliseconds
 
-// Between two looks, in seconds: from the first to the last.
+// The time between two checks, in seconds: it doubles from the first to the longest.
 constexpr double kFirstPatience = 0.05;
 constexpr double kLongestPatience = 10;
 
-/// Whether this very process is one that a service manager started, which starts it again after a clean exit.
+/// Whether a service manager started this very process; it starts the next one after a clean exit.
 bool isManagedService() {
   const char* const process = std::getenv("SYSTEMD_EXEC_PID");
   return process != nullptr && process == std::to_string(::getpid());
 }
 
-/// A program beside this one.
+/// The path of the waker, in the same directory as this program.
 std::string wakerPath() {
   std::error_code unknown;
   return (std::filesystem::read_symlink("/proc/self/exe", unknown).parent_path() / "kvragent-wake").string();
@@ -46,8 +46,8 @@ bool LocalCleanExit::wouldBeStartedAgain() {
   return services_.isActivatable(name_) && ::access(wakerPath().c_str(), X_OK) == 0;
 }
 
-/// Leaves a process behind that has the bus start the next agent for what no client asks for. It is watching
-/// when this returns, and acts once this process has ended.
+/// Starts the waker, which has the bus start the next agent for events that no client calls for. The waker is
+/// watching when this returns true, and acts once this process has ended.
 bool LocalCleanExit::leaveWaker() {
   std::array<int, 2> input{};
   std::array<int, 2> output{};
@@ -127,7 +127,7 @@ void LocalCleanExit::look(double patience) {
       phase_ = ExitPhase::WakerWatches;
       break;
     case ExitStep::GiveUpName:
-      // What is scheduled from here on is the next agent's.
+      // Activities scheduled from now on are left to the next agent.
       phase_ = ExitPhase::NameGivenUp;
       activities_.beginEnding();
       services_.beginEnding();

@@ -9,7 +9,7 @@ namespace kvr {
 std::int64_t LocalProcesses::executablePath(std::int32_t process, std::span<char> buffer) const {
   const std::string link = "/proc/" + std::to_string(process) + "/exe";
   const auto length = ::readlink(link.c_str(), buffer.data(), buffer.size());
-  // A path that fills the buffer may have been cut.
+  // A path that fills the whole buffer may have been truncated.
   if (length <= 0 || static_cast<std::size_t>(length) >= buffer.size()) return -1;
   const std::string path(buffer.data(), static_cast<std::size_t>(length));
   const auto runs = FileIdentity::of(link);

@@ -23,7 +23,8 @@ namespace {
 
 constexpr std::string_view kTemporaryTag = ".kvr-";
 constexpr std::string_view kTemporaryTemplate = "XXXXXX";
-/// A stamp is settled once file times have moved on since: they tick with the coarse clock, every few ms.
+/// How old a file's times must be for its stamp to count as settled: they follow a clock that ticks every few
+/// ms only.
 constexpr std::int64_t kSettlingNanoseconds = 50'000'000;
 constexpr int kAttempts = 10;
 
@@ -33,7 +34,7 @@ Error failure(int code, const std::string& path) {
 
 Error failure(const std::string& path) { return failure(errno, path); }
 
-/// Why a path cannot name a file, if it cannot.
+/// Why a path is not acceptable as a file name, if it is not.
 std::optional<Error> objectionTo(const std::string& path) {
   if (path.starts_with('/') && path.find('\0') == std::string::npos) return std::nullopt;
   return Error{"files", EINVAL, "not an absolute path: " + path.substr(0, path.find('\0'))};
@@ -46,7 +47,7 @@ std::optional<Error> objectionToKind(const struct stat& status, const std::strin
                                  : Error{"files", EINVAL, path + ": not a regular file"};
 }
 
-/// Whether a failed look at a path says that there is no such file.
+/// Whether an error code means that there is no such file.
 bool isMissing(int code) { return code == ENOENT || code == ENOTDIR; }
 
 std::string directoryOf(const std::string& path) {
@@ -81,9 +82,9 @@ Descriptor openExisting(const std::string& path, int flags) {
 }
 
 /// Reads to the end. The size of `bytes` is the first guess at what there is: one more than a file's size
-/// makes the second call the last one.
+/// lets the second call find the end.
 std::optional<Error> readAll(int descriptor, std::string& bytes, std::size_t limit, const std::string& path) {
-  constexpr std::size_t kMost = 1UL << 20U;  // a step
+  constexpr std::size_t kMost = 1UL << 20U;  // bytes per step
   constexpr std::size_t kLeast = 4096;
   std::size_t used = 0;
   while (true) {
@@ -99,7 +100,7 @@ std::optional<Error> readAll(int descriptor, std::string& bytes, std::size_t lim
   return std::nullopt;
 }
 
-/// Makes a directory's entries durable. File systems that have no such operation are taken at their word.
+/// Makes a directory's entries durable. A file system without that operation counts as successful.
 std::optional<Error> syncDirectory(const std::string& directory) {
   const auto descriptor = openExisting(directory, O_RDONLY | O_DIRECTORY);
   if (!descriptor) return failure(directory);
@@ -107,7 +108,7 @@ std::optional<Error> syncDirectory(const std::string& directory) {
   return std::nullopt;
 }
 
-/// Takes the lock that marks a temporary file as in use. False when somebody removed the file meanwhile.
+/// Locks a temporary file to mark it as in use. False when somebody removed the file meanwhile.
 bool hold(int descriptor) {
   while (::flock(descriptor, LOCK_EX) != 0 && errno == EINTR) {
   }
@@ -115,9 +116,9 @@ bool hold(int descriptor) {
   return ::fstat(descriptor, &status) == 0 && status.st_nlink > 0;
 }
 
-/// A new, empty file beside `path`, mode 0600, marked as in use; its path is put in `name`.
+/// Creates an empty file beside `path`, mode 0600, locked as in use, and sets `name` to its path.
 Result<Descriptor> createTemporary(const std::string& path, std::string& name) {
-  constexpr std::size_t kLongestName = 200;  // of the target, so that the temporary one's is not too long
+  constexpr std::size_t kLongestName = 200;  // of the target, so that the temporary name is not too long
   const auto slash = path.rfind('/');
   for (int attempt = 0; attempt < kAttempts; ++attempt) {
     name = path.substr(0, slash + 1) + "." + path.substr(slash + 1, kLongestName);
@@ -136,7 +137,7 @@ bool isTemporaryName(std::string_view name) {
          name.substr(name.size() - tail).starts_with(kTemporaryTag);
 }
 
-/// Removes a temporary file that no writer holds.
+/// Removes a temporary file that no writer has locked.
 void removeIfAbandoned(const std::string& path) {
   const auto descriptor = openExisting(path, O_RDONLY | O_NOFOLLOW);
   struct stat status {};
@@ -144,7 +145,7 @@ void removeIfAbandoned(const std::string& path) {
   if (::flock(descriptor.get(), LOCK_EX | LOCK_NB) == 0) ::unlink(path.c_str());
 }
 
-/// Whether a file can be put in the place of what bears the name.
+/// Why a file cannot replace what is at the path, if it cannot.
 std::optional<Error> objectionToReplacing(const std::string& path) {
   struct stat status {};
   if (::stat(path.c_str(), &status) != 0) {
@@ -269,7 +270,7 @@ std::optional<Error> LocalFiles::replace(const std::string& path, const std::str
   auto error = replaceAtomically(steps, bytes);
   if (steps.isTemporaryLeft()) {
     const std::lock_guard own(mutex_);
-    swept_.erase(directoryOf(path));  // for the next one to sweep
+    swept_.erase(directoryOf(path));  // the next change clears it again
   }
   return error;
 }
@@ -312,7 +313,7 @@ std::optional<Error> LocalFiles::renameToUnused(const std::string& from, const s
   if (auto error = objectionTo(to)) return error;
   if (::renameat2(AT_FDCWD, from.c_str(), AT_FDCWD, to.c_str(), RENAME_NOREPLACE) != 0) {
     if (errno != EINVAL && errno != ENOSYS) return failure(errno, errno == EEXIST ? to : from);
-    // A file system without that operation: a second name replaces nothing either.
+    // The file system does not support that. A hard link does not replace an existing file either.
     if (::link(from.c_str(), to.c_str()) != 0) return failure(errno, errno == EEXIST ? to : from);
     if (::unlink(from.c_str()) != 0) return failure(from);
   }
@@ -336,8 +337,8 @@ std::unique_ptr<FileLock> LocalFiles::lock(const std::string& directory) {
   return std::make_unique<Lock>(*this, state);
 }
 
-/// While the other processes' lock cannot be had, only the first of our threads waits for it: the next ones
-/// try once, until one succeeds.
+/// While another process holds the lock, only this process's first thread waits for it; later ones try only
+/// once, until one succeeds.
 void LocalFiles::lockAgainstOtherProcesses(const std::string& directory, DirectoryLock& state,
                                            double patience) {
   std::optional<Error> error = createDirectory(directory);

@@ -25,7 +25,7 @@ namespace {
 using namespace std::chrono_literals;
 
 constexpr auto kPatience = 1s;
-/// What a pipe that is ready takes without waiting for its reader.
+/// How many bytes a pipe that is ready accepts without blocking.
 constexpr std::size_t kMostAtOnce = PIPE_BUF;
 
 std::string_view environment(const char* name) {
@@ -60,14 +60,15 @@ const char* priorityOf(LogLevel level) {
   }
 }
 
-/// Whether standard error is the very stream to the journal that the service manager set up.
+/// Whether the descriptor is the journal stream that the service manager set up.
 bool leadsToJournal(int descriptor) {
   struct stat status {};
   if (::fstat(descriptor, &status) != 0) return false;
   return environment("JOURNAL_STREAM") == std::to_string(status.st_dev) + ":" + std::to_string(status.st_ino);
 }
 
-/// A line waits for the reader of a terminal, a pipe or a socket; a file and the null device take it at once.
+/// Whether writing may block: a terminal, a pipe or a socket waits for its reader; a file and the null device
+/// do not.
 bool mayBlock(int descriptor) {
   struct stat status {};
   if (::fstat(descriptor, &status) != 0) return true;
@@ -98,7 +99,7 @@ void appendTimestamp(std::string& line) {
   line += 'Z';
 }
 
-/// Line breaks as \n and \r; other control characters, and Unicode's own line breaks, as \xNN a byte.
+/// Line breaks become \n and \r; other control characters, and Unicode's line breaks, become \xNN per byte.
 void appendEscaped(std::string& line, std::string_view message) {
   const auto appendHex = [&line](char c) {
     static constexpr char kDigits[] = "0123456789abcdef";
@@ -186,8 +187,8 @@ void LocalLog::writeLine(LogLevel level, const std::string& message) {
   if (rest.size() < line.size()) torn_ = stuck_;
 }
 
-/// Whether the reader takes as much as is written at once. One that takes nothing for a while costs lines,
-/// not the agent's time: it is waited for again only after it has taken a whole one.
+/// Whether the descriptor accepts a whole piece without blocking. If a reader accepts nothing for a while,
+/// lines are dropped without waiting until it has taken a whole line again.
 bool LocalLog::isReady(std::chrono::steady_clock::time_point deadline) {
   using std::chrono::milliseconds;
   const auto left = std::chrono::ceil<milliseconds>(deadline - std::chrono::steady_clock::now()).count();

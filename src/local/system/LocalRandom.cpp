@@ -10,7 +10,7 @@ namespace kvr {
 
 std::string LocalRandom::uuid() {
   std::array<unsigned char, 16> bytes{};
-  // So few bytes come whole or not at all.
+  // So few bytes are never returned in part.
   while (::getrandom(bytes.data(), bytes.size(), 0) < 0) {
     if (errno != EINTR) throw std::system_error(errno, std::generic_category(), "getrandom");
   }
