@@ -10,12 +10,12 @@
 
 namespace kvr {
 
-/// One user's accounts, set at will, and a script for the renewals.
+/// One user's accounts, set by the test, with scripted renewals.
 class SimulatedAccountStore : public AccountStore {
  public:
   struct Renewal {
     std::int64_t resultCode = 0;
-    /// Take the place of the held ones when the result code is 0.
+    /// Replace the held tokens when the result code is 0.
     std::map<std::string, std::string> tokens{};
     double delay = 0;  ///< seconds
     std::optional<Error> error{};
@@ -29,8 +29,8 @@ class SimulatedAccountStore : public AccountStore {
   std::optional<AuthenticationAccount> authentication;
   std::optional<StoreAccount> store;
   std::map<std::string, std::string, std::less<>> tokens;  ///< by service
-  Renewal renewal;                                         ///< how every renewal goes
-  std::vector<RenewalOptions> renewals;                    ///< those asked for, in order
+  Renewal renewal;                                         ///< the outcome of every renewal
+  std::vector<RenewalOptions> renewals;                    ///< all requested ones, in order
 
   std::optional<CloudAccount> primaryAccount() const override { return primary; }
   std::optional<AuthenticationAccount> authenticationAccountFor(

@@ -5,7 +5,7 @@
 namespace kvr {
 namespace {
 
-/// What rounding of a date may take from a wait, in seconds.
+/// The most that rounding a date may shorten a wait by, in seconds.
 constexpr double kMargin = 0.001;
 
 }  // namespace
@@ -24,7 +24,7 @@ SimulatedActivityScheduler::SimulatedActivityScheduler(PropertyListFiles& lists,
 
 SimulatedActivityScheduler::~SimulatedActivityScheduler() { clock_.whenMoved(nullptr); }
 
-/// An event under way that comes early enough is left: it arms for the rest.
+/// An earlier event that is already scheduled is kept; it arms again for the rest of the wait.
 void SimulatedActivityScheduler::arm(std::optional<double> wait) {
   if (!wait) return;
   const double time = clock_.elapsed() + *wait + kMargin;

@@ -16,7 +16,7 @@ class SimulatedActivityScheduler : public FileActivityScheduler {
   SimulatedActivityScheduler(const SimulatedActivityScheduler&) = delete;
   SimulatedActivityScheduler& operator=(const SimulatedActivityScheduler&) = delete;
 
-  /// Another one is another boot; it counts from the next check-in of the post-boot activity.
+  /// Another value means another boot; it counts from the next check-in of the post-boot activity.
   std::string boot = "B0071D00-0000-4000-8000-000000000001";
 
   using FileActivityScheduler::setNetworkReachable;
@@ -29,7 +29,7 @@ class SimulatedActivityScheduler : public FileActivityScheduler {
  private:
   SimulatedClock& clock_;
   SimulatedWorkQueues& queues_;
-  std::optional<double> armed_;  ///< the uptime of the next event that starts what is due
+  std::optional<double> armed_;  ///< when the next event starts due activities, in uptime
 };
 
 }  // namespace kvr

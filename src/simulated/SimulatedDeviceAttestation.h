@@ -11,11 +11,11 @@
 
 namespace kvr {
 
-/// Signs with whatever it is told to return.
+/// Returns `signature` for every message.
 class SimulatedAttestedKey : public AttestedKey {
  public:
   Result<std::string> signature = std::string("signature");
-  mutable std::vector<std::string> messages;  ///< those signed, in order
+  mutable std::vector<std::string> messages;  ///< all signed ones, in order
 
   Result<std::string> sign(std::string_view message) const override {
     messages.emplace_back(message);
@@ -23,7 +23,7 @@ class SimulatedAttestedKey : public AttestedKey {
   }
 };
 
-/// Issues what the test says, one outcome a kind of certificate.
+/// Issues what the test sets, one outcome per kind of certificate.
 class SimulatedDeviceAttestation : public DeviceAttestation {
  public:
   struct Outcome {
@@ -46,11 +46,11 @@ class SimulatedDeviceAttestation : public DeviceAttestation {
 
   bool supported = true;
   std::optional<Error> accessControlError;
-  /// The key of both outcomes, until they are given others.
+  /// The key of both outcomes until the test replaces them.
   const std::shared_ptr<SimulatedAttestedKey> key = std::make_shared<SimulatedAttestedKey>();
   Outcome preferred = issued(key, {"leaf", "issuer"});
   Outcome fallback = issued(key, {"fallback leaf", "fallback issuer"});
-  std::vector<AttestationOptions> requests;  ///< those made, in order
+  std::vector<AttestationOptions> requests;  ///< all requests, in order
 
   bool isSupported() const override { return supported; }
   Result<std::shared_ptr<const KeyAccessControl>> newAccessControl() override {

@@ -13,7 +13,7 @@ class SimulatedDeviceProperties : public DeviceProperties {
  public:
   std::map<std::string, std::string, std::less<>> answers;
   bool internalInstall = false;
-  std::function<void()> whenAsked;  ///< does what others do meanwhile
+  std::function<void()> whenAsked;  ///< called at each question, to do what other threads might do
 
   std::optional<std::string> answer(std::string_view question) const override {
     if (whenAsked) whenAsked();

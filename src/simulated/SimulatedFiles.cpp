@@ -68,7 +68,7 @@ Result<std::optional<FileContents>> SimulatedFiles::read(const std::string& path
 
 Result<std::optional<FileStamp>> SimulatedFiles::stamp(const std::string& path) {
   const std::lock_guard lock(mutex_);
-  // A file that cannot be read must not be taken for an unchanged one.
+  // The caller must not take a file that cannot be read for an unchanged one.
   if (auto fault = readFaults_.of(path)) return *std::move(fault);
   if (directories_.contains(path)) return failure(EISDIR, path);
   const auto found = files_.find(path);
@@ -261,7 +261,7 @@ void SimulatedFiles::whenChanged(Changed changed) {
   changed_ = std::move(changed);
 }
 
-// Ends.
+// Ending.
 
 void SimulatedFiles::killAfterSteps(std::size_t count) {
   const std::lock_guard lock(mutex_);
@@ -283,7 +283,7 @@ void SimulatedFiles::takeOver(const SimulatedFiles& other) {
   unsynced_ = other.unsynced_;
 }
 
-/// Changes of names are kept in their order, as by a file system with a journal.
+/// Changes of names are kept in order, as on a file system with a journal.
 void SimulatedFiles::losePower(std::mt19937_64& random) {
   const std::lock_guard lock(mutex_);
   const auto kept = static_cast<std::size_t>(random() % (unsynced_.size() + 1));
@@ -305,7 +305,7 @@ void SimulatedFiles::losePower(std::mt19937_64& random) {
   }
 }
 
-// Steps, with the mutex held.
+// Steps; with the mutex held.
 
 std::optional<Error> SimulatedFiles::begin(Step step, const std::string& path) {
   if (hasEnded()) return failure(EIO, path);
@@ -323,7 +323,7 @@ std::optional<Error> SimulatedFiles::syncDirectoryOf(const std::string& path) {
   return std::nullopt;
 }
 
-/// Nothing in the place of a file removes it.
+/// Without a new file, removes the old one.
 void SimulatedFiles::put(const std::string& path, std::optional<File> file) {
   const auto found = files_.find(path);
   unsynced_.push_back({path, found == files_.end() ? std::nullopt : std::optional(found->second)});
@@ -334,7 +334,7 @@ void SimulatedFiles::put(const std::string& path, std::optional<File> file) {
   }
 }
 
-/// As a process does once a directory, before it replaces the first file there.
+/// Done once per directory and process, before the first file there is replaced.
 void SimulatedFiles::removeLeftovers(const std::string& directory) {
   if (!swept_.insert(directory).second) return;
   const std::string prefix = directory + "/.";
@@ -365,7 +365,7 @@ std::size_t SimulatedFiles::readCount() const {
   return reads_;
 }
 
-/// Every content gets an inode of its own, so that its stamp tells it from all others at once.
+/// Every new content gets a new inode, so that its stamp differs from all others at once.
 void SimulatedFiles::store(const std::string& path, std::string bytes, bool isSynced) {
   const auto now = nanoseconds(clock_.now());
   const FileStamp stamp{1, ++lastInode_, bytes.size(), now, now, true};

@@ -15,9 +15,9 @@ namespace kvr {
 
 /// Files in memory, with faults on demand.
 ///
-/// They outlive whatever uses them, so a crash and a restart are: destroy the users, build them again on the
-/// same files. A file is replaced in the same steps as a real one; what was not synced when the power is lost
-/// may be lost with it. Thread-safe.
+/// They outlive the objects that use them: to simulate a crash and a restart, destroy the users and build new
+/// ones on the same files. A file is replaced in the same steps as on disk; what was not synced may be lost
+/// with the power. Thread-safe.
 class SimulatedFiles : public Files {
  public:
   static constexpr const char* kHomeDirectory = "/home/user";
@@ -34,41 +34,42 @@ class SimulatedFiles : public Files {
   std::optional<Error> renameToUnused(const std::string& from, const std::string& to) override;
   std::unique_ptr<FileLock> lock(const std::string& directory) override;
 
-  // Changes and looks from outside: no fault stops them, and they count for nothing.
-  /// Puts a file, and its directories, in place.
+  // Changes and reads from outside the simulated program: no fault applies to them and no counter counts
+  // them.
+  /// Stores a file and creates its directories.
   void put(const std::string& path, std::string bytes);
-  /// As `put`, for a tree, in the binary encoding.
+  /// Stores a tree as a binary property list.
   void putPropertyList(const std::string& path, const Value& tree);
   std::optional<std::string> get(const std::string& path) const;
-  /// The tree that a file holds; null when there is no such file or it holds none.
+  /// The tree in a file; null when there is no such file or it holds no property list.
   Value getPropertyList(const std::string& path) const;
   void erase(const std::string& path);
   /// The paths of the files in `directory` and below it, in ascending order.
   std::vector<std::string> list(const std::string& directory) const;
 
-  // Faults last until they are set to nothing. A file's own fault goes before that of all files.
+  // Faults last until they are set to nothing. A fault for one file takes precedence over that for all files.
   void setReadFault(std::optional<Error> error);
   void setReadFault(const std::string& path, std::optional<Error> error);
-  /// Of everything that changes a file or directory.
+  /// For everything that changes a file or directory.
   void setWriteFault(std::optional<Error> error);
   void setWriteFault(const std::string& path, std::optional<Error> error);
 
-  /// What one step of a change is.
+  /// The kinds of steps that a change consists of.
   enum class Step { CreateTemporary, Write, Sync, Rename, SyncDirectory, Remove };
-  /// Asked before every step of a change, with the path that is to be changed: the error in its place, if
-  /// any.
+  /// Called before every step of a change, with the path to be changed; an error that it returns replaces the
+  /// step.
   using StepFault = std::function<std::optional<Error>(Step step, const std::string& path)>;
   void setStepFault(StepFault fault);
   using Changed = std::function<void(const std::string& path, bool isDone)>;
-  /// Told the path after every change that was tried, and whether it was done to the end.
+  /// Called with the path after every attempted change; `isDone` is true if all its steps were done.
   void whenChanged(Changed changed);
 
-  /// The end of the process at a point between two steps: after `count` more, none reaches a file.
+  /// Simulates a killed process: after `count` more steps, no step has an effect.
   void killAfterSteps(std::size_t count);
   bool isKilled() const;
-  /// The files as another instance has them, in the place of these.
+  /// Replaces these files by those of another instance.
   void takeOver(const SimulatedFiles& other);
-  /// What was not synced is lost, as far as `random` has it: the latest changes of names, and the end of
+  /// Loses what was not synced, as far as `random` decides: the latest changes of names, and the end of
   /// contents.
   void losePower(std::mt19937_64& random);
 
@@ -82,7 +83,7 @@ class SimulatedFiles : public Files {
     FileStamp stamp;
     bool isSynced = true;
   };
-  /// A change of what a name leads to that is not durable yet.
+  /// A change of the file under a name that is not durable yet.
   struct Unsynced {
     std::string path;
     std::optional<File> before;
@@ -115,8 +116,8 @@ class SimulatedFiles : public Files {
   Faults writeFaults_;
   StepFault stepFault_;
   Changed changed_;
-  std::vector<Unsynced> unsynced_;  ///< the oldest first
-  std::set<std::string> swept_;     ///< directories without leftovers of earlier processes
+  std::vector<Unsynced> unsynced_;  ///< oldest first
+  std::set<std::string> swept_;     ///< directories already cleared of leftovers of earlier processes
   std::optional<std::size_t> lastStep_;
   std::size_t steps_ = 0;
   std::size_t reads_ = 0;

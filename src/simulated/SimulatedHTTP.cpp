@@ -6,7 +6,7 @@ namespace kvr {
 
 namespace {
 
-/// A request under way. The first answer is the one; the reply is given on the concurrent queue.
+/// A request under way. Only the first answer counts; the reply is given on the concurrent queue.
 class Exchange : public std::enable_shared_from_this<Exchange> {
  public:
   Exchange(WorkQueues& queues, HTTPSession::Reply reply) : queues_(queues), reply_(std::move(reply)) {}

@@ -13,11 +13,11 @@
 
 namespace kvr {
 
-/// A network whose answers the test scripts, in virtual time.
+/// A network with scripted answers, in virtual time.
 ///
-/// Each request takes the next scripted response; with none left it goes to `handler`, and without a handler
-/// it fails. Replies come on the concurrent queue. A request that is not answered within its own timeout
-/// fails then, and what answers it later is dropped.
+/// Each request takes the next scripted response. When none is left it goes to `handler`, and without a
+/// handler it fails. Replies arrive on the concurrent queue. A request that is not answered within its own
+/// timeout fails then, and a later answer is dropped.
 class SimulatedHTTP : public HTTP {
  public:
   using Answer = std::function<void(HTTPResponse)>;
@@ -37,10 +37,10 @@ class SimulatedHTTP : public HTTP {
 
   /// Called inside `send`; may answer at once or keep `answer` for later.
   Handler handler;
-  /// Scripts the response to the next request that has none yet, `delay` seconds after it was sent.
+  /// Scripts the response to the next request without one, given `delay` seconds after it is sent.
   void respond(int status, std::string body, double delay = 0);
   void fail(Error error, double delay = 0);
-  /// The next request is never answered.
+  /// Scripts that the next request without a response is never answered.
   void ignore();
 
   /// Every request so far, in the order sent.

@@ -10,7 +10,7 @@
 
 namespace kvr {
 
-/// Keeps every line; misused completions are faults besides. Any thread.
+/// Keeps all lines; misused completions also count as faults. Any thread.
 class SimulatedLog : public Log {
  public:
   struct Line {
@@ -24,16 +24,16 @@ class SimulatedLog : public Log {
   std::vector<Line> lines() const;
   std::vector<std::string> texts() const;
   std::vector<std::string> texts(LogLevel level) const;
-  /// How many lines read exactly `text`.
+  /// How many lines are exactly `text`.
   std::size_t count(std::string_view text) const;
-  /// Whether a line holds `part`.
+  /// Whether any line contains `part`.
   bool contains(std::string_view part) const;
   void clear();
-  /// From here on only the last lines are kept, so many at least.
+  /// From now on keeps only the latest lines, at least `count`.
   void keepLast(std::size_t count);
 
   std::vector<std::string> faults() const;
-  /// The faults so far, which are then no faults any more: for tests that provoke one.
+  /// Returns the faults so far and clears them: for tests that provoke one.
   std::vector<std::string> takeFaults();
 
   void reportMisusedCompletion(std::string_view what, std::string_view name) override;

@@ -9,7 +9,7 @@
 
 namespace kvr {
 
-/// Notifications that the test posts. What is registered at the end is let go by `end`.
+/// Notifications posted by the test. `end` drops all registrations.
 class SimulatedNotifications : public Notifications {
  public:
   explicit SimulatedNotifications(WorkQueues& queues) : queues_(queues) {}
@@ -20,7 +20,7 @@ class SimulatedNotifications : public Notifications {
     return last_;
   }
   void cancel(Token token) override {
-    // Let go when nothing here is being changed any more: a handler's end may cancel another.
+    // Destroyed only after the map is changed: a handler's destructor may cancel another registration.
     const auto cancelled = handlers_.extract(token);
   }
 

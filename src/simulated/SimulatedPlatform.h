@@ -30,8 +30,8 @@
 
 namespace kvr {
 
-/// A whole world in memory: one thread, virtual time, everything decided by the seed and by what the test
-/// sets in the public members.
+/// A whole platform in memory: one thread and virtual time. Everything is decided by the seed and by what the
+/// test sets in the public members.
 ///
 ///     SimulatedPlatform simulated;
 ///     simulated.http.respond(200, "{}");
@@ -42,7 +42,7 @@ namespace kvr {
 struct SimulatedPlatform {
   explicit SimulatedPlatform(std::uint64_t seed = 1, LogLevel leastLogged = LogLevel::Debug)
       : log(leastLogged), queues(clock, seed), random(seed) {}
-  /// What waits finishes and all other work goes while everything it may use is still there.
+  /// Lets waiting items finish and drops all other work while everything it may use still exists.
   ~SimulatedPlatform() {
     log.beginEnding();
     activities.beginEnding();
@@ -52,8 +52,8 @@ struct SimulatedPlatform {
   SimulatedPlatform(const SimulatedPlatform&) = delete;
   SimulatedPlatform& operator=(const SimulatedPlatform&) = delete;
 
-  /// What no working program does: exceptions that left work items, waits that nothing could end, completions
-  /// answered twice or never.
+  /// What a correct program never does: exceptions that leave work items, waits that nothing can end,
+  /// completions answered twice or never.
   std::vector<std::string> faults() const {
     std::vector<std::string> faults = queues.faults();
     for (auto& fault : log.faults()) faults.push_back(std::move(fault));

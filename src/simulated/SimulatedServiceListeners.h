@@ -12,7 +12,7 @@
 
 namespace kvr {
 
-/// The program at the other end of a connection.
+/// The program at the client's end of a connection.
 struct SimulatedPeer {
   Value::Dictionary entitlements;
   std::int32_t processIdentifier = 1000;
@@ -29,20 +29,20 @@ class SimulatedServiceConnection : public ServiceConnection,
  public:
   struct Call {
     std::optional<Value> reply;
-    bool isRefused = false;  ///< because the connection was, or is gone
+    bool isRefused = false;  ///< because the connection was refused or is gone
   };
 
   SimulatedServiceConnection(WorkQueues& queues, Log& log, SimulatedPeer peer);
 
   // The client's end.
 
-  /// Calls an operation by its member name. Served once the connection is accepted; an unknown member throws
-  /// std::logic_error then.
+  /// Calls a method by its member name. It is served once the connection is accepted; an unknown member then
+  /// throws std::logic_error.
   std::shared_ptr<const Call> invoke(std::string member, Value::Array arguments = {});
-  /// The client goes: later calls are refused and the exported object is let go of, on the connection's
+  /// The client leaves: later calls are refused, and the exported object is released on the connection's
   /// queue.
   void disconnect();
-  /// Whether the delegate decided, and how.
+  /// Whether the delegate has accepted the connection, or refused it; both are false until it decides.
   bool isAccepted() const { return accepted_ == true; }
   bool isRefused() const { return accepted_ == false; }
   const std::optional<ServiceInterface>& exportedInterface() const { return interface_; }
@@ -74,22 +74,22 @@ class SimulatedServiceConnection : public ServiceConnection,
   std::optional<bool> accepted_;
   bool isResumed_ = false;
   bool isGone_ = false;
-  std::vector<Pending> pending_;  ///< until decided
+  std::vector<Pending> pending_;  ///< calls made before the decision
   std::optional<ServiceInterface> interface_;
   std::shared_ptr<ServiceObject> object_;
 };
 
-/// The services of one process, with a way in for fake clients.
+/// The services of one process, with a way to connect simulated clients.
 class SimulatedServiceListeners : public ServiceListeners {
  public:
   SimulatedServiceListeners(WorkQueues& queues, Log& log) : queues_(queues), log_(log) {}
 
   std::unique_ptr<ServiceListener> newListener(std::string name) override;
 
-  /// Connects a client to a service that has been resumed (else throws std::logic_error). The connection is
-  /// offered to the delegate on the listener's queue.
+  /// Connects a client to a service that has been resumed (else throws std::logic_error). The delegate is
+  /// asked on the listener's queue.
   std::shared_ptr<SimulatedServiceConnection> connect(const std::string& name, SimulatedPeer peer);
-  /// Whether a listener of this name has been resumed and lives.
+  /// Whether a listener of this name exists and has been resumed.
   bool isListening(const std::string& name) const;
 
  private:
@@ -97,7 +97,7 @@ class SimulatedServiceListeners : public ServiceListeners {
 
   WorkQueues& queues_;
   Log& log_;
-  std::map<std::string, Listener*> listeners_;  ///< those resumed, by name
+  std::map<std::string, Listener*> listeners_;  ///< the resumed ones, by name
 };
 
 }  // namespace kvr

@@ -24,7 +24,7 @@ class SimulatedApplicationRegistry : public ApplicationRegistry {
   }
 };
 
-/// Answers with what the test has put in place.
+/// Answers with what the test has set.
 class SimulatedStore : public StoreLookup {
  public:
   explicit SimulatedStore(WorkQueues& queues) : queues_(queues), queue_(queues.newSerialQueue("store")) {}
@@ -33,7 +33,7 @@ class SimulatedStore : public StoreLookup {
   double purchaseDelay = 0;  ///< seconds
   std::optional<std::vector<CatalogueItem>> catalogue = std::vector<CatalogueItem>();
   std::optional<Error> catalogueError;
-  std::vector<std::int64_t> purchaseQueries;  ///< the accounts asked about
+  std::vector<std::int64_t> purchaseQueries;  ///< the accounts that were asked about
   std::size_t lookups = 0;
 
   void purchaseHistory(std::int64_t storeAccountIdentifier, std::vector<std::string> /*bundleIdentifiers*/,

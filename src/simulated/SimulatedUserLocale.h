@@ -6,7 +6,7 @@
 
 namespace kvr {
 
-/// A locale that groups every three digits; set the fields at will.
+/// A locale that groups digits in threes; the test sets the fields.
 class SimulatedUserLocale : public UserLocale {
  public:
   std::string identifier = "en_US";

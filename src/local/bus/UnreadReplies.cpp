@@ -83,8 +83,8 @@ UnreadReplies::Peer& UnreadReplies::peerNamed(const char* name) {
   return peer;
 }
 
-/// No watch tells when these peers leave (not all of them have clients here), so those with few unread bytes
-/// are dropped.
+/// Many peers have no `BusClient` whose watch reports that they leave. So those with few unread bytes are
+/// dropped.
 void UnreadReplies::makeRoom() {
   std::erase_if(peers_, [this](const auto& entry) {
     const Peer& peer = entry.second;

@@ -69,7 +69,7 @@ void EventLoop::setFailureHandler(std::function<void(const std::string&)> handle
 
 void EventLoop::post(Work work) {
   const std::lock_guard lock(mutex_);
-  if (closed_) return;  // the caller's argument is destroyed after the lock is released
+  if (closed_) return;  // the caller's argument goes after the lock
   posted_.push_back(std::move(work));
   wake();
 }

@@ -40,10 +40,10 @@ namespace {
 constexpr std::size_t kStackSize = std::size_t{2} << 20;  // committed as it is used
 constexpr std::size_t kGuardSize = 4096;
 
-/// The fiber that was resumed last, for its entry.
+/// The fiber resumed last; read by its entry function.
 thread_local Fiber* resumed = nullptr;
 
-/// The exceptions being handled are counted a thread; each fiber has a count of its own.
+/// The C++ runtime counts the exceptions being handled per thread; each fiber needs its own count.
 class HandledExceptions {
  public:
   void swapWithThread() {
@@ -119,7 +119,7 @@ struct Fiber::Contexts {
     arrived();
   }
 
-  /// To be called first thing on the fiber's own stack.
+  /// Call this first on the fiber's own stack.
   void arrived() {
 #ifdef KVR_FIBER_ASAN
     __sanitizer_finish_switch_fiber(ownFakeStack, &resumerStack, &resumerStackSize);
@@ -134,7 +134,7 @@ Fiber::Fiber(std::function<void()> function)
   contexts_->own.uc_stack.ss_size = kStackSize;
   contexts_->own.uc_link = nullptr;
   ::makecontext(&contexts_->own, &Fiber::enter, 0);
-  // The sanitizer would clean the memory of this whole stack at every switch.
+  // The sanitizer would otherwise clear the memory of this whole stack at every switch.
   contexts_->own.uc_stack = {};
 }
 

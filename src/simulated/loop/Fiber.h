@@ -6,10 +6,10 @@
 
 namespace kvr {
 
-/// A flow of control with a stack of its own, on the thread that resumes it.
+/// A flow of control with its own stack, on the thread that resumes it.
 ///
-/// `resume` runs it until it pauses or its function returns. It may be destroyed only when it has finished.
-/// All of it belongs to one thread.
+/// `resume` runs it until it pauses or its function returns. Destroy it only when it has finished. Use it on
+/// one thread only.
 class Fiber {
  public:
   /// `function` must not throw.
@@ -18,9 +18,9 @@ class Fiber {
   Fiber(const Fiber&) = delete;
   Fiber& operator=(const Fiber&) = delete;
 
-  /// Goes on in the fiber; returns when it pauses or has finished. Not from inside a fiber.
+  /// Continues the fiber; returns when it pauses or has finished. Not from inside a fiber.
   void resume();
-  /// Gives control back to whoever resumed the fiber, until the next `resume`. Inside the fiber only.
+  /// Returns control to the caller of `resume`, until the next `resume`. Inside the fiber only.
   void pause();
   bool isFinished() const { return finished_; }
 

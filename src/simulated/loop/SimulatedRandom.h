@@ -8,7 +8,7 @@
 
 namespace kvr {
 
-/// UUIDs of the random form, the same ones for the same seed.
+/// Version 4 UUIDs; the same seed gives the same ones.
 class SimulatedRandom : public Random {
  public:
   explicit SimulatedRandom(std::uint64_t seed) : random_(seed) {}

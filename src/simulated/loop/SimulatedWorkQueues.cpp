@@ -43,7 +43,7 @@ class SimulatedWorkQueues::Queue : public WorkQueue, public std::enable_shared_f
   std::deque<Work> items;  ///< of a serial queue
 };
 
-/// Runs items, one after the other, on a stack of its own.
+/// Runs items one after the other on its own stack.
 struct SimulatedWorkQueues::Runner {
   explicit Runner(SimulatedWorkQueues& queues) : fiber([this, &queues] { queues.work(*this); }) {}
 
@@ -99,7 +99,7 @@ class SimulatedWorkQueues::SimulatedTimer : public Timer {
  private:
   struct Firing {
     Work work;
-    bool waits = false;  ///< handed to the queue, not begun
+    bool waits = false;  ///< handed to the queue and not begun
   };
 
   void end() {
@@ -191,7 +191,7 @@ void SimulatedWorkQueues::run() {
   requireOutside();
   for (int count = 0;; ++count) {
     if (count == kMostItemsAtOnce) throw std::logic_error("work is handed over without end");
-    // Everything that is due now competes for being next.
+    // Everything due now may be picked next.
     while (step(clock_.elapsed_)) continue;
     if (!runOne()) return;
   }

@@ -16,20 +16,20 @@
 
 namespace kvr {
 
-/// All work on one thread, in virtual time, in an order that the seed decides.
+/// Runs all work on one thread, in virtual time, in an order that the seed decides.
 ///
-/// Nothing runs until the test says so with `run`, `advance` or `runUntil`. Whenever several items could run
-/// next, the seed picks one: the same seed gives the same order, another seed another one that real threads
-/// could give as well. An item that waits for a signal is set aside while others run; its serial queue stays
-/// busy meanwhile. Time passes only when nothing is runnable.
+/// Nothing runs until the test calls `run`, `advance` or `runUntil`. When several items could run next, the
+/// seed picks one: the same seed gives the same order; each order is one that real threads could produce as
+/// well. An item that waits for a signal is suspended while others run; its serial queue stays busy
+/// meanwhile. Time passes only when nothing can run.
 ///
 ///     queues.mainQueue()->async([&] { ... });
 ///     queues.run();                                // everything that can run without time passing
 ///     queues.advance(60);                          // a minute
 ///     EXPECT_TRUE(queues.runUntil([&] { return replied; }));  // however long it takes
 ///
-/// An exception that leaves an item, a wait on the main queue, and a wait that nothing can end any more are
-/// faults, see `faults`. One thread only.
+/// Faults (see `faults`) are an exception that leaves an item, a wait on the main queue, and a wait that
+/// nothing can end any more. Use it on one thread only.
 class SimulatedWorkQueues : public WorkQueues {
  public:
   SimulatedWorkQueues(SimulatedClock& clock, std::uint64_t seed);
@@ -44,32 +44,32 @@ class SimulatedWorkQueues : public WorkQueues {
   std::shared_ptr<Timer> newRepeatingTimer(double interval, WorkQueueRef queue, Work work) override;
   std::shared_ptr<Signal> newSignal() override;
 
-  // For tests; not from inside an item. All of them throw std::logic_error when work keeps handing over work
-  // without end at one point in time.
+  // For tests; not from inside an item. All of them throw std::logic_error when work adds more work without
+  // end while no time passes.
 
-  /// Runs until nothing is runnable now. No time passes.
+  /// Runs until nothing can run now. No time passes.
   void run();
-  /// Lets `seconds` pass, running everything that becomes due, in the order of time.
+  /// Lets `seconds` pass and runs everything that becomes due, in order of time.
   void advance(double seconds);
   /// Lets `seconds` pass in which nothing runs, as while a device is suspended; what became due meanwhile is
-  /// due at once.
+  /// due immediately afterwards.
   void suspend(double seconds) { clock_.elapsed_ += seconds; }
-  /// Goes from event to event until `predicate` holds (true) or nothing is left to happen (false). Then no
-  /// wait without a limit can end any more: such waits throw std::logic_error inside their items.
+  /// Advances from event to event until `predicate` holds (true) or nothing is left to happen (false). In the
+  /// latter case, waits without a limit cannot end any more: they throw std::logic_error inside their items.
   bool runUntil(const std::function<bool()>& predicate);
-  /// From here on every wait returns false at once, those under way as well.
+  /// From now on every wait returns false at once, including those under way.
   void beginEnding();
-  /// Ends every wait, lets the waiting items finish, releases all work that has not run and refuses further
-  /// work. The destructor does it too.
+  /// Ends every wait, lets the waiting items finish, drops all work that has not run and accepts no more. The
+  /// destructor calls it too.
   void end();
 
   /// Items waiting inside `Signal::wait`.
   std::size_t waiting() const { return waiters_.size(); }
-  /// Whether anything is runnable or will become due.
+  /// Whether anything can run now or later.
   bool hasFuture() const;
 
   const std::vector<std::string>& faults() const { return faults_; }
-  /// The faults so far, which are then no faults any more: for tests that provoke one.
+  /// Returns the faults so far and clears them: for tests that provoke one.
   std::vector<std::string> takeFaults() { return std::exchange(faults_, {}); }
 
  private:
@@ -78,11 +78,12 @@ class SimulatedWorkQueues : public WorkQueues {
   class SimulatedSignal;
   struct Runner;
   struct Waiter;
-  using EventKey = std::pair<double, std::uint64_t>;  ///< virtual time due, then order of scheduling
+  using EventKey =
+      std::pair<double, std::uint64_t>;  ///< the virtual time when it is due, then the order of scheduling
 
   EventKey schedule(double delay, std::function<void()> event);
   void cancel(const EventKey& key) { events_.erase(key); }
-  /// Moves time on to the next event, if it is due by `limit`, and lets it happen.
+  /// Advances time to the next event, if it is due by `limit`, and runs the event.
   bool step(double limit);
 
   void enqueue(const std::shared_ptr<Queue>& queue, Work work);
@@ -105,8 +106,8 @@ class SimulatedWorkQueues : public WorkQueues {
   std::uint64_t scheduled_ = 0;
   std::map<EventKey, std::function<void()>> events_;
 
-  // What is runnable now.
-  std::vector<std::shared_ptr<Queue>> readyQueues_;  ///< serial queues that are not busy and hold an item
+  // What can run now.
+  std::vector<std::shared_ptr<Queue>> readyQueues_;  ///< serial queues that are not busy and have an item
   std::vector<Work> readyItems_;                     ///< of the concurrent queues
   std::vector<Runner*> readyRunners_;                ///< items whose wait has ended
 
