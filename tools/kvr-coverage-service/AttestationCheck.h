@@ -12,8 +12,8 @@ struct Attestation {
   std::string body;
 };
 
-/// What is wrong with an attestation; nothing when it is good. `authority` is the content of a certificate
-/// file, PEM or DER; without it the chain is not traced to anyone.
+/// What is wrong with an attestation; nothing when it is valid. `authority` is the content of a certificate
+/// file, PEM or DER; without it the chain's issuer is not checked.
 std::optional<std::string> faultOf(const Attestation& attestation,
                                    const std::optional<std::string>& authority);
 

@@ -13,29 +13,29 @@
 
 namespace kvr::coverage_service {
 
-/// How an answer is to differ from the plain one.
+/// How an answer differs from the normal one.
 struct Behaviour {
   enum class Body { Plain, Garbage, Truncated, Oversize };
   enum class End { Close, Reset, Hold };
 
   std::optional<int> status;
-  std::optional<std::string> redirect;  ///< the location
+  std::optional<std::string> redirect;  ///< the location to redirect to
   Body body = Body::Plain;
-  double late = 0;  ///< seconds
+  double late = 0;  ///< delay in seconds
   bool never = false;
-  std::optional<std::string> raw;  ///< what is sent in place of an answer
-  std::string repeat;              ///< and then again and again
-  double pace = 0;                 ///< seconds between two of these
+  std::optional<std::string> raw;  ///< bytes to send instead of an answer
+  std::string repeat;              ///< sent again and again after it
+  double pace = 0;                 ///< seconds between two repetitions
   End end = End::Close;
 };
 
-/// The rules by which answers misbehave, per endpoint, set while the service runs. Thread-safe.
+/// The rules for misbehaving answers, per endpoint; they can be set while the service runs. Thread-safe.
 class Behaviours {
  public:
-  /// Replaces the rules of each endpoint that `document` names:
-  /// `{"coverage": [RULE...], "asset": [RULE...]}`, see `kHelp`. On an error nothing is changed.
+  /// Replaces the rules of each endpoint in `document`, `{"coverage": [RULE...], "asset": [RULE...]}`, see
+  /// `kHelp`. On an error nothing changes.
   std::optional<Error> set(const Value& document);
-  /// What the next request is to meet: the first rule of the endpoint that fits. Counts it.
+  /// The behaviour for the next request: the first matching rule of the endpoint. Counts the request.
   Behaviour next(std::string_view endpoint, const std::optional<std::string>& serialNumber);
 
   static const char* const kHelp;
@@ -44,7 +44,7 @@ class Behaviours {
   struct Rule {
     Behaviour behaviour;
     std::optional<std::string> serialNumber;
-    std::int64_t times = -1;  ///< still to come; no end when negative
+    std::int64_t times = -1;  ///< how often it still applies; negative: without end
     std::int64_t every = 1;
     std::int64_t seen = 0;
   };

@@ -8,7 +8,7 @@
 
 namespace kvr::coverage_service {
 
-/// The whole content of a regular file as it is now; nothing when there is none.
+/// The whole content of a regular file; nothing when there is none.
 inline std::optional<std::string> readFile(const std::string& path) {
   std::error_code error;
   if (!std::filesystem::is_regular_file(path, error)) return std::nullopt;

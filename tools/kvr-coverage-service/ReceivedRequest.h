@@ -7,12 +7,12 @@
 
 namespace kvr::coverage_service {
 
-/// A request as it came over the wire.
+/// A request as it arrived.
 struct ReceivedRequest {
   std::string method;
   std::string path;                         ///< without query, percent escapes resolved
-  std::string target;                       ///< as it came
-  std::vector<HTTPHeaders::Field> headers;  ///< in their order, repeated ones included
+  std::string target;                       ///< unchanged
+  std::vector<HTTPHeaders::Field> headers;  ///< in order, repeated ones included
   std::string body;
 };
 

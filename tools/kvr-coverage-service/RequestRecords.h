@@ -9,15 +9,14 @@
 
 namespace kvr::coverage_service {
 
-/// What the service was sent and what it answered: one JSON document a request, NNNNNN.json, in one
-/// directory.
+/// Records requests and the answers given: one JSON document per request, NNNNNN.json, in one directory.
 ///
 /// `{"time": seconds since 1970, "method", "path", "headers": [[NAME, VALUE]...], "body" (or "bodyBase64"
 /// when it is not UTF-8), "status" (0 when there is to be no answer), "reason" (why it is a 400)}`.
 /// Thread-safe.
 class RequestRecords {
  public:
-  /// Goes on after the highest number that the directory holds. Throws when the directory cannot be made.
+  /// Continues after the highest number in the directory. Throws when the directory cannot be created.
   explicit RequestRecords(std::string directory);
 
   /// The document is complete before this returns. Throws when it cannot be written.

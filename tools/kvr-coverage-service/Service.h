@@ -10,7 +10,7 @@
 
 namespace kvr::coverage_service {
 
-/// The two endpoints, answered from files that are read afresh at each request, and the control endpoint.
+/// The two endpoints, answered from files that are read at each request, and the control endpoint.
 class Service {
  public:
   struct Options {
@@ -20,7 +20,7 @@ class Service {
     std::string storefront;  ///< empty for the account's own
   };
 
-  /// Adds its handlers to `server`, which must not serve any longer than this lives.
+  /// Adds its handlers to `server`, which must stop serving before this is destroyed.
   Service(WireServer& server, Options options);
   Service(const Service&) = delete;
   Service& operator=(const Service&) = delete;

@@ -11,25 +11,25 @@
 
 namespace kvr::coverage_service {
 
-/// One client's connection, for as long as it lasts.
+/// One client's connection.
 class Connection : public httplib::Stream {
  public:
   /// `stop` becomes readable when the server stops.
   Connection(Descriptor socket, int stop) : socket_(std::move(socket)), stop_(stop) {}
 
-  /// Waits for the first byte of another request; false when the client has gone or kept silent for long, or
-  /// the server stops.
+  /// Waits for the first byte of another request; false when the client has gone or was silent for too long,
+  /// or the server stops.
   bool awaitRequest();
-  /// The header fields of the request at hand, in the order in which they came.
+  /// The header fields of the present request, in order.
   std::vector<HTTPHeaders::Field> headers() const;
-  /// Waits; without a limit when `seconds` is negative. False when meanwhile the client went or the server
-  /// stopped.
+  /// Waits for `seconds`, or without a limit if negative. False when the client goes or the server stops
+  /// meanwhile.
   bool wait(double seconds) const;
   /// Writes all of it; false when the client has gone.
   bool send(std::string_view bytes) const;
-  /// Breaks the connection off as a host does that knows nothing of it.
+  /// Resets the connection (TCP RST), without a regular close.
   void reset() const;
-  /// Nothing more is written: the client sees the connection end.
+  /// Writes nothing more: the client sees the connection end.
   void abandon() { isAbandoned_ = true; }
 
   bool is_readable() const override;
@@ -47,19 +47,19 @@ class Connection : public httplib::Stream {
   const int stop_;
   std::string unread_;
   std::size_t readUpTo_ = 0;
-  std::string head_;  ///< of the request at hand, as far as it has been read
+  std::string head_;  ///< of the present request, as far as it has been read
   bool isHeadComplete_ = false;
   bool isAbandoned_ = false;
 };
 
-/// An HTTP server with a thread for each connection, so that an answer that is held back holds up nobody.
+/// An HTTP server with one thread per connection, so that a delayed answer does not delay other clients.
 class WireServer : public httplib::Server {
  public:
   WireServer();
 
   /// The connection of the request that the calling thread is answering.
   static Connection& connection();
-  /// Lets nobody wait any longer and ends `listen_after_bind`, if it has begun. Any thread.
+  /// Ends all waits and `listen_after_bind`, if it has begun. Any thread.
   void stopServing();
 
  private:

@@ -11,7 +11,7 @@ namespace kvr::simulate {
 namespace {
 
 constexpr const char* kDismiss = "DismissFollowUpForSerialNumber";
-constexpr double kLimit = 3 * 3600;  ///< seconds for an answer, the longest delay included
+constexpr double kLimit = 3 * 3600;  ///< seconds until an answer must have come, the longest delay included
 
 const std::vector<std::string> kMembers{"ScheduleOutreach",
                                         "ScheduleOutreachAfter",

@@ -1,4 +1,4 @@
-// Conversion dates, and what is known of a device's warranty.
+// Conversion dates and cached warranties.
 
 #include "core/scheduling/SchedulingKeys.h"
 #include "core/warranty/CacheMetadata.h"
@@ -18,7 +18,7 @@ constexpr double kHour = 3600;
 constexpr double kLongestLookUp = 3 * kHour;
 constexpr const char* kCacheSuffix = "_Warranty.plist";
 
-/// Files round dates in a far future.
+/// Dates in a far future are rounded when they are stored.
 double roundingOf(Date date) { return 1e-15 * std::abs(date.secondsSince1970); }
 
 std::string cachePathOf(const std::string& serialNumber) {
@@ -34,8 +34,7 @@ void Invariants::answered(const Value& warranty) {
   }
 }
 
-/// Downloads bring dates. After a boot what is pending counts, and an upgrade in the same start schedules
-/// only then.
+/// Conversion dates come from downloads. A run after a boot may store the pending one again.
 void Invariants::checkConversionDate(const Value& stored) {
   if (runs_.contains(names::kPostBoot) && stored == conversionAtStart_) return;
   const auto date = stored.dateIfAny();
@@ -54,8 +53,8 @@ void Invariants::readCaches() {
   }
 }
 
-/// The conversion date that a download brings is stored before its warranty is cached, unless an earlier one
-/// is stored already. Migration, a part of start-up, brings none.
+/// The conversion date in a download is stored before its warranty is cached, unless an earlier one is
+/// already stored. Migration, which is part of start-up, stores none.
 void Invariants::cacheChanged(const std::string& path) {
   if (!path.ends_with(kCacheSuffix)) return;
   auto& cache = caches_[path];
@@ -69,7 +68,7 @@ void Invariants::cacheChanged(const std::string& path) {
   if (isNews && !filesFail_) checkConversionStored(cache);
 }
 
-/// And the next download that brings it makes up for one that could not be stored.
+/// If the date could not be stored, the next download that contains it must store it.
 void Invariants::downloaded(const std::string& lastUpdatedKey) {
   const auto hash = lastUpdatedKey.substr(0, lastUpdatedKey.find('_'));
   const auto found = std::ranges::find_if(
@@ -92,7 +91,7 @@ std::optional<Date> Invariants::conversionDateOf(const Value& warranty) const {
   return conversionDateIn(warranty, day.isNull() ? kDayLengths[0] : day.asDouble());
 }
 
-/// Whether whatever a look-up can have found out of that device lately is an open offer.
+/// Whether every answer that a look-up of this device can have got lately is an open offer.
 bool Invariants::isSurelyOpen(const std::string& serialNumber) const {
   const auto now = platform_->clock.now();
   const CacheMetadata metadata(serialNumber);

@@ -8,15 +8,15 @@
 
 namespace kvr::simulate {
 
-/// Chance, the same on every machine for the same seed.
+/// Random decisions, the same on every machine for the same seed.
 class Dice {
  public:
   explicit Dice(std::uint64_t seed) : random(seed) {}
 
   std::uint64_t number() { return random(); }
-  /// From 0 to below `count`.
+  /// From 0 to `count` - 1.
   std::size_t below(std::size_t count) { return static_cast<std::size_t>(random() % count); }
-  /// From 0 to below 1.
+  /// From 0 to just below 1.
   double share() { return static_cast<double>(random() >> 11U) * 0x1p-53; }
   double between(double least, double most) { return least + (most - least) * share(); }
   bool happens(double probability) { return share() < probability; }

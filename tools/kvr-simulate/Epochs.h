@@ -8,16 +8,16 @@
 
 namespace kvr::simulate {
 
-/// A date so many days from `today`, as the service sends it: mostly in whole seconds, now and then with a
-/// fraction, in milliseconds, below zero, or as anything else that a number can be.
+/// A date between `leastDays` and `mostDays` from `today`, as the service sends it: mostly in whole seconds,
+/// sometimes with a fraction, in milliseconds, negative, or any other number.
 Value drawEpoch(Dice& dice, Date today, double leastDays, double mostDays);
 
-// What the service means by what it sends. Read here anew, so that the agent's reading has a second opinion.
+// What the values from the service mean. Implemented independently of the agent, as a second opinion.
 
-/// Whole seconds without a sign; above ten thousand millions they are milliseconds. A number below zero is
-/// what its bits are without a sign, and lies in a far future.
+/// Whole unsigned seconds, or milliseconds above ten thousand million. The bits of a negative number are read
+/// as unsigned, so it lies in the far future.
 std::optional<Date> dateOf(const Value& epoch);
-/// The conversion date that a warranty brings, with days of so many seconds.
+/// The conversion date in a warranty; `day` is the length of a day in seconds.
 std::optional<Date> conversionDateIn(const Value& warranty, double day);
 
 }  // namespace kvr::simulate

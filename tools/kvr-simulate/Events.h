@@ -8,37 +8,37 @@
 namespace kvr::simulate {
 
 enum class EventKind {
-  Call,          ///< a client asks something
-  Offer,         ///< the service changes what it says of a device
-  Watch,         ///< a watch is paired, unpaired, archived or taken back
+  Call,          ///< a client calls the agent
+  Offer,         ///< the service changes its answer about a device
+  Watch,         ///< a watch is paired, unpaired, archived or restored
   Account,       ///< the owner signs in or out
-  Token,         ///< the service no longer takes the account's token
-  Locale,        ///< another language
+  Token,         ///< the service no longer accepts the account's token
+  Locale,        ///< the language changes
   Clock,         ///< the wall clock is set
-  Suspend,       ///< the device sleeps
-  Network,       ///< the network goes for a while
-  Reboot,        ///< the device starts anew
-  Upgrade,       ///< and with another system
+  Suspend,       ///< the device is suspended
+  Network,       ///< the network is gone for a while
+  Reboot,        ///< the device reboots
+  Upgrade,       ///< the device reboots with another system version
   Stop,          ///< the agent is told to end
-  Crash,         ///< the agent dies at some step of a change of a file
-  PowerLoss,     ///< and what was not synced with it
+  Crash,         ///< the agent dies at some step of changing a file
+  PowerLoss,     ///< as a crash, and what was not synced is lost
   ServiceFault,  ///< the service fails for a while
   FileFault,     ///< changes of files fail for a while
   Attestation,   ///< certificates fail for a while
-  Damage,        ///< somebody else spoils a file
+  Damage,        ///< somebody else damages a file
   Setting,       ///< the operator stores a setting
 };
 
-/// Something that happens to a device: complete in itself, so that leaving others out does not change it.
+/// Something that happens to a device. It is self-contained: leaving out other events does not change it.
 struct Event {
-  std::size_t number;  ///< in the list of its seed
+  std::size_t number;  ///< in the list for its seed
   double at;           ///< seconds since birth
   EventKind kind;
   std::uint64_t chance;  ///< decides the details
 };
 
 const char* nameOf(EventKind kind);
-/// What happens in so many years: in bursts, so that one thing comes in the midst of another.
+/// The events of `years` years. They come in bursts, so that they overlap.
 std::vector<Event> eventsOf(std::uint64_t seed, double years);
 
 }  // namespace kvr::simulate

@@ -63,7 +63,7 @@ void Invariants::fileChanged(const std::string& path, bool isDone) {
   if (bytes && path.ends_with(".plist") && !damageIsPlanted_ && !readPropertyList(*bytes)) {
     report("files are whole", path);
   }
-  // What an earlier process left is cleared away before the first file of a directory is replaced.
+  // Leftovers of an earlier process are removed before the first file of a directory is replaced.
   const bool isCleared = isDone && bytes && path.find(".damaged-") == std::string::npos && !filesFailed_;
   for (const auto& neighbour : platform_->files.list(path.substr(0, path.rfind('/')))) {
     if (isTemporary(neighbour) && (isCleared || !leftovers_.contains(neighbour))) {
@@ -89,7 +89,7 @@ void Invariants::checkPreferences() {
     for (const auto& [key, value] : before.dictionary()) keys.insert(key);
   }
   for (const auto& [key, value] : after.dictionary()) keys.insert(key);
-  // What is known of one device's cached warranty changes together.
+  // The preferences about one device's cached warranty change together.
   std::set<std::string> changed;
   for (const auto& key : keys) {
     if (before[key] == after[key]) continue;
@@ -117,7 +117,7 @@ void Invariants::checkChange(const std::string& key, const Value& before, const 
   if (key == preference::kConversionOutreachScheduledDate && !after.isNull()) checkConversionDate(after);
   if (key == preference::kServerVersionCache && isWithoutWatches(before)) trouble();
   if (key.ends_with(std::string("_") + names::kLastUpdatedDate)) downloaded(key);
-  // A post run schedules the refresh for what it looked up, in the place of what others wait for.
+  // A post run schedules the refresh for the items it looked up, instead of the one that others wait for.
   const auto refreshDate = std::string(names::kFollowUpRefresh) + names::kTargetDateSuffix;
   if (key == refreshDate && runs_.contains(names::kFollowUpPost)) refreshed_.clear();
   if (!after.isNull() || mayBeRemoved(key)) return;
@@ -129,8 +129,8 @@ void Invariants::checkChange(const std::string& key, const Value& before, const 
   }
 }
 
-/// The end of the run that was started for this date removes it, and the very first run after an upgrade all
-/// of them; whoever schedules for no date, none in the agent, would do so as well.
+/// A target date is removed at the end of the run that was started for it; the very first run after an
+/// upgrade removes all of them.
 void Invariants::checkTargetDateRemoval(const std::string& activity, const Value& before) {
   const auto upgrade = runs_.find(names::kPostUpgrade);
   if (upgrade != runs_.end() && upgrade->second.isFirstUpgrade) return;
@@ -142,7 +142,7 @@ void Invariants::checkTargetDateRemoval(const std::string& activity, const Value
   }
 }
 
-/// Only an offer that begins anew after the dismissal takes a device from the list.
+/// A device is only removed from the list by an offer that begins anew after the dismissal.
 void Invariants::checkPostedList(const Value& before, const Value& after, const Value& tree) {
   const auto later = listIn(after);
   std::set<std::string> seen;
@@ -170,8 +170,8 @@ void Invariants::checkFollowUps() {
   }
 }
 
-/// What has expired and could not be taken from the file is shown again when the clock is set back. Its
-/// refreshes are over, until the next start.
+/// An expired item that could not be removed from the file is shown again when the clock is set back. It is
+/// not refreshed until the next start.
 void Invariants::rememberExpired() {
   if (platform_ == nullptr) return;
   for (const auto& entry : listIn(platform_->files.getPropertyList(kFollowUpsPath)["items"])) {
@@ -200,7 +200,7 @@ bool Invariants::posting(const FollowUpItem& item, const std::vector<FollowUpIte
       item.uniqueIdentifier != std::string(names::kFollowUpClient) + "." + hash) {
     report("follow-ups are made from what the service said", "another device's");
   }
-  // What an earlier version showed is shown on, whatever it is made of.
+  // An item posted by an earlier version stays, whatever its contents.
   if (isMigrated) return true;
   if (!offer->isOffered) report("nothing is posted that is not offered", describe(item.title));
   if (!(offer->end() > now)) {
@@ -210,7 +210,7 @@ bool Invariants::posting(const FollowUpItem& item, const std::vector<FollowUpIte
   return wasPending;
 }
 
-/// New follow-ups come from the post activity only, which downloads for every run.
+/// New follow-ups come only from the post activity, which downloads in every run.
 void Invariants::checkNewPost(const Offer& offer, const std::string& name, Date now) {
   const auto stored = preferences();
   const auto due = offer.postDate(activationOf(offer.serialNumber, stored));
@@ -226,8 +226,7 @@ void Invariants::checkNewPost(const Offer& offer, const std::string& name, Date 
 
 void Invariants::posted(const FollowUpItem& item, bool wasPending, bool isDone) {
   if (!isWatching() || !isDone) {
-    // Not tried again before the next refresh; and with the process cut off it may have been done all the
-    // same.
+    // The post is not tried again before the next refresh; if the process was cut off, it may have succeeded.
     refreshed_.erase(*item.uniqueIdentifier);
     return;
   }
@@ -249,7 +248,8 @@ void Invariants::clearing(const std::vector<std::string>& uniqueIdentifiers,
     const auto serial = item.userInfo.find(names::kFollowUpSerialNumber);
     if (serial == item.userInfo.end()) continue;
     checkCleared(serial->second.string());
-    // The end fails what was asked for. Neither a dismissal nor the refresh activity has asked for anything.
+    // When the process ends, downloads fail, and no follow-up may be cleared because of that. A dismissal and
+    // the refresh activity do not download.
     if (endDismisses_ && !endDismisses_->contains(serial->second.string()) &&
         !runs_.contains(names::kFollowUpRefresh)) {
       report("the end takes no follow-up away", describe(item.title));

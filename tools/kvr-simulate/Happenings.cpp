@@ -1,4 +1,4 @@
-// What each kind of event does.
+// The effect of each kind of event.
 
 #include "core/devices/DeviceKeys.h"
 #include "core/warranty/LookupPolicy.h"
@@ -53,7 +53,7 @@ void Life::apply(const Event& event) {
       return end(false, dice.happens(0.7), dice.oneOf({20.0, kHour, kDay}));
     case EventKind::Stop:
       foretellDeath(dice);
-      // What is asked for just before is under way then.
+      // Calls made just before, so that they are under way when the process ends.
       if (process_ && dice.happens(0.5)) {
         clients_.invoke(process_->simulated, "GetDefaultDeviceInfoUsingPolicy", {LookupPolicy::kRefresh});
         clients_.invoke(process_->simulated, "GetAllDeviceInfosUsingPolicy", {LookupPolicy::kRefresh, true});
@@ -249,7 +249,8 @@ void Life::attestation(Dice& dice) {
 }
 
 void Life::damage(Dice& dice) {
-  // The agent's preferences more often than others, and while it is not there: it has to find out.
+  // The agent's preferences are damaged more often than other files, and while no process runs, so that the
+  // next one finds them damaged.
   const bool isOfPreferences = dice.happens(0.5);
   if (isOfPreferences) {
     foretellDeath(dice);
@@ -300,7 +301,7 @@ void Life::endFaults() {
   if (clockOffset_ != 0) setClock(0);
   disturb();
   if (process_) {
-    // A crash that has not come is called off.
+    // Cancel a crash that has not happened yet.
     process_->simulated.files.killAfterSteps(static_cast<std::size_t>(-1) / 2);
     process_->simulated.files.setStepFault(nullptr);
     world_.show(process_->simulated);

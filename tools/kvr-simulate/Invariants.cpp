@@ -1,4 +1,4 @@
-// Processes, runs, requests and the state of rest.
+// Processes, runs, requests and the final state.
 
 #include "kvr-simulate/Invariants.h"
 
@@ -16,12 +16,12 @@ namespace kvr::simulate {
 namespace {
 
 constexpr double kHour = 3600;
-constexpr double kSlack = 3 * kHour;  ///< back-offs and the like
+constexpr double kSlack = 3 * kHour;  ///< for retries and the like
 constexpr double kQuiet = 200;        ///< seconds after which requests belong to other downloads
 constexpr std::size_t kAttempts = 3;
-constexpr double kMostDays = 4294967295;  ///< that are counted
+constexpr double kMostDays = 4294967295;  ///< the most that the agent counts
 
-/// Of "1,234 days left".
+/// The number in "1,234 days left".
 double daysIn(const Value& text) {
   std::string digits = text.stringIfAny().value_or("");
   std::erase(digits, ',');
@@ -95,7 +95,7 @@ void Invariants::step() {
   toBeListed_.clear();
 }
 
-/// The service is offered last.
+/// Start-up offers the service as its last step.
 bool Invariants::isStartingUp() const { return !platform_->services.isListening(names::kAgent); }
 
 // Runs.
@@ -181,7 +181,7 @@ void Invariants::suspended(double seconds) {
   excuseRuns();
 }
 
-// Quiet.
+// Calm.
 
 void Invariants::checkCalm() {
   if (!isWatching()) return;
@@ -226,24 +226,24 @@ void Invariants::checkShown(const Value& stored, const Value& registrations) {
   const auto pending = pendingItems();
   const auto refresh = stored[std::string(names::kFollowUpRefresh) + names::kTargetDateSuffix].dateIfAny();
   if (refresh) datesAreDamaged_ = false;
-  // The first run after an upgrade clears the date; what is registered stays so.
+  // The first run after an upgrade removes the date, but the registration stays.
   const bool isToCome = refresh || registrations.contains(names::kFollowUpRefresh) ||
                         runs_.contains(names::kFollowUpRefresh) || runs_.contains(names::kFollowUpPost);
   const bool isAnyRefreshed = std::ranges::any_of(pending, [this](const FollowUpItem& item) {
-    // One that an earlier version posted and nobody could take over is no device's.
+    // An item that an earlier version posted and that could not be migrated belongs to no device.
     return item.userInfo.contains(names::kFollowUpSerialNumber) && !expired_.contains(*item.uniqueIdentifier);
   });
   if (isAnyRefreshed && !isToCome && !datesAreDamaged_) {
     report("what is shown is kept up to date", "no refresh is to come");
   }
-  // One may be late, by its grace.
+  // A refresh may be late by its grace period.
   if (shortestDay < 86400 || !refresh || *refresh <= platform_->clock.now()) return;
   for (const auto& item : pending) {
     const auto posted = refreshed_.find(*item.uniqueIdentifier);
     auto* const offer = world_.service.find(item.title);
     if (posted == refreshed_.end() || posted->second < clockMoved_ || offer == nullptr) continue;
     const auto activation = activationOf(offer->serialNumber, stored);
-    // One that was posted by another setting of the clock counts as not shown until its date comes again.
+    // An item posted while the clock was set differently counts as not shown until its date comes again.
     if (std::max(activation, offer->displayed()) > platform_->clock.now()) continue;
     const double left = std::min(std::ceil((*offer->end() - platform_->clock.now()) / 86400), kMostDays);
     const double shown = std::max(daysIn(item.informativeFooterText), 1.0);
@@ -254,7 +254,7 @@ void Invariants::checkShown(const Value& stored, const Value& registrations) {
   }
 }
 
-// Rest.
+// The final state.
 
 void Invariants::checkRest(Date postedAt) {
   if (!isWatching()) return;
@@ -298,7 +298,8 @@ void Invariants::checkDevice(const std::string& serialNumber, const std::vector<
   }
 }
 
-/// Until the offer begins anew. A dismissal cut off by a crash before its date was stored lasts for good.
+/// A dismissal holds until the offer begins anew. If a crash prevented its date from being stored, it holds
+/// for good.
 bool Invariants::isDismissed(const Offer& offer, const Value& stored) const {
   const Value hash = sha256Hash(offer.serialNumber);
   const auto& list = stored[preference::kFollowUpDismissedHashes];
@@ -307,7 +308,7 @@ bool Invariants::isDismissed(const Offer& offer, const Value& stored) const {
   return !when || !offer.displayed() || *when >= *offer.displayed();
 }
 
-/// The earliest that the agent may go by, while a watch is being paired again.
+/// The earliest activation date that the agent may use while a watch is being paired again.
 std::optional<Date> Invariants::activationOf(const std::string& serialNumber, const Value& stored) const {
   if (serialNumber == world_.phone) return stored["DefaultDeviceActivationDate"].dateIfAny();
   const auto* const watch = world_.watch(serialNumber);

@@ -14,10 +14,10 @@
 
 namespace kvr::simulate {
 
-/// What operators set the length of a day to, in seconds; the first one is what it is otherwise.
+/// The day lengths that operators set, in seconds; the first one is the default.
 inline constexpr std::array kDayLengths{86400, 1800, 7200};
 
-/// How much life was covered.
+/// Counts of what was simulated.
 struct Figures {
   std::size_t starts = 0;
   std::size_t crashes = 0;
@@ -32,7 +32,7 @@ struct Figures {
   void add(const Figures& other);
 };
 
-/// Whether a service of that version has no watches looked after.
+/// Whether a service with this version does not handle watches.
 bool isWithoutWatches(const Value& serverVersion);
 
 /// An invariant that did not hold.
@@ -41,8 +41,7 @@ struct Breach {
   std::string detail;
 };
 
-/// What must hold whatever happens. It is told what the agent does, at the moment when it does it, and keeps
-/// the first breach.
+/// What must always hold. It is told of each action of the agent as it happens, and keeps the first breach.
 class Invariants {
  public:
   explicit Invariants(World& world) : world_(world) {}
@@ -50,30 +49,31 @@ class Invariants {
   const std::optional<Breach>& breach() const { return breach_; }
   void report(const std::string& invariant, const std::string& detail);
 
-  // A process.
+  // The process.
 
-  /// Before the agent starts: what it finds must be sound.
+  /// Call before the agent starts: the files that it finds must be sound.
   void beginProcess(SimulatedPlatform& platform);
-  /// The process is told to end, while somebody waits for the dismissal of these devices' follow-ups.
+  /// The process is told to end, while clients wait for the dismissal of these devices' follow-ups.
   void beginEnding(std::set<std::string> serialNumbersToDismiss) {
     endDismisses_ = std::move(serialNumbersToDismiss);
   }
-  /// From here on it is nobody's fault what the process does.
+  /// From now on nothing that the process does counts.
   void endProcess();
   /// Whether the process is alive and not cut off from its files.
   bool isWatching() const { return platform_ != nullptr && !platform_->files.isKilled(); }
-  /// After every work item.
+  /// Call after every work item.
   void step();
-  /// With everything quiet for a while: nothing is overdue, and what is shown is up to date.
+  /// Call when nothing has happened for a while: nothing may be overdue, and what is shown must be up to
+  /// date.
   void checkCalm();
-  /// After the faults have stopped and every device was looked up anew.
+  /// Call after all faults have stopped and every device was looked up again.
   void checkRest(Date postedAt);
 
   // What the agent does.
 
   void runBegins(const std::string& activity);
   void runEnds(const std::string& activity, ActivityResult result);
-  /// Whether it takes the place of one that is shown.
+  /// Returns whether the item replaces one that is shown.
   bool posting(const FollowUpItem& item, const std::vector<FollowUpItem>& pending);
   void posted(const FollowUpItem& item, bool wasPending, bool isDone);
   void clearing(const std::vector<std::string>& uniqueIdentifiers, const std::vector<FollowUpItem>& pending);
@@ -82,26 +82,26 @@ class Invariants {
   void coverageAnswered(int status);
   void answered(const Value& warranty);
 
-  // What happens to it.
+  // What happens to the agent.
 
-  /// Activities may run anew.
+  /// From now on the limit on runs counts again from zero.
   void excuseRuns() { runTimes_.clear(); }
   void clockMoved();
-  /// Something after which look-ups may fail for a while, or have found out something else before.
+  /// From now on look-ups may fail for a while, or may have found something else before.
   void trouble() { troubled_ = world_.now; }
   void dismissalAsked(const std::string& serialNumber) { dismissed_.insert(serialNumber); }
   void suspended(double seconds);
-  /// What is shown may be what was shown before.
+  /// After this, items may be shown with an earlier text.
   void powerLost() { refreshed_.clear(); }
-  /// Faults of files begin: what is not recorded then is lost.
+  /// File faults begin: what cannot be recorded during them is lost.
   void excuseFiles() { filesFail_ = filesFailed_ = true; }
   void endFileFaults() { filesFail_ = false; }
-  /// Somebody else changed files.
+  /// Somebody else has changed files.
   void allowDamage() { damageIsPlanted_ = filesFailed_ = true; }
   void readFilesAgain();
 
   Figures figures;
-  double shortestDay = 86400;  ///< that was ever configured, in seconds
+  double shortestDay = 86400;  ///< the shortest one ever configured, in seconds
 
  private:
   struct Run {
@@ -115,7 +115,7 @@ class Invariants {
     Value warranty;
     Value earlier;
     double changed = -1e9;
-    bool hasNews = false;  ///< a conversion date, which could not be stored so far
+    bool hasNews = false;  ///< it has a conversion date that could not be stored yet
   };
 
   bool isStartingUp() const;
@@ -150,24 +150,24 @@ class Invariants {
   std::map<std::string, std::deque<double>> runTimes_;
   Value preferences_;  ///< as last seen
   std::set<std::string> toBeListed_;
-  std::set<std::string> leftovers_;  ///< what was there when the process began
+  std::set<std::string> leftovers_;  ///< files that existed when the process began
   std::map<std::string, std::string> durable_;
   bool filesFail_ = false;
-  bool filesFailed_ = false;  ///< in this process, which may know of more than they hold
+  bool filesFailed_ = false;  ///< in this process; the agent may know more than its files contain
   bool damageIsPlanted_ = false;
-  bool datesAreDamaged_ = false;  ///< and may be missing, until the chain of refreshes begins anew
+  bool datesAreDamaged_ = false;  ///< dates may be missing until the next refresh is scheduled
   double clockMoved_ = -1;
-  /// When the refresh activity updated what is shown, by unique identifier. What others updated since has to
-  /// wait for the refresh that was scheduled before.
+  /// When the refresh activity last updated each shown item, by unique identifier. An item that others have
+  /// updated since has to wait for the refresh that was scheduled before.
   std::map<std::string, double> refreshed_;
-  std::set<std::string> begun_;     ///< activities, in this process
-  Value conversionAtStart_;         ///< for when the conversion outreach was pending when the process began
-  std::set<Date> conversionDates_;  ///< that the service ever brought
+  std::set<std::string> begun_;     ///< activities that have run in this process
+  Value conversionAtStart_;         ///< the target date of the conversion outreach when the process began
+  std::set<Date> conversionDates_;  ///< all that the service ever sent
   std::map<std::string, Cache> caches_;
-  std::set<std::string> dismissed_;  ///< serial numbers, in this process
+  std::set<std::string> dismissed_;  ///< serial numbers whose dismissal was requested in this process
   double troubled_ = -1e9;
-  std::set<std::string> expired_;  ///< by a clock that was set anew since, in this process
-  std::optional<std::set<std::string>> endDismisses_;  ///< once the process is told to end
+  std::set<std::string> expired_;  ///< items that expired before the clock was set, in this process
+  std::optional<std::set<std::string>> endDismisses_;  ///< set once the process is told to end
   double lastRequest_ = -1e9;
   std::size_t versionRequests_ = 0;
   std::size_t coverageRequests_ = 0;

@@ -12,7 +12,7 @@ namespace {
 constexpr double kHour = 3600;
 constexpr double kDay = 24 * kHour;
 constexpr double kYear = 365 * kDay;
-constexpr double kCalm = 3 * kHour;  ///< without disturbance, after which everything is to be in order
+constexpr double kCalm = 3 * kHour;  ///< after so long without disturbance, everything must be in order
 constexpr double kLookInterval = 6 * kHour;
 constexpr std::size_t kMostItemsAtOnce = 200'000;
 
@@ -82,7 +82,7 @@ void Life::end(bool losesPower, bool isStopped, double pause) {
   losesPower_ = false;
 }
 
-/// Whether the process has to be looked after; called after every work item.
+/// Whether to stop running the process; called after every work item.
 bool Life::isOver(double time) {
   auto& simulated = process_->simulated;
   world_.now = processBegan_ + simulated.clock.elapsed();
@@ -109,7 +109,7 @@ void Life::runUntil(double time) {
   if (!noticeDeath() && world_.now < time) end(false, true, 0.2);
 }
 
-/// Whether the process was cut off from its files, and is over with that.
+/// Ends a process that was cut off from its files; false if it was not.
 bool Life::noticeDeath() {
   if (!process_ || !process_->simulated.files.isKilled()) return false;
   ++(losesPower_ ? invariants_.figures.powerLosses : invariants_.figures.crashes);
@@ -137,7 +137,7 @@ void Life::advanceTo(double time) {
   }
 }
 
-/// At the same times whatever happens, so that fewer events do not hide what more of them showed.
+/// Checks at fixed times whatever happens, so that a reduced list of events does not hide a breach.
 void Life::look() {
   nextLook_ = (std::floor(world_.now / kLookInterval) + 1) * kLookInterval;
   const bool isCalm = process_ && !stepFault_ && world_.now > disturbed_ + kCalm &&
@@ -145,7 +145,7 @@ void Life::look() {
   if (!isBroken() && isCalm) invariants_.checkCalm();
 }
 
-/// After the faults have stopped: an outreach, what it leads to, and a look at every device.
+/// After the faults have stopped: requests an outreach, waits for its effects, and looks up every device.
 void Life::rest() {
   endFaults();
   agenda_.clear();

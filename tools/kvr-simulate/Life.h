@@ -13,23 +13,23 @@
 
 namespace kvr::simulate {
 
-/// How a life went.
+/// The outcome of a life.
 struct Outcome {
   std::optional<Breach> breach;
-  double at = 0;                           ///< seconds since birth, of the breach
-  std::optional<std::size_t> afterEvents;  ///< how many of the events had happened then
+  double at = 0;                           ///< when the breach happened, in seconds since birth
+  std::optional<std::size_t> afterEvents;  ///< how many events had happened by then
   std::vector<std::string> lastLines;
   Figures figures;
-  std::uint64_t digest = 0;  ///< of what the agent did; the same for the same life
+  std::uint64_t digest = 0;  ///< of the agent's actions; equal for equal lives
 };
 
-/// A device from its first start on, the agent on it, and what happens to both.
+/// A device from its first start on, with the agent on it and everything that happens to both.
 class Life {
  public:
   struct Options {
     double years = 1;
     LogLevel leastLogged = LogLevel::Error;
-    bool isTraced = false;  ///< what happens is printed
+    bool isTraced = false;  ///< print what happens
   };
 
   Life(std::uint64_t seed, Options options);
@@ -40,7 +40,7 @@ class Life {
   void birth();
   void start();
   void end(bool losesPower, bool isStopped, double pause);
-  /// Now and then the next process dies while it starts, or soon after.
+  /// Sometimes schedules that the next process dies while it starts, or soon after.
   void foretellDeath(Dice& dice);
   void advanceTo(double time);
   void runUntil(double time);
@@ -52,7 +52,7 @@ class Life {
 
   void apply(const Event& event);
   void say(const std::string& text) const;
-  /// Something calm is over for a while.
+  /// Marks the end of a calm period.
   void disturb() {
     disturbed_ = world_.now;
     invariants_.trouble();
@@ -84,16 +84,16 @@ class Life {
   Invariants invariants_;
   Clients clients_;
   std::unique_ptr<Process> process_;
-  std::unique_ptr<SimulatedFiles> files_;  ///< while no process is
+  std::unique_ptr<SimulatedFiles> files_;  ///< while no process exists
   SimulatedClock idleClock_;
-  double startsAt_ = 0;  ///< the next process, while there is none
+  double startsAt_ = 0;  ///< when the next process starts, while there is none
   double processBegan_ = 0;
-  double clockOffset_ = 0;  ///< of the wall clock
+  double clockOffset_ = 0;  ///< of the wall clock, in seconds
   double disturbed_ = 0;
-  double nextLook_ = 0;                     ///< whether all is in order
-  bool losesPower_ = false;                 ///< when the crash under way comes
-  std::optional<std::size_t> stepsToLive_;  ///< changes of files, for the next process
-  bool losesPowerNext_ = false;             ///< when it dies after them
+  double nextLook_ = 0;                     ///< when to check the invariants next
+  bool losesPower_ = false;                 ///< when the process dies in the crash under way
+  std::optional<std::size_t> stepsToLive_;  ///< how many steps of file changes the next process lives for
+  bool losesPowerNext_ = false;             ///< when the next process dies after them
   std::uint64_t starts_ = 0;
   SimulatedFiles::StepFault stepFault_;
   std::multimap<double, std::function<void()>> agenda_;

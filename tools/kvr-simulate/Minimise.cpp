@@ -12,7 +12,7 @@ class Minimiser {
   Minimiser(std::uint64_t seed, double years, const std::string& invariant)
       : seed_(seed), years_(years), invariant_(invariant) {}
 
-  /// Whether these events break the invariant; if so they are the best ones so far.
+  /// Whether these events break the invariant; if so, keeps them as the best so far.
   bool take(std::vector<Event> events) {
     if (lives_ >= kMostLives || events.size() >= best.size()) return false;
     ++lives_;

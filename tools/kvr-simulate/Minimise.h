@@ -7,7 +7,7 @@
 
 namespace kvr::simulate {
 
-/// The fewest of these events found after which the same invariant does not hold.
+/// Reduces the events to as few as it finds that still break the same invariant.
 std::vector<Event> minimised(std::uint64_t seed, std::vector<Event> events, double years,
                              const std::string& invariant);
 

@@ -7,8 +7,8 @@
 namespace kvr::simulate {
 namespace {
 
-constexpr std::uint64_t kSlowStarts = 4;  ///< one of so many is
-constexpr double kLongestPause = 20;      ///< seconds, between two steps of a slow start
+constexpr std::uint64_t kSlowStarts = 4;  ///< one start in so many is slow
+constexpr double kLongestPause = 20;      ///< seconds between two steps of a slow start
 
 HTTPResponse endingResponse() { return {0, std::nullopt, Error{"http", 42, "the process is ending"}}; }
 
@@ -178,7 +178,7 @@ void Process::answer(const HTTPRequest& request, const SimulatedHTTP::Answer& an
   std::erase_if(open_, [](const auto& open) { return *open.first; });
   open_.emplace_back(done, answer);
   const auto queue = simulated.queues.concurrentQueue(Priority::Default);
-  // A request that nobody answers fails by its own limit.
+  // A request without an answer fails by its own timeout.
   simulated.queues.after(request.timeout, queue, [this, done] {
     if (!std::exchange(*done, true)) --openRequests_;
   });

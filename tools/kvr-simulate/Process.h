@@ -12,8 +12,8 @@
 
 namespace kvr::simulate {
 
-/// Passes activities on to the simulated scheduler and tells the invariants of their runs; and somebody that
-/// an activity has checked in.
+/// Forwards to the simulated scheduler and reports runs to the invariants; calls `checkedIn` after each
+/// check-in of an activity.
 class RecordingActivities : public ActivityScheduler {
  public:
   RecordingActivities(ActivityScheduler& scheduler, Log& log, Invariants& invariants,
@@ -31,7 +31,7 @@ class RecordingActivities : public ActivityScheduler {
   const std::function<void()> checkedIn_;
 };
 
-/// Passes listeners on, and tells somebody before each new one.
+/// Forwards to the simulated listeners and calls `beforeNew` before each new listener.
 class RecordingListeners : public ServiceListeners {
  public:
   RecordingListeners(ServiceListeners& listeners, std::function<void()> beforeNew)
@@ -47,7 +47,7 @@ class RecordingListeners : public ServiceListeners {
   const std::function<void()> beforeNew_;
 };
 
-/// Passes follow-ups on to the simulated centre and tells the invariants of them.
+/// Forwards to the simulated follow-up centre and reports posting and clearing to the invariants.
 class RecordingCenter : public FollowUpCenter {
  public:
   RecordingCenter(FollowUpCenter& center, Invariants& invariants)
@@ -60,10 +60,10 @@ class RecordingCenter : public FollowUpCenter {
   Invariants& invariants_;
 };
 
-/// One life of the agent: a simulated platform that is watched, and the agent on it.
+/// One process of the agent: a simulated platform that is observed, and the agent on it.
 class Process {
  public:
-  /// `files`: what the process before left behind, if there was one.
+  /// `files`: the files that the previous process left, or null.
   Process(World& world, Invariants& invariants, std::uint64_t seed, LogLevel leastLogged,
           const SimulatedFiles* files);
   ~Process();
@@ -71,15 +71,15 @@ class Process {
   Process& operator=(const Process&) = delete;
 
   void start();
-  /// Ends as on a termination signal. What a client has asked to dismiss may go meanwhile.
+  /// Ends as on a termination signal. Follow-ups that clients have asked to dismiss may go meanwhile.
   void stop(std::set<std::string> serialNumbersToDismiss);
-  /// Nothing but what may wait for days is under way.
+  /// Whether nothing is under way except what may wait for days.
   bool isIdle() const { return openRequests_ == 0 && simulated.activities.runsUnderWay() == 0; }
 
   SimulatedPlatform simulated;
 
  private:
-  /// Start-up takes its time, in which whatever else can run does.
+  /// Lets other work run in the middle of start-up.
   void letOthersRun();
   void answer(const HTTPRequest& request, const SimulatedHTTP::Answer& answer);
 
@@ -88,7 +88,7 @@ class Process {
   const double began_;
   const double pause_;  ///< seconds between two steps of start-up
   int openRequests_ = 0;
-  /// Requests, with whether each has been answered.
+  /// Requests without an answer yet, each with a flag that is set once it is done.
   std::vector<std::pair<std::shared_ptr<bool>, SimulatedHTTP::Answer>> open_;
   RecordingActivities activities_;
   RecordingListeners services_;

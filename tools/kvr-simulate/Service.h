@@ -12,42 +12,42 @@
 
 namespace kvr::simulate {
 
-/// What the service says of one device from some day on. Its label is its own, so that whatever the agent
-/// shows tells from which one it was made.
+/// The service's answer about one device from some time on. Each offer has a unique label, so that everything
+/// the agent shows can be traced to the offer it came from.
 struct Offer {
   std::string serialNumber;
   bool isOffered = false;
   Value::Dictionary epochs;  ///< the dates as they are sent, by key
   double daysBeforeEnd = 0;
   bool isCovered = false;
-  double lastServed = -1;  ///< seconds since birth
+  double lastServed = -1;  ///< when last sent, in seconds since birth
 
   std::optional<Date> end() const;
   std::optional<Date> displayed() const;
-  /// From when it may be posted to a device activated at `activation`.
+  /// When it may first be posted to a device activated at `activation`.
   std::optional<Date> postDate(std::optional<Date> activation) const;
   bool isOpen(Date now) const { return isOffered && end() > now; }
 };
 
-/// The coverage service as it is during one life, with its faults.
+/// The coverage service during one life, with its faults.
 class Service {
  public:
   enum class Fault { None, Refuses, Breaks, Late, Never, Garbage, Null, Giant, Deep, Other, Unreachable };
   struct Outcome {
-    std::optional<HTTPResponse> response;  ///< none: never
+    std::optional<HTTPResponse> response;  ///< none: the request is never answered
     double delay = 0;                      ///< seconds
-    std::optional<std::size_t> offer;      ///< the one answered, if the answer is one
+    std::optional<std::size_t> offer;      ///< the offer in the answer, if there is one
   };
 
   explicit Service(std::uint64_t seed) : dice_(seed) {}
 
-  /// Puts a new offer in the place of the device's present one.
+  /// Replaces the device's present offer.
   std::size_t publish(Offer offer);
-  /// The device's present offer; one without anything for a device that is not known.
+  /// The device's present offer; an empty one for an unknown device.
   std::size_t currentOf(const std::string& serialNumber);
-  /// Whether each of a device's offers that was answered since `time` is open.
+  /// Whether every offer of the device that was sent since `time` is open.
   bool areOpen(const std::string& serialNumber, double time, Date now) const;
-  /// The offer of that label.
+  /// The offer with this label, or null.
   Offer* find(const Value& label);
   Offer& at(std::size_t number) { return offers_[number]; }
   static Value labelOf(std::size_t number) { return "Offer " + std::to_string(number); }
@@ -58,7 +58,7 @@ class Service {
 
   Fault coverageFault = Fault::None;
   Fault versionFault = Fault::None;
-  double faultShare = 1;  ///< how many of the requests a fault strikes
+  double faultShare = 1;  ///< the share of requests that a fault affects
   std::string validToken = "token 0";
 
  private:

@@ -9,36 +9,35 @@
 
 namespace kvr::simulate {
 
-/// What outlives the agent: the device, its owner, the watches and the service, and the files between two
-/// processes.
+/// What outlives a process of the agent: the device, its owner, the watches and the service.
 struct World {
   struct Watch {
     std::string serialNumber;
     Date paired;
-    Date pairedBefore;  ///< the earlier one of the last two pairings
+    Date pairedBefore;  ///< the earlier of the last two pairings
     bool isPaired = true;
     bool isArchived = false;
   };
 
   explicit World(std::uint64_t seed);
 
-  /// A new offer for a device: what the service may come to say at `today`.
+  /// Draws a new offer that the service might make for a device at `today`.
   Offer drawOffer(Dice& dice, const std::string& serialNumber, Date today) const;
-  /// The phone and the watches, those not paired as well.
+  /// The phone and all watches, including unpaired ones.
   std::vector<std::string> serialNumbers() const;
-  /// Those that are looked after.
+  /// The phone and the watches that the agent looks after.
   std::vector<std::string> trackedSerialNumbers() const;
   const Watch* watch(const std::string& serialNumber) const;
-  /// Whether a look-up may fail as things are.
+  /// Whether a look-up may fail at present.
   bool isInTrouble() const;
-  /// Makes a platform show this world as it is.
+  /// Sets up a platform to match this world.
   void show(SimulatedPlatform& platform) const;
-  /// Puts the files of the earlier layout in place.
+  /// Stores the files of the earlier layout.
   void putLegacyFiles(SimulatedFiles& files);
 
   const std::uint64_t seed;
   Dice dice;
-  double now = 0;  ///< seconds since birth, which nobody sets
+  double now = 0;  ///< seconds since birth, which no clock change affects
   std::string phone;
   std::vector<Watch> watches;
   Service service;
@@ -46,13 +45,14 @@ struct World {
   unsigned boot = 0;
   std::string locale = "en_US";
   bool hasAccount = true;
-  double accountChanged = 0;  ///< when, by `now`
+  double accountChanged = 0;  ///< when, in seconds since birth
   std::string heldToken = "token 0";
   SimulatedAccountStore::Renewal renewal;
   SimulatedDeviceAttestation::Outcome attestation;
   bool hasAttestation = true;
   bool isNetworkReachable = true;
-  std::vector<std::string> hosts{"coverage.tarsil.example", "assets.tarsil.example"};  ///< ever configured
+  std::vector<std::string> hosts{"coverage.tarsil.example",
+                                 "assets.tarsil.example"};  ///< all hosts ever configured
 };
 
 }  // namespace kvr::simulate

@@ -1,4 +1,4 @@
-// Lives whole lives of the agent, each from a seed, and looks whether what must always hold does.
+// Simulates whole lives of the agent, each from a seed, and checks that the invariants hold.
 
 #include "kvr-simulate/Minimise.h"
 
@@ -25,7 +25,7 @@ struct Arguments {
   bool isBrief = false;
 };
 
-/// Every few seeds all that is logged is put into words, as an agent does that is being watched.
+/// For some seeds everything is logged, so that the formatting of log lines is exercised too.
 constexpr std::uint64_t kLoggedSeeds = 8;
 
 LogLevel levelFor(std::uint64_t seed) { return seed % kLoggedSeeds == 0 ? LogLevel::Debug : LogLevel::Error; }
