@@ -1,8 +1,8 @@
-// The least that can be on the bus: a name, an object, and replies built by sd-bus appends.
+// The smallest possible service on the bus: a name, an object, and replies built by sd-bus calls.
 //
-// kvr-bench-bare [TREE]: "Info" replies the dictionary that the file describes, built anew for every call;
-// "Infos" an array of the dictionaries in that one; "Ping" replies nothing. A line of the file is a kind, a
-// key (but in an array) and a value: "s key text", "x key 1", "t key 1", "d key 1.5", "b key 1", "( key 1.5"
+// kvr-bench-bare [TREE]: "Info" replies with the dictionary that the file describes, built again for every
+// call; "Infos" with an array of the dictionaries in it; "Ping" with nothing. A line of the file is a type, a
+// key (not in an array) and a value: "s key text", "x key 1", "t key 1", "d key 1.5", "b key 1", "( key 1.5"
 // (a date); "{ key" and "[ key" open a container, "}" and "]" close it.
 
 #include <systemd/sd-bus.h>

@@ -1,4 +1,4 @@
-// What clients see: calls of the agent against calls of the bare service, by one client on one bus.
+// The clients' view: calls of the agent compared with calls of the bare service, by one client on one bus.
 
 #include "CoverageAnswer.h"
 #include "Figures.h"
@@ -28,7 +28,7 @@ Value infoFrom(const RawBusClient& client, const MakeCall& make) {
   return client.value("a{sv}", {answerTo(client, make(client)), {}, {}});
 }
 
-/// Agent with a filled cache, and a bare service that replies the same.
+/// Starts the agent with a filled cache and a bare service with the same reply.
 void startBoth(Programs& programs) {
   programs.startAgent();
   programs.fillCache();
@@ -39,7 +39,7 @@ void startBoth(Programs& programs) {
     throw std::runtime_error("the bare service replies something else");
 }
 
-/// Median and 99th percentile of single calls, in seconds.
+/// The median and the 99th percentile of single calls, in seconds.
 std::vector<double> singleCalls(const RawBusClient& client, const MakeCall& make) {
   constexpr int kCalls = 1000;
   std::vector<double> times;
@@ -50,7 +50,7 @@ std::vector<double> singleCalls(const RawBusClient& client, const MakeCall& make
   return {quantile(times, 0.5), quantile(times, 0.99)};
 }
 
-/// Keeps calls in flight until a number of them has been answered.
+/// Keeps a number of calls in flight until enough have been answered.
 class Flight {
  public:
   Flight(const RawBusClient& client, const MakeCall& make) : client_(client), make_(make) {}
@@ -89,7 +89,7 @@ class Flight {
   int open_ = 0;
 };
 
-/// Median over clients of connecting and making one call, in seconds.
+/// The median time for a new client to connect and make one call, in seconds.
 double firstCalls(const Programs& programs, const MakeCall& make) {
   constexpr int kClients = 40;
   std::vector<double> times;
@@ -103,7 +103,7 @@ double firstCalls(const Programs& programs, const MakeCall& make) {
   return quantile(times, 0.5);
 }
 
-/// A cached warranty for each watch, as if downloaded.
+/// Writes a cached warranty for each watch, as a download would.
 void writeCaches(const Programs& programs, const std::vector<std::string>& serialNumbers) {
   const Value warranty = *readJSON(coverageAnswer());
   const std::string bytes = *writePropertyList(warranty, PropertyListEncoding::XML);

@@ -16,13 +16,13 @@
 namespace kvr::bench {
 namespace {
 
-/// What was made counts as used.
+/// Stops the compiler from removing an unused result.
 template <class T>
 void keep(const T& made) {
   asm volatile("" : : "g"(&made) : "memory");
 }
 
-/// Seconds a run.
+/// The average seconds per run.
 double repeated(const std::function<void()>& work) {
   constexpr int kRuns = 300;
   return secondsOf([&] {

@@ -9,7 +9,7 @@ constexpr std::size_t kKeys = 60;
 constexpr const char* kText =
     "Your device is covered for repairs & replacements; see \"terms\" for what that includes.";
 
-/// Further labels, as each new client brings some.
+/// Adds labels until the answer has its usual size.
 void fill(nlohmann::json& answer) {
   for (int number = 1; answer.size() < kKeys; ++number) {
     answer["localizedLabel" + std::to_string(number)] = std::to_string(number) + ". " + kText;

@@ -4,7 +4,7 @@
 
 namespace kvr::bench {
 
-/// An answer of the coverage service as they come: 60 keys, about 6 kB of JSON.
+/// A typical answer of the coverage service: 60 keys, about 6 kB of JSON.
 std::string coverageAnswer();
 
 }  // namespace kvr::bench

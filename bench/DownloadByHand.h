@@ -8,14 +8,14 @@
 
 namespace kvr::bench {
 
-// The same work as a download's, by hand: no checks but for failure, nothing logged.
+// The work of a download, written by hand: it checks only for failure and logs nothing.
 
-/// The JSON of an answer as an XML property list.
+/// Converts an answer from JSON to an XML property list.
 std::string propertyListByHand(const std::string& json);
-/// Puts a file in another's place, atomically and durably.
+/// Replaces a file atomically and durably.
 void replaceByHand(const std::string& path, const std::string& bytes);
 
-/// The device's key and its certificate chain, read once from the directory they are kept in.
+/// The device's key and certificate chain, read once from their directory.
 struct HeldKey {
   explicit HeldKey(const std::string& directory);
 
@@ -23,7 +23,7 @@ struct HeldKey {
   std::vector<std::string> chain;  ///< DER
 };
 
-/// Signature and chain as header values, joined.
+/// The signature and the chain as header values, joined.
 std::string attestByHand(const HeldKey& key, const std::string& body);
 
 }  // namespace kvr::bench

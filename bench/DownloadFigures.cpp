@@ -1,4 +1,4 @@
-// What a download costs besides the network: the agent's own classes on the local platform, in this process.
+// The cost of a download without the network: the agent's own classes on the local platform, in this process.
 
 #include "CoverageAnswer.h"
 #include "DownloadByHand.h"
@@ -27,7 +27,7 @@
 namespace kvr::bench {
 namespace {
 
-/// Sends this process's error output to /dev/null, where the log of a platform in it goes.
+/// Redirects this process's standard error to /dev/null, because the platform's log goes there.
 class Silence {
  public:
   Silence() : kept_(::dup(STDERR_FILENO)) { redirect(::open("/dev/null", O_WRONLY | O_CLOEXEC)); }
@@ -43,7 +43,7 @@ class Silence {
   const int kept_;
 };
 
-/// A session that has every answer at once, and notes when it handed one over.
+/// A session that answers every request at once and records when it did.
 class Canned : public HTTP, public HTTPSession {
  public:
   explicit Canned(WorkQueues& queues) : queues_(queues) {}
@@ -66,7 +66,7 @@ class Canned : public HTTP, public HTTPSession {
   Clock::time_point answered_;  ///< read once the download has completed
 };
 
-/// The local platform of the world's device, in this process.
+/// The local platform with the fixture's device, in this process.
 class InProcess {
  public:
   InProcess() { kvr_registerDefaults(local_->preferences); }
@@ -89,7 +89,7 @@ class InProcess {
   const std::unique_ptr<LocalPlatform> local_ = build();
 };
 
-/// Downloads do not come back to back; a file counts as old again by then.
+/// Downloads are never back to back in practice; after this pause, files count as settled again.
 void pause() { std::this_thread::sleep_for(std::chrono::milliseconds(60)); }
 
 /// Seconds from the answer's arrival until the download has completed.
@@ -178,7 +178,7 @@ void request() {
     addKestAuthenticationHeadersWithBody(platform, request, request.body);
     built = std::move(request);
   };
-  build();  // makes the key
+  build();  // creates the key
   pause();
   if (!built.headers.value("X-Tarsil-Kest")) throw std::runtime_error("the request was not attested");
   const HeldKey key(

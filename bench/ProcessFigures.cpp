@@ -1,4 +1,4 @@
-// What the processes cost: start, memory, wake-ups.
+// The cost of the processes: start, memory, wake-ups.
 
 #include "Figures.h"
 #include "Measurement.h"
@@ -18,7 +18,7 @@ std::string kibibytes(double value) { return number(value, 0) + " KiB"; }
 
 void start() {
   Programs programs;
-  // The first start of all migrates.
+  // The very first start runs the migration.
   programs.startAgent();
   programs.stopAgent();
   constexpr int kStarts = 5;

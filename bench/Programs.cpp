@@ -23,10 +23,10 @@ namespace {
 constexpr const char* kBarePath = "/com/tarsil/kvragent/bare";
 constexpr const char* kBareInterface = "com.tarsil.kvragent.Bare";
 constexpr std::uint64_t kLimitMicroseconds = 60'000'000;
-/// For so long at least a changed file is read anew each time.
+/// A changed file is parsed at every read for less than this time.
 constexpr std::chrono::milliseconds kSettling{100};
 
-/// The lines that the bare service reads.
+/// Writes a value in the format of the bare service.
 void write(std::ostream& file, const Value& value, const std::string& key) {
   const auto open = [&](char kind) -> std::ostream& {
     return file << kind << (key.empty() ? "" : " ") << key;
@@ -71,7 +71,7 @@ BusMessageRef callOf(const RawBusClient& client, const char* name, const char* p
   return BusMessageRef(message);
 }
 
-/// The sum of the lines of a process's memory map that begin so, in KiB.
+/// The sum of the values, in KiB, of all lines in a process's memory map that begin with this text.
 double memoryNamed(pid_t process, std::string_view beginning) {
   std::ifstream file("/proc/" + std::to_string(process) + "/smaps_rollup");
   double sum = 0;

@@ -13,8 +13,8 @@ using testing::AgentWorld;
 
 using testing::RawBusClient;
 
-/// A program that runs for as long as this lives; what it prints goes to /dev/null. Started as directly as
-/// the system allows, so that its start can be measured.
+/// A program that runs as long as this object exists; its output goes to /dev/null. It is started as directly
+/// as the system allows, so that its start can be measured.
 class Program {
  public:
   Program(std::vector<std::string> arguments, std::vector<std::string> environment);
@@ -27,7 +27,7 @@ class Program {
   pid_t pid_ = -1;
 };
 
-/// The real agent and the bare service on one private bus, the coverage service behind the agent.
+/// The agent and the bare service on one private bus, with the coverage service behind the agent.
 class Programs {
  public:
   static constexpr const char* kBareName = "com.tarsil.kvragent.bare";
@@ -35,15 +35,15 @@ class Programs {
   Programs();
 
   void startAgent();
-  /// `tree` is what its "Info" replies, null for nothing.
+  /// `tree` is the reply to "Info"; null for an empty one.
   void startBare(const Value& tree = {});
   void stopAgent() { agent_.reset(); }
   void stopBare() { bare_.reset(); }
   pid_t agent() const { return agent_->pid(); }
   pid_t bare() const { return bare_->pid(); }
-  /// Has the agent download the coverage of the phone, and waits until its files count as old.
+  /// Lets the agent download the phone's coverage and waits until its files count as settled.
   void fillCache() const;
-  /// Lets a client call without a connection of its own being counted.
+  /// A client whose own connection time is not measured.
   RawBusClient newClient() const { return world.newClient(); }
 
   AgentWorld world{AgentWorld::Attestation::Optional};
@@ -61,14 +61,14 @@ BusMessageRef bareInfoCall(const RawBusClient& client);
 BusMessageRef allInfosCall(const RawBusClient& client);
 BusMessageRef bareAllInfosCall(const RawBusClient& client);
 BusMessageRef pingCall(const RawBusClient& client);
-/// Sends the call and waits; throws what it failed with.
+/// Sends the call and waits for the answer; throws its error.
 BusMessageRef answerTo(const RawBusClient& client, const BusMessageRef& call);
 
-/// What a process has in memory for itself alone, in KiB.
+/// A process's private memory, in KiB.
 double privateMemory(pid_t process);
-/// What of it the process has written to. The rest is code, which others may share at one time or another.
+/// The part of it that the process has written to. The rest is code, which other processes may come to share.
 double writtenMemory(pid_t process);
-/// How often the threads of a process have been put on and off a processor.
+/// How many context switches the threads of a process have had.
 std::int64_t contextSwitches(pid_t process);
 
 }  // namespace kvr::bench

@@ -23,18 +23,18 @@ void requireRoundTrips(const Value& tree) {
   if (!xml) return;
   const auto fromXML = readPropertyList(*xml);
   require(bool(fromXML), "XML that was written can be read");
-  // Dates lose their fractions the first time.
+  // XML drops the fractions of dates the first time.
   const auto second = writePropertyList(*fromXML, PropertyListEncoding::XML);
   require(second && *second == *xml, "XML gives the tree back");
 }
 
 namespace {
 
-/// What is read of the top level alone is what stands there in the whole tree.
+/// Checks that reading only the top level gives the same entries as the whole tree.
 void requireSameTopLevel(std::string_view input, const Value& tree) {
   if (!tree.isDictionary() || tree.dictionary().empty()) return;
   const auto& [key, value] = *tree.dictionary().rbegin();
-  // Of a binary list, only such keys are looked for.
+  // In a binary list, only such keys are searched for.
   if (!std::ranges::all_of(key, [](char c) { return static_cast<unsigned char>(c) < 0x80; })) return;
   const std::string_view keys[] = {key};
   const auto part = readPropertyListWithin({0, 0}, input, keys);

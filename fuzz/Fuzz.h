@@ -8,17 +8,17 @@
 
 namespace kvr::fuzz {
 
-/// What a target does with one input: it takes in anything, and what must hold of it holds. Each target
-/// defines it once; `Engine.cpp` feeds it from libFuzzer, `Replay.cpp` from files.
+/// Runs one target with one input. It accepts any input and checks the properties that must always hold. Each
+/// target defines it once; `Engine.cpp` calls it from libFuzzer, `Replay.cpp` with files.
 void run(std::string_view input);
 
-/// Ends the program with what is wrong unless it holds.
+/// Ends the program with an error message unless `holds`.
 void require(bool holds, const char* what, const std::string& detail = {});
 
-/// A tree that was read comes back equal from the binary encoding, and from XML if XML takes it.
+/// Checks that a tree comes back equal from the binary encoding, and from XML if XML can hold it.
 void requireRoundTrips(const Value& tree);
 
-/// Reads with one reader of property lists; what it takes has its round trips.
+/// Reads with one property list reader; if that succeeds, checks the round trips.
 void readAndWriteBack(std::string_view input, Result<Value> (*read)(std::string_view));
 
 }  // namespace kvr::fuzz

@@ -1,4 +1,4 @@
-// Reads files while memory is short: one allocation after the other fails, each once.
+// Reads files while memory is short: each allocation fails once, one after the other.
 #include "Fuzz.h"
 #include "platform/codec/JSON.h"
 #include "platform/stores/FilePreferences.h"
@@ -19,7 +19,7 @@ std::size_t allocations = 0;
 std::size_t failing = 0;  ///< the allocation that fails, counted from 1; 0 for none
 std::ptrdiff_t held = 0;
 
-/// Whether an allocation is to fail.
+/// Whether this allocation must fail.
 bool fails() { return ++allocations == failing; }
 
 }  // namespace
@@ -56,14 +56,14 @@ namespace kvr::fuzz {
 
 namespace {
 
-/// Does it once with each of its allocations failing; how many there are. Only `bad_alloc` may come of it,
-/// and nothing may stay allocated.
+/// Calls the function once for each of its allocations, which then fails; returns the number of allocations.
+/// Only `bad_alloc` may be thrown, and nothing may stay allocated.
 template <class Work>
 std::size_t starve(const Work& work) {
   for (std::size_t at = 0;; ++at) {
     const auto before = held;
     allocations = 0;
-    failing = at;  // none the first time, when what is made once is made
+    failing = at;  // none fails the first time, while one-time data is allocated
     try {
       work();
     } catch (const std::bad_alloc&) {
@@ -84,7 +84,7 @@ std::size_t starveReader(Result<Value> (*read)(std::string_view), std::string_vi
   });
 }
 
-/// A file is not taken for damaged because memory was short, and is replaced as a whole or not at all.
+/// A file must not count as damaged because memory was short, and is replaced completely or not at all.
 std::size_t starveFile(const std::string& bytes) {
   constexpr const char* kPath = "/home/user/Library/Preferences/domain.plist";
   SimulatedClock clock;

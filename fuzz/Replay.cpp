@@ -1,4 +1,4 @@
-// Feeds a target from files: each as it is, or with --sweep STEP each damaged in every STEPth place.
+// Runs a target with files: each unchanged, or with --sweep STEP damaged at every STEPth position.
 #include "Fuzz.h"
 
 #include <algorithm>
@@ -23,8 +23,7 @@ std::vector<fs::path> filesBelow(const fs::path& path) {
   return files;
 }
 
-/// In every `step`th place: a truncation; each bit the other way, all bits so, and a NUL and a '<' in its
-/// place.
+/// At every `step`th position: truncates; flips each bit, and all bits; and puts in a NUL and a '<'.
 std::size_t sweep(const std::string& bytes, std::size_t step) {
   std::size_t inputs = 0;
   std::string damaged = bytes;
@@ -52,7 +51,7 @@ int main(int argc, char** argv) {
     for (const auto& path : filesBelow(argv[argument])) {
       std::ifstream file(path, std::ios::binary);
       const std::string bytes(std::istreambuf_iterator<char>(file), {});
-      std::fprintf(stderr, "%s\n", path.c_str());  // whose failure follows, if one does
+      std::fprintf(stderr, "%s\n", path.c_str());  // so that a failure can be assigned to its file
       kvr::fuzz::run(bytes);
       inputs += 1 + (step > 0 ? sweep(bytes, step) : 0);
       ++files;

@@ -1,5 +1,4 @@
-// What comes over the bus: a message whose body is the input, as a peer may send it; and what was read, sent
-// on.
+// Input from the bus: a message whose body is the input, as a peer may send it; what was read is sent again.
 #include "Fuzz.h"
 #include "local/buscodec/BusCodec.h"
 #include "local/buscodec/BusHandles.h"
@@ -47,7 +46,7 @@ std::string signalWith(std::string_view type, std::string_view body) {
   return message.append(body);
 }
 
-/// A bus that is connected to nobody but us.
+/// A bus connected only to this process.
 class Wire {
  public:
   Wire() {
@@ -93,7 +92,7 @@ void requireSentOn(const Wire& wire, std::string_view type, const Value& value) 
 
 void run(std::string_view input) {
   static auto wire = std::make_unique<Wire>();
-  constexpr std::size_t kLargest = std::size_t{64} * 1024;  // what a socket takes at once
+  constexpr std::size_t kLargest = std::size_t{64} * 1024;  // what a socket accepts at once
   if (input.empty() || input.size() > kLargest) return;
   const auto type = kTypes[static_cast<unsigned char>(input[0]) % kTypes.size()];
   wire->send(signalWith(type, input.substr(1)));
@@ -102,7 +101,7 @@ void run(std::string_view input) {
   while ((r = sd_bus_process(wire->bus(), &message)) > 0 && message == nullptr) {
   }
   if (r < 0 || message == nullptr) {
-    wire = std::make_unique<Wire>();  // the bus library itself would not have it
+    wire = std::make_unique<Wire>();  // the bus library itself would refuse it
     return;
   }
   const BusMessageRef held(message);

@@ -1,4 +1,4 @@
-// The files that describe the device: the input stands in the place of each, and everything is asked.
+// The files that describe the device: the input replaces each in turn, and every value is asked for.
 #include "Fuzz.h"
 #include "integration/support/TemporaryDirectory.h"
 #include "local/device/LocalAccountSession.h"
@@ -25,8 +25,7 @@
 namespace kvr::fuzz {
 namespace {
 
-/// Whom a file belongs to is a question to the real one, so there are real ones, empty; what they hold is
-/// simulated.
+/// Ownership is checked on real files, so there are real, empty ones; their contents are simulated.
 struct Device {
   Device() {
     for (const auto* trusted : {"Accounts.plist", "Entitlements.plist"}) directory.write(trusted, "");

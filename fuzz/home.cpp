@@ -1,4 +1,4 @@
-// The agent's own property lists below the home directory: the input stands in the place of each.
+// The agent's own property lists below the home directory: the input replaces each in turn.
 #include "Fuzz.h"
 #include "core/warranty/KVRWarranty.h"
 #include "simulated/SimulatedPlatform.h"
@@ -16,7 +16,7 @@ struct Store {
   const std::string& bytes;
   const std::string path;
 
-  /// Whether what is there is taken or set aside whole, with one line that says so.
+  /// Whether the file is either accepted or set aside as a whole, with one line about it.
   void requireTakenOrSetAside(bool isTaken) const {
     const auto errors = simulated.log.texts(LogLevel::Error);
     require(errors.size() == (isTaken ? 0U : 1U), "one error line if damaged, else none", path);

@@ -1,5 +1,5 @@
-// One exchange over HTTP: what stands before the first byte FF sets the request's headers, the rest is what
-// the server answers.
+// One exchange over HTTP: the part of the input before the first byte FF sets the request's headers, the rest
+// is the server's answer.
 #include "Fuzz.h"
 #include "local/http/LocalHTTP.h"
 #include "local/loop/EventLoop.h"
@@ -20,7 +20,7 @@
 namespace kvr::fuzz {
 namespace {
 
-/// The headers whose fields stand a line each: "Name:value". A name alone takes the field away.
+/// The headers, one per line: "Name:value". A name without a value removes the header.
 HTTPHeaders headersIn(std::string_view text) {
   HTTPHeaders headers;
   while (!text.empty()) {
@@ -37,7 +37,7 @@ HTTPHeaders headersIn(std::string_view text) {
   return headers;
 }
 
-/// Waits for one of them; libFuzzer's timer does not end it.
+/// Waits for one of them; libFuzzer's timer signal does not end the wait.
 template <std::size_t count>
 bool waitFor(std::array<pollfd, count>& sources, int milliseconds) {
   int ready = 0;
@@ -47,7 +47,7 @@ bool waitFor(std::array<pollfd, count>& sources, int milliseconds) {
   return ready > 0;
 }
 
-/// A server on this machine that answers one request with any bytes.
+/// A server on this machine that answers one request with the given bytes.
 class Server {
  public:
   Server() : listener_(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
@@ -63,7 +63,7 @@ class Server {
   std::string url() const { return "http://127.0.0.1:" + std::to_string(ntohs(address_.sin_port)) + "/"; }
   int descriptor() const { return listener_.get(); }
 
-  /// Takes the next connection; what came until the end of the request's headers.
+  /// Accepts the next connection; returns what arrived up to the end of the request's headers.
   std::string serve(std::string_view answer) const {
     const Descriptor connection(::accept4(listener_.get(), nullptr, nullptr, SOCK_CLOEXEC));
     std::string request;
@@ -79,7 +79,7 @@ class Server {
       answer.remove_prefix(static_cast<std::size_t>(count));
     }
     ::shutdown(connection.get(), SHUT_WR);
-    // The client has read all it wants to once it closes, or sees that it is closed.
+    // Once the client closes, or sees the connection closed, it has read all it wants.
     std::array closed{pollfd{connection.get(), POLLIN, 0}};
     if (!answer.empty()) waitFor(closed, 1000);
     return request;

@@ -1,4 +1,4 @@
-// What the service answers: from JSON to a record, and through every form a record takes.
+// The service's answers: from JSON to a record, and through every form of a record.
 #include "platform/codec/JSON.h"
 
 #include "Fuzz.h"

@@ -1,4 +1,4 @@
-// The files of attested keys: the input stands in the place of each, the others are sound.
+// The files of attested keys: the input replaces each in turn; the others are valid.
 #include "Fuzz.h"
 #include "local/keys/LocalKeyStore.h"
 #include "simulated/SimulatedFiles.h"
@@ -50,7 +50,7 @@ struct Keys {
     const auto authority = certificateIn(issued->issuer);
     require(verify(certificateIn(issued->leaf), authority, clock.now()) == Verdict::Good, "they are sound");
     const auto errors = log.texts(LogLevel::Error).size();
-    // Another authority's good pair is possible: then the leaf is what is reported.
+    // It may be a valid pair of another authority: then the leaf is reported.
     require(issued->leaf == kept.leaf ? errors == 0 : errors == 1, "one line, unless what was kept is good");
     const auto again = store.credentialsFor(request);
     require(again && again->leaf == issued->leaf, "what is made anew is kept");

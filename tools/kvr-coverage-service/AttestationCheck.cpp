@@ -24,14 +24,14 @@ using Fault = std::optional<std::string>;
 
 constexpr std::size_t kMaximumInflated = std::size_t{256} << 10;
 
-/// What a text without blanks or breaks decodes to.
+/// Decodes base64; nothing unless the text is exactly the encoding, without blanks or line breaks.
 std::optional<Bytes> strictlyDecoded(const std::string& text) {
   auto bytes = base64Decode(text);
   if (bytes && (bytes->empty() || base64Encode(*bytes) != text)) return std::nullopt;
   return bytes;
 }
 
-/// The content of a raw DEFLATE stream; nothing when it is none, ends early, or has something after its end.
+/// The content of a raw DEFLATE stream; nothing when it is invalid, incomplete or followed by other bytes.
 std::optional<std::string> inflated(Bytes& bytes) {
   z_stream stream{};
   if (inflateInit2(&stream, -MAX_WBITS) != Z_OK) return std::nullopt;
@@ -55,7 +55,7 @@ Certificate certificateFrom(std::span<const std::uint8_t> der) {
   return certificate && next == der.data() + der.size() ? certificate : nullptr;
 }
 
-/// Takes the layers off the chain's header one by one.
+/// Decodes the chain's header, layer by layer.
 Fault readChain(const std::string& header, std::vector<Certificate>& chain) {
   auto compressed = strictlyDecoded(header);
   if (!compressed) return "the chain is not base64";

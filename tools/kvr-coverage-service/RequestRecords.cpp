@@ -16,7 +16,7 @@
 namespace kvr::coverage_service {
 namespace {
 
-/// The text, or what its bytes mean as Latin-1 when it is not UTF-8.
+/// The text itself, or, if it is not UTF-8, its bytes read as Latin-1.
 std::string legible(const std::string& bytes) {
   if (isUTF8(bytes)) return bytes;
   std::string text;

@@ -17,7 +17,7 @@ constexpr std::string_view kOtherDevicesPath = "/api/v2/coverage/summary";
 constexpr std::string_view kAssetPath = "/library/TARSIL/asset/kvrV2.plist";
 constexpr std::size_t kOversize = (std::size_t{1} << 20) + 1;
 
-/// Whether a text from outside may become (part of) a file's name.
+/// Whether a text from outside is safe to use in a file name.
 bool isFileName(std::string_view text, std::string_view allowedMarks, std::size_t longest) {
   return !text.empty() && text.size() <= longest && text.find("..") == std::string_view::npos &&
          std::ranges::all_of(text, [&](char c) {
@@ -30,7 +30,7 @@ double secondsSince1970() {
   return std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
 }
 
-/// Sends what is no answer, or none that a client should take.
+/// Sends malformed or forbidden output instead of an answer.
 void sendRaw(Connection& connection, const Behaviour& behaviour) {
   bool isOpen = connection.send(*behaviour.raw);
   while (isOpen && !behaviour.repeat.empty()) {

@@ -18,14 +18,14 @@ namespace {
 
 using namespace kvr::coverage_service;
 
-/// Serves until a termination signal comes; false when serving ended by itself.
+/// Serves until a termination signal arrives; false when serving ended without one.
 bool serve(WireServer& server, int port, const sigset_t& signals) {
   auto served = std::async(std::launch::async, [&server] {
     const bool wasStopped = server.listen_after_bind();
     if (!wasStopped) ::kill(::getpid(), SIGTERM);
     return wasStopped;
   });
-  // Stopping a server that does not run yet would be lost.
+  // Stopping the server before it runs would have no effect.
   using namespace std::chrono_literals;
   while (!server.is_running() && served.wait_for(1ms) == std::future_status::timeout) {
   }
@@ -56,7 +56,7 @@ int main(int argc, char** argv) {
   app.add_option("--storefront", options.storefront, "The storefront expected in place of the account's own");
   CLI11_PARSE(app, argc, argv);
 
-  // Before there are threads, so that all of them leave the signals to this one.
+  // Before any thread starts, so that only this thread receives the signals.
   sigset_t signals;
   sigemptyset(&signals);
   sigaddset(&signals, SIGTERM);

@@ -10,24 +10,25 @@
 
 namespace kvr::simulate {
 
-/// The programs that ask the agent, and what they are promised: one answer each, in time, and a right one.
+/// The client programs, and what they are promised: exactly one answer to each call, in time, and a correct
+/// one.
 class Clients {
  public:
   Clients(World& world, Invariants& invariants) : world_(world), invariants_(invariants) {}
 
-  /// Some client asks something; what it was, for a trace.
+  /// Makes a random call; returns a description for a trace.
   std::string ask(Dice& dice, SimulatedPlatform& platform);
   std::shared_ptr<const SimulatedServiceConnection::Call> invoke(SimulatedPlatform& platform,
                                                                  const std::string& member,
                                                                  Value::Array arguments);
   void checkAnswers();
-  /// Whose follow-ups somebody has asked to dismiss and not been answered.
+  /// The devices with an unanswered request to dismiss their follow-ups.
   std::set<std::string> serialNumbersToDismiss() const;
-  /// Whether nobody waits for an answer.
+  /// Whether no call is unanswered.
   bool areServed() const { return open_.empty(); }
-  /// Nobody was served for so long, and nobody could have been.
+  /// Extends all deadlines by a time in which no call could be served.
   void excuse(double seconds);
-  /// The agent has ended, and so have all connections.
+  /// The process has ended, and with it all connections.
   void processEnded();
 
  private:

@@ -21,15 +21,15 @@ namespace kvr::client {
 namespace {
 
 constexpr std::string_view kShortened = "…";
-constexpr unsigned kTimelineColumns = 100;  // where no terminal says
-constexpr unsigned kDateColumns = 12;       // that stand behind a timeline's bars
+constexpr unsigned kTimelineColumns = 100;  // if there is no terminal
+constexpr unsigned kDateColumns = 12;       // behind the bars of a timeline
 
 Date now() {
   using Seconds = std::chrono::duration<double>;
   return {std::chrono::duration_cast<Seconds>(std::chrono::system_clock::now().time_since_epoch()).count()};
 }
 
-/// Writes an answer's text, or its JSON; `none` in the place of a text without anything.
+/// Prints an answer as text or JSON; prints `none` instead of an empty text.
 template <class Answer>
 Status show(const Result<Answer>& answer, const Options& options, const std::string& none) {
   if (!answer) return fail(answer.error());
@@ -39,7 +39,7 @@ Status show(const Result<Answer>& answer, const Options& options, const std::str
   return print(text.empty() ? none + "\n" : text, kFine);
 }
 
-/// Writes that something was done: `line`, or `fact` under a name.
+/// Prints a confirmation: `line`, or in JSON `fact` under `name`.
 Status confirm(const Options& options, const std::string& line, std::string_view name, const Value& fact) {
   return options.json ? print(Report::json(name, fact), kFine) : print(printable(line) + "\n", kFine);
 }
@@ -54,7 +54,7 @@ Result<std::vector<Device>> knownDevices(const AgentClient& agent) {
   return known;
 }
 
-/// The whole of a serial number that may be given as it is shown; itself when no device ends so.
+/// Completes a serial number given in its shortened form; returns it unchanged when no device ends in it.
 Result<std::string> wholeSerial(const AgentClient& agent, const std::string& given) {
   if (!given.starts_with(kShortened)) return given;
   const auto devices = knownDevices(agent);
@@ -70,8 +70,8 @@ Result<std::string> wholeSerial(const AgentClient& agent, const std::string& giv
   return Error{"kvrctl", 0, "more than one serial number ends so; --show-serial shows them whole"};
 }
 
-/// Whether the serial number is this device's, a paired one's, or that of an offer that is still shown; says
-/// so if it is not.
+/// Whether the serial number belongs to this device, a paired one, or a follow-up still shown; prints an
+/// error if not.
 bool isKnownDevice(const AgentClient& agent, const std::string& serialNumber, const Options& options) {
   const auto devices = knownDevices(agent);
   if (!devices || std::ranges::find(*devices, serialNumber, &Device::serialNumber) != devices->end()) {
@@ -95,7 +95,7 @@ Result<std::vector<DeviceInfo>> infosFor(const AgentClient& agent, const Options
   return std::vector{*std::move(info)};
 }
 
-/// Each device with what is known of it, here and at the agent.
+/// The status of each device, from the agent and from its files.
 Result<std::vector<DeviceStatus>> statusesFrom(const AgentClient& agent, Policy policy) {
   const auto infos = agent.allDeviceInfos(policy, false);
   if (!infos) return infos.error();

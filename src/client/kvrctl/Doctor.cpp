@@ -32,7 +32,7 @@ namespace fs = std::filesystem;
 
 constexpr int kAnswerLimit = 5;                // seconds
 constexpr int kConnectLimit = 3000;            // milliseconds
-constexpr std::time_t kYear2024 = 1704067200;  // no agent ran before
+constexpr std::time_t kYear2024 = 1704067200;  // the clock is wrong if it shows an earlier time
 constexpr std::time_t kYear2100 = 4102444800;
 
 std::string reasonOf(int error) { return std::generic_category().message(error); }
@@ -53,7 +53,7 @@ Verdict agentVerdict() {
           cureFor(device.error())};
 }
 
-/// Whether nobody but root and this user can write a file that the agent has to trust.
+/// Checks that nobody but root and this user can write a file that the agent has to trust.
 Verdict trustVerdict(const fs::path& path) {
   const std::string subject = path.filename().string();
   struct stat status {};
@@ -110,7 +110,7 @@ std::string portOf(const URL& url) {
   return isGiven ? authority.substr(colon + 1) : url.scheme() == "http" ? "80" : "443";
 }
 
-/// Why no connection could be made; empty when one was.
+/// Why no connection could be made; empty on success.
 std::string connectFailure(const std::string& host, const std::string& port) {
   addrinfo hints{};
   hints.ai_socktype = SOCK_STREAM;
@@ -139,7 +139,7 @@ std::string connectFailure(const std::string& host, const std::string& port) {
   return reason;
 }
 
-/// An address that the agent's preferences may name, and where the agent asks when they do not.
+/// A preference that can hold an endpoint's address, and the default.
 struct Endpoint {
   const char* key;
   const char* usual;

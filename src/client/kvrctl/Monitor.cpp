@@ -22,12 +22,12 @@
 namespace kvr::client {
 namespace {
 
-/// Where what happens is told, a line each: text, or a JSON document.
+/// Prints each event as one line: text or a JSON document.
 class Teller {
  public:
   explicit Teller(bool inJSON) : inJSON_(inJSON) {}
 
-  /// `subject` is what it happened to, `event` what happened, `detail` how it is now, if it is at all.
+  /// `subject` is the kind of thing, `event` what happened to it, `detail` its new state, if it has one.
   void tell(const std::string& subject, const std::string& name, const std::string& event,
             const std::string& detail = {}) const {
     using Seconds = std::chrono::duration<double>;
@@ -50,7 +50,7 @@ class Teller {
   const bool inJSON_;
 };
 
-/// Tells what has come to, gone from or changed in a list of lines, each under a name.
+/// Reports lines that were added, removed or changed since the last look; each line has a unique name.
 class Differences {
  public:
   using Lines = std::map<std::string, std::string>;
@@ -137,7 +137,7 @@ int handleOwner(sd_bus_message* message, void* teller, sd_bus_error*) {
   });
 }
 
-/// Has the loop end with a signal. The signals must be blocked in every thread.
+/// Ends the loop on these signals, which must be blocked in every thread.
 void endWith(EventLoop& loop, std::initializer_list<int> signals) {
   for (const int signal : signals) {
     sd_event_add_signal(

@@ -31,8 +31,8 @@ void appendWarranty(std::vector<std::pair<std::string, std::string>>& lines, con
   append("Offer ends", dateText(coverage.offerEnd));
 }
 
-/// Whole days from one date to another, rounded up; "0" for one that has passed, nothing for one that no
-/// calendar reaches.
+/// Whole days from one date to another, rounded up; "0" for a date that has passed, empty for one outside the
+/// calendar.
 std::string daysBetween(Date from, Date until) {
   if (!isInCalendar(until)) return "";
   const double days = std::ceil((until - from) / static_cast<double>(kDaySeconds));
@@ -48,7 +48,7 @@ std::string ageText(double seconds) {
   return std::to_string(whole / kDaySeconds) + " days ago";
 }
 
-/// Whether a date is one that a person still has to wait for.
+/// Whether a date lies in the future.
 bool isAhead(const std::optional<Date>& date, Date now) { return date && *date > now; }
 
 std::string aligned(const std::vector<std::pair<std::string, std::string>>& lines) {

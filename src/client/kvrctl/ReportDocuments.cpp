@@ -6,7 +6,7 @@
 #include <cstdio>
 #include <utility>
 
-// The answers as documents, for programs.
+// JSON documents of the answers, for programs.
 
 namespace kvr::client {
 namespace {
@@ -23,7 +23,7 @@ std::optional<std::string> isoDate(Date date) {
   return text;
 }
 
-/// The tree as JSON can hold it.
+/// Converts a tree to types that JSON can hold.
 Value plain(const Value& tree) {
   switch (tree.kind()) {
     case Value::Kind::Date:
@@ -47,8 +47,8 @@ Value plain(const Value& tree) {
   }
 }
 
-/// A document of one property beside the version. The parts are put together as text, because each of them
-/// may be nested as deep as a document can.
+/// A document with the version and one other property. It is assembled as text, because the property may
+/// already be nested as deep as a document can be.
 std::string document(std::string_view name, const std::string& content) {
   return printable("{\"" + std::string(name) + "\":" + content + ",\"version\":" + std::string(kVersion) +
                    "}") +

@@ -16,7 +16,7 @@ namespace {
 
 constexpr std::array<const char*, 4> kColours{"\033[32m", "\033[31m", "\033[33m", "\033[2m"};
 constexpr const char* kPlain = "\033[0m";
-constexpr std::size_t kGap = 2;  // columns between two
+constexpr std::size_t kGap = 2;  // columns between two cells
 
 std::string formatted(Date date, const char* format) {
   if (!isInCalendar(date)) return "unknown";
@@ -27,7 +27,7 @@ std::string formatted(Date date, const char* format) {
   return printable({text.data(), std::strftime(text.data(), text.size(), format, &local)});
 }
 
-/// Control characters, line separators, and what reorders text.
+/// Control characters, line separators, and characters that reorder text.
 bool isUnprintable(char32_t point) {
   return point < 0x20 || (point >= 0x7F && point <= 0x9F) || (point >= 0x2028 && point <= 0x202E) ||
          (point >= 0x2066 && point <= 0x2069) || point == 0x200E || point == 0x200F || point == 0x061C;
@@ -71,7 +71,7 @@ std::size_t columnsOf(std::string_view text) {
   bool isInColour = false;
   for (const char c : text) {
     if (c == '\033') isInColour = true;
-    // What continues a character in UTF-8 takes no column of its own.
+    // Continuation bytes of UTF-8 take no column.
     if (!isInColour && (static_cast<unsigned char>(c) & 0xC0U) != 0x80U) ++columns;
     if (c == 'm') isInColour = false;
   }

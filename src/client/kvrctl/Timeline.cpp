@@ -9,8 +9,8 @@ namespace kvr::client {
 namespace {
 
 constexpr double kDay = 86400;  // seconds
-// Of the axis, before and after now. Coverage is long, what the agent does is near: an axis for the one would
-// leave no room for the other, so coverage may run out of it.
+// The length of the axis before and after now. Coverage lasts long, but the agent's activities are near: an
+// axis for all of the coverage would leave no room for them, so coverage may extend beyond it.
 constexpr double kPast = 60 * kDay;
 constexpr double kLeastFuture = 60 * kDay;
 constexpr double kFutureForCoverage = 180 * kDay;
@@ -18,7 +18,7 @@ constexpr double kFuture = 365 * kDay;
 
 constexpr std::array<const char*, 3> kNames{"coverage", "offer", "follow-up"};
 
-// The picture's measures, in its own units.
+// The dimensions of the SVG picture, in its own units.
 constexpr int kWidth = 960;
 constexpr int kLeft = 260;
 constexpr int kRight = 30;
@@ -49,7 +49,7 @@ std::string escaped(const std::string& text) {
   return result;
 }
 
-/// The text's start, with an ellipsis in the place of what does not fit.
+/// The beginning of the text, with an ellipsis if the rest does not fit.
 std::string fitted(const std::string& text, std::size_t columns) {
   if (columnsOf(text) <= columns) return text + std::string(columns - columnsOf(text), ' ');
   std::string start;
@@ -68,7 +68,7 @@ std::string filled(const char* format, Values... values) {
   return {text.data(), static_cast<std::size_t>(std::clamp(length, 0, static_cast<int>(text.size()) - 1))};
 }
 
-/// When the texts of what is shown change next.
+/// When the text of the shown follow-ups changes next.
 std::optional<Date> nextChange(const std::vector<Activity>& activities) {
   for (const auto& activity : activities) {
     if (activity.identifier.ends_with(".followuprefresh") && activity.isToCome()) return activity.date();

@@ -31,7 +31,7 @@ Status withAgent(AgentCommand command, const Options& options) {
   return status;
 }
 
-/// The command line: which commands there are, and what each takes.
+/// Parses the command line: defines the commands and their arguments.
 class CommandLine {
  public:
   CommandLine() : app_("Asks the agent about devices and their warranties.", "kvrctl") {
@@ -68,7 +68,7 @@ class CommandLine {
     commands_.emplace(added, std::move(operation));
     return added;
   }
-  /// A command whose operation asks the agent.
+  /// Adds a command that calls the agent.
   CLI::App* add(const char* name, const char* description, AgentCommand operation) {
     return add(name, description, [this, operation] { return withAgent(operation, options_); });
   }
