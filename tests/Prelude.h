@@ -1,6 +1,6 @@
 #pragma once
 
-// Before the names below, which some of its enumerators have too.
+// Included before the names below, because some of its enumerators have the same names.
 #include "platform/stores/PropertyListFiles.h"
 
 #include <gmock/gmock.h>
@@ -21,7 +21,7 @@
 
 namespace kvr {
 
-// The words that most tests speak in.
+// Names that most tests use.
 using Array = Value::Array;
 using Dictionary = Value::Dictionary;
 using ::testing::AllOf;
@@ -40,7 +40,7 @@ using ::testing::UnorderedElementsAre;
 constexpr double kDay = 86400;
 constexpr double kInfinity = std::numeric_limits<double>::infinity();
 
-/// How often a text holds another.
+/// How often `part` occurs in `text`.
 inline std::size_t countOf(std::string_view part, std::string_view text) {
   std::size_t count = 0;
   for (auto at = text.find(part); at != std::string_view::npos; at = text.find(part, at + 1)) ++count;

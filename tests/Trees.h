@@ -6,7 +6,7 @@
 
 namespace kvr {
 
-/// Every kind of leaf that JSON, XML and the binary encoding all hold, where they are hardest to hold.
+/// Boundary values of every leaf type that JSON, XML and the binary encoding have in common.
 inline Value treeForEveryEncoding() {
   std::string planes;
   for (char32_t plane = 0; plane <= 16; ++plane) appendUTF8(planes, plane * 0x10000 + 0x1234);

@@ -25,7 +25,7 @@ openssl::Certificate certificateInDER(const std::string& bytes) {
   return openssl::adoptCertificate(d2i_X509(nullptr, &at, static_cast<long>(bytes.size())));
 }
 
-/// What OpenSSL's verifier says of a leaf against an authority's PEM file.
+/// The result of verifying a leaf against an authority's PEM file with OpenSSL.
 std::string verdictOn(const std::string& leaf, const fs::path& authority, Date now) {
   const openssl::StoreHandle trusted(X509_STORE_new());
   const openssl::StoreContextHandle context(X509_STORE_CTX_new());
@@ -49,7 +49,7 @@ bool isSignatureOf(const std::string& signature, const std::string& message, con
                           message.size()) == 1;
 }
 
-/// Files that look as old as they can be, and differ from one another by their content alone.
+/// Files whose stamps are settled and depend on the contents only.
 struct OldFiles : LocalFiles {
   using LocalFiles::LocalFiles;
 
@@ -67,7 +67,7 @@ struct OldFiles : LocalFiles {
     return LocalFiles::read(path, limit);
   }
 
-  int readings = 0;  ///< of keys and certificates
+  int readings = 0;  ///< how often a key or certificate was read
 };
 
 struct AnAttestation : ::testing::Test {
@@ -76,7 +76,7 @@ struct AnAttestation : ::testing::Test {
     properties_.answers["ProductType"] = "Phone14,2";
   }
 
-  /// One process's view of the machine.
+  /// The objects of one process.
   struct Process {
     explicit Process(AnAttestation& test)
         : files(test.log_, test.home()),
@@ -107,7 +107,7 @@ struct AnAttestation : ::testing::Test {
             .identifierGroups = {std::string(DeviceAttestation::kDeviceIdentifiers),
                                  std::string(DeviceAttestation::kHardwareProperties)}};
   }
-  /// What a process of its own is answered.
+  /// Asks in a new process and returns the answer.
   Answer issued(bool usesFallbackKind = false) { return Process(*this).ask(options(usesFallbackKind)).get(); }
   void expectGood(const Answer& answer) const {
     ASSERT_FALSE(answer.error) << describe(*answer.error);

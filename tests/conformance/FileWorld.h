@@ -22,7 +22,7 @@ inline std::vector<std::string> namesIn(const std::string& directory) {
   return names;
 }
 
-/// One user's files, of this machine or simulated, as they are seen from outside.
+/// One user's files, on this machine or simulated, with access from outside.
 class FileWorld {
  public:
   explicit FileWorld(bool isLocal)
@@ -30,7 +30,7 @@ class FileWorld {
         local_(filesOfAnotherProcess()) {}
 
   Files& files() { return local_ ? *local_ : simulated_; }
-  /// The same files as another process has them; null for simulated ones.
+  /// The same files opened by another process; null for simulated ones.
   std::unique_ptr<Files> filesOfAnotherProcess() {
     return directory_ ? std::make_unique<LocalFiles>(log, directory_->path().string()) : nullptr;
   }
@@ -46,7 +46,7 @@ class FileWorld {
   std::optional<std::string> get(const std::string& path) {
     return local_ ? contentOfFile(path) : simulated_.get(path);
   }
-  /// Null where there is no file.
+  /// Null if there is no file.
   Value tree(const std::string& path) {
     const auto bytes = get(path);
     return bytes ? *readPropertyList(*bytes) : Value();
@@ -54,7 +54,7 @@ class FileWorld {
   void erase(const std::string& path) {
     local_ ? static_cast<void>(std::filesystem::remove(path)) : simulated_.erase(path);
   }
-  /// The names in a directory's own level, by default the home directory's.
+  /// The names directly in a directory, by default the home directory.
   std::vector<std::string> names(const std::string& folder = "") {
     const auto directory = folder.empty() ? files().homeDirectory() : folder;
     if (local_) return namesIn(directory);
@@ -68,7 +68,7 @@ class FileWorld {
   SimulatedLog log;
 
  private:
-  // In this order: each is made with what stands above.
+  // The order matters: each member uses those above it.
   const std::unique_ptr<TemporaryDirectory> directory_;
   SimulatedFiles simulated_{clock};
   const std::unique_ptr<Files> local_;
@@ -77,7 +77,7 @@ class FileWorld {
   PropertyListFiles lists{files(), clock, log};
 };
 
-/// A test that runs in both worlds.
+/// A test that runs with local and with simulated files.
 struct InBothWorlds : ::testing::TestWithParam<bool> {
   static std::string nameOf(const ::testing::TestParamInfo<bool>& info) {
     return info.param ? "Local" : "Simulated";

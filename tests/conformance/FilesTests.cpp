@@ -91,7 +91,7 @@ INSTANTIATE_TEST_SUITE_P(, APropertyListFile, ::testing::Bool(), APropertyListFi
 
 TEST_P(APropertyListFile, IsReadAsItIsNow) {
   EXPECT_TRUE(read().isNull());
-  // Contents of equal size, one right after the other: no stamp may hide one.
+  // Write contents of equal size in quick succession: no stamp may hide a change.
   for (int round = 0; round < 50; ++round) {
     world.put(path, bytesOf(Dictionary{{"round", round}}));
     EXPECT_EQ(read()["round"], Value(round));
@@ -169,7 +169,7 @@ TEST_F(ASimulatedPropertyListFile, IsParsedOnceWhileTheMemoryForItLastsAndItIsUn
   files.put("/damaged", "garbage {");
   const std::pair<const char*, bool> reads[] = {
       {"/a", true},  {"/damaged", true}, {"/damaged", false},
-      {"/b", true},  {"/a", false},      {"/c", true},  // takes the place of what was longest unused
+      {"/b", true},  {"/a", false},      {"/c", true},  // replaces the least recently used one
       {"/a", false}, {"/b", true}};
   for (const auto& [path, again] : reads) EXPECT_EQ(isReadAgain(path), again) << path;
 }
@@ -199,7 +199,7 @@ TEST_F(LocalFilesOf, OtherKindsThanPlainOnesAreRefusedWithoutWaiting) {
   EXPECT_EQ(codeOf(files.read("/dev/zero", 10)), EINVAL);
   EXPECT_EQ(codeOf(files.read("relative", 10)), EINVAL);
   EXPECT_EQ(codeOf(files.replace(home + std::string("/a\0b", 4), "x")), EINVAL);
-  // Files of the kernel have no size before they are read.
+  // Files in /proc report size 0.
   EXPECT_TRUE(*files.read("/proc/self/status", 65536));
   EXPECT_THAT(namesIn(home), ElementsAre("fifo"));
 }

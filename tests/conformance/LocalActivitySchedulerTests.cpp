@@ -15,7 +15,7 @@ namespace {
 constexpr const char* kUpgrade = "com.tarsil.kvragent.upgrade";
 constexpr const char* kBoot = "com.tarsil.kvragent.boot";
 
-/// One start of the process, on a device that outlives it. The test's thread is the main one.
+/// One run of the process, on a device that outlives it. The test's thread is the main thread.
 struct Start {
   Start(FileWorld& world, DeviceProperties& properties, const Clock& clock)
       : device(world.path("device")),
@@ -44,7 +44,7 @@ struct Start {
   void monitor(const std::string& identifier) {
     scheduler.newActivity(identifier)->checkIn({}, recorder(identifier));
   }
-  /// Ends this start in order; what ran in it.
+  /// Ends this run in an orderly way; returns the activities that have run in it.
   std::vector<std::string> finish() {
     queues.drain(30);
     return runs;
@@ -102,7 +102,8 @@ TEST_F(ALocalScheduler, WaitsForTheNetworkWithoutAskingAgain) {
   const auto setNetwork = [&](bool isReachable) {
     world.putTree(device + "/Network.plist", Dictionary{{"reachable", isReachable}});
   };
-  // The device says so, goes away, or does not say and the host's network service is believed.
+  // The network returns because "Network.plist" says so, because it is deleted, or because the host's service
+  // says so.
   const std::pair<std::function<void()>, std::function<void()>> cases[] = {
       {[&] { setNetwork(false); }, [&] { setNetwork(true); }},
       {[&] { setNetwork(false); }, [&] { std::filesystem::remove_all(device); }},

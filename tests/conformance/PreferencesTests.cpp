@@ -8,7 +8,7 @@ namespace {
 
 const std::string kDomain = "com.tarsil.kvragent";
 
-/// The preferences as one process has them.
+/// The preferences of one process.
 struct Process {
   Process(Files& files, FileWorld& world)
       : lists(files, world.clock, world.log), preferences(lists, world.log, kDomain) {}
@@ -20,7 +20,7 @@ struct Process {
 struct APreference : InBothWorlds {
   std::string pathOf(const std::string& domain) { return folder + "/" + domain + ".plist"; }
   Value stored() { return world.tree(pathOf(kDomain)); }
-  /// A new one at every writing.
+  /// The inode changes with every write.
   std::uint64_t inodeOfDomain() {
     return (*world.files().stamp(pathOf(kDomain))).value_or(FileStamp{}).inode;
   }

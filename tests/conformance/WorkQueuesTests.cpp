@@ -14,17 +14,17 @@ namespace {
 
 constexpr int kMany = 200;
 
-/// Work queues of either kind. Waiting for a signal on the test's own thread lets the work go on: the local
-/// ones by themselves, the simulated ones inside that wait.
+/// Work queues of either kind. While the test's thread waits for a signal, work goes on: local queues have
+/// their own threads, simulated ones run inside the wait.
 struct QueuesWorld {
   virtual ~QueuesWorld() = default;
   virtual WorkQueues& queues() = 0;
   virtual void beginEnding() = 0;
-  /// What is said of work items that failed.
+  /// The log lines about work items that failed.
   virtual std::vector<std::string> failures() const = 0;
 };
 
-/// The main event loop has a thread of its own here, so that the test's thread may wait.
+/// The main event loop runs on its own thread, so that the test's thread may wait.
 struct LocalQueuesWorld : QueuesWorld {
   LocalQueuesWorld() {
     std::promise<void> ready;
@@ -70,14 +70,14 @@ struct WorkQueuesTest : ::testing::TestWithParam<bool> {
   WorkQueueRef serial() { return queues().newSerialQueue("test"); }
   WorkQueueRef concurrent() { return queues().concurrentQueue(Priority::Default); }
   static void await(const std::shared_ptr<Signal>& signal) { ASSERT_TRUE(signal->wait(std::nullopt)); }
-  /// Lets everything handed to `queue` so far run.
+  /// Waits until everything handed to `queue` so far has run.
   void flush(const WorkQueueRef& queue) {
     const auto done = newSignal();
     queue->async([done] { done->signal(); });
     await(done);
   }
 
-  std::vector<std::string> record;  ///< of what happened on one serial queue
+  std::vector<std::string> record;  ///< what happened on one serial queue
   std::unique_ptr<QueuesWorld> world =
       GetParam() ? std::unique_ptr<QueuesWorld>(std::make_unique<LocalQueuesWorld>())
                  : std::make_unique<SimulatedQueuesWorld>();
@@ -113,7 +113,7 @@ TEST_P(WorkQueuesTest, OthersGoOnHoweverManyItemsWait) {
   std::atomic<int> through{0};
   std::vector<WorkQueueRef> serialQueues;
   const auto waitAtGate = [&] {
-    // The last to arrive opens the gate: all must have been let in side by side.
+    // The last one to arrive opens the gate, so all of them must run at the same time.
     if (++arrived == 3 * kMany) gate->signal();
     if (gate->wait(std::nullopt) && ++through == 3 * kMany) allThrough->signal();
   };
@@ -266,7 +266,8 @@ TEST_P(WorkQueuesTest, WorkThatNeverRanIsReleasedAtTheEnd) {
   queues().after(1e6, queue, [held = marker] {});
   queues().after(INFINITY, queues().mainQueue(), [held = marker] {});
   const auto timer = queues().newRepeatingTimer(1e6, queue, [held = marker] {});
-  // This item's wait ends with the world. What stands behind it, or is handed over after it, comes too late.
+  // This wait ends when the queues are destroyed. Work queued behind it, or handed over after it, must not
+  // run.
   const auto begun = newSignal();
   std::atomic<int> late{0};
   queue->async([&late, begun, never = newSignal(), queue, held = marker] {
@@ -300,7 +301,7 @@ TEST_P(WorkQueuesTest, EndingEndsEveryWait) {
   EXPECT_EQ(ended, kMany);
 }
 
-// What only real threads do.
+// Only for real threads.
 
 TEST(LocalQueues, DrainOnceNothingIsQueuedOrRunningAndTakeNothingMore) {
   LocalQueuesWorld world;

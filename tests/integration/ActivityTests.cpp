@@ -6,7 +6,7 @@
 namespace kvr::testing {
 namespace {
 
-/// A device on which the agent has never run, whose every warranty carries an offer that is due.
+/// A device on which the agent has never run; all its warranties have an offer that is due.
 struct ANewDevice : ::testing::Test {
   ANewDevice() {
     const auto now = static_cast<double>(std::time(nullptr));
@@ -41,7 +41,7 @@ TEST_F(ANewDevice, GetsItsFollowUpsWhereverTheAgentIsKilledOnTheWay) {
     world.agent().kill();
   }
   world.startAgent();
-  // It may have done all its work before the last kill.
+  // The agent may have finished its work before it was killed the last time.
   world.newClient().call("ScheduleOutreach");
   world.agent().waitForErrorOutput("Schedule refresh for: ");
   EXPECT_THAT(pendingSerials(), UnorderedElementsAre(World::kPhone, World::kFirstWatch, World::kSecondWatch));

@@ -60,7 +60,7 @@ TEST_F(TheAgent, TakesAnyTextForASerialNumber) {
   }
   EXPECT_EQ(asked, all);
   for (const auto& serialNumber : odd) {
-    if (serialNumber.find('\0') != std::string::npos) continue;  // no call can carry it
+    if (serialNumber.find('\0') != std::string::npos) continue;  // no call can contain it
     const Value info = World::info(client, serialNumber, World::Default);
     EXPECT_EQ(info["device"]["serialNumber"], Value(serialNumber));
     EXPECT_EQ(label(info), Value("Warranty")) << "from the cache";
@@ -76,7 +76,7 @@ TEST_F(TheAgent, ServesOthersWhileSomeWaitForRenewalsAndAttestations) {
   const auto polite = world.newClient();
   ASSERT_EQ(label(World::info(polite, World::kFirstWatch, World::Default)), Value("Warranty"));
 
-  // Both answers take an hour: whoever waits for them waits out its limit, or the end of the agent.
+  // Both answers take an hour, so a caller waits until its own limit or until the agent ends.
   world.setAccount(Dictionary{{"resultCode", 0}, {"delay", 3600}});
   world.writeDeviceFile("Attestation.plist", Dictionary{{"Delay", 3600}});
   world.misbehave(R"([{"status":401,"serialNumber":"SNWATCH00002"}])");
@@ -118,7 +118,7 @@ TEST_F(TheAgent, LeavesCleanlyAfterAChangeOfLanguageAndComesBackWhenItIsCalled) 
   EXPECT_EQ(label(World::info(client, World::kPhone, World::Default)), Value("Garantie"));
   world.setLocale("en_US");
   world.waitForName(false);
-  world.pair({World::kFirstWatch});  // which brings it back without a call
+  world.pair({World::kFirstWatch});  // it starts the agent again without a call
   world.bus.daemon().waitForErrorOutput("Devices followups to be posted, if required", before);
 }
 
@@ -143,7 +143,7 @@ TEST_F(TheAgent, SaysFirstThatItWasLaunched) {
 
 TEST_F(TheAgent, HandlesSixteenNotificationsInARowAndAsManyEditsEachOnItsOwn) {
   for (const bool areEdits : {false, true}) {
-    world.writeDeviceFile("FeatureFlags.plist", Dictionary{});  // the phone alone is looked up
+    world.writeDeviceFile("FeatureFlags.plist", Dictionary{});  // only the phone is looked up
     world.pair({});
     world.startAgent();
     const auto client = world.newClient();
@@ -175,7 +175,7 @@ TEST_F(TheAgent, KnowsTheSupportApplicationInTheUsersLanguage) {
   world.writeDeviceFile("Resources/KavrelUI/nl/Localizable.plist", Dictionary{{"INSTALLED", "Aanwezig"}});
   world.startAgent();
   const auto waiting = world.newClient();
-  // For the store, which holds up nobody else.
+  // This call waits for the store and must not delay other clients.
   waiting.send("AppSupportAvailability", "s", {"not there"});
   const auto client = world.newClient();
   const std::pair<const char*, const char*> texts[] = {{"en_GB", "Installed"}, {"de_AT", "Installiert"},

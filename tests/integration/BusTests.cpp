@@ -118,7 +118,7 @@ Value nested(int depth, bool inArrays, Value tree) {
 }
 
 struct AValueOnTheBus : BusFixture {
-  /// A value that the service was sent and has sent back.
+  /// Sends a value to the service and returns the value that it sends back.
   Value echo(const char* member, const char* type, const Value& value) {
     return client.value(type, client.call(member, type, {value}));
   }
@@ -179,7 +179,7 @@ TEST_F(AValueOnTheBus, MayBeNestedToAnyDepthWithoutBreakingTheConnection) {
   }
 }
 
-/// The signature of what stands under a path of keys in a record.
+/// The type of the value under a path of keys in a record.
 std::string signatureUnder(sd_bus_message* message, const std::vector<std::string>& path) {
   const char* contents = nullptr;
   for (std::size_t i = 0; i < path.size(); ++i) {

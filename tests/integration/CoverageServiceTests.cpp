@@ -34,7 +34,7 @@ struct Identity {
       *newLeafCertificate(key, {}, authority, Date{static_cast<double>(std::time(nullptr))}, 60);
 
   static CertifiedKey authorityOf(const openssl::Key& key) { return {key, *newAuthorityCertificate(key)}; }
-  /// The JSON of the chain.
+  /// The chain's JSON.
   std::string chain(JSONSlashes slashes = JSONSlashes::Escaped) const {
     const Array certificates{base64Encode(*derOf(leaf)), base64Encode(*derOf(authority.certificate))};
     return *writeJSON(Dictionary{{"certs", certificates}}, slashes);
@@ -77,7 +77,7 @@ struct ACoverageService : ::testing::Test {
                    R"(123,"requestTimezone":-3,"serialNumber":"S1"})";
     return request;
   }
-  /// The status and the body of the answer.
+  /// The status and body of the answer.
   std::string ask(const HTTPRequest& request) {
     const HTTPResponse answer = client_.exchange(request);
     return std::to_string(answer.status) + " " + answer.body.value_or("");

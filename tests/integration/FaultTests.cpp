@@ -1,4 +1,4 @@
-// The real agent, ended or refused at each of its calls about files in turn.
+// Runs the real agent and kills it at, or fails, each of its file system calls in turn.
 #include "integration/support/AgentWorld.h"
 #include "integration/support/Injection.h"
 #include "platform/text/SHA256Hash.h"
@@ -13,13 +13,13 @@ namespace kvr::testing {
 namespace {
 
 namespace fs = std::filesystem;
-/// Error lines that one failed call may lead to: what it broke, and the two of a download that came to
-/// nothing.
+/// The most error lines after one failed call: one about the call itself, and two about a download that
+/// failed.
 constexpr std::size_t kMostComplaints = 3;
-/// The same when all calls fail from there on.
+/// The same if all later calls fail too.
 constexpr std::size_t kMostComplaintsOfLasting = 4;
 
-/// What a file holds, without what is another one each time.
+/// A file's contents without dates, which differ in every run.
 Value steady(const Value& tree) {
   if (tree.isDate()) return Date{0};
   if (!tree.isDictionary()) return tree;
@@ -34,12 +34,11 @@ Value contentOf(const fs::path& path) {
   return bytes.starts_with("-----BEGIN ") && bytes.ends_with("-----\n") ? "PEM" : bytes;
 }
 
-/// A store below "Library", and a change of it that a client brings about. Whatever the number of the round,
-/// it is a change.
+/// A directory below "Library", and a call of a client that changes it in every round.
 struct Store {
   std::string folder;
-  unsigned changes;      ///< of files
-  unsigned directories;  ///< made in it
+  unsigned changes;      ///< how many files change
+  unsigned directories;  ///< how many directories are created in it
   std::function<void(AgentWorld&, int round)> prepare;
   std::function<void(const RawBusClient&, int round)> change;
 };
@@ -68,7 +67,7 @@ std::vector<Store> allStores() {
 }
 
 struct TheAgentsStores : ::testing::Test {
-  /// What the files of a store hold, by their names.
+  /// The contents of a store's files, by file name.
   using State = Dictionary;
   void SetUp() override {
     if (KVR_SANITIZED) GTEST_SKIP() << "a sanitizer's runtime stands before the injector's calls";
@@ -97,7 +96,7 @@ struct TheAgentsStores : ::testing::Test {
   }
 
   fs::path library() const { return world.home() / "Library"; }
-  /// Brings a store back to what it was at the beginning, each file at one moment.
+  /// Restores a store's initial state; each file is replaced atomically.
   void restore(const Store& store, int round) {
     const auto saved = world.directory / "saved" / store.folder;
     if (!fs::exists(saved)) fs::remove_all(library() / store.folder);
@@ -107,12 +106,12 @@ struct TheAgentsStores : ::testing::Test {
     }
     store.prepare(world, round);
   }
-  /// Brings all of them back, behind an agent that is no more.
+  /// Restores all stores, while no agent runs.
   void restoreAll() const {
     fs::remove_all(library());
     fs::copy(world.directory / "saved", library(), fs::copy_options::recursive);
   }
-  /// Has the calls of a store from `first` to `last` fail, or none if `first` is 0.
+  /// Makes the store's calls number `first` to `last` fail, or none if `first` is 0.
   void arm(const std::string& folder, unsigned first = 0, unsigned last = 0, int error = 0) const {
     injection->first = 0;
     injection->path[0] = '\0';
@@ -152,7 +151,7 @@ struct TheAgentsStores : ::testing::Test {
     return std::count_if(begin(all), end(all), [](const auto& entry) { return isTemporary(entry.path()); });
   }
 
-  /// Whether each file is the old or the new one; of the preferences, each of them.
+  /// Checks that each file is the old or the new one; in the preferences file, each single preference.
   static void expectOldOrNew(const State& state, const State& before, const State& after) {
     for (const auto& [file, now] : after) EXPECT_TRUE(!before.contains(file) || state.contains(file)) << file;
     for (const auto& [file, now] : state) {
@@ -169,7 +168,8 @@ struct TheAgentsStores : ::testing::Test {
     }
   }
 
-  /// The agent's error lines so far. What it printed may arrive after what it replied, but not out of order.
+  /// The number of the agent's error lines so far. Its output may arrive after its reply, but in order, so a
+  /// marker line is awaited first.
   std::size_t errorLines() {
     const auto mark = "MARK" + std::to_string(++marks);
     world.newClient().call("GetDeviceInfoForSerialNumber", "st", {mark, World::CacheOnly});
@@ -205,7 +205,7 @@ TEST_F(TheAgentsStores, AreTheOldOrTheNewOnesWhereverItIsKilled) {
       startAgent();
       arm(store.folder, call, call, Injection::kKill);
       store.change(world.newClient(), 0);
-      // A file that has become old enough is not read again, which makes fewer calls.
+      // A file whose stamp has settled is not read again, so fewer calls are made.
       if (injection->calls < call) world.agent().kill();
       ASSERT_EQ(world.agent().wait(), -SIGKILL);
       expectOldOrNew(stateOf(store), before, after);
@@ -230,7 +230,8 @@ TEST_F(TheAgentsStores, AreTheOldOrTheNewOnesWhateverCallFailsAndNormalWithoutAR
   const auto client = world.newClient();
   int round = 0;
   unsigned calls = 0;
-  /// Makes a change while some calls fail, and again when none does; whether as many calls were made.
+  /// Makes a change while some calls fail, and again while none does; returns whether the failing calls were
+  /// reached.
   const auto change = [&](const Store& store, unsigned first, unsigned last, int error) {
     SCOPED_TRACE(store.folder + ", call " + std::to_string(first) + ": " + std::strerror(error));
     restore(store, ++round);

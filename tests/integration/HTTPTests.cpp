@@ -15,7 +15,7 @@ namespace kvr::testing {
 namespace {
 
 constexpr std::size_t kMebibyte = std::size_t{1} << 20;
-constexpr int kConnections = 64;  // to a host
+constexpr int kConnections = 64;  // per host
 constexpr int kCouldNotConnect = 7;
 constexpr int kTimedOut = 28;
 constexpr int kNoHandshake = 35;
@@ -29,7 +29,7 @@ class Peer {
  public:
   explicit Peer(int descriptor) : descriptor_(descriptor) {}
 
-  /// The next request, head and body; empty when the client has gone.
+  /// The next request, headers and body; empty when the client has gone.
   std::string request() {
     std::size_t length = std::string::npos;
     while (unread_.size() < length) {
@@ -63,8 +63,8 @@ class Peer {
   std::string unread_;
 };
 
-/// A server on a loopback port that treats every connection as its script says; a connection ends when the
-/// script returns.
+/// A server on a loopback port that runs its script for every connection; a connection ends when the script
+/// returns.
 class ScriptedServer {
  public:
   using Script = std::function<void(Peer&)>;
@@ -123,7 +123,7 @@ std::string response(std::string_view status, std::string_view body) {
          "\r\n\r\n" + std::string(body);
 }
 
-/// Answers the first request of a connection with these bytes.
+/// Answers the first request of a connection with the given bytes.
 ScriptedServer::Script sends(std::string bytes) {
   return [bytes = std::move(bytes)](Peer& peer) {
     peer.request();
@@ -131,7 +131,7 @@ ScriptedServer::Script sends(std::string bytes) {
   };
 }
 
-/// Answers every request of a connection with what was asked.
+/// Answers every request of a connection with the request itself.
 void echo(Peer& peer) {
   for (auto request = peer.request(); !request.empty(); request = peer.request()) {
     if (!peer.write(response("200 OK", request))) return;
@@ -316,7 +316,7 @@ TEST_F(OverHTTP, WhatWasNotSentGoesAgainOnceAndWhatWasSentNever) {
   for (auto& reply : replies) EXPECT_EQ(codeOf(reply.get()), kNoHandshake);
   EXPECT_EQ(busy.connections(), 100);
 
-  // Over a new connection, over one that was kept alive, and with another one kept alive beside it.
+  // On a new connection, on a kept-alive one, and on a kept-alive one beside another.
   for (const int answered : {0, 1, 2}) {
     for (const bool isPost : {false, true}) {
       std::latch allAtOnce(answered);

@@ -11,8 +11,8 @@ constexpr const char* kInvalid = "org.freedesktop.DBus.Error.InvalidArgs";
 constexpr const char* kUnknown = "org.freedesktop.DBus.Error.UnknownMethod";
 constexpr const char* kNoObject = "org.freedesktop.DBus.Error.UnknownObject";
 
-/// The agent, beside whose hostile peers a polite one is always served, and whose memory and descriptors stay
-/// where they were.
+/// The agent with hostile peers: it must always serve a polite one, and its memory and descriptors must not
+/// grow.
 struct TheAgentAmongHostilePeers : ::testing::Test {
   void begin() {
     world.startAgent();
@@ -25,10 +25,11 @@ struct TheAgentAmongHostilePeers : ::testing::Test {
     EXPECT_EQ(polite->value("a{sv}", polite->call("DefaultDevice"))["serialNumber"], Value(World::kPhone))
         << when;
   }
-  /// Once the peers have left. A sanitizer keeps what was let go of.
+  /// Call once the hostile peers have left. Memory is not checked under a sanitizer, which does not reuse it
+  /// at once.
   void expectNothingIsLeft(const std::string& when) {
     expectPoliteService(when);
-    EXPECT_LE(descriptors(), descriptors_ + 32) << when;  // some connections to the service are kept
+    EXPECT_LE(descriptors(), descriptors_ + 32) << when;  // some connections to the service stay open
     if (!KVR_SANITIZED) {
       EXPECT_LE(memory(), memory_ + (64 << 10)) << when << ", in KiB";
     }
@@ -45,7 +46,7 @@ struct TheAgentAmongHostilePeers : ::testing::Test {
     return std::distance(all, std::filesystem::directory_iterator());
   }
 
-  /// Reads answers until it has those of `count` calls; how many bore each error, "" for none.
+  /// Reads the answers to `count` calls; returns how many had each error name, "" for none.
   static std::map<std::string, int> answers(const RawBusClient& client, int count) {
     std::map<std::string, int> found;
     for (; count > 0; --count) {

@@ -9,7 +9,7 @@ namespace {
 
 constexpr const char* kFailure = "kvragent failed to load warranty";
 
-/// A rule that has these bytes sent in an answer's place, and then others again and again.
+/// A rule that sends these bytes instead of an answer, with further members of the rule in `further`.
 std::string raw(const std::string& bytes, const std::string& further = "") {
   return R"("raw":")" + bytes + "\"" + (further.empty() ? "" : "," + further);
 }
@@ -39,7 +39,7 @@ TEST_F(TheAgentOfAHostileService, MakesTheAttemptsItMayAndFailsOnce) {
   const std::string kilobyte(1000, 'a');
   const std::string ok = R"(HTTP/1.1 200 OK\r\n)";
   const std::string five = ok + R"(Content-Length: 5\r\n\r\n)";
-  // What the coverage service does with every request about the second watch.
+  // The answer to every request about the second watch.
   const std::pair<const char*, std::string> all[] = {
       {"endless headers", endless(ok, "X-More: " + kilobyte + R"(\r\n)")},
       {"an endless header", endless(ok + "X-More: ", kilobyte)},
@@ -93,7 +93,7 @@ TEST_F(TheAgentOfAHostileService, AnswersFromTheCacheWhileTheServiceKeepsItWaiti
                            raw(started, R"("repeat":" ","pace":1)")}) {
     misbehave(rule);
     const auto requests = world.coverageRequests().size();
-    // In the end as many as there are connections to a host, and more.
+    // In total more than the most connections to a host.
     for (int i = 0; i < 22; ++i) {
       waiting.push_back(world.newClient());
       waiting.back().send("GetDeviceInfoForSerialNumber", "st", {World::kSecondWatch, World::Refresh});

@@ -16,16 +16,16 @@ constexpr uid_t kNobody = 65534;
 constexpr const char* kRefusal =
     " org.freedesktop.DBus.Error.AccessDenied: missing entitlement 'com.tarsil.private.kvragent'";
 
-/// How a program is run that calls.
+/// How to run a program that calls the agent.
 struct Launch {
   std::vector<std::string> command;
   ChildProcess::Environment changes{};
-  std::function<void()> beforeItCalls{};  ///< it has connected, and waits
+  std::function<void()> beforeItCalls{};  ///< runs when it has connected and waits
 };
 
 struct TheAgentsPeer : ::testing::Test {
   TheAgentsPeer() {
-    // Another user can get at the bus and the programs. What a member does is done at once.
+    // Let another user reach the bus and the programs. The methods should finish at once.
     fs::permissions(world.bus.directory(), fs::perms(0711));
     fs::permissions(world.directory.path(), fs::perms(0711));
     world.changePreference("PostUpgradeOutreachDelay", 0);
@@ -38,7 +38,7 @@ struct TheAgentsPeer : ::testing::Test {
     const Value entitlements = Dictionary{{"com.tarsil.private.kvragent", value}};
     world.writeDeviceFile("Entitlements.plist", Dictionary{{program.string(), entitlements}});
   }
-  /// A program of its own, with nothing granted to it yet.
+  /// A separate program without any entitlement.
   fs::path program(const std::string& name) const {
     const auto path = world.directory / name;
     fs::copy_file(KVR_PROGRAMS "/kvr-peer-probe", path, fs::copy_options::overwrite_existing);
@@ -56,7 +56,7 @@ struct TheAgentsPeer : ::testing::Test {
     fs::remove(device() / "Entitlements.plist");
   }
 
-  /// One line a member.
+  /// The answers, one line per method.
   std::string answersTo(const Launch& run) const {
     ChildProcess::Environment changes = run.changes;
     changes["DBUS_SESSION_BUS_ADDRESS"] = world.bus.address();
@@ -77,7 +77,7 @@ struct TheAgentsPeer : ::testing::Test {
     probe.waitForOutput(std::string(last) + " ");
     return probe.output();
   }
-  /// Whether each member serves who calls so, and with what reason in the log; the device is ordinary then.
+  /// Checks whether every method serves this caller, and the reason in the log; then resets the device.
   void expect(bool isServed, const std::string& name, const Launch& run, const std::string& reason = "") {
     const auto from = world.agent().errorOutput().size();
     const auto answers = answersTo(run);
@@ -109,7 +109,7 @@ TEST_F(TheAgentsPeer, IsServedOnlyWhenItIsAGrantedProgramOfTheAgentsUser) {
   expect(false, "a copy of the granted program", {{program("other")}});
   const auto other = world.directory / "other";
 
-  // The program changes once it runs.
+  // The program file changes while the program runs.
   const auto expectNoneOnce = [&](const char* name, const std::function<void(const fs::path&)>& change) {
     const auto path = grantedProgram();
     expect(false, name, {{path}, {}, [&] { change(path); }});
@@ -120,7 +120,7 @@ TEST_F(TheAgentsPeer, IsServedOnlyWhenItIsAGrantedProgramOfTheAgentsUser) {
   expect(false, "ended after it had connected", {{grantedProgram()}, {{"KVR_PROBE_LEAVES", "1"}}},
          "Error Domain=process");
 
-  // It has another name, and either is granted.
+  // The program has a second name; the entitlement is granted to one of the two.
   for (const bool isSymbolic : {true, false}) {
     for (const bool isLinkGranted : {true, false}) {
       const auto path = program("granted");
@@ -157,8 +157,8 @@ TEST_F(TheAgentsPeer, IsServedOnlyWhenItIsAGrantedProgramOfTheAgentsUser) {
   expect(false, "set to another user", {{path}}, "it belongs to another user");
 }
 
-/// Answers to calls that the agent may have made, with each of `numbers`: the bus's answer about a client,
-/// which names a process.
+/// Forged answers to calls number `first` and following, `count` of them: the bus's answer about a client,
+/// naming `process`.
 std::string forgedAnswers(const std::string& agent, std::uint32_t first, std::uint32_t count, pid_t process) {
   std::string body;
   std::string* out = &body;
@@ -172,7 +172,7 @@ std::string forgedAnswers(const std::string& agent, std::uint32_t first, std::ui
     number(value.size());
     out->append(value).push_back('\0');
   };
-  number(0);  // the array's length, once it is known
+  number(0);  // the array's length, filled in later
   for (const auto& [key, value] : {std::pair<const char*, std::size_t>{"UnixUserID", ::geteuid()},
                                    {"ProcessID", static_cast<std::size_t>(process)}}) {
     align(8);
@@ -189,7 +189,7 @@ std::string forgedAnswers(const std::string& agent, std::uint32_t first, std::ui
     out = &message;
     number(body.size());
     number(1000 + i);
-    number(0);  // the length of the fields
+    number(0);  // the length of the fields, filled in later
     out->append("\5\1u", 4);
     number(first + i);
     out->append("\6\1s", 4);
@@ -219,13 +219,13 @@ TEST_F(TheAgentsPeer, IsNotWhoForgedAnswersOfTheBusSayItIs) {
   ASSERT_GE(sd_bus_message_get_cookie(ping, &number), 0);
   const std::string forged = forgedAnswers(sd_bus_message_get_sender(ping),
                                            static_cast<std::uint32_t>(number) + 1, 16, granted.pid());
-  // The agent finds them behind the call, before the bus has answered what the call makes it ask.
+  // They arrive right after the call, before the bus can answer the agent's own question about the caller.
   world.agent().send(SIGSTOP);
   ASSERT_GE(sd_bus_send(client.bus(), client.newCall("DefaultDevice").get(), nullptr), 0);
   ASSERT_GE(sd_bus_flush(client.bus()), 0);
   ASSERT_EQ(::send(sd_bus_get_fd(client.bus()), forged.data(), forged.size(), MSG_NOSIGNAL),
             static_cast<ssize_t>(forged.size()));
-  // Once this is answered, the bus has handed everything on.
+  // Once this call is answered, the bus has forwarded all messages before it.
   ASSERT_GE(sd_bus_call_method(client.bus(), kBusName, kBusPath, kBusName, "GetId", nullptr, nullptr, ""), 0);
   world.agent().send(SIGCONT);
   const auto reply = client.call("DefaultDevice");

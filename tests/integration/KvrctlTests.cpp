@@ -46,18 +46,18 @@ struct Kvrctl : BusFixture {
   }
 
   std::shared_ptr<void> serveAgent() { return serve(agentServiceInterface()); }
-  /// What the agent replies from now on.
+  /// Sets the agent's reply to a method.
   void setAnswer(const std::string& member, const Value& value) {
     const std::lock_guard lock(mutex_);
     answers_[member] = value;
   }
-  /// A member's calls get no reply; tells when one has come.
+  /// From now on calls of this method get no reply; the future is ready once one has arrived.
   std::future<void> hold(const std::string& member) {
     const std::lock_guard lock(mutex_);
     heldMember_ = member;
     return isHeld_.get_future();
   }
-  /// The last call and its arguments.
+  /// The last call with its arguments.
   std::string asked() const {
     const std::lock_guard lock(mutex_);
     return asked_;
@@ -123,7 +123,7 @@ TEST_F(Kvrctl, AsksWhatItIsTold) {
   }
 }
 
-/// One line on standard error, nothing on standard output, and the status.
+/// Expects one line on standard error, nothing on standard output, and the given status.
 MATCHER_P2(IsFailure, status, line, "") {
   return arg.status == status && arg.output.empty() && arg.errors.find('\n') + 1 == arg.errors.size() &&
          ::testing::Value(arg.errors, line);
@@ -235,11 +235,11 @@ TEST_F(Kvrctl, TakesAnyTextForASerialNumber) {
     const Value status = (*told)["statuses"].array().at(0);
     EXPECT_EQ(status["device"]["serialNumber"], Value(serialNumber));
     EXPECT_EQ(status["isDismissed"], Value(true)) << "known by the hash that the agent uses";
-    if (serialNumber.find('\0') != std::string::npos) continue;  // no command line can carry it
+    if (serialNumber.find('\0') != std::string::npos) continue;  // no command line can contain it
     run({"dismiss", "--", serialNumber});
     EXPECT_EQ(asked(), "Dismiss" + call + describe(Value(Array{serialNumber})));
     EXPECT_EQ(run({"info", "--policy", "cache", "--", serialNumber}).errors, "");
-    // Nothing is known, so kvrctl looks whether there is such a device.
+    // The agent knows no warranty, so kvrctl checks whether the device exists.
     EXPECT_EQ(asked(), "PairedDevices()");
   }
 }

@@ -7,8 +7,8 @@
 
 namespace kvr {
 
-/// A phone with a signed-in owner and two endpoints: the version asset publishes versions 2 and 3, and
-/// coverage requests go to `coverage` (none: they are never answered).
+/// A phone whose owner is signed in, with two endpoints: the version asset publishes versions 2 and 3;
+/// `coverage` answers coverage requests (if empty, they are never answered).
 struct CoverageWorld : SimulatedPlatform {
   static constexpr const char* kLocal = "LOCAL";
 
@@ -39,7 +39,7 @@ struct CoverageWorld : SimulatedPlatform {
     reset();
   }
 
-  /// Puts accounts, answers and overrides back to where every download succeeds.
+  /// Resets accounts, answers and overrides so that every download succeeds.
   void reset() {
     accounts.primary = CloudAccount{"alt-dsid"};
     accounts.authentication = AuthenticationAccount{"alternate-dsid"};

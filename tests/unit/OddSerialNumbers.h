@@ -5,7 +5,7 @@
 
 namespace kvr {
 
-/// Serial numbers that nobody would choose: any text is one.
+/// Unusual serial numbers; any text is a valid one.
 inline std::vector<std::string> oddSerialNumbers() {
   return {"",
           "a/../b",

@@ -10,11 +10,11 @@
 
 namespace kvr {
 
-/// A world with offers, whose dates are given in days from now.
+/// A test with offers; dates are given in days from now.
 struct AnOfferTest : CoverageTest {
   Date inDays(double days) const { return world.clock.now() + days * kDay; }
 
-  /// The dictionary of an offer with all its texts; `more` goes over it.
+  /// The dictionary of an offer with all its texts; `more` takes precedence.
   Dictionary offer(double endsInDays, const Dictionary& more = {}) const {
     Dictionary dictionary = more;
     dictionary.merge(Dictionary{
@@ -27,7 +27,7 @@ struct AnOfferTest : CoverageTest {
     });
     return dictionary;
   }
-  /// The offer with more parameters beside the one that displays it.
+  /// The offer with further parameters in addition to the one that displays it.
   static Dictionary with(Dictionary parameters, Dictionary offer) {
     parameters["zubOfferDisplay"] = true;
     offer["featureToggleParameters"] = std::move(parameters);
@@ -36,7 +36,7 @@ struct AnOfferTest : CoverageTest {
   Dictionary shownInDays(double displayInDays, double endsInDays) const {
     return offer(endsInDays, {{"zubOfferFollowupDisplayDate", inDays(displayInDays).secondsSince1970}});
   }
-  /// One whose follow-up is due.
+  /// An offer whose follow-up is due.
   Dictionary due(double endsInDays) const { return shownInDays(-1, endsInDays); }
   KVRDeviceInfoRef info(const std::optional<std::string>& serialNumber, const Value& warranty,
                         std::optional<Date> activation = {}, std::uint64_t type = KVRDevice::kLocal) {
@@ -53,7 +53,8 @@ struct AnOfferTest : CoverageTest {
       serials.push_back(item.userInfo.at(names::kFollowUpSerialNumber).string());
     return serials;
   }
-  /// The lines since the last call that are not about how an item is built, less the operation's name.
+  /// The log lines since the last call, without those about building an item and without the name of the
+  /// operation.
   std::vector<std::string> newLines() {
     std::vector<std::string> lines;
     for (auto line : world.log.texts()) {
@@ -67,7 +68,7 @@ struct AnOfferTest : CoverageTest {
   std::optional<Date> target(const std::string& identifier) {
     return world.preferences.dateForKey(identifier + names::kTargetDateSuffix);
   }
-  /// Starts an activity by itself; its result, where it gives one at once.
+  /// Runs an activity directly; returns its result if there is one at once.
   template <class Activity, class... Means>
   std::optional<ActivityResult> start(Means... means) {
     result.reset();
@@ -77,7 +78,7 @@ struct AnOfferTest : CoverageTest {
         ActivityHandler(world.log, "test", [this](ActivityResult it) { result = it; }));
     return result;
   }
-  std::optional<ActivityResult> result;  ///< of the activity that was started last
+  std::optional<ActivityResult> result;  ///< of the last activity
   Array hashes(const char* key) {
     const auto list = world.preferences.objectForKey(key);
     return list.isArray() ? list.array() : Array{};
@@ -90,7 +91,7 @@ struct AnOfferTest : CoverageTest {
     item.userInfo = userInfo;
     return item;
   }
-  /// Has an item pending that is not the agent's doing.
+  /// Posts an item that the agent has not posted.
   void pend(const std::string& uniqueIdentifier, const Dictionary& userInfo = {}) {
     const auto client = world.followUps.newClient(names::kFollowUpClient);
     EXPECT_FALSE(client->postItem(item(uniqueIdentifier, 2, userInfo)));

@@ -5,8 +5,8 @@
 
 namespace kvr {
 
-/// A test in a simulated world of its own. What can still run without time passing runs at the end; a fault
-/// fails the test. A test that provokes faults takes them (`takeFaults`).
+/// A test on its own simulated platform. At the end, everything runs that can run without time passing, and a
+/// fault fails the test. A test that provokes faults must take them (`takeFaults`).
 template <class World>
 struct TestIn : ::testing::Test {
   void TearDown() override {

@@ -1,9 +1,9 @@
-// A client for the tests of who is served: calls members of the agent and prints what each was answered, as
-// "MEMBER ERROR: TEXT". What it is to do stands in its environment, so that it can be run in any way:
+// A client for the tests of peer identity: calls methods of the agent and prints each answer as "MEMBER
+// ERROR: TEXT". It takes its options from the environment, so that it can be run under any name:
 //
-//   KVR_PROBE_MEMBERS  the members with their signatures: "DefaultDevice: ScheduleOutreachAfter:d"
+//   KVR_PROBE_MEMBERS  the methods with their signatures: "DefaultDevice: ScheduleOutreachAfter:d"
 //   KVR_PROBE_WAITS    print "ready" and wait for SIGUSR1 first
-//   KVR_PROBE_LEAVES   have a child make the calls once the process that connected has ended
+//   KVR_PROBE_LEAVES   let a child make the calls after the process that connected has ended
 
 #include "local/buscodec/BusHandles.h"
 
@@ -20,7 +20,7 @@
 
 namespace {
 
-/// Connected by this process, which is who the bus says the client is.
+/// A socket connected by this process, so that the bus reports this process as the client.
 int connectedSocket() {
   const std::string address = std::getenv("DBUS_SESSION_BUS_ADDRESS");
   const auto from = address.find("path=") + 5;
@@ -44,7 +44,7 @@ void waitForSignal() {
   sigwait(&signals, &signal);
 }
 
-/// Goes on in a child, once the parent is no more.
+/// Continues in a child process once the parent has ended.
 void leave() {
   const auto parent = static_cast<int>(::syscall(SYS_pidfd_open, ::getpid(), 0));
   if (::fork() != 0) ::_exit(EXIT_SUCCESS);

@@ -6,11 +6,11 @@
 
 namespace kvr::testing {
 
-/// A phone with two watches, its coverage service and its agent: the real programs on a bus of their own. The
-/// test is the client.
+/// A phone with two watches, its coverage service and its agent: the real programs on a private bus. The test
+/// is the client.
 ///
-/// The agent is started by `startAgent`, so that a test may change the device before. It finds a device that
-/// it has set up earlier, and so does nothing of its own accord.
+/// `startAgent` starts the agent, so that a test may change the device first. By default the device is
+/// already set up, so that the agent does nothing on its own.
 class AgentWorld {
  public:
   static constexpr const char* kPhone = "SNPHONE00001";
@@ -18,27 +18,27 @@ class AgentWorld {
   static constexpr const char* kSecondWatch = "SNWATCH00002";
   enum Policy : std::uint64_t { Default = 0, CacheOnly = 1, Refresh = 2 };
 
-  /// Whether the service insists on attested requests about the phone.
+  /// Whether the service requires attestation for requests about the phone.
   enum class Attestation { Required, Optional };
 
   explicit AgentWorld(Attestation attestation = Attestation::Required);
 
-  /// From here on it is the device's first start.
+  /// Makes the next start the device's first one.
   void becomeNewDevice() const {
     std::filesystem::remove(home() / kActivities);
     changePreference("PostUpgradeActivityCompleted", {});
   }
-  /// Starts the agent, after killing one that runs, and returns once it has its name on the bus.
+  /// Kills the agent if it runs, starts it, and returns once it owns its name on the bus.
   void startAgent();
-  /// Instead: has the bus start it at the first call. It prints to the bus's error output, and its exit
-  /// status in the end.
+  /// Lets the bus start the agent at the first call instead. The agent's output, and finally its exit status,
+  /// go to the bus's error output.
   void letTheBusStartIt();
-  /// Waits until somebody on the bus has the agent's name, or nobody has.
+  /// Waits until the agent's name on the bus has an owner, or has none.
   void waitForName(bool isOwned) const;
   ChildProcess& agent() { return *agent_; }
   RawBusClient newClient() const { return RawBusClient(bus.address()); }
 
-  /// A new file in the old one's place: nobody reads half of it.
+  /// Replaces the file atomically, so that nobody reads half of it.
   void writeDeviceFile(const std::string& name, const Value& tree,
                        PropertyListEncoding encoding = PropertyListEncoding::XML) const {
     const auto path = directory.write("device/new", *writePropertyList(tree, encoding));
@@ -51,20 +51,20 @@ class AgentWorld {
     writeDeviceFile("Locale.plist", Dictionary{{"identifier", identifier}});
   }
   void pair(const std::vector<std::string>& serialNumbers) const;
-  /// The account of the device, with a script for renewals (null: none).
+  /// Sets the device's account, with a script for renewals (null: none).
   void setAccount(const Value& renewal) const;
-  /// What the service answers about a device (SERIAL), or about it in one locale (SERIAL.LOCALE).
+  /// Sets the service's answer about a device (SERIAL), or in one locale (SERIAL.LOCALE).
   void setCoverage(const std::string& name, const std::string& json) const {
     directory.write("service/coverage/" + name + ".json", json);
   }
-  /// Tells the service how to answer coverage requests, in the rules that its control endpoint takes.
+  /// Sets the rules for answering coverage requests; see the service's control endpoint.
   void misbehave(const std::string& rules) const;
 
-  /// The requests that the service got, as it recorded them.
+  /// The requests that the service has recorded.
   std::vector<Value> requests() const;
-  /// Those for coverage.
+  /// Only the coverage requests.
   std::vector<Value> coverageRequests() const;
-  /// A property list below the home directory.
+  /// Reads a property list below the home directory.
   Value file(const std::string& path) const { return *readPropertyList(*contentOfFile(home() / path)); }
   void setPreferences(const Value& preferences) const {
     writeFile(home() / kPreferences, *writePropertyList(preferences, PropertyListEncoding::Binary));
@@ -79,19 +79,19 @@ class AgentWorld {
   std::string cacheFileOf(const std::string& serialNumber) const;
   std::filesystem::path home() const { return directory / "home"; }
 
-  // Calls by a client, and what they reply.
+  // Calls of a client; they return the reply.
   static Value info(const RawBusClient& client, const std::string& serialNumber, std::uint64_t policy) {
     return client.value("a{sv}", client.call("GetDeviceInfoForSerialNumber", "st", {serialNumber, policy}));
   }
   static Array allInfos(const RawBusClient& client, std::uint64_t policy) {
     return client.value("aa{sv}", client.call("GetAllDeviceInfosUsingPolicy", "tb", {policy, false})).array();
   }
-  /// The warranty's dictionary in a device info, null for none.
+  /// The warranty's dictionary in a device info; null if there is none.
   static Value warrantyIn(const Value& info) { return info["warranty"]["DictionaryRepresentation"]; }
 
   PrivateBus bus;
   TemporaryDirectory directory;
-  ChildProcess::Environment moreEnvironment;  ///< of the agent, besides what makes its world
+  ChildProcess::Environment moreEnvironment;  ///< for the agent, in addition to the usual one
 
  private:
   static constexpr const char* kActivities = "Library/Activities/com.tarsil.kvragent.plist";

@@ -17,11 +17,11 @@
 
 namespace kvr::testing {
 
-/// A service on a bus of its own, in this process, that does what a test tells it; its clients, too, are this
-/// program.
+/// A service on a private bus, in this process, whose behaviour the test sets. Its clients are in this
+/// process too.
 struct BusFixture : ::testing::Test, ServiceListenerDelegate {
   static constexpr std::string_view kEntitlement = "com.example.entitlement";
-  /// Long enough for the slowest machine under a sanitizer; only ever spent on a failure.
+  /// Long enough for the slowest machine under a sanitizer; only a failing test waits this long.
   static constexpr std::chrono::seconds kLimit{60};
 
   using Behaviour = std::function<void(const std::string& member, const Array&, ServiceReply reply)>;
@@ -36,15 +36,15 @@ struct BusFixture : ::testing::Test, ServiceListenerDelegate {
   }
   ~BusFixture() override { stop(); }
 
-  /// States the entitlement's value for a program, by default this one, and for no other.
+  /// Grants the entitlement with this value to one program, by default this one, and to no other.
   void entitle(const Value& value, const std::string& program = "/proc/self/exe") {
     const Dictionary granted{{std::string(kEntitlement), value}};
     root_.write("Entitlements.plist",
                 *writePropertyList(Dictionary{{std::filesystem::canonical(program).string(), granted}},
                                    PropertyListEncoding::XML));
   }
-  /// Serves the name on the bus until what is returned goes, by default with operations that echo every type.
-  /// The name is there on return; after the end nothing of the test is touched any more.
+  /// Serves the name on the bus until the returned object is destroyed, by default with methods that echo
+  /// each type. On return the name is owned; after the end nothing of the test is used any more.
   [[nodiscard]] std::shared_ptr<void> serve(const ServiceInterface& interface = echoInterface()) {
     interface_ = interface;
     listener->resume(interface);
@@ -61,7 +61,7 @@ struct BusFixture : ::testing::Test, ServiceListenerDelegate {
   RawBusClient newClient() const { return RawBusClient(bus.address()); }
   bool waitUntilLost() { return lost_.get_future().wait_for(kLimit) == std::future_status::ready; }
 
-  /// Has every object made from now on do this.
+  /// Sets the behaviour of every object created from now on.
   void behave(const Behaviour& behaviour) {
     newBehaviour = [behaviour] { return behaviour; };
   }
@@ -85,12 +85,12 @@ struct BusFixture : ::testing::Test, ServiceListenerDelegate {
 
   PrivateBus bus;
   SimulatedLog log;
-  /// What each object does. By default they reply what they were given.
+  /// Creates each object's behaviour; by default it replies with the first argument.
   std::function<Behaviour()> newBehaviour = [] {
     return [](auto&, const Array& arguments, const ServiceReply& reply) { reply(arguments.at(0)); };
   };
   std::function<void()> onObjectGone = [] {};
-  std::vector<Value> decisions;  ///< the entitlement's value, at every decision
+  std::vector<Value> decisions;  ///< the entitlement's value at each decision
 
   std::unique_ptr<LocalServiceListeners> listeners;
   std::unique_ptr<ServiceListener> listener;

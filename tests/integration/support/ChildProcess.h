@@ -26,16 +26,16 @@
 
 namespace kvr::testing {
 
-/// A program run as a child; what it prints is kept. Killed at the end if it still runs.
+/// A program run as a child process; keeps its output, and kills it in the destructor.
 ///
-/// Every wait ends with an exception that tells what the child printed once a generous limit has passed, so
-/// that a child that hangs is a failure and not a stuck test run.
+/// Each wait throws an exception with the child's output after a generous limit, so that a hanging child
+/// fails the test instead of blocking the test run.
 class ChildProcess {
  public:
   using Environment = std::map<std::string, std::string>;
 
-  /// Starts `arguments[0]`, an absolute path or one found in PATH. The environment is this process's own with
-  /// `changes` on top; an empty value takes the variable away.
+  /// Starts `arguments[0]`, an absolute path or a program in PATH, with this process's environment changed by
+  /// `changes`; an empty value removes a variable.
   explicit ChildProcess(std::vector<std::string> arguments, const Environment& changes = {})
       : name_(arguments.at(0)) {
     std::vector<std::string> environment = environmentWith(changes);
@@ -47,7 +47,7 @@ class ChildProcess {
     pid_ = ::fork();
     if (pid_ < 0) fail("fork");
     if (pid_ == 0) {
-      // A test that crashes leaves nothing running behind.
+      // The child must not outlive a test that crashes.
       ::prctl(PR_SET_PDEATHSIG, SIGKILL);
       if (::getppid() != parent) ::_exit(127);
       ::dup2(output.second.get(), STDOUT_FILENO);
@@ -64,14 +64,14 @@ class ChildProcess {
   }
   ~ChildProcess() {
     if (!reaped_ && ::kill(pid_, SIGKILL) == 0) ::waitpid(pid_, nullptr, 0);
-    // Something the child started may hold the pipes open still.
+    // A process started by the child may still hold the pipes open.
     const std::uint64_t one = 1;
     if (::write(stop_.get(), &one, sizeof one) != sizeof one) std::terminate();
     reader_.join();
   }
 
   pid_t pid() const { return pid_; }
-  /// What was printed so far.
+  /// The output so far.
   std::string output() const {
     const std::lock_guard lock(mutex_);
     return output_;
@@ -80,8 +80,8 @@ class ChildProcess {
     const std::lock_guard lock(mutex_);
     return errorOutput_;
   }
-  /// Wait until a whole line holding `text` has been printed from byte `from` on, and return it without its
-  /// line break.
+  /// Wait until a whole line that contains `text` has been printed, from byte `from` on; return it without
+  /// its line break.
   std::string waitForOutput(std::string_view text, std::size_t from = 0) {
     return waitFor(output_, text, from);
   }
@@ -92,8 +92,8 @@ class ChildProcess {
   void send(int signal) const {
     if (::syscall(SYS_pidfd_send_signal, process_.get(), signal, nullptr, 0) < 0) fail("pidfd_send_signal");
   }
-  /// Waits for the end and returns the exit status, or minus the signal that ended it. All it printed has
-  /// been read by then.
+  /// Waits for the end; returns the exit status, or minus the number of the signal that ended it. All output
+  /// has been read by then.
   int wait() {
     if (reaped_) return status_;
     pollfd process{process_.get(), POLLIN, 0};
@@ -118,13 +118,13 @@ class ChildProcess {
   }
 
  private:
-  /// Long enough for the slowest machine under a sanitizer; only ever spent on a failure.
+  /// Long enough for the slowest machine under a sanitizer; only a failing test waits this long.
   static constexpr std::chrono::seconds kLimit{60};
 
   [[noreturn]] static void fail(const char* what) {
     throw std::system_error(errno, std::generic_category(), what);
   }
-  /// The ends to read from and to write to.
+  /// The read end and the write end.
   static std::pair<Descriptor, Descriptor> newPipe() {
     std::array<int, 2> ends{};
     if (::pipe2(ends.data(), O_CLOEXEC) < 0) fail("pipe2");
@@ -190,7 +190,7 @@ class ChildProcess {
 
   const std::string name_;
   pid_t pid_ = -1;
-  Descriptor outputs_[2];  ///< what it prints, and prints as errors
+  Descriptor outputs_[2];  ///< its standard output and standard error
   Descriptor process_;
   Descriptor stop_;
   mutable std::mutex mutex_;  ///< guards what follows

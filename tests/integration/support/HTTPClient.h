@@ -11,7 +11,7 @@
 
 namespace kvr::testing {
 
-/// The agent's HTTP with all it needs, and its answers to wait for.
+/// The agent's HTTP with everything it needs; answers are futures.
 class HTTPClient {
  public:
   std::future<HTTPResponse> start(HTTPRequest request) {

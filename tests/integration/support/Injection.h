@@ -6,18 +6,19 @@
 
 namespace kvr::testing {
 
-/// What a test tells the injector, and what that tells the test: one page that a program which is run under
-/// it shares with the test.
+/// A memory page shared by a test and a program under the injector: the test sets which calls fail, the
+/// injector counts.
 ///
-/// What counts are the program's calls to the system about files and directories at and below `path`.
+/// Only the program's calls on files and directories at and below `path` count.
 struct Injection {
-  static constexpr const char* kVariable = "KVR_INJECTION";  ///< names the page's file
+  static constexpr const char* kVariable = "KVR_INJECTION";  ///< the name of the page's file
   static constexpr std::int32_t kKill = 0;
   static constexpr std::size_t kLongestPath = 512;
 
   std::atomic<std::uint32_t> first{0};  ///< the first call that fails, counted from 1; 0 for none
-  std::atomic<std::uint32_t> last{0};   ///< the last one
-  std::atomic<std::int32_t> error{0};   ///< its errno, or `kKill` for the program's end in its place
+  std::atomic<std::uint32_t> last{0};   ///< the last one that fails
+  std::atomic<std::int32_t> error{
+      0};  ///< the errno of the failing calls, or `kKill` to kill the program instead
   std::atomic<std::uint32_t> calls{0};
   std::atomic<std::uint32_t> fileSyncs{0};
   std::atomic<std::uint32_t> directorySyncs{0};

@@ -5,20 +5,20 @@
 
 namespace kvr::testing {
 
-/// A message bus of the test's own: the reference daemon as a session bus that allows its user everything.
-/// Its limit on a message's size is the daemon's default, the strictest an agent is likely to meet.
+/// A private message bus: the reference daemon as a session bus that allows its user everything. Its limit on
+/// message sizes is the daemon's default, the strictest an agent is likely to meet.
 class PrivateBus {
  public:
-  /// Has the bus start a program when somebody calls the name.
+  /// Makes the bus start a program when somebody calls the name.
   void addService(const std::string& name, const std::string& command) const {
     directory_.write("services/" + name + ".service",
                      "[D-BUS Service]\nName=" + name + "\nExec=" + command + "\n");
   }
-  /// The bus itself; what the programs it starts print as errors is printed there.
+  /// The daemon; its error output includes that of the programs it starts.
   ChildProcess& daemon() { return daemon_; }
   const std::string& address() const { return address_; }
   const std::filesystem::path& directory() const { return directory_.path(); }
-  /// Ends the bus the hard way; every connection is lost.
+  /// Kills the bus; every connection is lost.
   void kill() { daemon_.kill(); }
 
  private:

@@ -8,7 +8,7 @@
 
 namespace kvr::testing {
 
-/// A client that speaks to a bus in plain messages. One thread.
+/// A client that sends plain bus messages. Use it on one thread.
 class RawBusClient {
  public:
   static constexpr const char* kName = "com.tarsil.kvragent";
@@ -16,7 +16,7 @@ class RawBusClient {
   static constexpr const char* kInterface = "com.tarsil.kvragent.KVRAgentProtocol";
 
   struct Reply {
-    BusMessageRef message;  ///< null when it was an error
+    BusMessageRef message;  ///< null after an error
     std::string error;      ///< the error's name
     std::string errorText;
   };
@@ -31,7 +31,7 @@ class RawBusClient {
   }
 
   sd_bus* bus() const { return bus_.get(); }
-  /// A call of the service's interface with arguments of the bus's basic types and records.
+  /// A call of the service's interface; arguments are of basic types or records.
   BusMessageRef newCall(const char* member, std::string_view types = "", const Array& arguments = {}) const {
     sd_bus_message* message = nullptr;
     require(sd_bus_message_new_method_call(bus(), &message, kName, kPath, kInterface, member), member);
@@ -56,16 +56,16 @@ class RawBusClient {
   Reply call(const char* member, std::string_view types = "", const Array& arguments = {}) const {
     return call(newCall(member, types, arguments));
   }
-  /// Sends a call and waits for nothing; an answer is expected all the same.
+  /// Sends a call without waiting; it still requests an answer.
   void send(const BusMessageRef& message) const {
-    std::uint64_t number = 0;  // without one, no answer would be expected
+    std::uint64_t number = 0;  // passing it requests an answer
     require(sd_bus_send(bus(), message.get(), &number), "sd_bus_send");
     require(sd_bus_flush(bus()), "sd_bus_flush");
   }
   void send(const char* member, std::string_view types = "", const Array& arguments = {}) const {
     send(newCall(member, types, arguments));
   }
-  /// The next answer to a call that was only sent; nothing when none comes.
+  /// The next answer to a call made with `send`; nothing when none arrives.
   std::optional<Reply> next() const {
     while (true) {
       sd_bus_message* message = nullptr;
@@ -77,20 +77,20 @@ class RawBusClient {
       return Reply{std::move(held), "", ""};
     }
   }
-  /// The value that a call replied; throws when it was an error.
+  /// The value in a reply; throws if it is an error.
   Value value(const char* type, const Reply& reply) const {
     if (!reply.message) throw std::runtime_error(reply.error + ": " + reply.errorText);
     Result<Value> value = readBusValue(reply.message.get(), type);
     if (!value) throw std::runtime_error(describe(value.error()));
     return *std::move(value);
   }
-  /// Waits until somebody on the bus has the service's name, or nobody has; false when nothing happens to it.
+  /// Waits until the service's name has an owner, or has none; false when the bus stays silent too long.
   bool waitForName(bool isOwned) const {
     const auto handler = [](sd_bus_message*, void*, sd_bus_error*) { return 0; };
     require(sd_bus_match_signal(bus(), nullptr, kBusName, nullptr, kBusName, "NameOwnerChanged", handler,
                                 nullptr),
             "sd_bus_match_signal");
-    // Every arrival and departure wakes it up, its own included; it is the service's name that counts.
+    // Every connection that comes or goes wakes this loop, so it checks the owner of the service's name.
     while ((sd_bus_get_name_creds(bus(), kName, 0, nullptr) >= 0) != isOwned) {
       const int processed = sd_bus_process(bus(), nullptr);
       require(processed, "sd_bus_process");
@@ -98,11 +98,12 @@ class RawBusClient {
     }
     return true;
   }
-  /// Makes this client leave the bus at once.
+  /// Leaves the bus at once.
   void leave() { bus_.reset(); }
 
  private:
-  static constexpr std::uint64_t kLimit = 60'000'000;  ///< in microseconds, only ever spent on a failure
+  static constexpr std::uint64_t kLimit =
+      60'000'000;  ///< in microseconds; only a failing test waits this long
 
   static void require(int result, const char* what) {
     if (result < 0) throw std::runtime_error(describe(busError(result, what)));

@@ -13,7 +13,7 @@
 
 namespace kvr::testing {
 
-/// Writes a file, with its missing parents.
+/// Writes a file and creates missing parent directories.
 inline void writeFile(const std::filesystem::path& path, std::string_view content) {
   std::filesystem::create_directories(path.parent_path());
   std::ofstream file(path, std::ios::binary);
@@ -21,14 +21,14 @@ inline void writeFile(const std::filesystem::path& path, std::string_view conten
   file << content << std::flush;
 }
 
-/// Nothing for a file that cannot be opened.
+/// The content of a file; nothing if it cannot be opened.
 inline std::optional<std::string> contentOfFile(const std::filesystem::path& path) {
   std::ifstream file(path, std::ios::binary);
   if (!file) return std::nullopt;
   return std::string(std::istreambuf_iterator<char>(file), {});
 }
 
-/// A fresh directory that is removed with everything in it at the end.
+/// A new directory that is removed with its contents in the destructor.
 class TemporaryDirectory {
  public:
   TemporaryDirectory() {

@@ -9,7 +9,7 @@ struct AnAgent : CoverageTest {
   static std::string serialNumberIn(const HTTPRequest& request) {
     return (*readJSON(request.body))["serialNumber"].string();
   }
-  /// The reply that will be there once the queues have run.
+  /// The reply is set once the queues have run.
   std::shared_ptr<std::optional<KVRDeviceInfoList>> allInfos() {
     auto reply = std::make_shared<std::optional<KVRDeviceInfoList>>();
     agent->getAllDeviceInfosUsingPolicy(
@@ -34,7 +34,7 @@ struct AnAgent : CoverageTest {
 
   std::shared_ptr<KVRAgent> agent =
       KVRAgent::initWithCallingProcessBundleID(world.platform, "com.example.client");
-  std::optional<bool> added;  ///< what the last call replied
+  std::optional<bool> added;  ///< the last reply
 };
 
 TEST_F(AnAgent, AnswersOverlappingCallsAfterTheLookupsOfBothWithOneRecordADevice) {

@@ -6,7 +6,7 @@
 namespace kvr {
 namespace {
 
-/// A warranty provider whose facts, but for the version and the locale, are plain fields.
+/// A warranty provider whose inputs, except version and locale, are plain fields.
 struct FakeWarrantyProvider : KVRAgentDefaultWarrantyProvider {
   using KVRAgentDefaultWarrantyProvider::KVRAgentDefaultWarrantyProvider;
 

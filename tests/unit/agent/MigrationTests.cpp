@@ -45,7 +45,7 @@ TEST_F(Migration, BringsWhatThereIsOfTheOldLayoutToTheNewOneOnce) {
     EXPECT_EQ(world.files.list(kFolder).size(), hasFile ? 1U : 0U);
     EXPECT_EQ(preferences.dateForKey(metadata.lastUpdatedDateKey), dateWhere(moves && hasDate));
     EXPECT_EQ(preferences.dateForKey("CachedWarrantyLastUpdatedDate"), dateWhere(hasDate && !moves));
-    const bool pairMoves = moves && hasLocale;  // a version goes with its locale
+    const bool pairMoves = moves && hasLocale;  // a version moves only together with its locale
     const Value locale = hasLocale ? Value("en_US") : Value(), version = hasVersion ? Value("1") : Value();
     EXPECT_EQ(preferences.objectForKey(metadata.localeKey), pairMoves ? locale : Value());
     EXPECT_EQ(preferences.objectForKey("CachedWarrantyLocale"), pairMoves ? Value() : locale);

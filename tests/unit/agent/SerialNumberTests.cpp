@@ -17,7 +17,7 @@ struct AnySerialNumber : AnOfferTest {
       return HTTPResponse{200, *writeJSON(due(10)), {}};
     };
   }
-  /// From here on it is the local device's, with what an earlier version left behind.
+  /// Gives the local device this serial number and the files of an earlier version.
   void become(const std::string& serialNumber) {
     world.deviceProperties.answers["SerialNumber"] = serialNumber;
     world.preferences.removeObject(preference::kMigrationVersion);
@@ -25,7 +25,7 @@ struct AnySerialNumber : AnOfferTest {
     asked.clear();
     world.log.clear();
   }
-  /// Whose the answer is, and whether it has a warranty.
+  /// The serial number in the answer, and whether it has a warranty.
   std::pair<std::optional<std::string>, bool> lookUp(const std::string& serialNumber, std::uint64_t policy) {
     KVRDeviceInfoRef info;
     agent->getDeviceInfoForSerialNumber(
@@ -39,7 +39,7 @@ struct AnySerialNumber : AnOfferTest {
   }
 
   const std::shared_ptr<KVRAgent> agent = KVRAgent::initWithCallingProcessBundleID(world.platform, "client");
-  std::set<std::string> asked;  ///< the serial numbers that the service was asked about
+  std::set<std::string> asked;  ///< the serial numbers in requests to the service
 };
 
 TEST_F(AnySerialNumber, IsMigratedLookedUpPostedRefreshedAndDismissedAsItIs) {

@@ -10,7 +10,7 @@ namespace {
 
 constexpr const char* kActivities = "/home/user/Library/Activities/com.tarsil.kvragent.plist";
 
-/// Makes a device one that was set up earlier, and on which nothing has changed since.
+/// Prepares a device that is already set up, with no upgrade or boot since.
 void setUp(CoverageWorld& world) {
   world.preferences.setObject("https://assets.example/kvrV2.plist", preference::kServerVersionURL);
   world.preferences.setObject(true, preference::kPostUpgradeActivityCompleted);
@@ -49,7 +49,7 @@ TEST_F(AStart, ServesTheBootBeforeTheUpgradeAndHasThatStoredInBetween) {
 
 TEST_F(AStart, RunsNoActivityBeforeItIsThrough) {
   world.preferences.setObject(inDays(-1), std::string(names::kOutreach) + names::kTargetDateSuffix);
-  // What other threads would do while migration asks for the device.
+  // Simulates other threads that run while migration asks for the device.
   world.deviceProperties.whenAsked = [this] { world.queues.run(); };
   const StartUp startUp(world.platform);
   world.deviceProperties.whenAsked = nullptr;

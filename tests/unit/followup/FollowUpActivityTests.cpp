@@ -8,13 +8,13 @@ namespace kvr {
 namespace {
 
 struct AFollowUpActivity : AnOfferTest {
-  /// The date in days from now, to a thousandth.
+  /// A date in days from now, rounded to a thousandth.
   std::optional<double> days(std::optional<Date> date) const {
     if (!date) return std::nullopt;
     return std::round((*date - world.clock.now()) / kDay * 1000) / 1000;
   }
   std::optional<double> targetDays(const char* identifier) { return days(target(identifier)); }
-  /// Runs an activity whose devices are `list`; its result.
+  /// Runs an activity whose device query returns `list`; returns its result.
   template <class Activity>
   std::optional<ActivityResult> runWith(const std::optional<KVRDeviceInfoList>& list) {
     policy = 0;
@@ -24,7 +24,7 @@ struct AFollowUpActivity : AnOfferTest {
     });
   }
 
-  std::uint64_t policy = 0;  ///< that the last one asked for
+  std::uint64_t policy = 0;  ///< the policy of the last device query
   const Date old = inDays(-100);
 };
 
@@ -35,12 +35,12 @@ TEST_F(AFollowUpActivity, FindsTheNextPostDate) {
       {{}, {}},
       {{info("A", shownInDays(5, 30), old), info("B", shownInDays(3, 30), old)}, 3},
       {{info("A", shownInDays(4, 2), old)}, 2},
-      {{info("A", shownInDays(4, -2), old), info("B", shownInDays(3, -5), old)}, -2},  // ends the scan
+      {{info("A", shownInDays(4, -2), old), info("B", shownInDays(3, -5), old)}, -2},  // the scan ends here
       {{info("posted", shownInDays(3, -5), old), info("B", off), info("C", {})}, {}},
       {{info("A", shownInDays(3, 30), inDays(6))}, 6},
-      {{info("A", shownInDays(-3, 30))}, {}},  // activated now
+      {{info("A", shownInDays(-3, 30))}, {}},  // an unknown activation date counts as now
       {{info("A", shownInDays(3, 30))}, 3},
-      {{info("A", offer(30), inDays(7))}, 7},  // never the end less its duration
+      {{info("A", offer(30), inDays(7))}, 7},  // not the end minus the duration
       {{info("A", offer(30), old)}, {}}};
   for (const auto& [list, next] : cases) {
     const auto found = KVRFollowUpPost::nextFollowUpPostDateWithDevicesInfo(world.platform, list);
@@ -56,9 +56,9 @@ TEST_F(AFollowUpActivity, FindsTheNextRefreshDate) {
       {{info("A", shownInDays(3, 20), old)}, 3, 1},
       {{info("A", shownInDays(0.25, 20), old)}, 0.25, 0.25},
       {{info("A", shownInDays(-1, 20.75), old), info("B", shownInDays(-1, 3.25), old)}, 0.25, 0.25},
-      {{info("A", offer(-1), old), info("B", shownInDays(-1, 2.5), old)}, -1, -1},  // ends the scan
+      {{info("A", offer(-1), old), info("B", shownInDays(-1, 2.5), old)}, -1, -1},  // the scan ends here
       {{info("A", Dictionary{}), info("B", {})}, {}, 1},
-      {{info("A", offer(2.5))}, {}, 0.5},  // shown from no known date
+      {{info("A", offer(2.5))}, {}, 0.5},  // without a display date
   };
   const auto next = [&](const KVRDeviceInfoList& list, bool isInitial) {
     return days(KVRFollowUpRefresh::nextFollowUpRefreshDateWithDevicesInfo(world.platform, list, isInitial));
@@ -81,7 +81,7 @@ TEST_F(AFollowUpActivity, PostsAndSchedulesWhatFollows) {
       {one(shownInDays(2, 30)), 2, {}},
       {one(shownInDays(-2, 2.5)), {}, 0.5},
       {one(shownInDays(-2, 0.25)), {}, 0.25},
-      {one(offer(-1), "B"), 1, {}},  // not back to back
+      {one(offer(-1), "B"), 1, {}},  // never back to back
       {KVRDeviceInfoList{info("B", offer(-1), old), info("C", shownInDays(0.25, 30), old)}, 0.25, {}},
       {KVRDeviceInfoList{info("B", offer(-1), old), info("C", shownInDays(4, 30), old)}, 1, {}},
   };
@@ -139,7 +139,7 @@ TEST_F(AFollowUpActivity, PutsOffOnlyARefreshThatDoesNotLieAhead) {
 }
 
 TEST_F(AFollowUpActivity, ShowsEveryCountOfShortDaysFromItsMomentOn) {
-  constexpr double kShortDay = 10;  // seconds
+  constexpr double kShortDay = 10;  // in seconds
   world.preferences.setObject(kShortDay, preference::kOneDayInterval);
   const Date end = world.clock.now() + 20.5 * kShortDay;
   const KVRDeviceInfoList list{info("A", due((end - world.clock.now()) / kDay), old)};

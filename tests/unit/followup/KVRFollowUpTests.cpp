@@ -7,7 +7,7 @@ namespace {
 constexpr const char* kPosted = preference::kFollowUpPostedHashes;
 constexpr const char* kDismissed = preference::kFollowUpDismissedHashes;
 
-/// Refuses what it is told to, and remembers the calls.
+/// Fails as the test sets, and records the calls.
 struct RecordingProvider : KVRFollowUpProvider {
   std::vector<FollowUpItem> pending;
   std::optional<Error> postError, clearError, listError;
@@ -143,7 +143,7 @@ TEST_F(AFollowUp, RefreshesByTheFirstRuleThatApplies) {
   for (const auto& [warranty, pending, force, shown, lines] : cases) {
     provider->pending.clear();
     if (pending) provider->pending = {item("own", 2, {{"FollowupSerialNumber", "SN"}})};
-    recordDismissal("SN", inDays(-1));  // counts for nothing here
+    recordDismissal("SN", inDays(-1));  // must have no effect here
     newLines();
     EXPECT_THAT(recorded.refreshFollowupWithDeviceInfo(info("SN", warranty), force), SizeIs(shown ? 1 : 0));
     std::erase_if(provider->posts, [](const FollowUpItem& post) { return post.uniqueIdentifier != "own"; });

@@ -10,9 +10,9 @@
 namespace kvr {
 namespace {
 
-/// The agent's activities in a world whose coverage service answers from a table.
+/// Runs the agent's activities; the coverage service answers from a table.
 struct TheAgentsLife : AnOfferTest {
-  std::map<std::string, Value> warranties;  ///< by serial number; the others' downloads fail
+  std::map<std::string, Value> warranties;  ///< by serial number; other downloads fail
 
   TheAgentsLife() {
     world.preferences.setObject("https://assets.example/kvrV2.plist", preference::kServerVersionURL);
@@ -140,7 +140,7 @@ TEST_F(TheAgentsLife, MovesTheConversionOutreachToEarlierDatesOnly) {
   const std::tuple<std::optional<double>, double, const char*> cases[] = {
       {50, 50, "scheduling conversion outreach %"},    {60, 50, ""}, {{}, 50, ""}, {40, 50, ""},
       {30, 30, "Re-scheduling conversion outreach %"}, {30, 30, ""}};
-  // A record without a date is no reason to schedule, nor is one after it.
+  // A warranty without a date does not schedule, and neither does one with a later date.
   for (const auto& [days, scheduled, said] : cases) {
     Dictionary warranty;
     if (days) warranty["zubOfferConversionDate"] = inDays(*days).secondsSince1970;

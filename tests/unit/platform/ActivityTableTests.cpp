@@ -9,7 +9,7 @@ constexpr auto kDeferred = ActivityResult::Deferred;
 const ActivityBlock kBlock = [](const ActivityHandler&) {};
 
 struct AnActivityTable : ::testing::Test {
-  /// What starts now, by name.
+  /// The identifiers of the activities that start now.
   std::vector<std::string> started() {
     std::vector<std::string> names;
     for (auto& run : table.takeDue(now)) {
@@ -29,7 +29,7 @@ struct AnActivityTable : ::testing::Test {
     now.date = now.date + seconds;
     now.uptime += seconds;
   }
-  /// Lets time pass until something is due.
+  /// Lets time pass until an activity is due.
   std::vector<std::string> next() {
     pass(table.secondsToNext(now).value());
     return started();
@@ -111,13 +111,13 @@ TEST_F(AnActivityTable, RunsAgainAtTheDateADeferredRunWaitsFor) {
   EXPECT_THAT(table.secondsToNext(now), Optional(499.0 + 86400));
   now.date = now.date + 315'360'000;
   EXPECT_THAT(started(), ElementsAre("a"));
-  // A date that is not ahead, or is none, says nothing.
+  // A date that is not in the future, or is NaN, has no effect.
   table.setEarliestDate("a", now.date - 10, now);
   table.setEarliestDate("a", Date{std::numeric_limits<double>::quiet_NaN()}, now);
   end("a", kDeferred);
   EXPECT_THAT(table.secondsToNext(now), Optional(10.0));
   EXPECT_THAT(next(), ElementsAre("a"));
-  table.setEarliestDate("a", now.date + 0.001, now);  // again and again: no spinning
+  table.setEarliestDate("a", now.date + 0.001, now);  // repeated without end, this must not spin
   end("a", kDeferred);
   EXPECT_THAT(table.secondsToNext(now), Optional(::testing::DoubleNear(ActivityTable::kShortestCycle, 1e-6)));
 }
@@ -150,7 +150,7 @@ TEST_F(AnActivityTable, SpacesOutWhatReactionsRegisterAgainAndAgainAndNothingEls
     const Value held = table.tree()["activities"]["a"]["heldUntilDate"];
     EXPECT_EQ(held.isNull(), *table.secondsToNext(now) == 0) << "the file says so while it waits";
     EXPECT_THAT(next(), ElementsAre("a"));
-    if (const auto heldUntil = react()) told.push_back(*heldUntil);  // by the run itself
+    if (const auto heldUntil = react()) told.push_back(*heldUntil);  // registered by the run itself
     pass(1);
     EXPECT_THAT(started(), IsEmpty());
     end("a", kFinished);

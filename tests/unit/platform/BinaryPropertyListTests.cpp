@@ -25,7 +25,7 @@ std::string bytesOf(const Trailer& trailer) {
          bigEndian(trailer.count, 8) + bigEndian(trailer.top, 8) + bigEndian(trailer.table, 8);
 }
 
-/// A list of the objects, whose references take two bytes; the first is the root.
+/// A property list of these objects with two-byte references; the first object is the root.
 std::string listOf(const std::vector<std::string>& objects) {
   std::string out = "bplist00";
   std::string table;
@@ -43,7 +43,7 @@ std::string arrayOf(const std::vector<unsigned>& objects) {
   return out;
 }
 
-/// Each of `levels` arrays holds the next one twice; the last holds the string object twice.
+/// `levels` arrays, each of which refers to the next one twice; the last one refers to the string twice.
 std::vector<std::string> doublingArrays(unsigned levels, const std::string& string) {
   std::vector<std::string> objects;
   for (unsigned i = 1; i <= levels; ++i) objects.push_back(arrayOf({i, i}));
@@ -126,7 +126,7 @@ TEST(ABinaryPropertyList, IsRefusedForAnyFaultOfItsTrailer) {
 }
 
 TEST(ABinaryPropertyList, CannotClaimTheSameBytesWithoutEnd) {
-  // Many strings, and the keys of many dictionaries, all made of the same megabyte.
+  // Many strings, or the keys of many dictionaries, that all refer to the same megabyte.
   constexpr unsigned kMany = 1000;
   const auto string = "\x5F\x12" + bigEndian(1 << 20, 4) + std::string(1 << 20, 'x');
   std::vector<unsigned> all;

@@ -30,7 +30,7 @@ TEST(ATree, ComesBackEqualThroughEveryEncoding) {
   const auto json = writeJSON(tree);
   const auto read = throughPropertyList(throughPropertyList(*readJSON(*json), kXML), kBinary);
   EXPECT_TRUE(read == tree);
-  // The text also tells -0.0 from 0.0 and 1.0 from 1, which compare equal.
+  // Comparing the text as well tells -0.0 from 0.0 and 1.0 from 1, which are equal as values.
   EXPECT_TRUE(*writeJSON(read) == *json);
 }
 

@@ -6,7 +6,7 @@ namespace {
 
 constexpr const char* kKey = "test.TargetDate";
 
-/// Does what the test says.
+/// An activity whose work the test sets.
 struct FakeActivity : KVRSchedulerActivityDelegate {
   bool network = false;
   std::function<void(ActivityHandler)> work = [](const ActivityHandler& handler) {

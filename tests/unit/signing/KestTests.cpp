@@ -15,7 +15,7 @@ constexpr const char* kUnsupported = "-[KVRKestManager generateKestCertficate:]:
 constexpr const char* kGenerated = "Kest certificate generation success: 1";
 constexpr const char* kNotGenerated = "Kest certificate generation success: 0";
 
-/// Bytes like those of a certificate: the same every time, and without any pattern to compress.
+/// Bytes that resemble a certificate: always the same, and hardly compressible.
 std::string certificate(unsigned seed) {
   std::mt19937 random(seed);
   std::string bytes(600, '\0');
@@ -109,7 +109,7 @@ TEST_F(DeviceAttestationHeaders, AreLeftOutAndTheReasonLoggedWhenTheyCannotBeMad
   expect({kUnsupported, kNotGenerated}, {}, kNone, [](auto& a) { a.supported = false; });
   expect(ungenerated, {"Failed to create access control: " + describe(locked)}, kNone,
          [&](auto& a) { a.accessControlError = locked; });
-  // Only the attestation service's own code says that a certificate is missing.
+  // The code means a missing certificate only in the domain of the attestation service.
   const Error elsewhere{"elsewhere", -11, "not issued"};
   expect(ungenerated, {generationFailed(describe(elsewhere))}, kNone,
          [&](auto& a) { a.preferred.error = elsewhere; });
@@ -124,7 +124,7 @@ TEST_F(DeviceAttestationHeaders, AreLeftOutAndTheReasonLoggedWhenTheyCannotBeMad
     a.fallback.chain.reset();
   });
   expect(timedOut, {}, kNone, [](auto& a) { a.preferred.delay = 60.001; });
-  // Both attempts share one limit.
+  // Both attempts share one time limit.
   expect(timedOut, {fellBack(-11)}, kNone, [](auto& a) {
     a.preferred = Attestation::failed(-11, 31);
     a.fallback.delay = 30;

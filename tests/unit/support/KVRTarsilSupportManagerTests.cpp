@@ -8,7 +8,7 @@ namespace {
 constexpr const char* kBundle = "com.tarsil.support";
 
 struct TheSupportApplication : SimulatedTest {
-  /// What the whole answer, or the store's part, holds besides the bundle.
+  /// The entries of the whole answer, or of its store part, without the bundle identifier.
   Value answer(bool storeOnly = false) {
     Array answers;
     const AvailabilityReply reply(world.log, "test", [&](const Value& it) { answers.push_back(it); });

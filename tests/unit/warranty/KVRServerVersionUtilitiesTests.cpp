@@ -13,7 +13,7 @@ Value pairOf(Value low, Value high) {
 
 std::string asset(const Value& tree) { return *writePropertyList(tree, PropertyListEncoding::XML); }
 
-/// A client that speaks versions 2 and 3, and the answers it comes to.
+/// A client that supports versions 2 and 3, and its results.
 struct Client : SimulatedPlatform {
   Client() {
     preferences.registerDefaults({{preference::kLowServerVersion, 2},
@@ -64,8 +64,8 @@ TEST(TheVersionNegotiation, SharesTheVersionsThatBothSidesSpeak) {
 }
 
 TEST(TheVersionNegotiation, TakesTheServersPairFromThePolicysSources) {
-  // Which source wins shows in the answer: only the cache lacks the high version, only the asset is stored
-  // anew.
+  // The results show which source was used: only the cached pair lacks the high version, and only the asset's
+  // pair is stored again.
   const Value cached = pairOf(1, 2);
   const Value published = pairOf(3, 9);
   const std::tuple<std::uint64_t, bool, bool, bool, std::size_t, Value> cases[] = {
@@ -83,7 +83,7 @@ TEST(TheVersionNegotiation, TakesTheServersPairFromThePolicysSources) {
     SCOPED_TRACE(format("%d %d %d", policy, hasCache, hasAsset));
     Client client;
     if (hasCache) client.preferences.setObject(cached, preference::kServerVersionCache);
-    if (hasAsset) client.http.respond(404, asset(published));  // the status plays no part
+    if (hasAsset) client.http.respond(404, asset(published));  // the status does not matter
     EXPECT_EQ(client.highEnabled(policy), high);
     EXPECT_EQ(client.http.requests().size(), requests);
     EXPECT_EQ(client.cache(), cacheAfter);

@@ -24,7 +24,7 @@ struct ADownload : CoverageTest {
     EXPECT_EQ(answers.size(), 1U);
     return answers.at(0);
   }
-  /// Has the service answer this conversion date.
+  /// Makes the service answer with this conversion date.
   void converts(const std::string& epoch) {
     world.coverage = [epoch](auto&) {
       return HTTPResponse{200, "{\"zubOfferConversionDate\":" + epoch + "}", {}};
@@ -172,7 +172,7 @@ TEST_F(ADownload, SchedulesAConversionOutreachOnceThoughNothingCanBeStored) {
 }
 
 TEST_F(ADownload, StoresAConversionDateThatCouldNotBeStoredBefore) {
-  // Where nothing could be stored, and where the cached answer holds the date already.
+  // When nothing could be stored, and when the cached answer already contains the date.
   for (const bool isCached : {false, true}) {
     const Date date{1'900'000'000.0 - isCached};
     converts(std::to_string(1'900'000'000 - isCached));
@@ -190,7 +190,7 @@ TEST_F(ADownload, StoresAConversionDateThatCouldNotBeStoredBefore) {
     world.files.setWriteFault(std::nullopt);
     world.files.setWriteFault(preferences, std::nullopt);
     EXPECT_TRUE(download(device).success);
-    // What a killed agent finds, with that by which the run is taken up again.
+    // The files of a killed agent contain the date and what resumes the run.
     const auto registered =
         world.files.getPropertyList("/home/user/Library/Activities/com.tarsil.kvragent.plist");
     EXPECT_TRUE(registered["activities"].contains(names::kConversionOutreach));

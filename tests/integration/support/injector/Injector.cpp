@@ -1,5 +1,5 @@
-// To be loaded before the C library (LD_PRELOAD): has one call about files end the program or fail, as the
-// page tells that it shares with the test.
+// Loaded before the C library (LD_PRELOAD): kills the program at one call on files, or makes calls fail, as
+// set in the page that it shares with the test.
 #include "integration/support/Injection.h"
 
 #include <dlfcn.h>
@@ -20,7 +20,7 @@ namespace {
 
 using kvr::testing::Injection;
 
-/// What is known of the descriptors that count.
+/// The kind of each open descriptor.
 enum class Opened : unsigned char { Elsewhere, File, Directory };
 std::array<std::atomic<Opened>, 1024> opened{};
 
@@ -55,7 +55,7 @@ void note(long descriptor, Opened kind) {
   }
 }
 
-/// One call that counts: whether it is to fail. `atTheEnd` is what is still done when the program ends in it.
+/// Counts a call; returns whether it must fail. If the program must be killed here, runs `atTheEnd` first.
 template <class Do = void (*)()>
 bool fails(const Do& atTheEnd = [] {}) {
   auto& shared = *page();
@@ -116,7 +116,7 @@ ssize_t write(int descriptor, const void* bytes, size_t size) {
   return ::syscall(SYS_write, descriptor, bytes, size);
 }
 
-/// Counts only: no power fails in a test, and the disk would take most of its time.
+/// Only counts: tests do not lose power, and syncing to disk would take most of their time.
 int fsync(int descriptor) {
   const auto kind = kindOf(descriptor);
   if (kind == Opened::Elsewhere) return 0;
@@ -125,7 +125,7 @@ int fsync(int descriptor) {
   return 0;
 }
 
-/// A descriptor is closed whatever the call says.
+/// The descriptor is closed even if the call reports an error.
 int close(int descriptor) {
   const bool isToFail = kindOf(descriptor) != Opened::Elsewhere && fails();
   const int error = errno;
