@@ -230,8 +230,8 @@ TEST_F(TheAgentsStores, AreTheOldOrTheNewOnesWhateverCallFailsAndNormalWithoutAR
   const auto client = world.newClient();
   int round = 0;
   unsigned calls = 0;
-  /// Makes a change while some calls fail, and again while none does; returns whether the failing calls were
-  /// reached.
+  /// Makes a change while some calls fail, and again while none does; sets `calls` to the number of
+  /// calls made.
   const auto change = [&](const Store& store, unsigned first, unsigned last, int error) {
     SCOPED_TRACE(store.folder + ", call " + std::to_string(first) + ": " + std::strerror(error));
     restore(store, ++round);
