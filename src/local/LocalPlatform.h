@@ -43,7 +43,7 @@ struct LocalPlatform {
   /// `busLost` is called on the bus thread; see `LocalServiceListeners`.
   LocalPlatform(EventLoop& mainLoop, std::unique_ptr<LocalLog> log, std::function<void()> busLost);
 
-  /// From here on the agent starts nothing new of its own accord. Call it before leaving the loop, which
+  /// From here on the agent starts nothing new on its own. Call it before leaving the loop, which
   /// drops delayed work.
   void beginEnding();
   /// Fails open requests, waits until running work has finished and sends the replies. False when some work

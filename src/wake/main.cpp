@@ -132,10 +132,9 @@ class Waker {
     bus_.thread()->post([this] { loop_.exit(EXIT_SUCCESS); });
   }
 
-  bool isActing_ = false;    ///< the agent has ended
-  bool isStarting_ = false;  ///< the next agent is being started
-  std::vector<std::string_view>
-      heard_;  ///< in order; of each name at most as many as are handled individually
+  bool isActing_ = false;                ///< the agent has ended
+  bool isStarting_ = false;              ///< the next agent is being started
+  std::vector<std::string_view> heard_;  ///< in order; of each name at most `kMostInARow`
   EventLoop loop_;
   const std::unique_ptr<LocalLog> log_ = LocalLog::fromEnvironment();
   LocalClock clock_;

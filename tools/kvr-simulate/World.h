@@ -51,8 +51,7 @@ struct World {
   SimulatedDeviceAttestation::Outcome attestation;
   bool hasAttestation = true;
   bool isNetworkReachable = true;
-  std::vector<std::string> hosts{"coverage.tarsil.example",
-                                 "assets.tarsil.example"};  ///< all hosts ever configured
+  std::vector<std::string> hosts{"coverage.tarsil.example", "assets.tarsil.example"};  ///< ever configured
 };
 
 }  // namespace kvr::simulate

@@ -46,8 +46,7 @@ class DeviceRoot {
   const std::string directory_;
   mutable std::mutex mutex_;
   mutable std::map<std::string, std::string> resolved_;  ///< by the path as given
-  mutable std::map<std::string, std::string>
-      distrust_;  ///< the reason, by the path of each file that is ignored
+  mutable std::map<std::string, std::string> distrust_;  ///< the reason, by the path of each ignored file
 };
 
 }  // namespace kvr

@@ -78,8 +78,7 @@ class SimulatedWorkQueues : public WorkQueues {
   class SimulatedSignal;
   struct Runner;
   struct Waiter;
-  using EventKey =
-      std::pair<double, std::uint64_t>;  ///< the virtual time when it is due, then the order of scheduling
+  using EventKey = std::pair<double, std::uint64_t>;  ///< virtual time when due, then order of scheduling
 
   EventKey schedule(double delay, std::function<void()> event);
   void cancel(const EventKey& key) { events_.erase(key); }

@@ -17,8 +17,7 @@ struct Injection {
 
   std::atomic<std::uint32_t> first{0};  ///< the first call that fails, counted from 1; 0 for none
   std::atomic<std::uint32_t> last{0};   ///< the last one that fails
-  std::atomic<std::int32_t> error{
-      0};  ///< the errno of the failing calls, or `kKill` to kill the program instead
+  std::atomic<std::int32_t> error{0};   ///< their errno, or `kKill` to kill the program instead
   std::atomic<std::uint32_t> calls{0};
   std::atomic<std::uint32_t> fileSyncs{0};
   std::atomic<std::uint32_t> directorySyncs{0};

@@ -102,8 +102,7 @@ class RawBusClient {
   void leave() { bus_.reset(); }
 
  private:
-  static constexpr std::uint64_t kLimit =
-      60'000'000;  ///< in microseconds; only a failing test waits this long
+  static constexpr std::uint64_t kLimit = 60'000'000;  ///< microseconds; only a failing test waits this long
 
   static void require(int result, const char* what) {
     if (result < 0) throw std::runtime_error(describe(busError(result, what)));
