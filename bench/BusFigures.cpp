@@ -162,7 +162,7 @@ void allInfos() {
     serialNumbers.emplace_back(AgentWorld::kPhone);
     writeCaches(programs, serialNumbers);
     programs.startAgent();
-    // A file so young that a further change could leave the same times is parsed at every reading.
+    // A file that changed a moment ago is parsed at every read.
     std::this_thread::sleep_for(std::chrono::milliseconds(100));
     const RawBusClient client = programs.newClient();
     const Value infos = AgentWorld::allInfos(client, AgentWorld::CacheOnly);

@@ -43,7 +43,7 @@ class Programs {
   pid_t bare() const { return bare_->pid(); }
   /// Lets the agent download the phone's coverage and waits until its files count as settled.
   void fillCache() const;
-  /// A client whose own connection time is not measured.
+  /// A new client on the bus of the two.
   RawBusClient newClient() const { return world.newClient(); }
 
   AgentWorld world{AgentWorld::Attestation::Optional};

@@ -1,4 +1,4 @@
-// kvr-bench [FIGURE...]: measures the figures, all of them by default, and prints a row or more of each.
+// kvr-bench [FIGURE...]: measures the given figures, by default all, and prints at least one row for each.
 
 #include "Figures.h"
 

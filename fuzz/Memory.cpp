@@ -16,7 +16,7 @@
 namespace {
 
 std::size_t allocations = 0;
-std::size_t failing = 0;  ///< the allocation that fails, counted from 1; 0 for none
+std::size_t failing = 0;  ///< number of the allocation that fails, from 1; 0 for none
 std::ptrdiff_t held = 0;
 
 /// Whether this allocation must fail.

@@ -36,7 +36,7 @@
 
 namespace kvr {
 
-/// The platform on this machine, as the environment describes it.
+/// The platform on this machine, configured by the environment.
 ///
 /// Build it on the main thread before the main loop runs. After the loop: call `end`, then destroy.
 struct LocalPlatform {

@@ -8,14 +8,14 @@
 
 namespace kvr {
 
-/// Records the requests.
+/// Records the requests for a clean exit.
 class SimulatedCleanExit : public CleanExit {
  public:
   explicit SimulatedCleanExit(const Clock& clock) : clock_(clock) {}
 
   void requestWhenIdle() override { requests.push_back(clock_.now()); }
 
-  std::vector<Date> requests;  ///< when it was asked for
+  std::vector<Date> requests;  ///< when each was made
 
  private:
   const Clock& clock_;

@@ -18,10 +18,12 @@ struct SimulatedPeer {
   std::int32_t processIdentifier = 1000;
 };
 
-/// One client's connection to a service, from both ends. The test holds the client's end:
+/// One client's connection to a service, seen from both ends. The test has the client's end:
 ///
-///     const auto client = simulated.services.connect("com.tarsil.kvragent", {{{"entitlement", true}},
-///     1234}); const auto call = client->invoke("PairedDevices"); simulated.queues.run();
+///     const auto client =
+///         simulated.services.connect("com.tarsil.kvragent", {{{"entitlement", true}}, 1234});
+///     const auto call = client->invoke("PairedDevices");
+///     simulated.queues.run();
 ///     ASSERT_TRUE(client->isAccepted());
 ///     EXPECT_EQ(*call->reply, Value::Array{});
 class SimulatedServiceConnection : public ServiceConnection,

@@ -107,7 +107,7 @@ struct AnAttestation : ::testing::Test {
             .identifierGroups = {std::string(DeviceAttestation::kDeviceIdentifiers),
                                  std::string(DeviceAttestation::kHardwareProperties)}};
   }
-  /// Asks in a new process and returns the answer.
+  /// Asks through a new `Process` and returns the answer.
   Answer issued(bool usesFallbackKind = false) { return Process(*this).ask(options(usesFallbackKind)).get(); }
   void expectGood(const Answer& answer) const {
     ASSERT_FALSE(answer.error) << describe(*answer.error);

@@ -17,7 +17,7 @@ class Service {
     std::string root;
     std::string authority;   ///< path of a certificate file; empty for none
     std::string accounts;    ///< path of a property list; empty for none
-    std::string storefront;  ///< empty for the account's own
+    std::string storefront;  ///< empty: the account's own
   };
 
   /// Adds its handlers to `server`, which must stop serving before this is destroyed.

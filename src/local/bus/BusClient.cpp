@@ -27,7 +27,7 @@ class CallReply {
   ~CallReply() {
     try {
       if (!given_) give(std::nullopt);
-    } catch (...) {  // NOLINT(bugprone-empty-catch): without memory for one message the caller waits
+    } catch (...) {  // NOLINT(bugprone-empty-catch): out of memory, so the caller gets no answer
     }
   }
 

@@ -17,10 +17,10 @@ namespace kvr {
 /// Notifications as signals on the session bus, which anyone on it may send:
 /// `com.tarsil.NotificationCenter.Posted` from `/com/tarsil/NotificationCenter`, with the name.
 ///
-/// Only the notifications that somebody has registered for are subscribed to on the bus. Normally a handler is called
-/// at once for each. A *row* is a series of notifications with no pause of a second: its first sixteen are
-/// handled one by one. Any further one within half a second of the last call counts as a flood, and one call
-/// stands for all of it. So a flood costs two calls a second, and a call always follows the last
+/// Only the notifications that somebody has registered for are subscribed to on the bus. Normally each one
+/// calls the handler at once. A *row* is a series of notifications without a pause of a second: its first
+/// sixteen are handled one by one. Any further one within half a second of the last call counts as a flood,
+/// and one call stands for all of it. So a flood costs two calls a second, and a call always follows the last
 /// notification.
 class LocalNotifications : public Notifications {
  public:

@@ -40,7 +40,7 @@ std::optional<std::string> factIn(std::string_view text) {
   return std::string(text);
 }
 
-/// The value of a variable in an os-release file: the last assignment, in quotes or plain.
+/// The value of a variable in an os-release file: from its last assignment, with or without quotes.
 std::optional<std::string> variable(std::string_view text, std::string_view name) {
   std::optional<std::string> found;
   while (!text.empty()) {

@@ -145,7 +145,7 @@ Result<CertifiedKey> LocalKeyStore::issueLeaf(const std::string& base, const Req
   return CertifiedKey{*key, *leaf};
 }
 
-/// Nothing when a file is missing or damaged.
+/// The pair in the files; nothing when one is missing or damaged.
 Result<std::optional<LocalKeyStore::KeyPair>> LocalKeyStore::readPair(const std::string& base,
                                                                       std::size_t certificates) {
   const auto keyText = contentOf(keyPath(base));
@@ -181,7 +181,7 @@ std::optional<Error> LocalKeyStore::writePair(const std::string& base, const Key
   return files_.replace(certificatePath(base), chain);
 }
 
-/// Nothing when the file is missing or larger than any key or chain could be.
+/// The content of a file; nothing when it is missing or larger than any key or chain could be.
 Result<std::optional<std::string>> LocalKeyStore::contentOf(const std::string& path) {
   const auto contents = files_.read(path, kLargestFile);
   if (!contents) {

@@ -17,7 +17,7 @@ Result<void*> loadSymbol(const char* library, const char* symbol) {
     if (void* const handle = ::dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL | RTLD_NODELETE)) {
       if (void* const found = ::dlsym(handle, symbol)) return found;
     }
-    const char* const reason = ::dlerror();  // NOLINT(concurrency-mt-unsafe): glibc keeps one a thread
+    const char* const reason = ::dlerror();  // NOLINT(concurrency-mt-unsafe): glibc keeps one per thread
     reasons += (reasons.empty() ? "" : "; ") + std::string(reason == nullptr ? "unknown reason" : reason);
   }
   return Error{"loading", 0, reasons};
