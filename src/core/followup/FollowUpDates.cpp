@@ -69,6 +69,11 @@ std::optional<Date> nextRefreshDate(const std::vector<FollowUpDateFacts>& device
   return next;
 }
 
+Date refreshDate(const std::vector<FollowUpDateFacts>& devices, Date now, double day) {
+  const auto date = nextRefreshDate(devices, now, day, true);
+  return date ? *date : *nextRefreshDate(devices, now, day, false);
+}
+
 Date followingPostDate(Date next, const std::vector<FollowUpDateFacts>& devices, Date now, double day) {
   if (next > now) return next;
   const Date later = now + std::max(std::isfinite(day) ? day : 0, kLeastInterval);

@@ -23,6 +23,8 @@ std::optional<Date> nextPostDate(const std::vector<FollowUpDateFacts>& devices, 
 /// devices alone and may be nothing; otherwise it is a day from now at the latest.
 std::optional<Date> nextRefreshDate(const std::vector<FollowUpDateFacts>& devices, Date now, double day,
                                     bool isInitialCall);
+/// The initial form, or the other where that gives nothing although follow-ups are shown.
+Date refreshDate(const std::vector<FollowUpDateFacts>& devices, Date now, double day);
 
 /// The date for which the post activity schedules itself again after a run that computed `next`. It never
 /// runs back to back, whatever day length is stored.

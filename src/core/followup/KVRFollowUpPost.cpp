@@ -3,7 +3,6 @@
 #include "core/followup/DeviceFacts.h"
 #include "core/followup/FollowUpKeys.h"
 #include "core/followup/KVRFollowUp.h"
-#include "core/followup/KVRFollowUpRefresh.h"
 #include "core/scheduling/KVRScheduler.h"
 #include "core/warranty/LookupPolicy.h"
 #include "core/warranty/WarrantyKeys.h"
@@ -60,19 +59,20 @@ void KVRFollowUpPost::handle(const std::optional<KVRDeviceInfoList>& devicesInfo
 }
 
 void KVRFollowUpPost::postAndSchedule(const KVRDeviceInfoList& devicesInfo) {
-  // Taken before posting: a follow-up that comes due meanwhile then still counts as in the future.
+  const double day = platform_.preferences.doubleForKey(preference::kOneDayInterval);
+  // Taken before posting: what comes due, or counts a day less, meanwhile then still counts as in the future.
   const auto now = platform_.clock.now();
+  const auto factsBefore = dateFactsOf(platform_, devicesInfo);
   const bool hasPosted = KVRFollowUp(platform_).postFollowUpWithDevicesInfo(devicesInfo);
   const auto facts = dateFactsOf(platform_, devicesInfo);
   if (const auto next = nextPostDate(facts, now)) {
-    const auto date =
-        followingPostDate(*next, facts, now, platform_.preferences.doubleForKey(preference::kOneDayInterval));
+    const auto date = followingPostDate(*next, facts, now, day);
     platform_.log.standard("%s: Re-schedule followUp post for: %@", kPerform, date);
     KVRScheduler::newSchedulerWithActivityDelegate(platform_, shared_from_this())
         ->scheduleActivityForDate(date);
   }
   if (hasPosted) {
-    const auto date = KVRFollowUpRefresh::_refreshDateWithDevicesInfo(platform_, devicesInfo);
+    const auto date = refreshDate(factsBefore, now, day);
     platform_.log.standard("%s: Schedule refresh for: %@", kPerform, date);
     KVRScheduler::newSchedulerForActivity(platform_, names::kFollowUpRefresh)
         ->scheduleActivityForDate(date, RegistrationCause::Demand);

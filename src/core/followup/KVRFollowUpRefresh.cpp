@@ -8,6 +8,9 @@
 #include "core/warranty/WarrantyKeys.h"
 #include "platform/names/Names.h"
 
+#include <algorithm>
+#include <vector>
+
 namespace kvr {
 
 std::string KVRFollowUpRefresh::identifier() const { return names::kFollowUpRefresh; }
@@ -31,16 +34,22 @@ void KVRFollowUpRefresh::performActivityForScheduler(const std::shared_ptr<KVRSc
 
 void KVRFollowUpRefresh::refreshAndSchedule(const KVRDeviceInfoList& devicesInfo) {
   auto& log = platform_.log;
+  const double day = platform_.preferences.doubleForKey(preference::kOneDayInterval);
+  // Taken before the texts are written: a count that drops meanwhile is still to be shown.
+  const auto now = platform_.clock.now();
+  auto facts = dateFactsOf(platform_, devicesInfo);
   const auto shown = KVRFollowUp(platform_).refreshFollowupWithDeviceInfos(devicesInfo);
   if (shown.empty()) {
     log.standard("No followups present, don't schedule another refresh");
     return;
   }
   log.standard("Followup present, schedule refresh for %@", shown);
-  const auto now = platform_.clock.now();
-  const auto next = _refreshDateWithDevicesInfo(platform_, shown);
-  const auto date =
-      followingRefreshDate(next, now, platform_.preferences.doubleForKey(preference::kOneDayInterval));
+  std::vector<FollowUpDateFacts> shownFacts;
+  for (std::size_t i = 0; i < devicesInfo.size(); ++i) {
+    if (std::ranges::find(shown, devicesInfo[i]) != shown.end()) shownFacts.push_back(std::move(facts[i]));
+  }
+  const auto next = refreshDate(shownFacts, now, day);
+  const auto date = followingRefreshDate(next, now, day);
   if (date != next) log.standard("Next refresh for %@ would come too soon, put off", next);
   log.standard("Schedule next refresh for %@", date);
   // A date that comes from the calendar is not throttled, however soon it is.
@@ -56,8 +65,8 @@ std::optional<Date> KVRFollowUpRefresh::nextFollowUpRefreshDateWithDevicesInfo(
 
 Date KVRFollowUpRefresh::_refreshDateWithDevicesInfo(Platform& platform,
                                                      const KVRDeviceInfoList& devicesInfo) {
-  const auto date = nextFollowUpRefreshDateWithDevicesInfo(platform, devicesInfo, true);
-  return date ? *date : *nextFollowUpRefreshDateWithDevicesInfo(platform, devicesInfo, false);
+  return refreshDate(dateFactsOf(platform, devicesInfo), platform.clock.now(),
+                     platform.preferences.doubleForKey(preference::kOneDayInterval));
 }
 
 }  // namespace kvr

@@ -16,7 +16,10 @@ bool KVRPostUpgradeActivity::isOwed() const {
 
 void KVRPostUpgradeActivity::performActivityForScheduler(const std::shared_ptr<KVRScheduler>& /*scheduler*/,
                                                          ActivityHandler withCompletionHandler) {
-  isOwed() ? performFirstRun() : performLaterRun();
+  {
+    const auto turn = KVRScheduler::takeTurn(platform_);
+    isOwed() ? performFirstRun() : performLaterRun();
+  }
   recordOSVersion();
   withCompletionHandler(ActivityResult::Finished);
 }

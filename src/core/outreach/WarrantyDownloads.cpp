@@ -85,13 +85,13 @@ std::shared_ptr<KVRWarrantyDownloader> newWarrantyDownloader(Platform& platform,
           std::move(callingProcessBundleID),
           [&platform] { return KVRDevicesManager::sharedManager(platform)->defaultDevice()->serialNumber(); },
           [&platform](const KVRWarrantyRef& warranty, const KVRWarrantyRef& cachedWarranty) {
-            _scheduleConversionOutreachIfRequiredForWarranty(platform, warranty, cachedWarranty);
+            return _scheduleConversionOutreachIfRequiredForWarranty(platform, warranty, cachedWarranty);
           }});
 }
 
-void _scheduleConversionOutreachIfRequiredForWarranty(Platform& platform, const KVRWarrantyRef& warranty,
+bool _scheduleConversionOutreachIfRequiredForWarranty(Platform& platform, const KVRWarrantyRef& warranty,
                                                       const KVRWarrantyRef& andCachedWarranty) {
-  if (!warranty) return;
+  if (!warranty) return true;
   // Downloads of several devices get here concurrently. The lock makes sure that the earliest date wins.
   const auto turn = KVRScheduler::takeTurn(platform);
   makeUpForUnstoredDate(platform);
@@ -99,8 +99,9 @@ void _scheduleConversionOutreachIfRequiredForWarranty(Platform& platform, const 
   switch (conversionScheduling(facts)) {
     case ConversionScheduling::NothingNew:
     case ConversionScheduling::NoDate:
+      return true;
     case ConversionScheduling::NotEarlier:
-      return;
+      return facts.date != unstoredDate(platform)->date;
     case ConversionScheduling::Earlier:
       platform.log.standard("Re-scheduling conversion outreach %@", *facts.date);
       break;
@@ -110,6 +111,7 @@ void _scheduleConversionOutreachIfRequiredForWarranty(Platform& platform, const 
   }
   newConversionScheduler(platform)->scheduleActivityForDate(facts.date);
   storeScheduledDate(platform, *facts.date);
+  return !unstoredDate(platform)->date;
 }
 
 }  // namespace kvr

@@ -15,8 +15,9 @@ std::shared_ptr<KVRWarrantyDownloader> newWarrantyDownloader(Platform& platform,
 
 /// Schedules the conversion outreach if a downloaded warranty has a conversion date that differs from the
 /// cached one's and is earlier than the scheduled date. `andCachedWarranty` is the warranty cached so far, or
-/// null. Any thread.
-void _scheduleConversionOutreachIfRequiredForWarranty(Platform& platform, const KVRWarrantyRef& warranty,
+/// null. False when the date is news and could not be stored: the cache must then keep the earlier warranty,
+/// so that the date is still news for the next download. Any thread.
+bool _scheduleConversionOutreachIfRequiredForWarranty(Platform& platform, const KVRWarrantyRef& warranty,
                                                       const KVRWarrantyRef& andCachedWarranty);
 
 }  // namespace kvr

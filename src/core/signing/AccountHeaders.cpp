@@ -77,11 +77,14 @@ void addSessionHeaders(Platform& platform, HTTPRequest& request) {
   const auto add = [&](const std::string& name, const std::string& value) {
     if (const auto sent = sendable(platform.log, name, value)) request.headers.set(name, sent);
   };
-  HTTPRequest withSession = request;
-  platform.accountSession.addClientInfoHeader(withSession);
-  platform.accountSession.addDeviceIdentifierHeader(withSession);
-  for (const auto& [name, value] : withSession.headers.fields()) {
-    if (request.headers.value(name) != value) add(name, value);
+  // One after the other: a header that cannot be sent must not take the place of one that can.
+  for (const auto addHeader :
+       {&AccountSession::addClientInfoHeader, &AccountSession::addDeviceIdentifierHeader}) {
+    HTTPRequest withHeader = request;
+    (platform.accountSession.*addHeader)(withHeader);
+    for (const auto& [name, value] : withHeader.headers.fields()) {
+      if (request.headers.value(name) != value) add(name, value);
+    }
   }
   for (const auto& [name, value] : platform.accountSession.authenticationHeadersFor(request)) {
     add(name, value);

@@ -2,8 +2,6 @@
 
 #include "core/warranty/WarrantyKeys.h"
 #include "platform/codec/PropertyList.h"
-#include "platform/codec/PropertyListLimits.h"
-#include "platform/stores/PropertyListFiles.h"
 #include "platform/text/URL.h"
 
 #include <algorithm>
@@ -12,9 +10,10 @@ namespace kvr {
 namespace {
 
 constexpr std::size_t kLargestAsset = std::size_t{1} << 20U;  // bytes
-/// Half of what a preferences file can hold, so that an asset fits in beside everything else. Only a binary
-/// list can exceed this, through sharing.
-constexpr TreeExtent kLargestKept{kMaximumValues / 2, PropertyListFiles::kLimit / 2};
+/// What is kept of an asset goes into the preferences, which are read at every question: they have to stay
+/// small enough to be remembered once they are parsed.
+constexpr TreeExtent kLargestKept{std::size_t{1} << 17U, std::size_t{1} << 20U};
+constexpr std::size_t kLargestStored = std::size_t{2} << 20U;  // bytes
 constexpr std::string_view kVersionKeys[] = {preference::kLowServerVersion, preference::kHighServerVersion};
 
 /// A string's leading digits as a number; anything else as it is.
@@ -212,12 +211,21 @@ using DictionaryCompletion = KVRServerVersionUtilities::DictionaryCompletion;
 /// The result of a fetch: the bytes, or the error.
 using Fetched = Result<std::string>;
 
+/// Whether the asset can be stored as an entry of the preferences, which makes it one level deeper.
+bool canBeKept(const Value& asset) {
+  const auto stored = writePropertyList(Value::Dictionary{{preference::kServerVersionCache, asset}},
+                                        PropertyListEncoding::Binary);
+  return stored && stored->size() <= kLargestStored;
+}
+
 /// Reduces an asset that is too large to store to its versions, as numbers.
 Value versionsOf(Platform& platform, const Value& url, const Value& asset) {
   platform.log.error("The asset from URL '%@' holds more than can be kept: only its versions are", url);
   if (!asset.isDictionary()) return asset;
   Value::Dictionary versions;
-  for (const auto& [key, version] : asset.dictionary()) versions.emplace(key, asVersion(version));
+  for (const auto& key : kVersionKeys) {
+    if (const auto& version = asset[key]; !version.isNull()) versions.emplace(key, asVersion(version));
+  }
   return versions;
 }
 
@@ -234,7 +242,8 @@ void handleFetched(Platform& platform, const Value& url, bool shouldRetry, const
     completion({});
     return;
   }
-  const Value asset = parsed->isWhole ? parsed->tree : versionsOf(platform, url, parsed->tree);
+  const bool isKept = parsed->isWhole && canBeKept(parsed->tree);
+  const Value asset = isKept ? parsed->tree : versionsOf(platform, url, parsed->tree);
   if (asset.isDictionary()) {
     completion(asset);
   } else if (shouldRetry) {

@@ -165,8 +165,11 @@ void KVRWarrantyDownloader::finish(const Value& answer, const std::optional<std:
   platform_.log.standard("downloaded warranty: %@", answer);
   const KVRWarrantyRef warranty = KVRWarranty::warrantyWithDictionary(platform_, answer);
   const KVRWarrantyRef cached = KVRWarranty::cachedWarrantyForSerialNumber(platform_, serialNumber);
-  caller_.warrantyDownloaded(warranty, cached);
-  store(*warranty, serialNumber);
+  if (caller_.warrantyDownloaded(warranty, cached)) {
+    store(*warranty, serialNumber);
+  } else {
+    platform_.log.error("the warranty is not cached, its conversion date cannot be stored");
+  }
   completion(true, warranty);
 }
 

@@ -19,8 +19,9 @@ struct DownloadCaller {
   std::string bundleID;
   /// The serial number of the device that the agent runs on; nothing when it has none.
   std::function<std::optional<std::string>()> localSerialNumber;
-  /// Called with each downloaded warranty before it is cached, and with the one cached so far, or null.
-  std::function<void(const KVRWarrantyRef& warranty, const KVRWarrantyRef& cachedWarranty)>
+  /// Called with each downloaded warranty before it is cached, and with the one cached so far, or null. False
+  /// when the warranty must not be cached, because what is new in it could not be stored.
+  std::function<bool(const KVRWarrantyRef& warranty, const KVRWarrantyRef& cachedWarranty)>
       warrantyDownloaded;
 };
 

@@ -169,15 +169,13 @@ void ActivityTable::noticeSystemVersion(const std::string& identifier,
   noticeOccasion(identifier, OccasionKind::Upgrade, version.value_or(recorded));
 }
 
-bool ActivityTable::noticeBoot(const std::string& identifier, const std::string& boot, bool recordsLost) {
+bool ActivityTable::noticeBoot(const std::string& identifier, const std::string& boot) {
   const auto found = records_.find(kBootIdentifier);
-  if (found == records_.end() && !recordsLost) {
+  if (found == records_.end()) {
     records_.emplace(kBootIdentifier, boot);
     return true;
   }
-  if (found == records_.end() || found->second != Value(boot)) {
-    noticeOccasion(identifier, OccasionKind::Boot, boot);
-  }
+  if (found->second != Value(boot)) noticeOccasion(identifier, OccasionKind::Boot, boot);
   return false;
 }
 

@@ -90,9 +90,9 @@ class ActivityTable {
   /// version (nothing) does not count as different. The version is recorded once the run has finished.
   void noticeSystemVersion(const std::string& identifier, const std::optional<std::string>& version,
                            bool isOwed);
-  /// Makes a boot occasion if a different boot is recorded, or if none is recorded because of `recordsLost`.
+  /// Makes a boot occasion if a different boot is recorded.
   /// The first boot ever is only recorded. Returns whether the persisted tree has changed.
-  bool noticeBoot(const std::string& identifier, const std::string& boot, bool recordsLost);
+  bool noticeBoot(const std::string& identifier, const std::string& boot);
 
   /// Returns the runs to start now and counts them as under way. When anything is due, every activity whose
   /// window is open runs along with it.

@@ -138,8 +138,7 @@ void FileActivityScheduler::checkIn(const std::string& identifier, const Activit
     }
     if (identifier == occasions_.afterUpgrade) table_.noticeSystemVersion(identifier, version, known.isOwed);
     if (identifier == occasions_.afterBoot) {
-      changed |= table_.noticeBoot(identifier, bootIdentifier(), registrationsLost_);
-      registrationsLost_ = false;
+      changed |= table_.noticeBoot(identifier, bootIdentifier());
     }
   }
   if (changed) save();
@@ -254,11 +253,9 @@ void FileActivityScheduler::end(const std::string& identifier, std::uint64_t num
 /// the file lock before `mutex_`.
 void FileActivityScheduler::load() {
   std::call_once(loaded_, [this] {
-    const auto stamp = lists_.files().stamp(path_);
     const auto tree = lists_.read(path_, kDictionary, kSetAside, ActivityTable::complaintAbout);
     const std::lock_guard lock(mutex_);
     unreadable_ = !tree;
-    registrationsLost_ = unreadable_ || (stamp && *stamp && tree->isNull());
     if (tree) table_.adopt(*tree);
   });
 }

@@ -100,7 +100,6 @@ class FileActivityScheduler : public ActivityScheduler {
   mutable std::mutex mutex_;  ///< guards the members below
   ActivityTable table_;
   bool unreadable_ = false;  ///< the file could not be read yet, so it must not be overwritten
-  bool registrationsLost_ = false;
   bool networkReachable_ = true;
   int suspensions_ = 0;
   bool ending_ = false;

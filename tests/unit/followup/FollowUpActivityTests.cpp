@@ -110,6 +110,21 @@ TEST_F(AFollowUpActivity, SchedulesWhatComesDueWhileOthersArePosted) {
   EXPECT_EQ(target(names::kFollowUpPost), displayDate);
 }
 
+TEST_F(AFollowUpActivity, RefreshesAtOnceWhenACountDropsWhileItIsWritten) {
+  const KVRDeviceInfoList list{info("A", due(2.5), old)};
+  const Date drop = *list[0]->warranty()->zubOfferEligibleUntil() - 2 * kDay;
+  const auto meanwhile = [this, drop](const std::string& path, bool) {
+    if (path.find("/FollowUps/") != std::string::npos) world.clock.set(drop + 1);
+  };
+  world.files.whenChanged(meanwhile);
+  runWith<KVRFollowUpPost>(list);
+  EXPECT_EQ(target(names::kFollowUpRefresh), drop);
+  world.clock.set(drop - kDay / 4);
+  runWith<KVRFollowUpRefresh>(list);
+  EXPECT_EQ(pending()[0].informativeFooterText, Value("3 days left"));
+  EXPECT_EQ(target(names::kFollowUpRefresh), drop);
+}
+
 TEST_F(AFollowUpActivity, DropsTheAnswerOfAPostRunThatWasDeferredMeanwhile) {
   std::vector<DeviceInfosAnswer> held;
   const auto post = std::make_shared<KVRFollowUpPost>(

@@ -216,12 +216,12 @@ TEST_F(AnActivityTable, ComplainsOfATreeThatIsNotItsOwn) {
 }
 
 TEST_F(AnActivityTable, ServesTheBootBeforeTheUpgradeAndRecordsEachAtItsEnd) {
-  EXPECT_TRUE(table.noticeBoot("boot", "one", false)) << "the first boot is only recorded";
+  EXPECT_TRUE(table.noticeBoot("boot", "one")) << "the first boot is only recorded";
   EXPECT_THAT(started(), IsEmpty());
   table.checkIn("upgrade", kBlock);
   table.noticeSystemVersion("upgrade", "17.1", false);
   table.checkIn("boot", kBlock);
-  EXPECT_FALSE(table.noticeBoot("boot", "two", false));
+  EXPECT_FALSE(table.noticeBoot("boot", "two"));
   EXPECT_THAT(started(), ElementsAre("boot"));
   end("boot", kDeferred);
   add("overdue", {});

@@ -50,14 +50,14 @@ TEST_F(ACoverageRequest, CarriesTheAccountsHeadersInTheirOrder) {
 
 TEST_F(ACoverageRequest, LeavesOutHeadersThatCannotBeSentAndNoOthers) {
   world.accountSession.clientInfo = {{"X-Client", "a\r\nX-Forged: b"}, {"X Device", "id"}, {"X-Good", "1"}};
-  world.accountSession.deviceIdentifier = {{"content-length", "7"}, {"X-Vornic", "2"}};
+  world.accountSession.deviceIdentifier = {{"content-length", "7"}, {"X-Good", "\r"}, {"X-Vornic", "2"}};
   world.accountSession.authentication = {{"X-Auth", std::string("a\0b", 3)}, {"X-Tarsil-Vornic-Token", "\n"}};
   world.preferences.setObject(Array{"a\nb"}, "storefrontLocale");
   EXPECT_TRUE(sign(false));
   EXPECT_THAT(request.headers.fields(),
               ElementsAre(Pair("X-Tarsil-Vornic-Token", "token"), Pair("X-Good", "1"), Pair("X-Vornic", "2"),
                           Pair("altDSID", "alt-dsid"), Pair("User-Agent", ::testing::_)));
-  EXPECT_EQ(world.log.texts(LogLevel::Error).size(), 6U);
+  EXPECT_EQ(world.log.texts(LogLevel::Error).size(), 7U);
   EXPECT_TRUE(world.log.contains("header 'content-length' is left out, it cannot be sent: "));
 }
 

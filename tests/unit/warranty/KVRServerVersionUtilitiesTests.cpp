@@ -131,6 +131,8 @@ TEST(TheVersionNegotiation, HeedsTheVersionsOfAnAssetWhateverElseItHolds) {
     return *writePropertyList(tree, PropertyListEncoding::Binary);
   };
   const std::string deep(1000, '('), end(1000, ')');
+  std::string many;
+  for (int i = 0; i < 200'000; ++i) many += "1,";
   const Value large = assetWith("8", std::string(1'000'000, 'x'));
   const Value shared = assetWith("8", Array(10, std::string(100'000, 'x')));
   const std::tuple<std::string, Value, bool> cases[] = {
@@ -139,7 +141,12 @@ TEST(TheVersionNegotiation, HeedsTheVersionsOfAnAssetWhateverElseItHolds) {
       {binary(assetWith("8", manyTexts)), pairOf(8, 9), false},
       {binary(assetWith("3", manyTexts)), pairOf(3, 9), true},
       {binary(assetWith(manyTexts, 1)), pairOf(Array{}, 9), false},
-      {"{ LowServerVersion = 8; more = " + deep + end + "; HighServerVersion = 9; }", pairOf(8, 9), false}};
+      {"{ LowServerVersion = 8; more = " + deep + end + "; HighServerVersion = 9; }", pairOf(8, 9), false},
+      // As deep as can be read, and too deep for an entry of another list.
+      {"{ LowServerVersion = 8; more = " + deep.substr(489) + end.substr(489) + "; HighServerVersion = 9; }",
+       pairOf(8, 9), false},
+      // More values than the preferences should hold.
+      {"{ LowServerVersion = 8; more = (" + many + "1); HighServerVersion = 9; }", pairOf(8, 9), false}};
   for (const auto& [body, cacheAfter, supported] : cases) {
     SCOPED_TRACE(body.substr(0, 80));
     ASSERT_LE(body.size(), std::size_t{1} << 20U);
