@@ -112,16 +112,16 @@ TEST_F(AFollowUpActivity, SchedulesWhatComesDueWhileOthersArePosted) {
 
 TEST_F(AFollowUpActivity, RefreshesAtOnceWhenACountDropsWhileItIsWritten) {
   const KVRDeviceInfoList list{info("A", due(2.5), old)};
-  const Date drop = *list[0]->warranty()->zubOfferEligibleUntil() - 2 * kDay;
-  const auto meanwhile = [this, drop](const std::string& path, bool) {
+  Date drop = *list[0]->warranty()->zubOfferEligibleUntil() - 2 * kDay;
+  world.files.whenChanged([this, &drop](const std::string& path, bool) {
     if (path.find("/FollowUps/") != std::string::npos) world.clock.set(drop + 1);
-  };
-  world.files.whenChanged(meanwhile);
+  });
   runWith<KVRFollowUpPost>(list);
   EXPECT_EQ(target(names::kFollowUpRefresh), drop);
+  drop = drop + kDay;
   world.clock.set(drop - kDay / 4);
   runWith<KVRFollowUpRefresh>(list);
-  EXPECT_EQ(pending()[0].informativeFooterText, Value("3 days left"));
+  EXPECT_EQ(pending()[0].informativeFooterText, Value("2 days left"));
   EXPECT_EQ(target(names::kFollowUpRefresh), drop);
 }
 
