@@ -17,15 +17,19 @@ std::optional<std::string> serialHashOf(const KVRDeviceInfo& deviceInfo) {
 }
 
 OfferFacts offerFactsOf(const KVRDeviceInfo& deviceInfo) {
-  OfferFacts facts;
+  const auto warranty = deviceInfo.warranty();
+  auto facts = warranty ? offerFactsOf(*warranty) : OfferFacts{};
   if (const auto device = deviceInfo.device()) facts.activationDate = device->activationDate();
-  if (const auto warranty = deviceInfo.warranty()) {
-    facts.hasWarranty = true;
-    facts.isOffered = warranty->zubOfferDisplay();
-    facts.eligibleUntil = warranty->zubOfferEligibleUntil();
-    facts.displayDate = warranty->zubOfferFollowupDisplayDate();
-    facts.durationBeforeEnd = warranty->zubOfferDurationBeforeEndDate();
-  }
+  return facts;
+}
+
+OfferFacts offerFactsOf(const KVRWarranty& warranty) {
+  OfferFacts facts;
+  facts.hasWarranty = true;
+  facts.isOffered = warranty.zubOfferDisplay();
+  facts.eligibleUntil = warranty.zubOfferEligibleUntil();
+  facts.displayDate = warranty.zubOfferFollowupDisplayDate();
+  facts.durationBeforeEnd = warranty.zubOfferDurationBeforeEndDate();
   return facts;
 }
 

@@ -14,6 +14,8 @@ std::optional<std::string> serialNumberOf(const KVRDeviceInfo& deviceInfo);
 std::optional<std::string> serialHashOf(const KVRDeviceInfo& deviceInfo);
 /// The facts that the rules need, as of now.
 OfferFacts offerFactsOf(const KVRDeviceInfo& deviceInfo);
+/// The same of a warranty alone, without an activation date.
+OfferFacts offerFactsOf(const KVRWarranty& warranty);
 std::vector<FollowUpDateFacts> dateFactsOf(Platform& platform, const KVRDeviceInfoList& deviceInfos);
 
 }  // namespace kvr

@@ -23,7 +23,7 @@ bool isNearer(std::optional<Date> date, std::optional<Date> next, Date now) {
 
 /// The later of display date and activation date. A device without an activation date counts as activated
 /// now, so a display date in the past gives nothing.
-std::optional<Date> displayDateOf(const OfferFacts& offer, Date now) {
+std::optional<Date> postDateOf(const OfferFacts& offer, Date now) {
   if (offer.displayDate && offer.activationDate.value_or(now) <= *offer.displayDate) return offer.displayDate;
   return offer.activationDate;
 }
@@ -37,7 +37,7 @@ std::optional<Date> nextPostDate(const std::vector<FollowUpDateFacts>& devices, 
     if (device.isPosted) continue;
     if (offer.isOffered) {
       if (offer.eligibleUntil && *offer.eligibleUntil > now) {
-        const auto candidate = displayDateOf(offer, now);
+        const auto candidate = postDateOf(offer, now);
         if (isNearer(candidate, next, now)) next = candidate;
       }
       if (isEarlier(offer.eligibleUntil, next, now)) next = offer.eligibleUntil;
@@ -56,7 +56,7 @@ std::optional<Date> nextRefreshDate(const std::vector<FollowUpDateFacts>& device
     if (offer.isOffered) {
       const double offset = day * (static_cast<double>(device.daysEligible) - 1);
       if (offset > 0 && offer.eligibleUntil) {
-        const auto shownFrom = displayDateOf(offer, now);
+        const auto shownFrom = postDateOf(offer, now);
         const auto dayChange = *offer.eligibleUntil - offset;
         const bool isShown = shownFrom && *shownFrom < now;
         if (isEarlier(dayChange, next, now) || (!next && isShown)) next = dayChange;

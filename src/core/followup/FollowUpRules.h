@@ -55,10 +55,16 @@ struct PostDate {
   bool isInFuture(Date now) const { return date && *date > now; }
 };
 
+/// The date from which an offer is to be followed up: its display date, otherwise the end of eligibility
+/// minus the lead time; nothing if both are missing.
+constexpr std::optional<Date> displayDateOf(const OfferFacts& facts) {
+  if (facts.displayDate || !facts.eligibleUntil) return facts.displayDate;
+  return *facts.eligibleUntil - facts.durationBeforeEnd;
+}
+
 /// The date from which an offered follow-up may be posted.
 constexpr PostDate postDate(const OfferFacts& facts) {
-  auto date = facts.displayDate;
-  if (!date && facts.eligibleUntil) date = *facts.eligibleUntil - facts.durationBeforeEnd;
+  const auto date = displayDateOf(facts);
   if (facts.activationDate && date && *facts.activationDate > *date) return {facts.activationDate, true};
   return {date, false};
 }

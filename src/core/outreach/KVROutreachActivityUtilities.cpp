@@ -1,6 +1,7 @@
 #include "core/outreach/KVROutreachActivityUtilities.h"
 
 #include "core/devices/KVRDevicesManager.h"
+#include "core/followup/DeviceFacts.h"
 #include "core/outreach/OutreachRules.h"
 #include "core/outreach/WarrantyDownloads.h"
 #include "core/scheduling/KVRScheduler.h"
@@ -90,7 +91,7 @@ void KVROutreachActivityUtilities::handleDownload(const std::optional<std::strin
         "Configuration does not support current device. Complete activity without scheduling followup");
     return;
   }
-  const auto candidate = outreachPostDate(*warranty);
+  const auto candidate = displayDateOf(offerFactsOf(*warranty));
   const auto now = platform_.clock.now();
   const std::lock_guard lock(mutex_);
   earliestPostDate_ = earlierPostDate(earliestPostDate_, candidate, now);

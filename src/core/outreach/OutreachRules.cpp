@@ -15,13 +15,6 @@ bool excludesCarrier(const Value& offerToggle, const std::optional<std::string>&
   return std::find(carriers.begin(), carriers.end(), Value(*carrierID)) != carriers.end();
 }
 
-std::optional<Date> outreachPostDate(const KVRWarranty& warranty) {
-  if (const auto displayDate = warranty.zubOfferFollowupDisplayDate()) return displayDate;
-  const auto end = warranty.zubOfferEligibleUntil();
-  if (!end) return std::nullopt;
-  return *end - warranty.zubOfferDurationBeforeEndDate();
-}
-
 std::optional<Date> earlierPostDate(std::optional<Date> held, std::optional<Date> candidate, Date now) {
   if (!held) return candidate;
   return candidate.value_or(now) < *held ? candidate : held;
