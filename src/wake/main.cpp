@@ -40,7 +40,7 @@ class Waker {
     for (const auto* name : {names::kLanguageChanged, names::kDeviceDidPair, names::kDeviceDidUnpair}) {
       notifications_.registerFor(name, [this, name] {
         const auto before = static_cast<std::size_t>(std::ranges::count(heard_, name));
-        if (before < LocalNotifications::kMostInARow) heard_.push_back(name);
+        if (before < LocalNotifications::kMostInARow) heard_.emplace_back(name);
         look();
       });
     }
