@@ -123,6 +123,7 @@ TEST_F(AFollowUpActivity, RefreshesAtOnceWhenACountDropsWhileItIsWritten) {
   runWith<KVRFollowUpRefresh>(list);
   EXPECT_EQ(pending()[0].informativeFooterText, Value("2 days left"));
   EXPECT_EQ(target(names::kFollowUpRefresh), drop);
+  world.files.whenChanged(nullptr);
 }
 
 TEST_F(AFollowUpActivity, DropsTheAnswerOfAPostRunThatWasDeferredMeanwhile) {
