@@ -37,7 +37,7 @@ void KVRFollowUpRefresh::refreshAndSchedule(const KVRDeviceInfoList& devicesInfo
   const double day = platform_.preferences.doubleForKey(preference::kOneDayInterval);
   // Taken before the texts are written: a count that drops meanwhile is still to be shown.
   const auto now = platform_.clock.now();
-  auto facts = dateFactsOf(platform_, devicesInfo);
+  const auto facts = dateFactsOf(platform_, devicesInfo);
   const auto shown = KVRFollowUp(platform_).refreshFollowupWithDeviceInfos(devicesInfo);
   if (shown.empty()) {
     log.standard("No followups present, don't schedule another refresh");
@@ -46,7 +46,7 @@ void KVRFollowUpRefresh::refreshAndSchedule(const KVRDeviceInfoList& devicesInfo
   log.standard("Followup present, schedule refresh for %@", shown);
   std::vector<FollowUpDateFacts> shownFacts;
   for (std::size_t i = 0; i < devicesInfo.size(); ++i) {
-    if (std::ranges::find(shown, devicesInfo[i]) != shown.end()) shownFacts.push_back(std::move(facts[i]));
+    if (std::ranges::find(shown, devicesInfo[i]) != shown.end()) shownFacts.push_back(facts[i]);
   }
   const auto next = refreshDate(shownFacts, now, day);
   const auto date = followingRefreshDate(next, now, day);
