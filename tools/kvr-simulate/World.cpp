@@ -72,8 +72,10 @@ const World::Watch* World::watch(const std::string& serialNumber) const {
 }
 
 bool World::isInTrouble() const {
-  return !hasAccount || !isNetworkReachable || renewal.never || renewal.resultCode != 0 ||
-         service.coverageFault != Service::Fault::None || service.versionFault != Service::Fault::None;
+  constexpr double kRenewalLimit = 60;  // seconds; the agent does not wait any longer for a new token
+  return !hasAccount || !isNetworkReachable || renewal.never || renewal.delay > kRenewalLimit ||
+         renewal.resultCode != 0 || service.coverageFault != Service::Fault::None ||
+         service.versionFault != Service::Fault::None;
 }
 
 void World::show(SimulatedPlatform& platform) const {
