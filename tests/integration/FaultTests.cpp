@@ -88,6 +88,7 @@ struct TheAgentsStores : ::testing::Test {
                           *writePropertyList(Dictionary{{"items", items}}, PropertyListEncoding::XML));
     world.startAgent();
     World::info(world.newClient(), World::kFirstWatch, World::Refresh);
+    world.agent().waitForErrorOutput(" follow-up: ");  // it is brought up to date after the answer
     ASSERT_EQ(world.agent().terminate(), 0);
     fs::copy(library(), world.directory / "saved", fs::copy_options::recursive);
   }
