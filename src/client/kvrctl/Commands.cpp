@@ -231,6 +231,7 @@ Status showTimeline(const AgentClient& agent, const Options& options) {
   const auto activities = state.activities();
   if (!followUps || !activities) return fail(followUps ? activities.error() : followUps.error());
   const Timeline timeline(*statuses, *followUps, *activities, now());
+  if (options.file == "-") return print(timeline.svg(), kFine);
   if (!options.file.empty()) {
     std::ofstream file(options.file, std::ios::trunc);
     if (!(file << timeline.svg() << std::flush)) {

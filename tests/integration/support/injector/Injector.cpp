@@ -1,5 +1,5 @@
 // Loaded before the C library (LD_PRELOAD): kills the program at one call on files, or makes calls fail, as
-// set in the page that it shares with the test.
+// set in the page that it shares with the test. Stops the wall clock at the second in KVR_CLOCK.
 #include "integration/support/Injection.h"
 
 #include <dlfcn.h>
@@ -14,6 +14,7 @@
 #include <csignal>
 #include <cstdarg>
 #include <cstdlib>
+#include <ctime>
 #include <string_view>
 
 namespace {
@@ -152,6 +153,22 @@ int link(const char* from, const char* to) {
 }
 
 int unlink(const char* path) { return failsFor(path) ? -1 : static_cast<int>(::syscall(SYS_unlink, path)); }
+
+int clock_gettime(clockid_t clock, timespec* time) {
+  static const char* const second = std::getenv("KVR_CLOCK");
+  if (second == nullptr || clock != CLOCK_REALTIME) {
+    return static_cast<int>(::syscall(SYS_clock_gettime, clock, time));
+  }
+  *time = {std::atoll(second), 0};
+  return 0;
+}
+
+time_t time(time_t* result) {
+  timespec now{};
+  ::clock_gettime(CLOCK_REALTIME, &now);
+  if (result != nullptr) *result = now.tv_sec;
+  return now.tv_sec;
+}
 
 int mkdir(const char* path, mode_t mode) {
   return failsFor(path) ? -1 : static_cast<int>(::syscall(SYS_mkdir, path, mode));
