@@ -127,7 +127,7 @@ TEST_F(Kvrctl, TellsOfAnActivityHowItEndedAndWhatItWaitsFor) {
                                   "(null), waits for the agent, to start", "finished, waits for (null)"));
   const auto serving = serveAgent();
   EXPECT_THAT(told(), ElementsAre("deferred, waits for its next try",
-                                  HasSubstr("waits for the limit of starts, until 01/01/99"),
+                                  HasSubstr("waits for the limit of starts, until 2999-01-01"),
                                   "finished, waits for (null)"));
 }
 
@@ -140,7 +140,7 @@ TEST_F(Kvrctl, PrintsTextThatCannotCommandATerminal) {
   EXPECT_THAT(text.output,
               HasSubstr("Coverage:      \\u001b]0;owned\\u0007 \\u009b2J\\u000d\\u000aCovered: no\\u202e\n"));
   EXPECT_THAT(text.output,
-              AllOf(HasSubstr("…1234"), Not(HasSubstr("C02XY1234")), HasSubstr("01/02/70 00:00:00")));
+              AllOf(HasSubstr("…1234"), Not(HasSubstr("C02XY1234")), HasSubstr("1970-01-02 00:00")));
   EXPECT_THAT(run({"info", "--show-serial"}).output, HasSubstr("C02XY1234"));
   EXPECT_THAT(run({"info", "--json"}).output, AllOf(Not(HasSubstr("\u009B")), HasSubstr("\\u009b")));
 }

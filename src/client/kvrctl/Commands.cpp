@@ -2,12 +2,12 @@
 
 #include "client/LocalState.h"
 #include "client/kvrctl/Doctor.h"
+#include "client/kvrctl/Table.h"
 #include "client/kvrctl/Timeline.h"
 #include "local/device/DeviceRoot.h"
 #include "local/device/LocalNetwork.h"
 #include "platform/codec/PropertyList.h"
 
-#include <sys/ioctl.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -21,8 +21,6 @@ namespace kvr::client {
 namespace {
 
 constexpr std::string_view kShortened = "…";
-constexpr unsigned kTimelineColumns = 100;  // if there is no terminal
-constexpr unsigned kDateColumns = 12;       // behind the bars of a timeline
 
 Date now() {
   using Seconds = std::chrono::duration<double>;
@@ -35,13 +33,25 @@ Status show(const Result<Answer>& answer, const Options& options, const std::str
   if (!answer) return fail(answer.error());
   const Report report = options.report();
   if (options.json) return print(report.json(*answer), kFine);
-  const std::string text = report.text(*answer);
+  const std::string text = report.text(*answer, Style::ofOutput());
   return print(text.empty() ? none + "\n" : text, kFine);
 }
 
 /// Prints a confirmation: `line`, or in JSON `fact` under `name`.
 Status confirm(const Options& options, const std::string& line, std::string_view name, const Value& fact) {
   return options.json ? print(Report::json(name, fact), kFine) : print(printable(line) + "\n", kFine);
+}
+
+/// The follow-ups that are shown. The follow-up centre drops one whose date has passed, but not from the
+/// file.
+Result<std::vector<FollowUp>> shownFollowUps() {
+  auto stored = LocalState().followUps();
+  if (!stored) return stored;
+  std::vector<FollowUp> shown = *std::move(stored);
+  std::erase_if(shown, [date = now()](const FollowUp& followUp) {
+    return followUp.expirationDate && *followUp.expirationDate <= date;
+  });
+  return shown;
 }
 
 Result<std::vector<Device>> knownDevices(const AgentClient& agent) {
@@ -100,7 +110,7 @@ Result<std::vector<DeviceStatus>> statusesFrom(const AgentClient& agent, Policy 
   const auto infos = agent.allDeviceInfos(policy, false);
   if (!infos) return infos.error();
   const LocalState state;
-  const auto followUps = state.followUps();
+  const auto followUps = shownFollowUps();
   std::vector<DeviceStatus> statuses;
   for (const auto& info : *infos) {
     DeviceStatus status;
@@ -213,7 +223,7 @@ Status showSupportApplication(const AgentClient& agent, const Options& options) 
   const Result<Value> answer = agent.supportApplication(options.text);
   if (!answer) return fail(answer.error());
   return options.json ? print(Report::json("supportApplication", *answer), kFine)
-                      : print(Report::text(*answer), kFine);
+                      : print(Report::text(*answer, Style::ofOutput()), kFine);
 }
 
 Status showWebURL(const AgentClient& agent, const Options& options) {
@@ -226,9 +236,8 @@ Status showWebURL(const AgentClient& agent, const Options& options) {
 Status showTimeline(const AgentClient& agent, const Options& options) {
   const auto statuses = statusesFrom(agent, Policy::CacheOnly);
   if (!statuses) return fail(statuses.error());
-  const LocalState state;
-  const auto followUps = state.followUps();
-  const auto activities = state.activities();
+  const auto followUps = shownFollowUps();
+  const auto activities = LocalState().activities();
   if (!followUps || !activities) return fail(followUps ? activities.error() : followUps.error());
   const Timeline timeline(*statuses, *followUps, *activities, now());
   if (options.file == "-") return print(timeline.svg(), kFine);
@@ -241,10 +250,7 @@ Status showTimeline(const AgentClient& agent, const Options& options) {
     if (!options.json) return kFine;
   }
   if (options.json) return print(Report::json("timeline", timeline.tree()), kFine);
-  winsize size{};
-  const bool isKnown = ::ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) == 0 && size.ws_col > 2 * kDateColumns;
-  return print(timeline.text(Style::ofOutput(), (isKnown ? size.ws_col : kTimelineColumns) - kDateColumns),
-               kFine);
+  return print(timeline.text(Style::ofOutput()), kFine);
 }
 
 Status postNotification(const AgentClient& agent, const Options& options) {
@@ -252,34 +258,31 @@ Status postNotification(const AgentClient& agent, const Options& options) {
   return error ? fail(*error) : confirm(options, options.text + " is posted", "posted", options.text);
 }
 
-Status showFollowUps(const Options& options) {
-  return show(LocalState().followUps(), options, "No follow-ups");
-}
+Status showFollowUps(const Options& options) { return show(shownFollowUps(), options, "No follow-ups"); }
 
 Status showActivities(const Options& options) {
   const auto activities = LocalState().activities();
   if (!activities) return fail(activities.error());
   const auto facts = circumstances();
   if (options.json) return print(Report::json(*activities, facts), kFine);
-  const std::string text = Report::text(*activities, facts);
+  const std::string text = Report::text(*activities, facts, Style::ofOutput());
   return print(text.empty() ? "No activities\n" : text, kFine);
 }
 
 Status showVerdicts(const Options& options) {
   constexpr std::array<const char*, 3> kMarks{"fine", "look", "broken"};
   constexpr std::array<Style::Paint, 3> kPaints{Style::Good, Style::Notice, Style::Bad};
-  const Style style = Style::ofOutput();
   Value::Array trees;
-  Table table({"Verdict", "Of", "Finding", "Cure"});
+  Table table({{"Verdict"}, {"Of", 12}, {"Finding", 20}, {"Cure", 20}});
   Status status = kFine;
   for (const auto& [subject, state, finding, cure] : examine()) {
     if (state == Verdict::Broken) status = kFailed;
     trees.emplace_back(Value::Dictionary{
         {"subject", subject}, {"verdict", kMarks[state]}, {"finding", finding}, {"cure", cure}});
-    table.add({style.paint(kPaints[state], kMarks[state]), printable(subject), printable(finding),
-               printable(cure)});
+    table.add({{kMarks[state], kPaints[state]}, printable(subject), printable(finding), printable(cure)});
   }
-  return options.json ? print(Report::json("verdicts", trees), status) : print(table.text(), status);
+  return options.json ? print(Report::json("verdicts", trees), status)
+                      : print(table.text(Style::ofOutput()), status);
 }
 
 }  // namespace kvr::client

@@ -43,7 +43,7 @@ class Teller {
     std::string line = subject;
     for (const auto* word : {&name, &event}) line += word->empty() ? "" : " " + *word;
     if (!detail.empty()) line += ": " + detail;
-    print(Style::moment(now) + "  " + printable(line) + "\n", kFine);
+    print(Style::second(now) + "  " + printable(line) + "\n", kFine);
   }
 
  private:

@@ -1,6 +1,10 @@
 #include "client/kvrctl/Report.h"
 
+#include "client/kvrctl/Table.h"
+#include "platform/names/Names.h"
+
 #include <algorithm>
+#include <array>
 #include <cmath>
 #include <utility>
 
@@ -51,20 +55,29 @@ std::string ageText(double seconds) {
 /// Whether a date lies in the future.
 bool isAhead(const std::optional<Date>& date, Date now) { return date && *date > now; }
 
-std::string aligned(const std::vector<std::pair<std::string, std::string>>& lines) {
-  std::size_t width = 0;
-  for (const auto& line : lines) width = std::max(width, line.first.size());
-  std::string text;
-  for (const auto& [name, value] : lines) {
-    text += name + ":" + std::string(width - name.size() + 1, ' ') + printable(value) + "\n";
-  }
-  return text;
+std::string shown(const std::vector<std::pair<std::string, std::string>>& lines, const Style& style) {
+  std::vector<std::pair<std::string, Cell>> cells;
+  for (const auto& [name, value] : lines) cells.emplace_back(name, printable(value));
+  return paragraph(cells, style);
 }
 
 }  // namespace
 
 const char* nameOf(std::uint64_t deviceType) {
   return deviceType == Device::Watch ? "Watch" : deviceType == Device::Other ? "Other" : "Default";
+}
+
+std::string nameOf(const Activity& activity) {
+  constexpr std::array<std::pair<std::string_view, const char*>, 6> kNames{
+      {{names::kPostUpgrade, "After an upgrade"},
+       {names::kPostBoot, "After a boot"},
+       {names::kOutreach, "Outreach"},
+       {names::kConversionOutreach, "Conversion outreach"},
+       {names::kFollowUpPost, "Post follow-ups"},
+       {names::kFollowUpRefresh, "Update follow-ups"}}};
+  const auto* const known =
+      std::ranges::find(kNames, activity.identifier, &decltype(kNames)::value_type::first);
+  return known == kNames.end() ? activity.identifier : known->second;
 }
 
 std::string waitsFor(const Activity& activity, const Circumstances& circumstances) {
@@ -94,23 +107,23 @@ Report::Lines Report::linesOf(const Device& device) const {
   return lines;
 }
 
-std::string Report::text(const std::vector<Device>& devices) const {
+std::string Report::text(const std::vector<Device>& devices, const Style& style) const {
   std::string text;
-  for (const Device& device : devices) text += (text.empty() ? "" : "\n") + aligned(linesOf(device));
+  for (const Device& device : devices) text += (text.empty() ? "" : "\n") + shown(linesOf(device), style);
   return text;
 }
 
-std::string Report::text(const std::vector<DeviceInfo>& infos) const {
+std::string Report::text(const std::vector<DeviceInfo>& infos, const Style& style) const {
   std::string text;
   for (const DeviceInfo& info : infos) {
     Lines lines = linesOf(info.device);
     appendWarranty(lines, info.warranty);
-    text += (text.empty() ? "" : "\n") + aligned(lines);
+    text += (text.empty() ? "" : "\n") + shown(lines, style);
   }
   return text;
 }
 
-std::string Report::text(const std::vector<FollowUp>& followUps) const {
+std::string Report::text(const std::vector<FollowUp>& followUps, const Style& style) const {
   std::string text;
   for (const FollowUp& followUp : followUps) {
     Lines lines{{"Follow-up", followUp.title.value_or("untitled")},
@@ -119,34 +132,42 @@ std::string Report::text(const std::vector<FollowUp>& followUps) const {
     lines.emplace_back("Shown by", followUp.targetBundleIdentifier.value_or("nobody"));
     lines.emplace_back("Badge", followUp.hasBadge ? "yes" : "no");
     if (followUp.expirationDate) lines.emplace_back("Shown until", Style::moment(*followUp.expirationDate));
-    text += (text.empty() ? "" : "\n") + aligned(lines);
+    text += (text.empty() ? "" : "\n") + shown(lines, style);
   }
   return text;
 }
 
-std::string Report::text(const std::vector<Activity>& activities, const Circumstances& circumstances) {
-  Table table({"Activity", "Not before", "Due", "Last run", "Waits for"});
+std::string Report::text(const std::vector<Activity>& activities, const Circumstances& circumstances,
+                         const Style& style) {
+  Table table({{"Activity", 14}, {"Not before", 0, 1}, {"Due"}, {"Last run", 17, 2}, {"Waits for", 14}});
   const auto dateText = [](const std::optional<Date>& date) { return date ? Style::moment(*date) : ""; };
   for (const Activity& activity : activities) {
-    const std::string lastRun =
-        activity.lastResult ? *activity.lastResult + ", " + dateText(activity.lastEnd) : "";
-    table.add({printable(activity.identifier), dateText(activity.targetDate), dateText(activity.dueDate),
-               printable(lastRun), waitsFor(activity, circumstances)});
+    const std::string lastRun = dateText(activity.lastEnd) + (activity.lastEnd ? ", " : "");
+    table.add({printable(nameOf(activity)), dateText(activity.targetDate), dateText(activity.dueDate),
+               activity.lastResult ? printable(lastRun + *activity.lastResult) : "",
+               waitsFor(activity, circumstances)});
   }
-  return activities.empty() ? "" : table.text();
+  return activities.empty() ? "" : table.text(style);
 }
 
-std::string Report::text(const Value& dictionary) {
+std::string Report::text(const Value& dictionary, const Style& style) {
   Lines lines;
   if (dictionary.isDictionary()) {
     for (const auto& [key, value] : dictionary.dictionary())
       lines.emplace_back(printable(key), describe(value));
   }
-  return aligned(lines);
+  return shown(lines, style);
 }
 
 std::string Report::text(const std::vector<DeviceStatus>& statuses, const Style& style) const {
-  Table table({"Device", "Serial", "Coverage", "Until", "Days left", "Offer until", "Follow-up", "Asked"});
+  Table table({{"Device", 14},
+               {"Serial", 0, 3},
+               {"Coverage", 12},
+               {"Until"},
+               {"Days left", 0, 2},
+               {"Offer until", 0, 5},
+               {"Follow-up", 0, 4},
+               {"Asked", 0, 1}});
   for (const auto& status : statuses) {
     const auto& coverage = status.coverage;
     const bool isCovered = coverage && coverage->isCovered;
@@ -155,18 +176,19 @@ std::string Report::text(const std::vector<DeviceStatus>& statuses, const Style&
         coverage && coverage->isOfferShown && coverage->offerEnd && *coverage->offerEnd > status.now;
     table.add({printable(status.device.name.value_or("unnamed")),
                printable(status.device.serialNumber ? serial(*status.device.serialNumber) : "unknown"),
-               style.paint(isCovered ? Style::Good : Style::Bad,
-                           !coverage   ? "unknown"
-                           : isCovered ? printable(coverage->label.value_or("covered"))
-                                       : "not covered"),
-               until ? style.day(*until) : "", until ? daysBetween(status.now, *until) : "",
+               {!coverage   ? "unknown"
+                : isCovered ? printable(coverage->label.value_or("covered"))
+                            : "not covered",
+                isCovered ? Style::Good : Style::Bad},
+               until ? style.day(*until) : "",
+               until ? daysBetween(status.now, *until) : "",
                isOffered ? style.day(*coverage->offerEnd) : "",
-               status.hasFollowUp   ? style.paint(Style::Notice, "shown")
+               status.hasFollowUp   ? Cell("shown", Style::Notice)
                : status.isDismissed ? "dismissed"
                                     : "",
                status.downloaded ? ageText(status.now - *status.downloaded) : ""});
   }
-  return table.text();
+  return table.text(style);
 }
 
 }  // namespace kvr::client

@@ -31,6 +31,9 @@ struct Circumstances {
 /// What a planned activity is waiting for, in words; empty when none is planned.
 std::string waitsFor(const Activity& activity, const Circumstances& circumstances);
 
+/// What an activity does, in words; its identifier if it is not one of the agent's.
+std::string nameOf(const Activity& activity);
+
 /// A one-word name for a device type.
 const char* nameOf(std::uint64_t deviceType);
 
@@ -49,14 +52,15 @@ class Report {
 
   // For people, with dates in the user's format and time zone: lines of name and value, with an empty line
   // between records, or a table. Empty when there are no records.
-  std::string text(const std::vector<Device>& devices) const;
-  std::string text(const std::vector<DeviceInfo>& infos) const;
-  std::string text(const std::vector<FollowUp>& followUps) const;
+  std::string text(const std::vector<Device>& devices, const Style& style) const;
+  std::string text(const std::vector<DeviceInfo>& infos, const Style& style) const;
+  std::string text(const std::vector<FollowUp>& followUps, const Style& style) const;
 
   /// Any dictionary, one line per entry.
-  static std::string text(const Value& dictionary);
+  static std::string text(const Value& dictionary, const Style& style);
   /// A table, one line per activity.
-  static std::string text(const std::vector<Activity>& activities, const Circumstances& circumstances);
+  static std::string text(const std::vector<Activity>& activities, const Circumstances& circumstances,
+                          const Style& style);
   /// A table, one line per device.
   std::string text(const std::vector<DeviceStatus>& statuses, const Style& style) const;
 

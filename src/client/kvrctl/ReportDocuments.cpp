@@ -139,6 +139,7 @@ Result<std::string> Report::json(const std::vector<Activity>& activities,
                                  const Circumstances& circumstances) {
   return listed("activities", activities, [&circumstances](const Activity& activity) {
     Value::Dictionary tree{{"identifier", activity.identifier},
+                           {"name", nameOf(activity)},
                            {"requiresNetwork", activity.requiresNetwork}};
     if (activity.targetDate) tree.emplace("targetDate", *activity.targetDate);
     if (activity.dueDate) tree.emplace("dueDate", *activity.dueDate);

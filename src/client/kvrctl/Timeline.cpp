@@ -1,9 +1,11 @@
 #include "client/kvrctl/Timeline.h"
 
+#include "platform/names/Names.h"
+
 #include <algorithm>
 #include <array>
 #include <cmath>
-#include <cstdio>
+#include <tuple>
 
 namespace kvr::client {
 namespace {
@@ -18,107 +20,120 @@ constexpr double kFuture = 365 * kDay;
 
 constexpr std::array<const char*, 3> kNames{"coverage", "offer", "follow-up"};
 
-// The dimensions of the SVG picture, in its own units.
-constexpr int kWidth = 960;
-constexpr int kLeft = 260;
-constexpr int kRight = 30;
-constexpr int kTop = 64;
-constexpr int kRowHeight = 34;
-constexpr int kBarHeight = 16;
+// The text's columns.
+constexpr std::size_t kColumns = 100;  // if the width is not limited
+constexpr std::size_t kFewestForLabels = 12;
+constexpr std::size_t kMostForLabels = 24;
+constexpr std::size_t kFewestForAxis = 8;
 
-std::string escaped(const std::string& text) {
-  std::string result;
-  for (const char c : text) {
-    switch (c) {
-      case '<':
-        result += "&lt;";
-        break;
-      case '>':
-        result += "&gt;";
-        break;
-      case '&':
-        result += "&amp;";
-        break;
-      case '"':
-        result += "&quot;";
-        break;
-      default:
-        result += c;
-    }
-  }
-  return result;
+std::optional<Date> inCalendar(std::optional<Date> date) {
+  return date && isInCalendar(*date) ? date : std::nullopt;
 }
 
-/// The beginning of the text, with an ellipsis if the rest does not fit.
-std::string fitted(const std::string& text, std::size_t columns) {
-  if (columnsOf(text) <= columns) return text + std::string(columns - columnsOf(text), ' ');
-  std::string start;
-  for (const char c : text) {
-    const bool isContinuation = (static_cast<unsigned char>(c) & 0xC0U) == 0x80U;
-    if (!isContinuation && columnsOf(start) + 1 >= columns) break;
-    start += c;
+constexpr std::array<const char*, 3> kBlocks{"█", "▒", "▓"};
+constexpr std::array<Style::Paint, 3> kPaints{Style::Good, Style::Faint, Style::Notice};
+constexpr const char* kEnded = "░";
+
+std::size_t indentOf(const Timeline::Row& row) { return row.subject == Timeline::Row::OfPart ? 2 : 0; }
+
+std::string legend(const Style& style, std::size_t columns) {
+  std::vector<std::tuple<const char*, Style::Paint, const char*>> items;
+  for (std::size_t kind = 0; kind < kNames.size(); ++kind) {
+    items.emplace_back(kBlocks[kind], kPaints[kind], kNames[kind]);
   }
-  return start + "…";
+  items.emplace_back(kEnded, Style::Faint, "ended");
+  items.emplace_back("◆", Style::Notice, "activity");
+  std::string text;
+  std::size_t at = 0;
+  for (const auto& [symbol, paint, name] : items) {
+    const std::size_t width = 2 + columnsOf(name);
+    const bool isFirst = at == 0 || at + 3 + width > columns;
+    if (at > 0) text += isFirst ? "\n" : "   ";
+    at = isFirst ? width : at + 3 + width;
+    text += style.paint(paint, symbol) + " " + name;
+  }
+  return text + "\n";
 }
 
-template <class... Values>
-std::string filled(const char* format, Values... values) {
-  std::array<char, 512> text{};
-  const int length = std::snprintf(text.data(), text.size(), format, values...);
-  return {text.data(), static_cast<std::size_t>(std::clamp(length, 0, static_cast<int>(text.size()) - 1))};
-}
-
-/// When the text of the shown follow-ups changes next.
-std::optional<Date> nextChange(const std::vector<Activity>& activities) {
-  for (const auto& activity : activities) {
-    if (activity.identifier.ends_with(".followuprefresh") && activity.isToCome()) return activity.date();
-  }
-  return std::nullopt;
+/// When the activity can run; nothing if no run is planned.
+std::optional<Date> dateOf(const char* identifier, const std::vector<Activity>& activities) {
+  const auto found = std::ranges::find(activities, identifier, &Activity::identifier);
+  return found != activities.end() && found->isToCome() ? std::optional(found->date()) : std::nullopt;
 }
 
 }  // namespace
 
+std::string Timeline::Row::end() const {
+  if (!spans.empty()) return spans.back().until ? Style::day(*spans.back().until) : "no end known";
+  return marks.empty() ? note : Style::day(marks.back());
+}
+
 Timeline::Timeline(const std::vector<DeviceStatus>& devices, const std::vector<FollowUp>& followUps,
                    const std::vector<Activity>& activities, Date now)
     : now_(now), from_(now - kPast), until_(now + kLeastFuture) {
-  for (const auto& status : devices) addDevice(status, followUps, nextChange(activities));
+  for (const auto& status : devices) addDevice(status, followUps, activities);
   for (const auto& activity : activities) {
-    const auto date = activity.dueDate ? activity.dueDate : activity.targetDate;
-    if (!date) continue;
-    rows_.push_back({printable(activity.identifier.substr(activity.identifier.rfind('.') + 1)), {}, {*date}});
-    reach(*date);
+    if (!activity.isToCome()) continue;
+    const Date date = activity.date();
+    rows_.push_back({printable(nameOf(activity)), Row::OfAgent, "", false, {}, {date}});
+    reach(date);
   }
   until_ = until_ + 0.05 * (until_ - from_);
 }
 
-void Timeline::addDevice(const DeviceStatus& status, const std::vector<FollowUp>& followUps,
-                         std::optional<Date> change) {
-  const auto& [device, coverage, hasFollowUp, isDismissed, downloaded, ignored] = status;
-  const std::string name = printable(device.name.value_or("unnamed"));
-  if (coverage && coverage->isCovered) {
-    add(name, CoverageSpan, device.activationDate.value_or(from_), coverage->end);
-  } else {
-    rows_.push_back({name, {}, {}});
+void Timeline::addCoverage(const DeviceStatus& status) {
+  Row row{printable(status.device.name.value_or("unnamed")), Row::OfDevice, "not covered"};
+  const auto& coverage = status.coverage;
+  if (!coverage) {
+    row.note = "unknown";
+    row.isUnknown = true;
+    rows_.push_back(std::move(row));
+    return;
   }
+  const auto end = inCalendar(coverage->end);
+  const bool hasEnded = end && *end <= now_;
+  if (coverage->isCovered && hasEnded) row.note = "ended " + Style::day(*end);
+  if (hasEnded ? *end > from_ : coverage->isCovered) {
+    const auto activated = inCalendar(status.device.activationDate).value_or(from_);
+    addSpan(row, CoverageSpan, end && activated >= *end ? std::min(from_, *end - kDay) : activated, end);
+    if (!hasEnded) row.note = printable(coverage->label.value_or("covered"));
+  }
+  rows_.push_back(std::move(row));
+}
+
+void Timeline::addDevice(const DeviceStatus& status, const std::vector<FollowUp>& followUps,
+                         const std::vector<Activity>& activities) {
+  addCoverage(status);
+  const auto& coverage = status.coverage;
   if (!coverage || !coverage->isOfferShown) return;
-  add("  offer", OfferSpan, coverage->offerFrom, coverage->offerEnd);
-  if (!hasFollowUp && !isDismissed && coverage->offerFrom && coverage->offerEnd > now_) {
-    add("  follow-up, to come", FollowUpSpan, std::max(*coverage->offerFrom, now_), coverage->offerEnd);
+  const auto begin = coverage->offerFrom;
+  const auto end = inCalendar(coverage->offerEnd);
+  if (!end || *end > from_) addPart("offer", OfferSpan, begin, end);
+  const auto post = dateOf(names::kFollowUpPost, activities);
+  if (!status.hasFollowUp && !status.isDismissed && begin && post && (!end || *post < *end)) {
+    addPart("follow-up, to come", FollowUpSpan, std::max({*begin, *post, now_}), end);
   }
   for (const auto& followUp : followUps) {
-    if (!followUp.serialNumber || followUp.serialNumber != device.serialNumber) continue;
-    add("  follow-up, shown", FollowUpSpan, now_, followUp.expirationDate);
-    if (change) rows_.back().marks.push_back(*change);
+    if (!followUp.serialNumber || followUp.serialNumber != status.device.serialNumber) continue;
+    addPart("follow-up, shown", FollowUpSpan, now_, inCalendar(followUp.expirationDate));
+    const auto change = dateOf(names::kFollowUpRefresh, activities);
+    if (change && (!followUp.expirationDate || *change < *followUp.expirationDate)) {
+      rows_.back().marks.push_back(*change);
+    }
   }
 }
 
-void Timeline::add(const std::string& label, Kind kind, std::optional<Date> from, std::optional<Date> until) {
-  Row row{label, {}, {}};
-  if (from && until && *from < *until) {
-    row.spans.push_back({kind, *from, *until});
-    reach(kind == CoverageSpan ? std::min(*until, now_ + kFutureForCoverage) : *until);
-  }
+void Timeline::addPart(const std::string& label, Kind kind, std::optional<Date> from,
+                       std::optional<Date> until) {
+  Row row{label, Row::OfPart, until ? "until " + Style::day(*until) : "no dates"};
+  if (from) addSpan(row, kind, *from, until);
   rows_.push_back(std::move(row));
+}
+
+void Timeline::addSpan(Row& row, Kind kind, Date from, std::optional<Date> until) {
+  if (until && !(from < *until)) return;
+  row.spans.push_back({kind, from, until, until && *until <= now_});
+  if (until) reach(kind == CoverageSpan ? std::min(*until, now_ + kFutureForCoverage) : *until);
 }
 
 void Timeline::reach(Date date) { until_ = std::max(until_, std::min(date, now_ + kFuture)); }
@@ -127,15 +142,20 @@ Value Timeline::tree() const {
   Value::Array rows;
   for (const auto& row : rows_) {
     Value::Array spans;
-    for (const auto& [kind, from, until] : row.spans) {
-      spans.emplace_back(Value::Dictionary{{"kind", kNames[kind]}, {"from", from}, {"until", until}});
+    for (const auto& [kind, from, until, hasEnded] : row.spans) {
+      Value::Dictionary span{{"kind", kNames[kind]}, {"from", from}, {"hasEnded", hasEnded}};
+      if (until) span.emplace("until", *until);
+      spans.emplace_back(std::move(span));
     }
     Value::Array marks(row.marks.begin(), row.marks.end());
-    const std::string label = row.label.substr(std::min(row.label.find_first_not_of(' '), row.label.size()));
-    rows.emplace_back(
-        Value::Dictionary{{"label", label}, {"spans", std::move(spans)}, {"marks", std::move(marks)}});
+    rows.emplace_back(Value::Dictionary{
+        {"label", row.label}, {"note", row.note}, {"spans", std::move(spans)}, {"marks", std::move(marks)}});
   }
   return Value::Dictionary{{"now", now_}, {"from", from_}, {"until", until_}, {"rows", std::move(rows)}};
+}
+
+std::size_t Timeline::cellOf(Date date, std::size_t width) const {
+  return static_cast<std::size_t>(std::lround(place(date) * static_cast<double>(width - 1)));
 }
 
 double Timeline::place(Date date) const {
@@ -143,111 +163,47 @@ double Timeline::place(Date date) const {
   return std::isnan(place) ? 0 : std::clamp(place, 0.0, 1.0);
 }
 
-std::string Timeline::text(const Style& style, std::size_t columns) const {
-  std::size_t labels = 0;
-  for (const auto& row : rows_) labels = std::max(labels, columnsOf(row.label));
-  labels = std::min<std::size_t>(labels, 24);
-  const std::size_t width = std::max<std::size_t>(columns, labels + 22) - labels - 2;
-  const auto columnOf = [&](Date date) {
-    return static_cast<std::size_t>(std::lround(place(date) * static_cast<double>(width - 1)));
-  };
-  constexpr std::array<Style::Paint, 3> kPaints{Style::Good, Style::Faint, Style::Notice};
-  constexpr std::array<const char*, 3> kBlocks{"█", "▒", "▓"};
-
-  std::string text = std::string(labels + 2 + columnOf(now_), ' ') + "now, " + Style::day(now_) + "\n";
-  for (const auto& row : rows_) {
-    std::vector<std::string> cells(width, " ");
-    cells[columnOf(now_)] = style.paint(Style::Faint, "│");
-    for (const auto& span : row.spans) {
-      for (std::size_t at = columnOf(span.from); at <= columnOf(span.until); ++at) {
-        cells[at] = style.paint(kPaints[span.kind], kBlocks[span.kind]);
-      }
-      if (span.until > until_) cells.back() = style.paint(kPaints[span.kind], "▶");
+std::vector<std::string> Timeline::cells(const Row& row, std::size_t width, const Style& style) const {
+  std::vector<std::string> cells(width, row.isUnknown ? style.paint(Style::Faint, "·") : " ");
+  cells[cellOf(now_, width)] = style.paint(Style::Faint, "│");
+  for (const auto& span : row.spans) {
+    const auto paint = span.hasEnded ? Style::Faint : kPaints[span.kind];
+    const std::size_t last = span.until ? cellOf(*span.until, width) : width - 1;
+    for (std::size_t at = cellOf(span.from, width); at <= last; ++at) {
+      cells[at] = style.paint(paint, span.hasEnded ? kEnded : kBlocks[span.kind]);
     }
-    for (const auto& mark : row.marks) cells[columnOf(mark)] = style.paint(Style::Notice, "◆");
-    text += fitted(row.label, labels) + "  ";
-    for (const auto& cell : cells) text += cell;
-    if (!row.spans.empty()) text += " " + Style::day(row.spans.back().until);
-    if (row.spans.empty() && !row.marks.empty()) text += " " + Style::day(row.marks.back());
-    text += "\n";
+    if (isBeyond(span)) cells.back() = style.paint(paint, "▶");
   }
-  text += "\n";
-  for (std::size_t kind = 0; kind < kNames.size(); ++kind) {
-    text += style.paint(kPaints[kind], kBlocks[kind]) + " " + kNames[kind] + "   ";
-  }
-  return text + style.paint(Style::Notice, "◆") + " activity\n";
+  for (const auto& mark : row.marks) cells[cellOf(mark, width)] = style.paint(Style::Notice, "◆");
+  return cells;
 }
 
-std::string Timeline::svg() const {
-  const int height = kTop + static_cast<int>(rows_.size()) * kRowHeight + 56;
-  const auto x = [this](Date date) { return kLeft + place(date) * (kWidth - kLeft - kRight); };
-  std::string svg = filled(
-      "<svg xmlns=\"http://www.w3.org/2000/svg\" viewBox=\"0 0 %d %d\" font-family=\"system-ui, sans-serif\" "
-      "font-size=\"13\" role=\"img\">\n<title>Coverage and offers</title>\n",
-      kWidth, height);
-  svg +=
-      "<style>\n"
-      "  text { fill: #2b303b } .faint { fill: #6b7280 } .grid { stroke: #d5d9e0 } .now { stroke: #c2410c }\n"
-      "  .coverage { fill: #2f855a } .offer { fill: #9bb7e8 } .follow-up { fill: #d97706 } .mark { fill: "
-      "#6d4bb8 }\n"
-      "  .ground { fill: #ffffff }\n"
-      "  @media (prefers-color-scheme: dark) {\n"
-      "    text { fill: #e6e8ec } .faint { fill: #9aa3b2 } .grid { stroke: #3a404c } .now { stroke: #fb923c "
-      "}\n"
-      "    .coverage { fill: #48b183 } .offer { fill: #4a6ea8 } .follow-up { fill: #f0a43a } .mark { fill: "
-      "#a78bfa }\n"
-      "    .ground { fill: #16181d }\n"
-      "  }\n"
-      "</style>\n";
-  svg += filled("<rect class=\"ground\" width=\"%d\" height=\"%d\" rx=\"8\"/>\n", kWidth, height);
-  constexpr int kDivisions = 5;
-  for (int division = 0; division <= kDivisions; ++division) {
-    const Date date = from_ + (until_ - from_) * division / kDivisions;
-    svg += filled("<line class=\"grid\" x1=\"%.1f\" x2=\"%.1f\" y1=\"%d\" y2=\"%d\"/>", x(date), x(date),
-                  kTop - 8, height - 44);
-    svg += filled("<text class=\"faint\" x=\"%.1f\" y=\"%d\" text-anchor=\"middle\">%s</text>\n", x(date),
-                  kTop - 16, Style::day(date).c_str());
-  }
-  int y = kTop;
+std::string Timeline::text(const Style& style) const {
+  const std::size_t columns = style.columns() == Style::kUnlimited ? kColumns : style.columns();
+  std::size_t labels = 0;
+  std::size_t ends = 0;
   for (const auto& row : rows_) {
-    const bool isPart = row.label.starts_with("  ");
-    svg += filled("<text x=\"%d\" y=\"%d\"%s>", isPart ? 40 : 24, y + kBarHeight - 3,
-                  isPart ? " class=\"faint\"" : "");
-    svg += escaped(fitted(row.label, 32)) + "</text>";
-    for (const auto& span : row.spans) {
-      const double left = x(span.from);
-      svg += filled("<rect class=\"%s\" x=\"%.1f\" y=\"%d\" width=\"%.1f\" height=\"%d\" rx=\"4\"/>",
-                    kNames[span.kind], left, y, std::max(x(span.until) - left, 3.0), kBarHeight);
-      if (span.until > until_) {
-        svg += filled("<path class=\"%s\" d=\"M%d %d l12 11 l-12 11 z\"/>", kNames[span.kind],
-                      kWidth - kRight - 4, y - 3);
-      }
-    }
-    for (const auto& mark : row.marks) {
-      svg += filled("<path class=\"mark\" d=\"M%.1f %d l7 8 l-7 8 l-7 -8 z\"/>", x(mark), y);
-    }
-    svg += "\n";
-    y += kRowHeight;
+    labels = std::max(labels, indentOf(row) + columnsOf(row.label));
+    ends = std::max(ends, columnsOf(row.end()));
   }
-  svg += filled("<line class=\"now\" stroke-width=\"2\" x1=\"%.1f\" x2=\"%.1f\" y1=\"%d\" y2=\"%d\"/>",
-                x(now_), x(now_), kTop - 8, height - 44);
-  svg += filled("<text x=\"%.1f\" y=\"22\" text-anchor=\"middle\" font-weight=\"600\">now, %s</text>\n",
-                x(now_), Style::day(now_).c_str());
-  int legend = kLeft;
-  for (const auto* name : kNames) {
-    svg += filled(
-        "<rect class=\"%s\" x=\"%d\" y=\"%d\" width=\"14\" height=\"14\" rx=\"3\"/><text class=\"faint\" "
-        "x=\"%d\" "
-        "y=\"%d\">%s</text>",
-        name, legend, height - 30, legend + 20, height - 18, name);
-    legend += 110;
+  labels = std::min(labels, std::clamp(columns / 3, kFewestForLabels, kMostForLabels));
+  const std::size_t others = labels + 2 + 1 + ends;
+  const std::size_t width = std::max(columns, others + kFewestForAxis) - others;
+
+  const std::string now = "now, " + Style::day(now_);
+  const std::size_t most = std::max(columns, columnsOf(now)) - columnsOf(now);
+  std::string text(std::min(labels + 2 + cellOf(now_, width), most), ' ');
+  text += now + "\n";
+  for (const auto& row : rows_) {
+    std::string rest = "  ";
+    for (const auto& cell : cells(row, width, style)) rest += cell;
+    rest += " " + row.end();
+    for (const auto& line : wrapped(row.label, labels - indentOf(row))) {
+      text += padded(std::string(indentOf(row), ' ') + line, labels) + rest + "\n";
+      rest = std::string(2 + cellOf(now_, width), ' ') + style.paint(Style::Faint, "│");
+    }
   }
-  svg += filled(
-      "<path class=\"mark\" d=\"M%d %d l7 7 l-7 7 l-7 -7 z\"/><text class=\"faint\" x=\"%d\" "
-      "y=\"%d\">activity"
-      "</text>\n</svg>\n",
-      legend + 7, height - 30, legend + 20, height - 18);
-  return svg;
+  return text + "\n" + legend(style, columns);
 }
 
 }  // namespace kvr::client

@@ -2,6 +2,7 @@
 
 #include "client/kvrctl/Commands.h"
 #include "client/kvrctl/Monitor.h"
+#include "client/kvrctl/Terminal.h"
 
 #include <CLI/CLI.hpp>
 #include <unistd.h>
@@ -22,7 +23,7 @@ Status withAgent(AgentCommand command, const Options& options) {
   Result<AgentClient> connected = AgentClient::connect();
   if (!connected) return fail(connected.error());
   AgentClient agent = *std::move(connected);
-  const bool isWatched = ::isatty(STDERR_FILENO) == 1;
+  const bool isWatched = isCapableTerminal(STDERR_FILENO);
   if (isWatched) {
     agent.setWaiting([](int seconds) { std::fprintf(stderr, "\rwaiting for the agent, %d s ", seconds); });
   }
