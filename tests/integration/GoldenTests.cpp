@@ -21,6 +21,7 @@ struct Reader {
 };
 
 const std::string kBerlin = "CET-1CEST,M3.5.0,M10.5.0/3";
+const Reader kBriton{"en_GB.UTF-8", "UTC", "80"};
 
 struct TheOutput : Kvrctl {
   void SetUp() override {
@@ -33,15 +34,19 @@ struct TheOutput : Kvrctl {
   }
   void TearDown() override { fs::current_path("/"); }
 
+  ChildProcess::Environment environmentFor(const Reader& reader) const {
+    return {{"DBUS_SESSION_BUS_ADDRESS", bus.address()},
+            {"HOME", "home"},
+            {"KVR_DEVICE_ROOT", "device"},
+            {"LOCPATH", KVR_LOCALES},
+            {"LC_ALL", reader.locale},
+            {"TZ", reader.zone},
+            {"COLUMNS", reader.columns},
+            {"LD_PRELOAD", KVR_PROGRAMS "/libkvr-injector.so"},
+            {"KVR_CLOCK", "1795608000"}};  // 2026-11-25, 12:00 UTC
+  }
   ChildProcess startFor(const Reader& reader, const std::string& command) {
-    return start(wordsOf(command), {{"HOME", "home"},
-                                    {"KVR_DEVICE_ROOT", "device"},
-                                    {"LOCPATH", KVR_LOCALES},
-                                    {"LC_ALL", reader.locale},
-                                    {"TZ", reader.zone},
-                                    {"COLUMNS", reader.columns},
-                                    {"LD_PRELOAD", KVR_PROGRAMS "/libkvr-injector.so"},
-                                    {"KVR_CLOCK", "1795608000"}});  // 2026-11-25, 12:00 UTC
+    return start(wordsOf(command), environmentFor(reader));
   }
   /// What the command prints, below a line that says for whom.
   std::string transcript(const Reader& reader, const std::string& command) {
@@ -66,7 +71,7 @@ struct TheOutput : Kvrctl {
 };
 
 TEST_F(TheOutput, IsTheSameTextForTheSameReader) {
-  const std::vector<Reader> english{{"en_GB.UTF-8", "UTC", "80"}, {"en_GB.UTF-8", kBerlin, "40"}};
+  const std::vector<Reader> english{kBriton, {"en_GB.UTF-8", kBerlin, "40"}};
   std::vector<Reader> everybody{{"de_DE.UTF-8", kBerlin, "80"},
                                 {"de_DE.UTF-8", "UTC", "40"},
                                 {"ja_JP.UTF-8", "UTC", "80"},
@@ -83,13 +88,32 @@ TEST_F(TheOutput, IsTheSameTextForTheSameReader) {
 }
 
 TEST_F(TheOutput, IsTheSamePictureForTheSameReader) {
-  for (const auto& [name, reader] :
-       std::map<std::string, Reader>{{"timeline.en.svg", {"en_GB.UTF-8", "UTC", ""}},
-                                     {"timeline.ja.svg", {"ja_JP.UTF-8", kBerlin, ""}}}) {
-    auto program = startFor(reader, "timeline --svg -");
-    EXPECT_EQ(program.wait(), 0);
+  const std::tuple<const char*, Reader, const char*> pictures[] = {
+      {"timeline.en.svg", kBriton, "timeline --svg -"},
+      {"timeline.ja.svg", {"ja_JP.UTF-8", kBerlin, ""}, "timeline --svg -"},
+      {"device.svg", kBriton, "timeline --svg - …0001"}};
+  for (const auto& [name, reader, command] : pictures) {
+    auto program = startFor(reader, command);
+    EXPECT_EQ(program.wait(), 0) << program.errorOutput();
     expectGolden(name, program.output());
   }
+}
+
+TEST_F(TheOutput, IsColouredOnATerminalThatShowsColours) {
+  std::string text;
+  for (const std::string setting : {"TERM=xterm", "TERM=xterm NO_COLOR=1", "TERM=dumb"}) {
+    for (const std::string command : {"status", "timeline", "doctor"}) {
+      const std::string line = setting + " COLUMNS=80 " + kProgram + " " + command;
+      ChildProcess terminal({"script", "-qe", "-E", "never", "-c", line, "/dev/null"},
+                            environmentFor(kBriton));
+      terminal.wait();
+      text += "$ " + setting + " kvrctl " + command + "\n" + terminal.output() + "\n";
+    }
+  }
+  for (auto at = text.find('\033'); at != std::string::npos; at = text.find('\033'))
+    text.replace(at, 1, "<ESC>");
+  std::erase(text, '\r');
+  expectGolden("terminal.txt", text);
 }
 
 TEST_F(TheOutput, TellsEachChangeOnceWhileItIsWatched) {

@@ -131,7 +131,7 @@ TEST_F(Kvrctl, TellsOfAnActivityHowItEndedAndWhatItWaitsFor) {
                                   "finished, waits for (null)"));
 }
 
-TEST_F(Kvrctl, PrintsTextThatCannotCommandATerminal) {
+TEST_F(Kvrctl, PrintsTextThatCanNeitherCommandATerminalNorBreakAPicture) {
   const auto serving = serveAgent();
   setAnswer("GetDefaultDeviceInfoUsingPolicy",
             info(Dictionary{{"covered", true},
@@ -143,6 +143,8 @@ TEST_F(Kvrctl, PrintsTextThatCannotCommandATerminal) {
               AllOf(HasSubstr("…1234"), Not(HasSubstr("C02XY1234")), HasSubstr("1970-01-02 00:00")));
   EXPECT_THAT(run({"info", "--show-serial"}).output, HasSubstr("C02XY1234"));
   EXPECT_THAT(run({"info", "--json"}).output, AllOf(Not(HasSubstr("\u009B")), HasSubstr("\\u009b")));
+  setAnswer("GetAllDeviceInfosUsingPolicy", Array{Dictionary{{"device", device("<&\x01\uFFFE")}}});
+  EXPECT_THAT(run({"timeline", "--svg", "-"}).output, HasSubstr(">&lt;&amp;\\u0001\uFFFD<"));
 }
 
 TEST_F(Kvrctl, TakesAnyTextForASerialNumber) {

@@ -234,12 +234,19 @@ Status showWebURL(const AgentClient& agent, const Options& options) {
 }
 
 Status showTimeline(const AgentClient& agent, const Options& options) {
+  auto serialNumber = options.serialNumber;
+  if (serialNumber) {
+    const auto whole = wholeSerial(agent, *serialNumber);
+    if (!whole) return fail(whole.error());
+    if (!isKnownDevice(agent, *whole, options)) return kNothingKnown;
+    serialNumber = *whole;
+  }
   const auto statuses = statusesFrom(agent, Policy::CacheOnly);
   if (!statuses) return fail(statuses.error());
   const auto followUps = shownFollowUps();
   const auto activities = LocalState().activities();
   if (!followUps || !activities) return fail(followUps ? activities.error() : followUps.error());
-  const Timeline timeline(*statuses, *followUps, *activities, now());
+  const Timeline timeline(*statuses, *followUps, *activities, now(), serialNumber);
   if (options.file == "-") return print(timeline.svg(), kFine);
   if (!options.file.empty()) {
     std::ofstream file(options.file, std::ios::trunc);

@@ -36,6 +36,21 @@ constexpr const char* kEnded = "░";
 
 std::size_t indentOf(const Timeline::Row& row) { return row.subject == Timeline::Row::OfPart ? 2 : 0; }
 
+const Cell kNow{"│", Style::Faint};
+
+/// The cells beside each other.
+std::string painted(const std::vector<Cell>& cells, const Style& style) {
+  std::string text;
+  std::string run;  // of one colour
+  for (std::size_t at = 0; at < cells.size(); ++at) {
+    run += cells[at].text;
+    if (at + 1 < cells.size() && cells[at + 1].paint == cells[at].paint) continue;
+    text += style.paint(cells[at].paint, run);
+    run.clear();
+  }
+  return text;
+}
+
 std::string legend(const Style& style, std::size_t columns) {
   std::vector<std::tuple<const char*, Style::Paint, const char*>> items;
   for (std::size_t kind = 0; kind < kNames.size(); ++kind) {
@@ -69,11 +84,14 @@ std::string Timeline::Row::end() const {
 }
 
 Timeline::Timeline(const std::vector<DeviceStatus>& devices, const std::vector<FollowUp>& followUps,
-                   const std::vector<Activity>& activities, Date now)
+                   const std::vector<Activity>& activities, Date now,
+                   const std::optional<std::string>& serialNumber)
     : now_(now), from_(now - kPast), until_(now + kLeastFuture) {
-  for (const auto& status : devices) addDevice(status, followUps, activities);
+  for (const auto& status : devices) {
+    if (!serialNumber || status.device.serialNumber == serialNumber) addDevice(status, followUps, activities);
+  }
   for (const auto& activity : activities) {
-    if (!activity.isToCome()) continue;
+    if (serialNumber || !activity.isToCome()) continue;
     const Date date = activity.date();
     rows_.push_back({printable(nameOf(activity)), Row::OfAgent, "", false, {}, {date}});
     reach(date);
@@ -125,7 +143,8 @@ void Timeline::addDevice(const DeviceStatus& status, const std::vector<FollowUp>
 
 void Timeline::addPart(const std::string& label, Kind kind, std::optional<Date> from,
                        std::optional<Date> until) {
-  Row row{label, Row::OfPart, until ? "until " + Style::day(*until) : "no dates"};
+  const char* const end = until && *until <= now_ ? "ended " : "until ";
+  Row row{label, Row::OfPart, until ? end + Style::day(*until) : "no dates"};
   if (from) addSpan(row, kind, *from, until);
   rows_.push_back(std::move(row));
 }
@@ -163,18 +182,18 @@ double Timeline::place(Date date) const {
   return std::isnan(place) ? 0 : std::clamp(place, 0.0, 1.0);
 }
 
-std::vector<std::string> Timeline::cells(const Row& row, std::size_t width, const Style& style) const {
-  std::vector<std::string> cells(width, row.isUnknown ? style.paint(Style::Faint, "·") : " ");
-  cells[cellOf(now_, width)] = style.paint(Style::Faint, "│");
+std::vector<Cell> Timeline::cells(const Row& row, std::size_t width) const {
+  std::vector<Cell> cells(width, row.isUnknown ? Cell("·", Style::Faint) : Cell(" "));
+  cells[cellOf(now_, width)] = kNow;
   for (const auto& span : row.spans) {
     const auto paint = span.hasEnded ? Style::Faint : kPaints[span.kind];
     const std::size_t last = span.until ? cellOf(*span.until, width) : width - 1;
     for (std::size_t at = cellOf(span.from, width); at <= last; ++at) {
-      cells[at] = style.paint(paint, span.hasEnded ? kEnded : kBlocks[span.kind]);
+      cells[at] = {span.hasEnded ? kEnded : kBlocks[span.kind], paint};
     }
-    if (isBeyond(span)) cells.back() = style.paint(paint, "▶");
+    if (isBeyond(span)) cells.back() = {"▶", paint};
   }
-  for (const auto& mark : row.marks) cells[cellOf(mark, width)] = style.paint(Style::Notice, "◆");
+  for (const auto& mark : row.marks) cells[cellOf(mark, width)] = {"◆", Style::Notice};
   return cells;
 }
 
@@ -196,11 +215,10 @@ std::string Timeline::text(const Style& style) const {
   text += now + "\n";
   for (const auto& row : rows_) {
     std::string rest = "  ";
-    for (const auto& cell : cells(row, width, style)) rest += cell;
-    rest += " " + row.end();
+    rest += painted(cells(row, width), style) + " " + row.end();
     for (const auto& line : wrapped(row.label, labels - indentOf(row))) {
       text += padded(std::string(indentOf(row), ' ') + line, labels) + rest + "\n";
-      rest = std::string(2 + cellOf(now_, width), ' ') + style.paint(Style::Faint, "│");
+      rest = std::string(2 + cellOf(now_, width), ' ') + painted({kNow}, style);
     }
   }
   return text + "\n" + legend(style, columns);

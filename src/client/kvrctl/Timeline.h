@@ -2,6 +2,7 @@
 
 #include "client/LocalState.h"
 #include "client/kvrctl/Report.h"
+#include "client/kvrctl/Table.h"
 
 #include <optional>
 #include <string>
@@ -13,9 +14,11 @@ namespace kvr::client {
 /// shown or planned, and when the text of the shown one changes next; and the planned activities.
 class Timeline {
  public:
-  /// `followUps` are those that are shown at `now`.
+  /// `followUps` are those that are shown at `now`. With a serial number, only that device is shown, without
+  /// the activities, which are for all devices.
   Timeline(const std::vector<DeviceStatus>& devices, const std::vector<FollowUp>& followUps,
-           const std::vector<Activity>& activities, Date now);
+           const std::vector<Activity>& activities, Date now,
+           const std::optional<std::string>& serialNumber = {});
 
   /// With block characters.
   std::string text(const Style& style) const;
@@ -60,7 +63,7 @@ class Timeline {
   /// The same in one of so many cells.
   std::size_t cellOf(Date date, std::size_t width) const;
   /// What a row looks like in block characters.
-  std::vector<std::string> cells(const Row& row, std::size_t width, const Style& style) const;
+  std::vector<Cell> cells(const Row& row, std::size_t width) const;
   bool isBeyond(const Span& span) const { return !span.until || *span.until > until_; }
 
   std::vector<Row> rows_;

@@ -20,7 +20,7 @@ constexpr double kMargin = 24;
 constexpr double kIndent = 16;  // of a device's parts
 constexpr double kLeastForLabels = 120;
 constexpr double kMostForLabels = 260;
-constexpr double kTop = 76;  // above the rows: now, years, months
+constexpr double kTop = 80;  // above the rows: now, years, months
 constexpr double kBarHeight = 16;
 constexpr double kLineHeight = 17;
 constexpr double kRowGap = 15;
@@ -40,13 +40,13 @@ constexpr const char* kStyle =
     "#6d4bb8 }\n"
     "  .ended { fill: none; stroke: #6b7280 } .unknown { fill: none; stroke: #6b7280; stroke-dasharray: 3 4 "
     "}\n"
-    "  .inside { fill: #ffffff }\n"
+    "  .inside { fill: #ffffff } .over { fill: #10131a }\n"
     "  .ground { fill: #ffffff } .halo { stroke: #ffffff; stroke-width: 4px; paint-order: stroke }\n"
     "  @media (prefers-color-scheme: dark) {\n"
     "    text { fill: #e6e8ec } .faint { fill: #a3abba } .grid { stroke: #3a404c } .now { stroke: #fb923c }\n"
-    "    .coverage { fill: #48b183 } .offer { fill: #4a6ea8 } .follow-up { fill: #f0a43a } .mark { fill: "
+    "    .coverage { fill: #48b183 } .offer { fill: #7c9fd9 } .follow-up { fill: #f0a43a } .mark { fill: "
     "#a78bfa }\n"
-    "    .inside { fill: #10131a } .ended, .unknown { stroke: #9aa3b2 }\n"
+    "    .inside, .over { fill: #10131a } .ended, .unknown { stroke: #9aa3b2 }\n"
     "    .ground { fill: #16181d } .halo { stroke: #16181d }\n"
     "  }\n"
     "</style>\n";
@@ -217,9 +217,9 @@ class TimelinePicture {
     const double at = x(timeline_.now_);
     const std::string text = "now, " + Style::day(timeline_.now_);
     const double half = widthOf(text, kFontSize) / 2;
-    return filled("<line class=\"now\" stroke-width=\"2\" x1=\"%.1f\" x2=\"%.1f\" y1=\"26\" y2=\"%.1f\"/>\n",
+    return filled("<line class=\"now\" stroke-width=\"2\" x1=\"%.1f\" x2=\"%.1f\" y1=\"24\" y2=\"%.1f\"/>\n",
                   at, at, bottom_) +
-           textAt(std::clamp(at, half + kGap, kWidth - half - kGap), 20,
+           textAt(std::clamp(at, half + kGap, kWidth - half - kGap), 18,
                   " text-anchor=\"middle\" font-weight=\"600\"", text) +
            "\n";
   }
@@ -266,25 +266,33 @@ class TimelinePicture {
     return svg;
   }
 
-  /// The row's last date: behind the bar or the mark if there is room, otherwise before it or inside.
+  /// The row's last date: behind the bar or the mark if there is room, otherwise inside the bar or before it.
   std::string end(const Row& row, double y) const {
-    if (row.spans.empty() && row.marks.empty()) return {};
+    const double baseline = y + kBarHeight - 4;
+    const char* const outside = " class=\"small faint halo\"";
     const std::string text = row.end();
-    const bool isBar = !row.spans.empty();
-    double begin = x(isBar ? row.spans.back().from : row.marks.back());
-    double end = isBar ? (row.spans.back().until ? x(*row.spans.back().until) : kWidth) : begin;
-    if (isBar && timeline_.isBeyond(row.spans.back())) end = kWidth;
+    const double width = widthOf(text);
+    if (row.spans.empty() && row.marks.empty()) {
+      return row.subject == Row::OfPart ? textAt(left_, baseline, outside, text) : "";
+    }
+    double begin = kWidth;
+    double end = 0;
+    for (const auto& span : row.spans) {
+      begin = std::min(begin, x(span.from));
+      end = std::max(end, timeline_.isBeyond(span) ? kWidth - kMargin : x(*span.until));
+    }
+    const double bar = end - begin;
     for (const auto& mark : row.marks) {
       begin = std::min(begin, x(mark) - 7);
       end = std::max(end, x(mark) + 7);
     }
-    const double baseline = y + kBarHeight - 4;
-    const char* const style = " class=\"small faint halo\"";
-    if (end + kGap + widthOf(text) < kWidth - kGap) return textAt(end + kGap, baseline, style, text);
-    if (begin - kGap - widthOf(text) > left_) {
-      return textAt(begin - kGap - widthOf(text), baseline, style, text);
-    }
-    return textAt(kWidth - kMargin - 10, baseline, " class=\"small inside\" text-anchor=\"end\"", text);
+    if (end + kGap + width < kWidth - kGap) return textAt(end + kGap, baseline, outside, text);
+    if (bar < width + 2 * kGap) return textAt(begin - kGap - width, baseline, outside, text);
+    const bool isOnGreen = row.spans.back().kind == Timeline::CoverageSpan;
+    return textAt(end - kGap, baseline,
+                  isOnGreen ? " class=\"small inside\" text-anchor=\"end\""
+                            : " class=\"small over\" text-anchor=\"end\"",
+                  text);
   }
 
   std::string legend() const {

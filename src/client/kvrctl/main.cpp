@@ -115,8 +115,11 @@ class CommandLine {
   }
 
   void addViews() {
-    add("timeline", "Coverage, offers and activities on one axis of dates", showTimeline)
-        ->add_option("--svg", options_.file, "Draws a picture into this file instead, - for standard output");
+    CLI::App* const timeline =
+        add("timeline", "Coverage, offers and activities on one axis of dates", showTimeline);
+    addSerial(timeline, "Only this device, by its serial number");
+    timeline->add_option("--svg", options_.file,
+                         "Draws a picture into this file instead, - for standard output");
     add("follow-ups", "The offers that are shown", [this] { return showFollowUps(options_); });
     add("activities", "The background activities: to come, and how each ended last",
         [this] { return showActivities(options_); });
