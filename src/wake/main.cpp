@@ -3,8 +3,8 @@
 //
 // The agent starts it before it releases its name. It writes one byte to its standard output once it is
 // watching. Its standard input is closed when the agent ends; from then on it acts: it has the bus start the
-// next agent when an activity is due or when a notification was posted, which it then posts again. It exits
-// once there is an agent.
+// next agent when an activity is due or when a notification was posted. Once there is an agent, it posts
+// again what it has heard, and exits.
 
 #include "local/bus/BusConnection.h"
 #include "local/buscodec/BusHandles.h"
@@ -70,7 +70,8 @@ class Waker {
         const char* now = nullptr;
         if (sd_bus_message_read(message, "sss", &name, &before, &now) >= 0 &&
             std::string_view(name) == names::kAgent && *now != '\0') {
-          static_cast<Waker*>(context)->loop_.exit(EXIT_SUCCESS);
+          auto* const self = static_cast<Waker*>(context);
+          self->loop_.post([self] { self->passOn(); });
         }
         return 0;
       });
@@ -110,7 +111,7 @@ class Waker {
     loop_.after(std::min(wait, kLongestWait), [this] { look(); });
   }
 
-  /// Notifications that arrive meanwhile are kept and posted to the next agent too.
+  /// Once it has succeeded, the name has an owner, and the bus says so.
   void start() {
     isStarting_ = true;
     bus_.thread()->post([this] {
@@ -118,22 +119,25 @@ class Waker {
       const bool isStarted =
           bus != nullptr && sd_bus_call_method(bus, kBus, kBusPath, kBus, "StartServiceByName", nullptr,
                                                nullptr, "su", names::kAgent, 0U) >= 0;
-      loop_.post([this, isStarted] { finishStart(isStarted); });
+      if (!isStarted) loop_.post([this] { tryAgainLater(); });
     });
   }
 
-  void finishStart(bool isStarted) {
+  void tryAgainLater() {
     isStarting_ = false;
-    if (!isStarted) {
-      loop_.after(kRetry, [this] { look(); });
-      return;
-    }
+    loop_.after(kRetry, [this] { look(); });
+  }
+
+  /// The next agent has the name; before that, it has subscribed to notifications. The bus reports this after
+  /// every notification that the agent may have missed, so all of them have been heard.
+  void passOn() {
     for (const auto name : heard_) notifications_.post(std::string(name));
+    heard_.clear();
     bus_.thread()->post([this] { loop_.exit(EXIT_SUCCESS); });
   }
 
   bool isActing_ = false;                ///< the agent has ended
-  bool isStarting_ = false;              ///< the next agent is being started
+  bool isStarting_ = false;              ///< the next agent is being started, or has been
   std::vector<std::string_view> heard_;  ///< in order; of each name at most `kMostInARow`
   EventLoop loop_;
   const std::unique_ptr<LocalLog> log_ = LocalLog::fromEnvironment();

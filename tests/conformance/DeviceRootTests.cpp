@@ -173,6 +173,27 @@ TEST_F(ADevice, SpeaksTheLanguageStatedElseThatOfTheEnvironment) {
   EXPECT_THAT(world.errors(), IsEmpty());
 }
 
+TEST_F(ADevice, KnowsTheOffsetOfEveryZoneAtEveryDate) {
+  const LocalUserLocale locale(root, log);
+  const Date spring{1774746000}, autumn{1792890000};  // 2026-03-29 and 2026-10-25, 01:00 UTC
+  const std::tuple<const char*, Date, long> cases[] = {{"UTC", spring, 0},
+                                                       {"Europe/Berlin", spring + -1, 3600},
+                                                       {"Europe/Berlin", spring, 7200},
+                                                       {"Europe/Berlin", autumn + -1, 7200},
+                                                       {"Europe/Berlin", autumn, 3600},
+                                                       {"Asia/Kolkata", spring, 19800},
+                                                       {"America/St_Johns", spring, -9000},
+                                                       {"America/St_Johns", autumn + 30 * kDay, -12600},
+                                                       {"Nowhere/Known", spring, 0},
+                                                       {"UTC", Date{kInfinity}, 0},
+                                                       {"UTC", Date{std::nan("")}, 0}};
+  for (const auto& [zone, date, offset] : cases) {
+    ::setenv("TZ", zone, 1);
+    EXPECT_EQ(locale.secondsFromGMT(date), offset) << zone << " " << describe(date);
+  }
+  ::unsetenv("TZ");
+}
+
 struct AnAccount : ADevice {
   using Outcome = std::pair<std::int64_t, std::string>;
 

@@ -6,6 +6,7 @@
 
 #include <atomic>
 #include <future>
+#include <latch>
 #include <stdexcept>
 #include <thread>
 
@@ -322,6 +323,43 @@ TEST(LocalQueues, DrainOnceNothingIsQueuedOrRunningAndTakeNothingMore) {
   const auto marker = std::make_shared<int>(0);
   queue->async([held = marker] { FAIL() << "ran after the end"; });
   EXPECT_EQ(marker.use_count(), 1);
+}
+
+TEST(LocalQueues, LetTheBackgroundNeitherStarveNorHoldUpTheRest) {
+  LocalQueuesWorld world;
+  const auto work = world.queues().concurrentQueue(Priority::Default);
+  const auto background = world.queues().concurrentQueue(Priority::Background);
+  const auto threads = static_cast<int>(std::max(4U, std::thread::hardware_concurrency()));
+  const auto turn = world.queues().newSignal();
+  std::atomic<bool> isOver{false};
+  // Every item hands over the next one, so there is always more to do than there are threads.
+  const std::function<void()> another = [&] {
+    if (!isOver) work->async(another);
+  };
+  for (int i = 0; i < 4 * threads; ++i) work->async(another);
+  background->async([&] { turn->signal(); });
+  EXPECT_TRUE(turn->wait(60)) << "the background never had its turn";
+  isOver = true;
+
+  // All threads are busy while the items are handed over. Those in the background keep a thread each until
+  // the other one has run.
+  std::latch allBusy(threads + 1);
+  std::promise<void> open;
+  const auto gate = open.get_future().share();
+  std::promise<void> done;
+  const auto last = done.get_future().share();
+  for (int i = 0; i < threads; ++i) {
+    work->async([&] {
+      allBusy.count_down();
+      gate.wait();
+    });
+  }
+  allBusy.arrive_and_wait();
+  for (int i = 0; i < kMany; ++i) background->async([last] { last.wait_for(std::chrono::seconds(60)); });
+  work->async([&] { done.set_value(); });
+  open.set_value();
+  EXPECT_EQ(last.wait_for(std::chrono::seconds(30)), std::future_status::ready);
+  EXPECT_TRUE(world.queues().drain(INFINITY));
 }
 
 TEST(AnEventLoop, RunsWhatWasPostedBeforeTheExitAndReleasesTheRest) {

@@ -1,14 +1,15 @@
 #pragma once
 
 #include "core/agent/Activities.h"
+#include "core/agent/Configuration.h"
 #include "core/warranty/WarrantyKeys.h"
 #include "platform/text/SHA256Hash.h"
 #include "unit/SimulatedTest.h"
 
 namespace kvr {
 
-/// A phone whose owner is signed in, with two endpoints: the version asset publishes versions 2 and 3;
-/// `coverage` answers coverage requests (if empty, they are never answered).
+/// A phone whose owner is signed in, with the agent's defaults and two endpoints: `asset` is the version
+/// asset, and `coverage` answers coverage requests (if empty, they are never answered).
 struct CoverageWorld : SimulatedPlatform {
   static constexpr const char* kLocal = "LOCAL";
 
@@ -21,17 +22,10 @@ struct CoverageWorld : SimulatedPlatform {
                                 {"UserAssignedDeviceName", "Phone"},
                                 {"ProductType", "Phone1,2"},
                                 {"ProductVersion", "17.9"}};
-    preferences.registerDefaults(
-        {{preference::kLowServerVersion, 2},
-         {preference::kHighServerVersion, 3},
-         {preference::kOneDayInterval, 86400},
-         {preference::kCachedWarrantyValidityDuration, 86400},
-         {preference::kServerVersionURL, "https://assets.example/kvrV2.plist"},
-         {preference::kWarrantyURL, "https://coverage.example/api/v3/coverage/summary"},
-         {preference::kWearablesWarrantyURL, "https://coverage.example/api/v2/coverage/summary"}});
+    kvr_registerDefaults(preferences);
     http.handler = [this](const HTTPRequest& request, bool, const SimulatedHTTP::Answer& answer) {
-      if (request.url.starts_with("https://assets.example/")) {
-        answer({200, "{ LowServerVersion = 2; HighServerVersion = 3; }", {}});
+      if (request.url.ends_with("/kvrV2.plist")) {
+        answer({200, asset, {}});
       } else if (coverage) {
         answer(coverage(request));
       }
@@ -57,6 +51,7 @@ struct CoverageWorld : SimulatedPlatform {
     pairedDevices.devices.push_back({"Watch", "Model", serialNumber, since, true, false});
   }
 
+  std::string asset = "{ LowServerVersion = 2; HighServerVersion = 3; }";
   std::function<HTTPResponse(const HTTPRequest&)> coverage;
 };
 

@@ -55,7 +55,10 @@ void AgentWorld::startAgent() {
   for (const auto* path : {"Library", "Library/Preferences", "Library/Activities"}) {
     std::filesystem::permissions(home() / path, std::filesystem::perms::owner_all);
   }
-  agent_ = std::make_unique<ChildProcess>(std::vector<std::string>{KVR_PROGRAMS "/kvragent"}, environment());
+  std::vector<std::string> command{KVR_PROGRAMS "/kvragent"};
+  if (!prologue.empty()) command = {"/bin/sh", "-e", "-c", prologue + "\nexec " + command.front()};
+  if (mayMount) command.insert(command.begin(), {"unshare", "--mount"});
+  agent_ = std::make_unique<ChildProcess>(command, environment());
   waitForName(true);
 }
 

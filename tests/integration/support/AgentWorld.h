@@ -16,6 +16,7 @@ class AgentWorld {
   static constexpr const char* kPhone = "SNPHONE00001";
   static constexpr const char* kFirstWatch = "SNWATCH00001";
   static constexpr const char* kSecondWatch = "SNWATCH00002";
+  static constexpr const char* kActivities = "Library/Activities/com.tarsil.kvragent.plist";
   enum Policy : std::uint64_t { Default = 0, CacheOnly = 1, Refresh = 2 };
 
   /// Whether the service requires attestation for requests about the phone.
@@ -78,6 +79,8 @@ class AgentWorld {
   }
   std::string cacheFileOf(const std::string& serialNumber) const;
   std::filesystem::path home() const { return directory / "home"; }
+  /// The agent's changes to the environment of this process.
+  ChildProcess::Environment environment() const;
 
   // Calls of a client; they return the reply.
   static Value info(const RawBusClient& client, const std::string& serialNumber, std::uint64_t policy) {
@@ -92,12 +95,14 @@ class AgentWorld {
   PrivateBus bus;
   TemporaryDirectory directory;
   ChildProcess::Environment moreEnvironment;  ///< for the agent, in addition to the usual one
+  /// Shell commands that the agent's process executes before it becomes the agent.
+  std::string prologue;
+  /// Whether the prologue may mount, which nobody else sees. Takes root.
+  bool mayMount = false;
 
  private:
-  static constexpr const char* kActivities = "Library/Activities/com.tarsil.kvragent.plist";
   static constexpr const char* kPreferences = "Library/Preferences/com.tarsil.kvragent.plist";
 
-  ChildProcess::Environment environment() const;
   std::unique_ptr<ChildProcess> service_;
   std::string serviceURL_;
   std::unique_ptr<ChildProcess> agent_;

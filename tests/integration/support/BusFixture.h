@@ -95,6 +95,12 @@ struct BusFixture : ::testing::Test, ServiceListenerDelegate {
   std::unique_ptr<LocalServiceListeners> listeners;
   std::unique_ptr<ServiceListener> listener;
 
+ protected:
+  EventLoop& loop() { return loop_; }
+  LocalWorkQueues& queues() { return queues_; }
+  const DeviceRoot& deviceRoot() const { return deviceRoot_; }
+  const LocalClock& clock() const { return clock_; }
+
  private:
   struct Object : ServiceObject {
     explicit Object(const BusFixture& test)

@@ -1,6 +1,10 @@
 #include "core/agent/KVRAgent.h"
+#include "core/agent/KVRAgentDefaultWarrantyProvider.h"
 #include "platform/codec/JSON.h"
 #include "unit/CoverageWorld.h"
+
+#include <latch>
+#include <thread>
 
 namespace kvr {
 namespace {
@@ -124,6 +128,41 @@ TEST_F(AnAgent, HandsOutTheWebURLOverrideOnInternalInstallationsOnly) {
   agent->readWebURLOverride(std::nullopt);
   EXPECT_THAT(replies, ElementsAre(Value(), Value("https://flow.example")));
   EXPECT_EQ(world.log.count("readWebURLOverride = https://flow.example"), 2U);
+}
+
+/// Keeps the answers to downloads until the test gives them.
+struct LateProvider : KVRAgentDefaultWarrantyProvider {
+  using KVRAgentDefaultWarrantyProvider::KVRAgentDefaultWarrantyProvider;
+
+  void downloadWarrantyForSerialNumber(const std::string&, DownloadCompletion handler) override {
+    handlers.push_back(std::move(handler));
+  }
+  std::vector<DownloadCompletion> handlers;
+};
+
+TEST_F(AnAgent, LosesNoAnswerOfThoseThatComeOnManyThreadsAtOnce) {
+  constexpr std::ptrdiff_t kThreads = 8;
+  for (int i = 0; i < 400; ++i) world.pair("W" + std::to_string(i));
+  const auto provider = std::make_shared<LateProvider>(world.platform, "client");
+  agent->warrantyProvider = std::shared_ptr<KVRAgentWarrantyProvider>(provider);
+  const auto reply = allInfos();
+  world.queues.run();
+  std::latch together(kThreads);
+  std::vector<std::thread> threads;
+  for (std::size_t first = 0; first < kThreads; ++first) {
+    threads.emplace_back([&, first] {
+      together.arrive_and_wait();
+      for (auto i = first; i < provider->handlers.size(); i += kThreads)
+        provider->handlers[i](false, nullptr);
+    });
+  }
+  for (auto& thread : threads) thread.join();
+  world.queues.run();
+  ASSERT_TRUE(reply->has_value());
+  std::set<std::string> serialNumbers;
+  for (const auto& record : **reply) serialNumbers.insert(*record->device()->serialNumber());
+  EXPECT_THAT(serialNumbers, SizeIs(401));
+  EXPECT_THAT(**reply, SizeIs(401));
 }
 
 }  // namespace

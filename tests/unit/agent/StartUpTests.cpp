@@ -12,7 +12,6 @@ constexpr const char* kActivities = "/home/user/Library/Activities/com.tarsil.kv
 
 /// Prepares a device that is already set up, with no upgrade or boot since.
 void setUp(CoverageWorld& world) {
-  world.preferences.setObject("https://assets.example/kvrV2.plist", preference::kServerVersionURL);
   world.preferences.setObject(true, preference::kPostUpgradeActivityCompleted);
   world.preferences.setObject("17.9", preference::kPostUpgradeOSVersion);
   world.files.putPropertyList(kActivities,
@@ -102,6 +101,81 @@ TEST_F(AStart, RunsEveryOutreachThatAClientAsksForAndNoneTooSoon) {
     EXPECT_EQ(runs(), isDelayed ? run : run + 1);
     world.queues.advance(10);
     EXPECT_EQ(runs(), run + 1);
+  }
+}
+
+TEST_F(AStart, WorksByTheDefaultsWhereNothingIsStored) {
+  const StartUp startUp(world.platform);
+  const auto client = world.services.connect(names::kAgent, {{{names::kEntitlement, true}}, 1234});
+  const auto urlsOfALookUp = [&](const char* member, const Array& arguments) {
+    world.http.clearRequests();
+    client->invoke(member, arguments);
+    world.queues.run();
+    std::vector<std::string> urls;
+    for (const auto& sent : world.http.requests()) urls.push_back(sent.request.url);
+    return urls;
+  };
+  const std::string assets = "https://assets.tarsil.example/library/TARSIL/asset/kvrV2.plist";
+  const std::string coverage = "https://coverage.tarsil.example/api/v";
+  const auto all =
+      UnorderedElementsAre(assets, assets, coverage + "3/coverage/summary", coverage + "2/coverage/summary");
+  world.pair("W");
+  EXPECT_THAT(urlsOfALookUp("GetAllDeviceInfosUsingPolicy", {0, false}), all);
+  world.queues.advance(86399);
+  EXPECT_THAT(urlsOfALookUp("GetAllDeviceInfosUsingPolicy", {0, false}), IsEmpty()) << "valid for a day";
+  world.queues.advance(1);
+  EXPECT_THAT(urlsOfALookUp("GetAllDeviceInfosUsingPolicy", {0, false}), all);
+
+  const std::tuple<int, int, bool> versions[] = {{1, 2, true}, {3, 4, true}, {1, 4, false}};
+  for (const auto& [low, high, isShared] : versions) {
+    world.asset = format("{ LowServerVersion = %d; HighServerVersion = %d; }", low, high);
+    EXPECT_THAT(urlsOfALookUp("GetDeviceInfoForSerialNumber", {"LOCAL", 2}), SizeIs(isShared ? 2 : 1));
+  }
+  client->invoke("TarsilAccountAdded");
+  world.queues.run();
+  EXPECT_EQ(target(names::kOutreach), world.clock.now() + 3600);
+}
+
+TEST_F(AStart, MonitorsFiveActivitiesInTheirOrder) {
+  const StartUp startUp(world.platform);
+  std::vector<std::string> monitored, expected;
+  for (const auto& line : world.log.texts()) {
+    if (line.starts_with("monitorForScheduledActivity")) monitored.push_back(line);
+  }
+  // The post activity exists only while it is scheduled.
+  for (const auto* identifier : {names::kPostUpgrade, names::kPostBoot, names::kOutreach,
+                                 names::kConversionOutreach, names::kFollowUpRefresh}) {
+    expected.push_back(format("monitorForScheduledActivity for '%@'", identifier));
+  }
+  EXPECT_EQ(monitored, expected);
+}
+
+TEST_F(AStart, RunsEachActivityOnceByItsCriteria) {
+  const std::pair<const char*, bool> activities[] = {
+      {names::kPostUpgrade, false},       {names::kPostBoot, false},        {names::kOutreach, true},
+      {names::kConversionOutreach, true}, {names::kFollowUpRefresh, false}, {names::kFollowUpPost, true}};
+  for (const auto& [identifier, needsNetwork] : activities) {
+    SCOPED_TRACE(identifier);
+    CoverageWorld device;
+    setUp(device);
+    const StartUp startUp(device.platform);
+    const Date now = device.clock.now();
+    KVRScheduler::newSchedulerForActivity(device.platform, identifier)->scheduleActivityWithDelay(3600);
+    auto registration = device.files.getPropertyList(kActivities)["activities"][identifier].dictionary();
+    const Date due = registration["dueDate"].date();
+    EXPECT_TRUE(now + 3600 <= due && due <= now + 3960) << describe(due);
+    registration.erase("dueDate");
+    EXPECT_EQ(registration, (Dictionary{{"delay", 3600},
+                                        {"gracePeriod", 360},
+                                        {"priority", "utility"},
+                                        {"registeredDate", now},
+                                        {"requiresNetwork", needsNetwork}}));
+    for (const bool isReachable : {false, true}) {
+      device.activities.setNetworkReachable(isReachable);
+      device.queues.advance(kDay);
+      const auto line = format("target reached for '%@', trigger activity", identifier);
+      EXPECT_EQ(device.log.count(line), needsNetwork && !isReachable ? 0U : 1U);
+    }
   }
 }
 

@@ -15,7 +15,6 @@ struct TheAgentsLife : AnOfferTest {
   std::map<std::string, Value> warranties;  ///< by serial number; other downloads fail
 
   TheAgentsLife() {
-    world.preferences.setObject("https://assets.example/kvrV2.plist", preference::kServerVersionURL);
     world.coverage = [this](const HTTPRequest& request) {
       const auto found = warranties.find((*readJSON(request.body))["serialNumber"].string());
       if (found == warranties.end() || found->second.isNull()) return HTTPResponse{500, {}, {}};

@@ -46,7 +46,7 @@ TEST_F(ADownload, GoesOnceToTheEndpointOfItsDeviceForItsClient) {
     EXPECT_TRUE(download(serialNumber).success);
     ASSERT_EQ(world.http.requests().size(), 2U) << "the version asset, then the coverage";
     const auto& request = world.http.requests()[1].request;
-    EXPECT_EQ(request.url, std::string("https://coverage.example") + path);
+    EXPECT_EQ(request.url, std::string("https://coverage.tarsil.example") + path);
     EXPECT_FALSE(request.followsRedirects);
     EXPECT_EQ(request.timeout, 30);
     EXPECT_EQ(request.sourceApplicationBundleID, "com.example.client");
@@ -251,7 +251,7 @@ TEST_F(ADownload, ReadsALocalFileOrItsVariantForTheDeviceInTheServicesPlace) {
   world.preferences.setObject("file:///data/plain", preference::kWearablesWarrantyURL);
   world.files.put("/data/plain.WATCH.", "{ quorURL = plain; }");
   EXPECT_EQ(download("WATCH").warranty->quorURL(), Value("plain"));
-  for (const auto& sent : world.http.requests()) EXPECT_THAT(sent.request.url, HasSubstr("assets.example"));
+  for (const auto& sent : world.http.requests()) EXPECT_THAT(sent.request.url, HasSubstr("/kvrV2.plist"));
 }
 
 }  // namespace
