@@ -341,13 +341,10 @@ TEST(LocalQueues, LetTheBackgroundNeitherStarveNorHoldUpTheRest) {
   EXPECT_TRUE(turn->wait(60)) << "the background never had its turn";
   isOver = true;
 
-  // All threads are busy while the items are handed over. Those in the background keep a thread each until
-  // the other one has run.
+  // All threads are busy while the items are handed over. Those in the background then keep a thread each.
   std::latch allBusy(threads + 1);
-  std::promise<void> open;
-  const auto gate = open.get_future().share();
-  std::promise<void> done;
-  const auto last = done.get_future().share();
+  std::promise<void> open, done, over;
+  const auto gate = open.get_future().share(), end = over.get_future().share();
   for (int i = 0; i < threads; ++i) {
     work->async([&] {
       allBusy.count_down();
@@ -355,10 +352,11 @@ TEST(LocalQueues, LetTheBackgroundNeitherStarveNorHoldUpTheRest) {
     });
   }
   allBusy.arrive_and_wait();
-  for (int i = 0; i < kMany; ++i) background->async([last] { last.wait_for(std::chrono::seconds(60)); });
+  for (int i = 0; i < kMany; ++i) background->async([end] { end.wait(); });
   work->async([&] { done.set_value(); });
   open.set_value();
-  EXPECT_EQ(last.wait_for(std::chrono::seconds(30)), std::future_status::ready);
+  EXPECT_EQ(done.get_future().wait_for(std::chrono::seconds(30)), std::future_status::ready);
+  over.set_value();
   EXPECT_TRUE(world.queues().drain(INFINITY));
 }
 
