@@ -38,6 +38,8 @@ struct TheOutput : Kvrctl {
     return {{"DBUS_SESSION_BUS_ADDRESS", bus.address()},
             {"HOME", "home"},
             {"KVR_DEVICE_ROOT", "device"},
+            {"TERM", "xterm"},
+            {"NO_COLOR", ""},
             {"LOCPATH", KVR_LOCALES},
             {"LC_ALL", reader.locale},
             {"TZ", reader.zone},
@@ -51,8 +53,10 @@ struct TheOutput : Kvrctl {
   /// What the command prints, below a line that says for whom.
   std::string transcript(const Reader& reader, const std::string& command) {
     auto program = startFor(reader, command);
-    const auto [status, output, errors] = outcomeOf(program);
+    auto [status, output, errors] = outcomeOf(program);
     EXPECT_EQ(errors, "") << command;
+    // A line for each record, so that a difference shows which one it is in.
+    for (std::size_t at = 0; (at = output.find("},{", at)) != std::string::npos;) output.insert(at + 2, "\n");
     return "$ LC_ALL=" + reader.locale + " TZ=" + reader.zone + " COLUMNS=" + reader.columns + " kvrctl " +
            command + "\n" + output + "[" + std::to_string(status) + "]\n\n";
   }
