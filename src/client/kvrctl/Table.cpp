@@ -45,23 +45,32 @@ std::size_t Table::nextToGo(const Widths& widths) const {
 
 Table::Widths Table::widthsFor(std::size_t columns) const {
   Widths natural = naturalWidths();
-  for (;;) {
-    Widths widths = natural;
-    while (total(widths) > columns) {
-      std::size_t widest = columns_.size();
-      for (std::size_t column = 0; column < columns_.size(); ++column) {
-        const std::size_t least = std::max(columns_[column].least, columnsOf(columns_[column].heading));
-        if (columns_[column].least == 0 || widths[column] <= least) continue;
-        if (widest == columns_.size() || widths[column] > widths[widest]) widest = column;
-      }
-      if (widest == columns_.size()) break;
-      --widths[widest];
-    }
-    if (total(widths) <= columns) return widths;
-    const std::size_t next = nextToGo(natural);
-    if (next == columns_.size()) return {};
-    natural[next] = 0;
+  Widths least = natural;
+  for (std::size_t column = 0; column < columns_.size(); ++column) {
+    const auto& [heading, fewest, goesAs] = columns_[column];
+    if (fewest > 0) least[column] = std::min(natural[column], std::max(fewest, columnsOf(heading)));
   }
+  while (total(least) > columns) {
+    const std::size_t next = nextToGo(least);
+    if (next == columns_.size()) return {};
+    natural[next] = least[next] = 0;
+  }
+  // The widest cells give way first.
+  while (total(natural) > columns) {
+    std::size_t widest = columns_.size();
+    for (std::size_t column = 0; column < columns_.size(); ++column) {
+      if (natural[column] == least[column]) continue;
+      if (widest == columns_.size() || natural[column] > natural[widest]) widest = column;
+    }
+    const std::size_t over = total(natural) - columns;
+    std::size_t second = least[widest];
+    for (std::size_t column = 0; column < columns_.size(); ++column) {
+      if (column != widest && natural[column] > least[column]) second = std::max(second, natural[column]);
+    }
+    const std::size_t step = natural[widest] > second ? natural[widest] - second : 1;
+    natural[widest] -= std::min(step, over);
+  }
+  return natural;
 }
 
 std::string Table::lines(const std::vector<Cell>& row, const Widths& widths, const Style& style) const {

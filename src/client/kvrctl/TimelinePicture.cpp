@@ -114,7 +114,7 @@ std::string textAt(double x, double y, const char* attributes, std::string_view 
 
 /// What the row shows, as a sentence.
 std::string sentence(const Row& row) {
-  std::string text = row.label + ": " + row.note;
+  std::string text = row.label + ": " + (row.isUnknown ? "coverage unknown" : row.note);
   for (const auto& [kind, from, until, hasEnded] : row.spans) {
     if (row.subject == Row::OfPart) text = row.label + ": from " + Style::day(from);
     if (row.subject == Row::OfDevice) text += hasEnded ? ", ended" : "";
