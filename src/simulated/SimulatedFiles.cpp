@@ -53,6 +53,17 @@ std::optional<Error> SimulatedFiles::Faults::of(const std::string& path) const {
   return found == byPath.end() ? all : found->second;
 }
 
+void SimulatedFiles::File::setBytes(std::string newBytes) {
+  bytes = std::move(newBytes);
+  stamp.size = bytes.size();
+  tree.reset();
+}
+
+const Result<Value>& SimulatedFiles::File::propertyList() const {
+  if (!tree) tree = readPropertyList(bytes);
+  return *tree;
+}
+
 SimulatedFiles::SimulatedFiles(const Clock& clock) : clock_(clock) { addDirectories(kHomeDirectory); }
 
 Result<std::optional<FileContents>> SimulatedFiles::read(const std::string& path, std::size_t limit) {
@@ -91,8 +102,7 @@ class SimulatedFiles::Replacement : public ReplaceSteps {
   }
   std::optional<Error> write(const std::string& bytes) override {
     if (auto error = files_.begin(Step::Write, path_)) return error;
-    files_.files_.at(temporary_).bytes = bytes;
-    files_.files_.at(temporary_).stamp.size = bytes.size();
+    files_.files_.at(temporary_).setBytes(bytes);
     return std::nullopt;
   }
   std::optional<Error> sync() override {
@@ -210,10 +220,17 @@ std::optional<std::string> SimulatedFiles::get(const std::string& path) const {
 }
 
 Value SimulatedFiles::getPropertyList(const std::string& path) const {
-  const auto bytes = get(path);
-  if (!bytes) return {};
-  auto tree = readPropertyList(*bytes);
-  return tree ? *std::move(tree) : Value();
+  const std::lock_guard lock(mutex_);
+  const auto found = files_.find(path);
+  if (found == files_.end()) return {};
+  const auto& tree = found->second.propertyList();
+  return tree ? *tree : Value();
+}
+
+bool SimulatedFiles::holdsPropertyList(const std::string& path) const {
+  const std::lock_guard lock(mutex_);
+  const auto found = files_.find(path);
+  return found != files_.end() && found->second.propertyList();
 }
 
 void SimulatedFiles::erase(const std::string& path) {
@@ -221,12 +238,12 @@ void SimulatedFiles::erase(const std::string& path) {
   files_.erase(path);
 }
 
-std::vector<std::string> SimulatedFiles::list(const std::string& directory) const {
+std::vector<std::string> SimulatedFiles::list(const std::string& directory, std::string_view part) const {
   const std::lock_guard lock(mutex_);
   const std::string prefix = directory + "/";
   std::vector<std::string> paths;
   for (auto at = files_.lower_bound(prefix); at != files_.end() && at->first.starts_with(prefix); ++at) {
-    paths.push_back(at->first);
+    if (at->first.find(part) != std::string::npos) paths.push_back(at->first);
   }
   return paths;
 }
@@ -299,8 +316,7 @@ void SimulatedFiles::losePower(std::mt19937_64& random) {
   unsynced_.clear();
   for (auto& [path, file] : files_) {
     if (std::exchange(file.isSynced, true)) continue;
-    file.bytes.resize(static_cast<std::size_t>(random() % (file.bytes.size() + 1)));
-    file.stamp.size = file.bytes.size();
+    file.setBytes(file.bytes.substr(0, static_cast<std::size_t>(random() % (file.bytes.size() + 1))));
     file.stamp.inode = ++lastInode_;
   }
 }

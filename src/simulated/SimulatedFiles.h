@@ -9,6 +9,8 @@
 #include <mutex>
 #include <random>
 #include <set>
+#include <string>
+#include <string_view>
 #include <vector>
 
 namespace kvr {
@@ -43,9 +45,11 @@ class SimulatedFiles : public Files {
   std::optional<std::string> get(const std::string& path) const;
   /// The tree in a file; null when there is no such file or it holds no property list.
   Value getPropertyList(const std::string& path) const;
+  /// Whether there is such a file and it holds a property list.
+  bool holdsPropertyList(const std::string& path) const;
   void erase(const std::string& path);
-  /// The paths of the files in `directory` and below it, in ascending order.
-  std::vector<std::string> list(const std::string& directory) const;
+  /// The paths of the files in `directory` and below it that contain `part`, in ascending order.
+  std::vector<std::string> list(const std::string& directory, std::string_view part = {}) const;
 
   // Faults last until they are set to nothing. A fault for one file takes precedence over that for all files.
   void setReadFault(std::optional<Error> error);
@@ -82,6 +86,10 @@ class SimulatedFiles : public Files {
     std::string bytes;
     FileStamp stamp;
     bool isSynced = true;
+    mutable std::optional<Result<Value>> tree = std::nullopt;  ///< the property list in it, once read
+
+    void setBytes(std::string newBytes);
+    const Result<Value>& propertyList() const;
   };
   /// A change of the file under a name that is not durable yet.
   struct Unsynced {

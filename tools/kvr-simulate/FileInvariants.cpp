@@ -4,7 +4,6 @@
 #include "core/scheduling/SchedulingKeys.h"
 #include "core/warranty/WarrantyKeys.h"
 #include "kvr-simulate/Invariants.h"
-#include "platform/codec/PropertyList.h"
 #include "platform/names/Names.h"
 #include "platform/text/SHA256Hash.h"
 
@@ -18,9 +17,27 @@ const std::string kPreferencesPath =
 const std::string kFollowUpsPath =
     std::string(SimulatedFiles::kHomeDirectory) + "/Library/FollowUps/" + names::kFollowUpClient + ".plist";
 
-bool isTemporary(const std::string& path) { return path.find(".kvr-") != std::string::npos; }
+constexpr std::string_view kTemporaryTag = ".kvr-";
 
 Value::Array listIn(const Value& value) { return value.isArray() ? value.array() : Value::Array(); }
+
+/// The keys whose values differ, in ascending order; `after` is a dictionary.
+std::vector<std::string> changedKeys(const Value& before, const Value& after) {
+  static const Value::Dictionary kNone;
+  const auto& earlier = before.isDictionary() ? before.dictionary() : kNone;
+  std::vector<std::string> keys;
+  const auto compare = [&keys](const std::string& key, const Value& left, const Value& right) {
+    if (!(left == right)) keys.push_back(key);
+  };
+  auto old = earlier.begin();
+  for (const auto& [key, value] : after.dictionary()) {
+    for (; old != earlier.end() && old->first < key; ++old) compare(old->first, old->second, {});
+    const bool isKept = old != earlier.end() && old->first == key;
+    compare(key, isKept ? old++->second : Value(), value);
+  }
+  for (; old != earlier.end(); ++old) compare(old->first, old->second, {});
+  return keys;
+}
 
 bool mayBeRemoved(const std::string& key) {
   return key == preference::kServerVersionCache || key == names::kLastUpdatedDate ||
@@ -60,15 +77,13 @@ void Invariants::fileChanged(const std::string& path, bool isDone) {
   cacheChanged(path);
   if (!isWatching()) return;
   checkNames(path);
-  if (bytes && path.ends_with(".plist") && !damageIsPlanted_ && !readPropertyList(*bytes)) {
+  if (bytes && path.ends_with(".plist") && !damageIsPlanted_ && !platform_->files.holdsPropertyList(path)) {
     report("files are whole", path);
   }
   // Leftovers of an earlier process are removed before the first file of a directory is replaced.
   const bool isCleared = isDone && bytes && path.find(".damaged-") == std::string::npos && !filesFailed_;
-  for (const auto& neighbour : platform_->files.list(path.substr(0, path.rfind('/')))) {
-    if (isTemporary(neighbour) && (isCleared || !leftovers_.contains(neighbour))) {
-      report("no temporary file stays", neighbour);
-    }
+  for (const auto& neighbour : platform_->files.list(path.substr(0, path.rfind('/')), kTemporaryTag)) {
+    if (isCleared || !leftovers_.contains(neighbour)) report("no temporary file stays", neighbour);
   }
   if (path == kPreferencesPath) checkPreferences();
   if (path == kFollowUpsPath) checkFollowUps();
@@ -84,15 +99,9 @@ void Invariants::checkPreferences() {
     datesAreDamaged_ = true;
     return;
   }
-  std::set<std::string> keys;
-  if (before.isDictionary()) {
-    for (const auto& [key, value] : before.dictionary()) keys.insert(key);
-  }
-  for (const auto& [key, value] : after.dictionary()) keys.insert(key);
   // The preferences about one device's cached warranty change together.
   std::set<std::string> changed;
-  for (const auto& key : keys) {
-    if (before[key] == after[key]) continue;
+  for (const auto& key : changedKeys(before, after)) {
     changed.insert(key.substr(0, key.find("_CachedWarranty")));
     checkChange(key, before[key], after[key], after);
   }

@@ -4,7 +4,6 @@
 
 #include "core/followup/FollowUpKeys.h"
 #include "core/scheduling/SchedulingKeys.h"
-#include "platform/codec/PropertyList.h"
 #include "platform/names/Names.h"
 #include "platform/text/SHA256Hash.h"
 #include "platform/text/URL.h"
@@ -63,7 +62,7 @@ void Invariants::beginProcess(SimulatedPlatform& platform) {
     leftovers_.insert(path);
     checkNames(path);
     const bool isList = path.ends_with(".plist") && path.find("/.") == std::string::npos;
-    if (isList && !damageIsPlanted_ && !readPropertyList(*platform.files.get(path))) {
+    if (isList && !damageIsPlanted_ && !platform.files.holdsPropertyList(path)) {
       report("files are whole after a crash", path);
     }
   }
