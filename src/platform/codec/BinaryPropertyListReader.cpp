@@ -43,7 +43,7 @@ class Reader {
     while (!open_.empty()) {
       if (!step()) return plistError(problem_);
     }
-    return std::move(objects_[top_].value);
+    return valueOf(objects_[top_]);
   }
   /// Whether the list was refused for its expanded size or its depth, and not for damage.
   bool isTooMuch() const { return isTooMuch_; }
@@ -55,7 +55,8 @@ class Reader {
   enum class State : std::uint8_t { Unread, Open, Read };
 
   struct Object {
-    Value value;
+    Value value;            ///< null for a text that nothing but keys has used so far
+    std::string_view text;  ///< of an ASCII string
     Extent extent;
     std::uint32_t height = 0;  ///< levels of containers, this one included
     State state = State::Unread;
@@ -114,6 +115,11 @@ class Reader {
   bool closeContainer(const Container& container);
   bool measure(const Container& container);
   bool finish(Object& object, Value value);
+  bool finishText(Object& object, std::string_view text);
+  static const Value& valueOf(Object& object);
+  static bool isString(const Object& object) {
+    return object.text.data() != nullptr || object.value.isString();
+  }
   bool mayCopy(std::uint64_t bytes);
   bool isText(std::uint64_t object, std::string_view text);
   std::optional<Value> leafOrEmpty(std::uint64_t object);
@@ -203,6 +209,17 @@ bool Reader::finish(Object& object, Value value) {
   return true;
 }
 
+/// Most texts are keys, which need no value of their own.
+bool Reader::finishText(Object& object, std::string_view text) {
+  object.text = text;
+  return finish(object, {});
+}
+
+const Value& Reader::valueOf(Object& object) {
+  if (object.text.data() != nullptr && object.value.isNull()) object.value = object.text;
+  return object.value;
+}
+
 /// Counts bytes before they are copied; refuses more than the limit. A key is copied for each use and once
 /// more as an object of its own; these extra copies are no larger than the input.
 bool Reader::mayCopy(std::uint64_t bytes) {
@@ -265,7 +282,7 @@ bool Reader::readBytes(Object& object, Kind kind, Content content) {
     const auto isASCII = [](char c) { return static_cast<unsigned char>(c) < 0x80; };
     if (!std::all_of(bytes.begin(), bytes.end(), isASCII))
       return refuse("a string that is not ASCII as it says");
-    return finish(object, bytes);
+    return finishText(object, bytes);
   }
   auto text = utf8FromUTF16(bytes, ByteOrder::Big);
   if (!text) return refuse("a string with half a character");
@@ -308,7 +325,7 @@ bool Reader::measure(const Container& container) {
   for (std::size_t i = 0; i < container.references(); ++i) {
     const auto& child = objects_[reference(container, i)];
     if (i < keys) {
-      if (!child.value.isString()) return refuse("a key that is not a string");
+      if (!isString(child)) return refuse("a key that is not a string");
       if (!mayCopy(child.extent.bytes)) return false;
       object.extent.bytes += child.extent.bytes;
     } else {
@@ -325,19 +342,20 @@ bool Reader::measure(const Container& container) {
 
 bool Reader::closeContainer(const Container& container) {
   if (!measure(container)) return false;
-  const auto child = [&](std::size_t index) -> const Value& {
-    return objects_[reference(container, index)].value;
-  };
+  const auto child = [&](std::size_t index) -> Object& { return objects_[reference(container, index)]; };
   if (container.isDictionary) {
     Value::Dictionary dictionary;
     for (std::size_t i = 0; i < container.count; ++i) {
-      dictionary.insert_or_assign(dictionary.end(), child(i).string(), child(container.count + i));
+      auto& key = child(i);
+      dictionary.insert_or_assign(dictionary.end(),
+                                  key.text.data() != nullptr ? std::string(key.text) : key.value.string(),
+                                  valueOf(child(container.count + i)));
     }
     return finish(objects_[container.object], std::move(dictionary));
   }
   Value::Array array;
   array.reserve(container.count);
-  for (std::size_t i = 0; i < container.count; ++i) array.push_back(child(i));
+  for (std::size_t i = 0; i < container.count; ++i) array.push_back(valueOf(child(i)));
   return finish(objects_[container.object], std::move(array));
 }
 
@@ -367,7 +385,7 @@ std::optional<Value> Reader::leafOrEmpty(std::uint64_t object) {
   }
   auto& found = objects_[object];
   if (found.state == State::Unread && !enter(object)) return std::nullopt;
-  if (found.state == State::Read) return found.value;
+  if (found.state == State::Read) return valueOf(found);
   const auto container =
       std::ranges::find(open_, object, [](const Container& open) -> std::uint64_t { return open.object; });
   return container->isDictionary ? Value(Value::Dictionary()) : Value(Value::Array());
@@ -375,7 +393,7 @@ std::optional<Value> Reader::leafOrEmpty(std::uint64_t object) {
 
 Result<Value> Reader::readTopLevel(EntryKeys keys) {
   if (!readTrailer() || !enter(top_)) return plistError(problem_);
-  if (open_.empty()) return std::move(objects_[top_].value);
+  if (open_.empty()) return valueOf(objects_[top_]);
   const auto top = open_.front();
   if (!top.isDictionary) return Value(Value::Array());
   Value::Dictionary entries;
