@@ -279,6 +279,10 @@ void Life::setting(Dice& dice) {
     case 0:
       invariants_.shortestDay = 1800;
       preferences.setObject(dice.oneOf({kDayLengths[1], kDayLengths[2]}), preference::kOneDayInterval);
+      // Long enough for some hundred runs of activities.
+      later(3 * kDay, [this] {
+        if (process_) process_->simulated.preferences.setObject(kDayLengths[0], preference::kOneDayInterval);
+      });
       break;
     case 1:
       preferences.setObject(dice.oneOf({0, 60, 1'000'000}), preference::kCachedWarrantyValidityDuration);
