@@ -7,8 +7,11 @@
 #include <algorithm>
 #include <atomic>
 #include <cstdio>
+#include <fstream>
 #include <map>
 #include <mutex>
+#include <numeric>
+#include <sstream>
 #include <thread>
 
 namespace kvr::simulate {
@@ -16,13 +19,15 @@ namespace {
 
 struct Arguments {
   std::uint64_t first = 1;
-  std::uint64_t seeds = 200;
+  std::uint64_t count = 200;
+  std::string listed;  ///< the file that lists the seeds; empty if they are consecutive
   double years = 1;
   unsigned jobs = std::max(std::thread::hardware_concurrency(), 1U);
   std::vector<std::size_t> only;
   bool isTraced = false;
   bool isWithoutEvents = false;
   bool isBrief = false;
+  bool goesOn = false;
 };
 
 /// For some seeds everything is logged, so that the formatting of log lines is exercised too.
@@ -39,6 +44,26 @@ std::vector<Event> eventsFor(std::uint64_t seed, const Arguments& arguments) {
     });
   }
   return events;
+}
+
+/// The seeds in a file: one in a line, before an optional comment from '#' on.
+std::vector<std::uint64_t> seedsIn(const std::string& path) {
+  std::ifstream file(path);
+  std::vector<std::uint64_t> seeds;
+  for (std::string line; std::getline(file, line);) {
+    std::istringstream words(line.substr(0, line.find('#')));
+    for (std::uint64_t seed = 0; words >> seed;) seeds.push_back(seed);
+    if (!words.eof()) throw CLI::ValidationError("--seeds-of", path + ": no seed: " + line);
+  }
+  if (seeds.empty()) throw CLI::ValidationError("--seeds-of", path + ": no seeds");
+  return seeds;
+}
+
+std::vector<std::uint64_t> seedsOf(const Arguments& arguments) {
+  if (!arguments.listed.empty()) return seedsIn(arguments.listed);
+  std::vector<std::uint64_t> seeds(arguments.count);
+  std::iota(seeds.begin(), seeds.end(), arguments.first);
+  return seeds;
 }
 
 void explain(std::uint64_t seed, const Arguments& arguments, const Outcome& outcome) {
@@ -64,14 +89,14 @@ void explain(std::uint64_t seed, const Arguments& arguments, const Outcome& outc
   std::fflush(stdout);
 }
 
-int simulate(const Arguments& arguments) {
+int simulate(const Arguments& arguments, const std::vector<std::uint64_t>& seeds) {
   std::mutex mutex;  // guards what follows
   Figures figures;
   std::map<std::uint64_t, Outcome> broken;
-  std::atomic<std::uint64_t> next{0};
+  std::atomic<std::size_t> next{0};
   const auto work = [&] {
-    for (auto index = next++; index < arguments.seeds; index = next++) {
-      const auto seed = arguments.first + index;
+    for (auto index = next++; index < seeds.size(); index = next++) {
+      const auto seed = seeds[index];
       const Life::Options options{arguments.years, arguments.isTraced ? LogLevel::Debug : levelFor(seed),
                                   arguments.isTraced};
       const auto events = eventsFor(seed, arguments);
@@ -83,20 +108,22 @@ int simulate(const Arguments& arguments) {
       figures.add(outcome.figures);
       if (!outcome.breach) continue;
       broken.emplace(seed, std::move(outcome));
-      next = arguments.seeds;
+      if (!arguments.goesOn) next = seeds.size();
     }
   };
   std::vector<std::thread> threads;
   for (unsigned job = 0; job < arguments.jobs; ++job) threads.emplace_back(work);
   for (auto& thread : threads) thread.join();
   std::printf(
-      "%llu seeds of %g years: %zu starts, %zu crashes, %zu losses of power, %zu calls, %zu requests, "
+      "%zu seeds of %g years: %zu starts, %zu crashes, %zu losses of power, %zu calls, %zu requests, "
       "%zu posts, %zu clock jumps, %zu file faults, %zu runs of activities\n",
-      static_cast<unsigned long long>(arguments.seeds), arguments.years, figures.starts, figures.crashes,
-      figures.powerLosses, figures.calls, figures.requests, figures.posts, figures.clockJumps,
-      figures.fileFaults, figures.runs);
+      seeds.size(), arguments.years, figures.starts, figures.crashes, figures.powerLosses, figures.calls,
+      figures.requests, figures.posts, figures.clockJumps, figures.fileFaults, figures.runs);
   if (broken.empty()) return EXIT_SUCCESS;
-  explain(broken.begin()->first, arguments, broken.begin()->second);
+  for (const auto& [seed, outcome] : broken) {
+    explain(seed, arguments, outcome);
+    if (!arguments.goesOn) break;
+  }
   return EXIT_FAILURE;
 }
 
@@ -106,15 +133,21 @@ int simulate(const Arguments& arguments) {
 int main(int count, char** texts) {
   kvr::simulate::Arguments arguments;
   CLI::App app("Lives whole lives of the agent in virtual time and checks what must always hold.");
-  app.add_option("--seeds", arguments.seeds, "how many lives");
+  app.add_option("--seeds", arguments.count, "how many lives");
+  app.add_option("--seeds-of", arguments.listed, "the file that lists the seeds of the lives");
   app.add_option("--years", arguments.years, "how long each is");
   app.add_option("--first", arguments.first, "the first life's seed");
   app.add_option("--jobs", arguments.jobs, "how many are lived at once");
   app.add_option("--only", arguments.only, "the numbers of the only events that happen")->delimiter(',');
   app.add_flag("--none", arguments.isWithoutEvents, "let nothing happen");
   app.add_flag("--brief", arguments.isBrief, "do not look for the shortest way to see a failure again");
+  app.add_flag("--go-on", arguments.goesOn, "do not stop at the first failure");
   app.add_flag("--trace", arguments.isTraced, "print what happens");
-  CLI11_PARSE(app, count, texts);
-  if (arguments.isTraced) arguments.jobs = 1;
-  return kvr::simulate::simulate(arguments);
+  try {
+    app.parse(count, texts);
+    if (arguments.isTraced) arguments.jobs = 1;
+    return kvr::simulate::simulate(arguments, kvr::simulate::seedsOf(arguments));
+  } catch (const CLI::Error& error) {
+    return app.exit(error);
+  }
 }
