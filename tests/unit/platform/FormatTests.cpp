@@ -1,5 +1,7 @@
 #include "Prelude.h"
+#include "platform/log/Completion.h"
 #include "platform/log/Format.h"
+#include "platform/log/Log.h"
 
 namespace kvr {
 namespace {
@@ -21,6 +23,28 @@ TEST(AMessage, IsFilledInItsOwnOrder) {
   EXPECT_EQ(format("%@ %@", std::optional<std::string>("there"), std::optional<Date>()), "there (null)");
   EXPECT_EQ(format("%@%@", std::vector<std::string>{"a", "b"}, std::vector<Described>{}), "(a, b)()");
   EXPECT_EQ(format("%@", Error{"files", 2, "missing"}), "Error Domain=files Code=2 \"missing\"");
+}
+
+struct KeptLines : Log {
+  KeptLines() : Log(LogLevel::Error, false) {}
+  void write(LogLevel, const std::string& message) override { lines.push_back(message); }
+  std::vector<std::string> lines;
+};
+
+TEST(ACompletion, AnswersOnceReleasesWhatItHoldsAndReportsOneAnswerTooManyOrTooFew) {
+  KeptLines log;
+  int answers = 0;
+  const auto held = std::make_shared<int>();
+  {
+    const Completion<> twice(log, "twice", [&answers, held] { ++answers; });
+    twice();
+    EXPECT_EQ(held.use_count(), 1);
+    twice();
+    const Completion<> never(log, "never", [] {});
+  }
+  EXPECT_EQ(answers, 1);
+  EXPECT_THAT(log.lines,
+              ElementsAre("twice: answered a second time, refused", "never: went without an answer"));
 }
 
 }  // namespace
