@@ -57,6 +57,7 @@ bool isAhead(const std::optional<Date>& date, Date now) { return date && *date >
 
 std::string shown(const std::vector<std::pair<std::string, std::string>>& lines, const Style& style) {
   std::vector<std::pair<std::string, Cell>> cells;
+  cells.reserve(lines.size());
   for (const auto& [name, value] : lines) cells.emplace_back(name, printable(value));
   return paragraph(cells, style);
 }

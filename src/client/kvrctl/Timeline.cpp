@@ -217,7 +217,9 @@ std::string Timeline::text(const Style& style) const {
     std::string rest = "  ";
     rest += painted(cells(row, width), style) + " " + row.end();
     for (const auto& line : wrapped(row.label, labels - indentOf(row))) {
-      text += padded(std::string(indentOf(row), ' ') + line, labels) + rest + "\n";
+      text += padded(std::string(indentOf(row), ' ') + line, labels);
+      text += rest;
+      text += '\n';
       rest = std::string(2 + cellOf(now_, width), ' ') + painted({kNow}, style);
     }
   }

@@ -159,7 +159,7 @@ int clock_gettime(clockid_t clock, timespec* time) {
   if (second == nullptr || clock != CLOCK_REALTIME) {
     return static_cast<int>(::syscall(SYS_clock_gettime, clock, time));
   }
-  *time = {std::atoll(second), 0};
+  *time = {std::strtoll(second, nullptr, 10), 0};
   return 0;
 }
 
