@@ -16,6 +16,15 @@ std::optional<Behaviour::Body> bodyNamed(const std::string& name) {
   return std::nullopt;
 }
 
+std::optional<tls::Flaw> flawNamed(const std::string& name) {
+  if (name == "self-signed") return tls::Flaw::SelfSigned;
+  if (name == "unknown") return tls::Flaw::Unknown;
+  if (name == "elsewhere") return tls::Flaw::Elsewhere;
+  if (name == "expired") return tls::Flaw::Expired;
+  if (name == "early") return tls::Flaw::Early;
+  return std::nullopt;
+}
+
 std::optional<Behaviour::End> endNamed(const std::string& name) {
   if (name == "close") return Behaviour::End::Close;
   if (name == "reset") return Behaviour::End::Reset;
@@ -26,9 +35,9 @@ std::optional<Behaviour::End> endNamed(const std::string& name) {
 }  // namespace
 
 const char* const Behaviours::kHelp =
-    R"(Misbehaviour is told by POST /control with {"coverage": [RULE...], "asset": [RULE...]}; an endpoint that is
-named gets these rules in place of its former ones. The first rule that fits a request decides. Members of a
-RULE, all optional:
+    R"(Misbehaviour is told by POST /control with {"coverage": [RULE...], "asset": [RULE...], "connection": [RULE...]};
+an endpoint that is named gets these rules in place of its former ones. The first rule that fits a request decides, or
+one of "connection" that fits a new connection over TLS. Members of a RULE, all optional:
   "status": N           answer this status (with "redirect": 302 unless given)
   "redirect": URL       answer a redirect to there
   "body": KIND          "garbage", "truncated" or "oversize"
@@ -38,16 +47,22 @@ RULE, all optional:
   "repeat": TEXT        after "raw", send this until the client goes
   "pace": SECONDS       wait so long before each "repeat"
   "end": KIND           after "raw" without "repeat": "close" (the default), "reset" or "hold" the connection
+  "certificate": KIND   of a connection: "self-signed", "unknown" (its authority), "elsewhere" (another host's),
+                        "expired" or "early" (not valid yet)
+  "oldTLS": true        of a connection: offer nothing above TLS 1.1
   "serialNumber": TEXT  only requests about this device
   "every": N            only each Nth request that would fit, beginning with the Nth
   "times": N            only this often
-GET /control/requests answers {"count": N}, the number of the last request recorded.)";
+GET /control/requests answers {"count": N, "connections": N, "bytes": N}: the number of the last request recorded, of the
+connections that began with TLS, and of the bytes that were received through them.)";
 
 std::optional<Error> Behaviours::set(const Value& document) {
   if (!document.isDictionary()) return failure("not an object");
   std::map<std::string, Rules, std::less<>> changed;
   for (const auto& [endpoint, list] : document.dictionary()) {
-    if (endpoint != "coverage" && endpoint != "asset") return failure("no endpoint is called " + endpoint);
+    if (endpoint != "coverage" && endpoint != "asset" && endpoint != "connection") {
+      return failure("no endpoint is called " + endpoint);
+    }
     if (!list.isArray()) return failure("the rules of " + endpoint + " are not an array");
     Rules& rules = changed[endpoint];
     for (const Value& element : list.array()) {
@@ -100,6 +115,13 @@ std::optional<std::string> Behaviours::takeMember(Rule& rule, const std::string&
     const auto end = text ? endNamed(*text) : std::nullopt;
     if (!end) return "is not an end";
     rule.behaviour.end = *end;
+  } else if (name == "certificate") {
+    const auto flaw = text ? flawNamed(*text) : std::nullopt;
+    if (!flaw) return "is not a kind of certificate";
+    rule.behaviour.flaw = *flaw;
+  } else if (name == "oldTLS") {
+    if (!value.isBool()) return "is not a bool";
+    if (value.boolean()) rule.behaviour.newestTLS = TLS1_1_VERSION;
   } else if (name == "serialNumber") {
     if (!text) return "is not a string";
     rule.serialNumber = text;

@@ -2,6 +2,8 @@
 
 #include "platform/value/Error.h"
 #include "platform/value/Value.h"
+#include "tls/Authority.h"
+#include "tls/Stream.h"
 
 #include <cstdint>
 #include <map>
@@ -27,13 +29,15 @@ struct Behaviour {
   std::string repeat;              ///< sent again and again after it
   double pace = 0;                 ///< seconds between two repetitions
   End end = End::Close;
+  tls::Flaw flaw = tls::Flaw::None;  ///< of the connection's certificate
+  int newestTLS = TLS1_3_VERSION;
 };
 
 /// The rules for misbehaving answers, per endpoint; they can be set while the service runs. Thread-safe.
 class Behaviours {
  public:
-  /// Replaces the rules of each endpoint in `document`, `{"coverage": [RULE...], "asset": [RULE...]}`, see
-  /// `kHelp`. On an error nothing changes.
+  /// Replaces the rules of each endpoint in `document`, `{"coverage": [RULE...], …}`, see `kHelp`. On an
+  /// error nothing changes.
   std::optional<Error> set(const Value& document);
   /// The behaviour for the next request: the first matching rule of the endpoint. Counts the request.
   Behaviour next(std::string_view endpoint, const std::optional<std::string>& serialNumber);

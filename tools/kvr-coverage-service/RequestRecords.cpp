@@ -32,9 +32,11 @@ Value documentOf(const ReceivedRequest& request, int status, const std::optional
   }
   Value::Dictionary document{{"time", std::chrono::duration<double>(now).count()},
                              {"method", legible(request.method)},
+                             {"version", legible(request.version)},
                              {"path", legible(request.target)},
                              {"headers", std::move(headers)},
                              {"status", status}};
+  if (!request.tls.empty()) document.emplace("tls", request.tls);
   if (isUTF8(request.body)) {
     document.emplace("body", request.body);
   } else {

@@ -11,7 +11,8 @@ namespace kvr::coverage_service {
 
 /// Records requests and the answers given: one JSON document per request, NNNNNN.json, in one directory.
 ///
-/// `{"time": seconds since 1970, "method", "path", "headers": [[NAME, VALUE]...], "body" (or "bodyBase64"
+/// `{"time": seconds since 1970, "method", "version", "tls" (absent without TLS), "path", "headers":
+/// [[NAME, VALUE]...], "body" (or "bodyBase64"
 /// when it is not UTF-8), "status" (0 when there is to be no answer), "reason" (why it is a 400)}`.
 /// Thread-safe.
 class RequestRecords {

@@ -7,6 +7,8 @@
 
 #include <algorithm>
 #include <chrono>
+#include <fstream>
+#include <stdexcept>
 #include <utility>
 
 namespace kvr::coverage_service {
@@ -68,7 +70,14 @@ void write(httplib::Response& response, std::string body, const char* type, Beha
 }  // namespace
 
 Service::Service(WireServer& server, Options options)
-    : options_(std::move(options)), records_(options_.root + "/requests") {
+    : options_(std::move(options)), server_(server), records_(options_.root + "/requests") {
+  if (!options_.tls.empty()) {
+    std::ofstream out(options_.tls, std::ios::binary | std::ios::trunc);
+    out << tlsAuthority_.pem();
+    out.close();
+    if (!out) throw std::runtime_error("cannot write " + options_.tls);
+    server.serveTLS([this](int socket) { return acceptTLS(socket); });
+  }
   const httplib::Server::Handler control = [this](const auto& request, auto& response) {
     handleControl(request, response);
   };
@@ -89,7 +98,8 @@ Service::Service(WireServer& server, Options options)
 
 void Service::handle(const httplib::Request& request, httplib::Response& response) {
   Connection& connection = WireServer::connection();
-  const ReceivedRequest received{request.method, request.path, request.target, connection.headers(),
+  const ReceivedRequest received{request.method, request.version, connection.tlsVersion(),
+                                 request.path,   request.target,  connection.headers(),
                                  request.body};
   Behaviour behaviour;
   Answer answer{404, "no such path", "text/plain", std::nullopt};
@@ -167,7 +177,15 @@ void Service::handleControl(const httplib::Request& request, httplib::Response& 
     response.set_content(fault ? fault->message : "{}", fault ? "text/plain" : "application/json");
     return;
   }
-  response.set_content("{\"count\":" + std::to_string(records_.count()) + "}", "application/json");
+  const auto& tls = server_.tlsCounts();
+  const Value counts = Value::Dictionary{
+      {"count", records_.count()}, {"connections", tls.connections.load()}, {"bytes", tls.bytes.load()}};
+  response.set_content(*writeJSON(counts), "application/json");
+}
+
+std::unique_ptr<tls::Stream> Service::acceptTLS(int socket) {
+  const Behaviour behaviour = behaviours_.next("connection", std::nullopt);
+  return tls::Stream::accept(socket, tlsAuthority_.issue(behaviour.flaw), behaviour.newestTLS);
 }
 
 }  // namespace kvr::coverage_service

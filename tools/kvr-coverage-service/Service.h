@@ -5,6 +5,7 @@
 #include "RequestRecords.h"
 #include "WireServer.h"
 
+#include <memory>
 #include <optional>
 #include <string>
 
@@ -15,12 +16,14 @@ class Service {
  public:
   struct Options {
     std::string root;
+    std::string tls;         ///< path that the TLS authority's certificate is written to; empty without TLS
     std::string authority;   ///< path of a certificate file; empty for none
     std::string accounts;    ///< path of a property list; empty for none
     std::string storefront;  ///< empty: the account's own
   };
 
-  /// Adds its handlers to `server`, which must stop serving before this is destroyed.
+  /// Throws when the certificates cannot be made. Adds its handlers to `server`, which must stop serving
+  /// before this is destroyed.
   Service(WireServer& server, Options options);
   Service(const Service&) = delete;
   Service& operator=(const Service&) = delete;
@@ -41,7 +44,11 @@ class Service {
   std::optional<std::string> faultIn(const ReceivedRequest& request) const;
   std::optional<std::string> coverageFile(const std::string& serialNumber, const std::string& locale) const;
 
+  std::unique_ptr<tls::Stream> acceptTLS(int socket);
+
   const Options options_;
+  const tls::Authority tlsAuthority_;
+  WireServer& server_;
   Behaviours behaviours_;
   RequestRecords records_;
 };

@@ -80,10 +80,21 @@ void describeAddress(int (*ask)(int, sockaddr*, socklen_t*), int socket, std::st
 
 }  // namespace
 
+Connection::~Connection() {
+  tls_.reset();
+  shutdown(socket_.get(), SHUT_RDWR);
+}
+
 bool Connection::awaitRequest() {
   head_.clear();
   isHeadComplete_ = false;
   return !isAbandoned_ && becomesReadable(kIdleSeconds * 1000);
+}
+
+char Connection::firstByte() const {
+  char byte = 0;
+  static_cast<void>(recv(socket_.get(), &byte, 1, MSG_PEEK));
+  return byte;
 }
 
 std::vector<HTTPHeaders::Field> Connection::headers() const {
@@ -116,7 +127,7 @@ bool Connection::wait(double seconds) const {
 }
 
 bool Connection::becomesReadable(int milliseconds) const {
-  if (readUpTo_ < unread_.size()) return true;
+  if (readUpTo_ < unread_.size() || (tls_ && tls_->hasUnread())) return true;
   pollfd watched[] = {{socket_.get(), POLLIN, 0}, {stop_, POLLIN, 0}};
   return poll(watched, 2, milliseconds) > 0 && watched[1].revents == 0;
 }
@@ -127,8 +138,10 @@ ssize_t Connection::read(char* bytes, std::size_t size) {
   if (readUpTo_ == unread_.size()) {
     if (!is_readable()) return -1;
     char buffer[4096];
-    const auto count = recv(socket_.get(), buffer, sizeof buffer, 0);
+    const auto count =
+        tls_ ? tls_->read(buffer, sizeof buffer) : recv(socket_.get(), buffer, sizeof buffer, 0);
     if (count <= 0) return count;
+    if (bytes_) *bytes_ += count;
     unread_.assign(buffer, static_cast<std::size_t>(count));
     readUpTo_ = 0;
   }
@@ -143,6 +156,7 @@ ssize_t Connection::read(char* bytes, std::size_t size) {
 }
 
 bool Connection::send(std::string_view bytes) const {
+  if (tls_) return tls_->write(bytes);
   while (!bytes.empty()) {
     const auto count = ::send(socket_.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
     if (count <= 0) return false;
@@ -157,7 +171,9 @@ void Connection::reset() const {
 }
 
 ssize_t Connection::write(const char* bytes, std::size_t size) {
-  return isAbandoned_ ? -1 : ::send(socket_.get(), bytes, size, MSG_NOSIGNAL);
+  if (isAbandoned_) return -1;
+  if (tls_) return tls_->write({bytes, size}) ? static_cast<ssize_t>(size) : -1;
+  return ::send(socket_.get(), bytes, size, MSG_NOSIGNAL);
 }
 
 void Connection::get_remote_ip_and_port(std::string& ip, int& port) const {
@@ -184,11 +200,23 @@ void WireServer::stopServing() {
   stop();
 }
 
+/// Waits for a new connection's first byte and encrypts the connection if the client wants it; false when it
+/// comes to nothing.
+bool WireServer::begin(Connection& connection) {
+  if (!connection.awaitRequest()) return false;
+  if (!acceptTLS_ || !tls::Stream::beginsWith(connection.firstByte())) return true;
+  ++tlsCounts_.connections;
+  auto stream = acceptTLS_(connection.socket());
+  if (!stream) return false;
+  connection.encrypt(std::move(stream), tlsCounts_.bytes);
+  return true;
+}
+
 bool WireServer::process_and_close_socket(socket_t socket) {
   Connection connection(Descriptor(socket), stop_.get());
   currentConnection = &connection;
   try {
-    bool isClosed = false;
+    bool isClosed = !begin(connection);
     while (!isClosed && connection.awaitRequest()) {
       if (!process_request(connection, false, isClosed, nullptr)) break;
     }
@@ -196,7 +224,6 @@ bool WireServer::process_and_close_socket(socket_t socket) {
     connection.abandon();
   }
   currentConnection = nullptr;
-  shutdown(socket, SHUT_RDWR);
   return true;
 }
 

@@ -50,6 +50,10 @@ int main(int argc, char** argv) {
          "what was received is recorded below requests/")
       ->required();
   app.add_option("--port", port, "Port on 127.0.0.1; 0 chooses one")->check(CLI::Range(0, 65535));
+  app.add_option(
+      "--tls", options.tls,
+      "Serve https too, on the same port; the certificate of the authority to trust for it is written to "
+      "this file");
   app.add_option("--authority", options.authority,
                  "Certificate file (PEM or DER): requests about the local device must be attested by it");
   app.add_option("--accounts", options.accounts, "The agent's Accounts.plist, to check headers by value");
