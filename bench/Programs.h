@@ -46,7 +46,7 @@ class Programs {
   /// A new client on the bus of the two.
   RawBusClient newClient() const { return world.newClient(); }
 
-  AgentWorld world{AgentWorld::Attestation::Optional};
+  AgentWorld world{AgentWorld::Attestation::Optional, AgentWorld::Transport::Plain};
 
  private:
   std::unique_ptr<Program> run(const std::string& program, std::vector<std::string> arguments = {}) const;

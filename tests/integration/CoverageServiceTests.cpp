@@ -1,11 +1,13 @@
 #include "Prelude.h"
 #include "integration/support/ChildProcess.h"
 #include "integration/support/HTTPClient.h"
+#include "integration/support/Host.h"
 #include "integration/support/TemporaryDirectory.h"
 #include "local/keys/LocalCertificates.h"
 #include "platform/codec/JSON.h"
 #include "platform/text/Base64.h"
 
+#include <stdlib.h>
 #include <zlib.h>
 
 #include <ctime>
@@ -45,7 +47,8 @@ struct Identity {
   }
 };
 
-struct ACoverageService : ::testing::Test {
+/// The parameter is the scheme.
+struct ACoverageService : ::testing::TestWithParam<const char*> {
   ACoverageService() {
     directory_.write("coverage/default.json", R"({"from":"default"})");
     directory_.write("Accounts.plist",
@@ -55,11 +58,13 @@ struct ACoverageService : ::testing::Test {
   }
 
   void start(const std::vector<std::string>& more = {}) {
-    std::vector<std::string> arguments{KVR_PROGRAMS "/kvr-coverage-service", "--root", directory_.path()};
+    std::vector<std::string> arguments{KVR_PROGRAMS "/kvr-coverage-service", "--root", directory_.path(),
+                                       "--tls", directory_ / "authorities.pem"};
     arguments.insert(arguments.end(), more.begin(), more.end());
     service_.emplace(arguments);
     const std::string line = service_->waitForOutput("listening on http://127.0.0.1:");
-    url_ = line.substr(line.find("http://"));
+    url_ = GetParam() + line.substr(line.find("://"));
+    ::setenv(kTrustedAuthorities, (directory_ / "authorities.pem").c_str(), 1);
   }
   HTTPRequest goodRequest() const {
     HTTPRequest request;
@@ -91,7 +96,7 @@ struct ACoverageService : ::testing::Test {
   std::optional<ChildProcess> service_;
 };
 
-TEST_F(ACoverageService, RefusesEveryBrokenRuleWithAReason) {
+TEST_P(ACoverageService, RefusesEveryBrokenRuleWithAReason) {
   const Identity identity;
   const Identity stranger;
   start({"--accounts", directory_ / "Accounts.plist", "--authority", directory_ / "authority.pem"});
@@ -151,7 +156,9 @@ TEST_F(ACoverageService, RefusesEveryBrokenRuleWithAReason) {
   }
 }
 
-TEST_F(ACoverageService, ChecksAnAttestationThatNobodyAskedFor) {
+INSTANTIATE_TEST_SUITE_P(Over, ACoverageService, ::testing::Values("http", "https"));
+
+TEST_P(ACoverageService, ChecksAnAttestationThatNobodyAskedFor) {
   start();
   HTTPRequest request = goodRequest();
   EXPECT_THAT(ask(request), HasSubstr("200 "));

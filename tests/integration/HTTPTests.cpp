@@ -1,9 +1,14 @@
 #include "Prelude.h"
 #include "integration/support/HTTPClient.h"
+#include "integration/support/Host.h"
+#include "integration/support/TemporaryDirectory.h"
 #include "local/system/Descriptor.h"
+#include "tls/Authority.h"
+#include "tls/Stream.h"
 
 #include <arpa/inet.h>
 #include <netinet/in.h>
+#include <stdlib.h>
 #include <sys/socket.h>
 
 #include <atomic>
@@ -27,7 +32,7 @@ constexpr int kTooLarge = 63;
 /// The server's end of one connection.
 class Peer {
  public:
-  explicit Peer(int descriptor) : descriptor_(descriptor) {}
+  Peer(int descriptor, std::unique_ptr<tls::Stream> tls) : descriptor_(descriptor), tls_(std::move(tls)) {}
 
   /// The next request, headers and body; empty when the client has gone.
   std::string request() {
@@ -40,7 +45,8 @@ class Peer {
         continue;
       }
       char buffer[4096];
-      const auto count = recv(descriptor_, buffer, sizeof buffer, 0);
+      const auto count =
+          tls_ ? tls_->read(buffer, sizeof buffer) : recv(descriptor_, buffer, sizeof buffer, 0);
       if (count <= 0) return {};
       unread_.append(buffer, static_cast<std::size_t>(count));
     }
@@ -50,6 +56,7 @@ class Peer {
   }
   /// False when the client has gone.
   bool write(std::string_view bytes) const {
+    if (tls_) return tls_->write(bytes);
     while (!bytes.empty()) {
       const auto count = send(descriptor_, bytes.data(), bytes.size(), MSG_NOSIGNAL);
       if (count <= 0) return false;
@@ -60,8 +67,20 @@ class Peer {
 
  private:
   const int descriptor_;
+  const std::unique_ptr<tls::Stream> tls_;
   std::string unread_;
 };
+
+/// Each test runs over plain connections and over TLS; the parameter is the scheme.
+using OverBoth = ::testing::TestWithParam<const char*>;
+
+/// Trusted by this process.
+const tls::Authority& authority() {
+  static const tls::Authority trusted;
+  static const TemporaryDirectory directory;
+  ::setenv(kTrustedAuthorities, directory.write("authorities.pem", trusted.pem()).c_str(), 1);
+  return trusted;
+}
 
 /// A server on a loopback port that runs its script for every connection; a connection ends when the script
 /// returns.
@@ -69,7 +88,8 @@ class ScriptedServer {
  public:
   using Script = std::function<void(Peer&)>;
 
-  explicit ScriptedServer(Script script) : script_(std::move(script)) {
+  explicit ScriptedServer(Script script, std::string scheme = OverBoth::GetParam())
+      : script_(std::move(script)), scheme_(std::move(scheme)) {
     sockaddr_in address{};
     address.sin_family = AF_INET;
     address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
@@ -88,7 +108,7 @@ class ScriptedServer {
   }
 
   const std::string& host() const { return host_; }
-  std::string url(const std::string& path = "/") const { return "http://" + host_ + path; }
+  std::string url(const std::string& path = "/") const { return scheme_ + "://" + host_ + path; }
   int connections() const { return accepted_; }
   int mostConnectionsAtOnce() const { return mostOpen_; }
 
@@ -100,8 +120,13 @@ class ScriptedServer {
       ++accepted_;
       mostOpen_ = std::max<int>(mostOpen_, ++open_);
       connections_.emplace_back(descriptor, std::thread([this, descriptor] {
-                                  Peer peer(descriptor);
-                                  script_(peer);
+                                  if (scheme_ == "http") {
+                                    Peer peer(descriptor, nullptr);
+                                    script_(peer);
+                                  } else if (auto tls = tls::Stream::accept(descriptor, identity_)) {
+                                    Peer peer(descriptor, std::move(tls));
+                                    script_(peer);
+                                  }
                                   --open_;
                                   shutdown(descriptor, SHUT_RDWR);
                                 }));
@@ -109,6 +134,8 @@ class ScriptedServer {
   }
 
   const Script script_;
+  const std::string scheme_;
+  const CertifiedKey identity_ = authority().issue();
   const Descriptor listener_{socket(AF_INET, SOCK_STREAM, 0)};
   std::string host_;
   std::atomic<int> accepted_{0};
@@ -144,7 +171,8 @@ void keepSilent(Peer& peer) {
   }
 }
 
-class OverHTTP : public ::testing::Test, protected HTTPClient {};
+class OverHTTP : public OverBoth, protected HTTPClient {};
+INSTANTIATE_TEST_SUITE_P(Over, OverHTTP, ::testing::Values("http", "https"));
 
 /// The error's code, 0 without an error.
 std::int64_t codeOf(const HTTPResponse& response) {
@@ -169,7 +197,7 @@ HTTPRequest post(std::string url, std::string body) {
   return request;
 }
 
-TEST_F(OverHTTP, ARequestIsSentExactlyAsItWasGiven) {
+TEST_P(OverHTTP, ARequestIsSentExactlyAsItWasGiven) {
   const ScriptedServer server(echo);
   const std::string host = "Host: " + server.host() + "\r\n";
 
@@ -200,7 +228,7 @@ TEST_F(OverHTTP, ARequestIsSentExactlyAsItWasGiven) {
   EXPECT_EQ(server.connections(), 1);
 }
 
-TEST_F(OverHTTP, AResponseIsTakenOnlyWhole) {
+TEST_P(OverHTTP, AResponseIsTakenOnlyWhole) {
   const std::string mebibyte(kMebibyte, 'a');
   const std::string untilClosed = "HTTP/1.1 200 OK\r\n\r\n";
   const std::string chunked = "HTTP/1.1 200 OK\r\nTransfer-Encoding: chunked\r\n\r\n";
@@ -246,24 +274,48 @@ TEST_F(OverHTTP, AResponseIsTakenOnlyWhole) {
   }
 }
 
-TEST_F(OverHTTP, AResponseIsGivenUpAtItsLimitWhereverItStops) {
-  for (const std::string sent : {"", "HTTP/1.1 200 OK\r\nContent-Length: 5\r\n\r\nf"}) {
-    const ScriptedServer server([&](Peer& peer) {
-      peer.request();
-      peer.write(sent);
-      keepSilent(peer);
-    });
-    for (const std::string scheme : {"http://", "https://"}) {
-      HTTPRequest request = get(scheme + server.host() + "/");
-      request.timeout = 0.05;
-      const HTTPResponse got = exchange(request);
-      EXPECT_EQ(got.status, 0);
-      EXPECT_EQ(codeOf(got), kTimedOut);
-    }
+TEST_P(OverHTTP, AnExchangeEndsAtItsLimitWhereverItStops) {
+  const ScriptedServer other(echo);
+  // After so many seconds the client looks at its limits, because another exchange begins.
+  const auto pass = [&](HTTPClient& client, int seconds) {
+    clockAhead += seconds;
+    EXPECT_EQ(client.exchange(get(other.url())).status, 200);
+  };
+  const std::string half = "HTTP/1.1 200 OK\r\nContent-Length: 5\r\n\r\nf";
+  const std::tuple<const char*, std::string, bool, int> cases[] = {{"at the handshake", "", false, 0},
+                                                                   {"before the answer", "", true, 0},
+                                                                   {"in the answer", half, true, 0},
+                                                                   {"without a connection", "", true, 64}};
+  for (const auto& [name, sent, greets, others] : cases) {
+    SCOPED_TRACE(name);
+    std::latch allCame(std::max(others, 1));
+    const ScriptedServer server(
+        [&](Peer& peer) {
+          if (greets) peer.request();
+          peer.write(sent);
+          allCame.count_down();
+          keepSilent(peer);
+        },
+        greets ? GetParam() : "http");
+    HTTPRequest request = get(GetParam() + ("://" + server.host()));
+    HTTPClient client;
+    std::vector<std::future<HTTPResponse>> before;
+    for (int i = 0; i < others; ++i) before.push_back(client.start(request));
+    if (others > 0) allCame.wait();
+    request.timeout = 30;
+    auto reply = client.start(request);
+    allCame.wait();
+    pass(client, 29);
+    EXPECT_EQ(reply.wait_for(std::chrono::seconds(0)), std::future_status::timeout);
+    pass(client, 2);
+    client.end();
+    EXPECT_EQ(codeOf(reply.get()), kTimedOut);
+    for (auto& earlier : before) EXPECT_EQ(codeOf(earlier.get()), kAborted);
+    clockAhead = 0;
   }
 }
 
-TEST_F(OverHTTP, WhatMustNotBeSentFailsWithoutAConnection) {
+TEST_P(OverHTTP, WhatMustNotBeSentFailsWithoutAConnection) {
   const ScriptedServer server(echo);
   using namespace std::string_literals;
   std::vector<HTTPRequest> refused;
@@ -287,7 +339,7 @@ TEST_F(OverHTTP, WhatMustNotBeSentFailsWithoutAConnection) {
   EXPECT_EQ(server.connections(), 0);
 }
 
-TEST_F(OverHTTP, TwoHundredRequestsAtOnceShareSixtyFourConnectionsThatCloseAfterwards) {
+TEST_P(OverHTTP, TwoHundredRequestsAtOnceShareSixtyFourConnectionsThatCloseAfterwards) {
   std::latch allAtOnce(kConnections);
   std::latch allClosed(kConnections);
   const ScriptedServer server([&](Peer& peer) {
@@ -305,12 +357,14 @@ TEST_F(OverHTTP, TwoHundredRequestsAtOnceShareSixtyFourConnectionsThatCloseAfter
   allClosed.wait();
 }
 
-TEST_F(OverHTTP, WhatWasNotSentGoesAgainOnceAndWhatWasSentNever) {
+TEST_P(OverHTTP, WhatWasNotSentGoesAgainOnceAndWhatWasSentNever) {
   std::latch allCame(50);
   std::atomic<int> came{0};
-  const ScriptedServer busy([&](Peer&) {
-    if (++came <= 50) allCame.arrive_and_wait();
-  });
+  const ScriptedServer busy(
+      [&](Peer&) {
+        if (++came <= 50) allCame.arrive_and_wait();
+      },
+      "http");
   std::vector<std::future<HTTPResponse>> replies;
   for (int i = 0; i < 50; ++i) replies.push_back(start(get("https://" + busy.host())));
   for (auto& reply : replies) EXPECT_EQ(codeOf(reply.get()), kNoHandshake);
@@ -337,18 +391,7 @@ TEST_F(OverHTTP, WhatWasNotSentGoesAgainOnceAndWhatWasSentNever) {
   }
 }
 
-TEST_F(OverHTTP, TheTimeSpentWaitingForAConnectionCounts) {
-  const ScriptedServer server(keepSilent);
-  std::vector<std::future<HTTPResponse>> pending;
-  for (int i = 0; i < kConnections; ++i) pending.push_back(start(get(server.url())));
-  HTTPRequest brief = get(server.url());
-  brief.timeout = 0.05;
-  EXPECT_EQ(codeOf(exchange(brief)), kTimedOut);
-  end();
-  for (auto& reply : pending) EXPECT_EQ(codeOf(reply.get()), kAborted);
-}
-
-TEST_F(OverHTTP, AReplyThatBlocksHoldsUpNobody) {
+TEST_P(OverHTTP, AReplyThatBlocksHoldsUpNobody) {
   const ScriptedServer server(echo);
   std::promise<void> release;
   std::promise<std::thread::id> first;
@@ -361,7 +404,7 @@ TEST_F(OverHTTP, AReplyThatBlocksHoldsUpNobody) {
   EXPECT_NE(first.get_future().get(), std::this_thread::get_id());
 }
 
-TEST_F(OverHTTP, EndingFailsWhatIsPendingAndWhatComesLater) {
+TEST_P(OverHTTP, EndingFailsWhatIsPendingAndWhatComesLater) {
   std::latch silent(1);
   const ScriptedServer server([&silent](Peer& peer) {
     peer.request();

@@ -1,5 +1,6 @@
 #include "integration/support/AgentWorld.h"
 
+#include "integration/support/Host.h"
 #include "platform/codec/JSON.h"
 #include "platform/text/SHA256Hash.h"
 
@@ -9,7 +10,7 @@
 
 namespace kvr::testing {
 
-AgentWorld::AgentWorld(Attestation attestation) {
+AgentWorld::AgentWorld(Attestation attestation, Transport transport) : transport_(transport) {
   directory.write("service/kvrV2.plist", "{ LowServerVersion = 2; HighServerVersion = 3; }");
   setCoverage("default", R"({"covered":true,"coverageLocalizedLabel":"Warranty"})");
   for (const auto* serialNumber : {kPhone, kFirstWatch, kSecondWatch}) {
@@ -26,7 +27,8 @@ AgentWorld::AgentWorld(Attestation attestation) {
   setLocale("en_US");
   entitle(true);
 
-  std::vector<std::string> command{KVR_PROGRAMS "/kvr-coverage-service", "--root", directory / "service"};
+  std::vector<std::string> command{KVR_PROGRAMS "/kvr-coverage-service", "--root", directory / "service",
+                                   "--tls", directory / "authorities.pem"};
   if (attestation == Attestation::Required) {
     command.insert(command.end(),
                    {"--authority",
@@ -34,12 +36,16 @@ AgentWorld::AgentWorld(Attestation attestation) {
   }
   service_ = std::make_unique<ChildProcess>(command);
   constexpr std::string_view kListening = "listening on ";
-  serviceURL_ = service_->waitForOutput(kListening).substr(kListening.size());
+  controlURL_ = service_->waitForOutput(kListening).substr(kListening.size());
   directory.write(std::string("home/") + kActivities, "{ OSVersion = \"17.9\"; activities = {}; }");
+  setServiceURL((transport == Transport::TLS ? "https://127.0.0.1:" : "http://127.0.0.1:") + port());
+}
+
+void AgentWorld::setServiceURL(const std::string& url) const {
   setPreferences(Dictionary{{"PostUpgradeActivityCompleted", true},
-                            {"ServerVersionURL", serviceURL_ + "/library/TARSIL/asset/kvrV2.plist"},
-                            {"WarrantyURL", serviceURL_ + "/api/v3/coverage/summary"},
-                            {"WearablesWarrantyURL", serviceURL_ + "/api/v2/coverage/summary"}});
+                            {"ServerVersionURL", url + "/library/TARSIL/asset/kvrV2.plist"},
+                            {"WarrantyURL", url + "/api/v3/coverage/summary"},
+                            {"WearablesWarrantyURL", url + "/api/v2/coverage/summary"}});
 }
 
 ChildProcess::Environment AgentWorld::environment() const {
@@ -48,6 +54,10 @@ ChildProcess::Environment AgentWorld::environment() const {
       {"KVR_LOG_PRIVATE", "1"},  {"DBUS_SESSION_BUS_ADDRESS", bus.address()},
       {"LC_ALL", "C"},           {"JOURNAL_STREAM", ""}};
   environment.insert(moreEnvironment.begin(), moreEnvironment.end());
+  if (transport_ == Transport::TLS) {
+    environment[kTrustedAuthorities] = directory / "authorities.pem";
+    environment["LD_PRELOAD"] += ":" KVR_PROGRAMS "/libkvr-test-host.so";
+  }
   return environment;
 }
 
@@ -97,16 +107,26 @@ void AgentWorld::setAccount(const Value& renewal) const {
   Dictionary authentication{{"alternateDSID", "alternate"},
                             {"tokens", Dictionary{{"com.tarsil.vornic.supportapp.auth", "first-token"}}}};
   if (!renewal.isNull()) authentication.emplace("renewal", renewal);
-  writeDeviceFile("Accounts.plist",
-                  Dictionary{{"primaryAccount", Dictionary{{"altDSID", "alt"},
-                                                           {"storefront", "143441"},
-                                                           {"authenticationAccount", authentication}}}});
+  writeDeviceFile(
+      "Accounts.plist",
+      Dictionary{{"primaryAccount", Dictionary{{"altDSID", "alt"},
+                                               {"storefront", "143441"},
+                                               {"authenticationAccount", authentication}}},
+                 {"sessionHeaders", Dictionary{{"clientInfo", Dictionary{{"X-Client", "c"}}},
+                                               {"deviceIdentifier", Dictionary{{"X-Device", "d"}}},
+                                               {"authentication", Dictionary{{"X-Proof", "p"}}}}}});
 }
 
-void AgentWorld::misbehave(const std::string& rules) const {
-  httplib::Client client(serviceURL_);
-  const auto answer = client.Post("/control", "{\"coverage\":" + rules + "}", "application/json");
+void AgentWorld::misbehave(const std::string& rules, const std::string& endpoint) const {
+  httplib::Client client(controlURL_);
+  const auto answer = client.Post("/control", "{\"" + endpoint + "\":" + rules + "}", "application/json");
   if (!answer || answer->status != 200) throw std::runtime_error("the service does not take " + rules);
+}
+
+Value AgentWorld::counts() const {
+  const auto answer = httplib::Client(controlURL_).Get("/control/requests");
+  if (!answer) throw std::runtime_error("the service does not say what it has counted");
+  return *readJSON(answer->body);
 }
 
 std::vector<Value> AgentWorld::requests() const {

@@ -22,7 +22,12 @@ class AgentWorld {
   /// Whether the service requires attestation for requests about the phone.
   enum class Attestation { Required, Optional };
 
-  explicit AgentWorld(Attestation attestation = Attestation::Required);
+  /// How the agent reaches the service. Under a sanitizer, no library can be preloaded that has the agent
+  /// trust the service's certificate.
+  enum class Transport { Plain, TLS };
+  static constexpr Transport kUsual = KVR_SANITIZED ? Transport::Plain : Transport::TLS;
+
+  explicit AgentWorld(Attestation attestation = Attestation::Required, Transport transport = kUsual);
 
   /// Makes the next start the device's first one.
   void becomeNewDevice() const {
@@ -58,9 +63,15 @@ class AgentWorld {
   void setCoverage(const std::string& name, const std::string& json) const {
     directory.write("service/coverage/" + name + ".json", json);
   }
-  /// Sets the rules for answering coverage requests; see the service's control endpoint.
-  void misbehave(const std::string& rules) const;
+  /// Sets the rules of an endpoint; see the service's control endpoint.
+  void misbehave(const std::string& rules, const std::string& endpoint = "coverage") const;
+  /// Sets where the agent finds the service: scheme, host and port. Keeps no other preference.
+  void setServiceURL(const std::string& url) const;
+  /// The service's port on 127.0.0.1.
+  std::string port() const { return controlURL_.substr(controlURL_.rfind(':') + 1); }
 
+  /// What the service has counted.
+  Value counts() const;
   /// The requests that the service has recorded.
   std::vector<Value> requests() const;
   /// Only the coverage requests.
@@ -104,7 +115,8 @@ class AgentWorld {
   static constexpr const char* kPreferences = "Library/Preferences/com.tarsil.kvragent.plist";
 
   std::unique_ptr<ChildProcess> service_;
-  std::string serviceURL_;
+  const Transport transport_;
+  std::string controlURL_;
   std::unique_ptr<ChildProcess> agent_;
 };
 
