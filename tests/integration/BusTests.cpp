@@ -2,13 +2,17 @@
 #include "integration/support/BusFixture.h"
 #include "local/buscodec/BusCodec.h"
 
+#include <sys/resource.h>
+
 #include <atomic>
 #include <numeric>
+#include <semaphore>
 
 namespace kvr::testing {
 namespace {
 
 using AService = BusFixture;
+constexpr const char* kLimits = "org.freedesktop.DBus.Error.LimitsExceeded";
 
 TEST_F(AService, DeliversTheCallsOfAConnectionInTheirOrderFromTheVeryFirst) {
   constexpr std::uint64_t kCalls = 200;
@@ -110,6 +114,72 @@ TEST_F(AService, EndsByGivingItsNameUpAndAnsweringWhatItHasTaken) {
   listener.reset();
   listeners.reset();
   EXPECT_EQ(client.value("s", client.next().value()), Value("the last"));
+}
+
+TEST_F(AService, ServesAsManyConnectionsAsItMayAndAnotherOnceOneHasLeft) {
+  constexpr std::size_t kMost = 4096;
+  rlimit files{};
+  ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &files), 0);
+  files.rlim_cur = std::max<rlim_t>(files.rlim_cur, std::min<rlim_t>(files.rlim_max, 2 * kMost));
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &files), 0);
+  std::counting_semaphore gone{0};
+  onObjectGone = [&] { gone.release(); };
+  std::vector<RawBusClient> clients;
+  while (clients.size() < kMost) {
+    clients.push_back(newClient());
+    ASSERT_GE(sd_bus_flush(clients.back().bus()), 0);
+  }
+  const auto serving = serve();
+  for (const auto& client : clients) client.send("EchoNumber", "t", {1});
+  for (const auto& client : clients) ASSERT_EQ(client.next().value().error, "");
+  const RawBusClient another = newClient();
+  EXPECT_EQ(another.call("EchoNumber", "t", {1}).error, kLimits);
+  clients.back().leave();
+  ASSERT_TRUE(gone.try_acquire_for(kLimit));
+  EXPECT_EQ(another.call("EchoNumber", "t", {1}).error, "");
+}
+
+TEST_F(AService, LeavesLittleToEachConnectionOnceAllTogetherHaveMuchOpen) {
+  std::counting_semaphore gone{0};
+  onObjectGone = [&] { gone.release(); };
+  std::mutex mutex;
+  std::vector<ServiceReply> unanswered;
+  behave([&](const std::string&, const Array&, const ServiceReply& reply) {
+    const std::lock_guard lock(mutex);
+    unanswered.push_back(reply);
+  });
+  const auto serving = serve();
+  // How many calls are refused, of so many with this text.
+  const auto refused = [](const RawBusClient& client, const std::string& text, int calls) {
+    for (int i = 0; i < calls; ++i) client.send("EchoText", "s", {text});
+    sd_bus_message* ping = nullptr;
+    sd_bus_message_new_method_call(client.bus(), &ping, RawBusClient::kName, RawBusClient::kPath,
+                                   "org.freedesktop.DBus.Peer", "Ping");
+    client.send(BusMessageRef(ping));
+    int count = 0;
+    for (auto answer = client.next(); answer && !answer->error.empty(); answer = client.next()) {
+      EXPECT_EQ(answer->error, kLimits);
+      ++count;
+    }
+    return count;
+  };
+  // In total 8192 calls, then 32 MiB.
+  const std::tuple<std::string, int, std::string, int> limits[] = {
+      {"", 1024, "", 16}, {std::string(1U << 20U, 'x'), 4, std::string(8U << 10U, 'x'), 2}};
+  for (const auto& [text, most, little, few] : limits) {
+    SCOPED_TRACE(most);
+    std::vector<RawBusClient> clients;
+    for (int i = 0; i < 10; ++i) clients.push_back(newClient());
+    for (std::size_t i = 0; i < 7; ++i) EXPECT_EQ(refused(clients[i], text, most), 0);
+    EXPECT_EQ(refused(clients[7], text, most / 2), 0);
+    EXPECT_EQ(refused(clients[8], text, most / 2 + 2), 2) << "the total is reached";
+    EXPECT_EQ(refused(clients[9], little, few + 2), 2);
+    clients[0].leave();
+    EXPECT_TRUE(gone.try_acquire_for(kLimit));
+    EXPECT_EQ(refused(clients[9], little, 1), 0);
+    clients.clear();
+    for (int i = 1; i < 10; ++i) EXPECT_TRUE(gone.try_acquire_for(kLimit));
+  }
 }
 
 Value nested(int depth, bool inArrays, Value tree) {
