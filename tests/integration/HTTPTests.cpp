@@ -259,8 +259,12 @@ TEST_P(OverHTTP, AResponseIsTakenOnlyWhole) {
     EXPECT_EQ(codeOf(got), code);
   }
   const ScriptedServer target(echo);
-  const ScriptedServer source(sends(movedTo(target.url("/there"))));
-  EXPECT_THAT(exchange(get(source.url())).body, Optional(HasSubstr("GET /there HTTP/1.1")));
+  const auto port = target.host().substr(target.host().find(':'));
+  const ScriptedServer source(sends(movedTo(GetParam() + ("://localhost" + port + "/there"))));
+  HTTPRequest identifying = get(source.url());
+  for (const auto* name : {"X-Token", "Accept"}) identifying.headers.set(name, "a");
+  EXPECT_EQ(exchange(identifying).body,
+            "GET /there HTTP/1.1\r\nHost: localhost" + port + "\r\nAccept: a\r\n\r\n");
   const ScriptedServer circle([&](Peer& peer) {
     while (!peer.request().empty() && peer.write(movedTo("/"))) {
     }

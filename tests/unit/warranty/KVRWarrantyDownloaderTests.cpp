@@ -48,9 +48,15 @@ TEST_F(ADownload, GoesOnceToTheEndpointOfItsDeviceForItsClient) {
     const auto& request = world.http.requests()[1].request;
     EXPECT_EQ(request.url, std::string("https://coverage.tarsil.example") + path);
     EXPECT_FALSE(request.followsRedirects);
-    EXPECT_EQ(request.timeout, 30);
     EXPECT_EQ(request.sourceApplicationBundleID, "com.example.client");
   }
+}
+
+TEST_F(ADownload, WaitsAMinuteForTheVersionsAndHalfOfOneForTheCoverage) {
+  world.http.ignore();
+  world.coverage = nullptr;
+  EXPECT_FALSE(download("WATCH").success);
+  EXPECT_EQ(world.clock.elapsed(), 60 + 30);
 }
 
 TEST_F(ADownload, LogsEachStepInItsOrder) {
