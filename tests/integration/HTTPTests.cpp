@@ -108,6 +108,8 @@ class ScriptedServer {
   }
 
   const std::string& host() const { return host_; }
+  /// With its colon.
+  std::string port() const { return host_.substr(host_.find(':')); }
   std::string url(const std::string& path = "/") const { return scheme_ + "://" + host_ + path; }
   int connections() const { return accepted_; }
   int mostConnectionsAtOnce() const { return mostOpen_; }
@@ -259,7 +261,7 @@ TEST_P(OverHTTP, AResponseIsTakenOnlyWhole) {
     EXPECT_EQ(codeOf(got), code);
   }
   const ScriptedServer target(echo);
-  const auto port = target.host().substr(target.host().find(':'));
+  const auto port = target.port();
   const ScriptedServer source(sends(movedTo(GetParam() + ("://localhost" + port + "/there"))));
   HTTPRequest identifying = get(source.url());
   for (const auto* name : {"X-Token", "Accept"}) identifying.headers.set(name, "a");
@@ -331,7 +333,7 @@ TEST_P(OverHTTP, WhatMustNotBeSentFailsWithoutAConnection) {
     add(server.url()).headers.set(name, "0");
   }
   for (const auto* method : {"", "GET /x HTTP/1.1\r\nX:", "G T"}) add(server.url()).method = method;
-  for (const auto& url : {"file:///etc/hosts"s, "ftp://127.0.0.1/"s, "http://a.example/"s, ""s,
+  for (const auto& url : {"file:///etc/hosts"s, "ftp://127.0.0.1/"s, "http://a.example" + server.port(), ""s,
                           "http://localhost@a.example/"s, server.url("/ HTTP/1.1\r\nX: y")}) {
     add(url);
   }

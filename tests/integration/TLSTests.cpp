@@ -17,7 +17,6 @@ struct TheAgentOverTLS : ::testing::Test {
   Value coverage() const {
     return World::warrantyIn(World::info(world.newClient(), World::kPhone, World::Refresh))["covered"];
   }
-  std::string outputFrom(std::size_t from) { return world.agent().errorOutput().substr(from); }
 
   AgentWorld world;
 };
@@ -42,10 +41,7 @@ TEST_F(TheAgentOverTLS, SendsNothingToAServiceThatItCannotTrust) {
       EXPECT_EQ(after["connections"].integer() - before["connections"].integer(), 2) << "asset and coverage";
       for (const auto* none : {"bytes", "count"}) EXPECT_EQ(after[none], before[none]) << none;
       for (const std::string line : {"Failed to fetch plist data from URL ", "load warranty status: 0 : "}) {
-        const auto text = outputFrom(from);
-        const auto found = text.find(line);
-        ASSERT_NE(found, std::string::npos) << line;
-        EXPECT_THAT(text.substr(found, text.find('\n', found) - found),
+        EXPECT_THAT(world.agent().waitForErrorOutput(line, from),
                     AllOf(HasSubstr("Domain=http Code=" + std::to_string(code)), HasSubstr(reason)));
       }
     }
@@ -57,10 +53,10 @@ TEST_F(TheAgentOverTLS, IsNotLedFromAnotherHostToOneWithoutIt) {
   world.setServiceURL("https://coverage.example:" + world.port());
   world.misbehave(elsewhere, "asset");
   EXPECT_EQ(coverage(), Value(true)) << "the agent goes by its own versions";
-  EXPECT_THAT(world.agent().errorOutput(), HasSubstr("redirected to what is not https"));
+  world.agent().waitForErrorOutput("redirected to what is not https");
   world.misbehave(elsewhere);
   EXPECT_EQ(coverage(), Value());
-  EXPECT_THAT(world.agent().errorOutput(), HasSubstr("load warranty status: 302"));
+  world.agent().waitForErrorOutput("load warranty status: 302");
   EXPECT_THAT(world.requests(), SizeIs(4));
   for (const auto& request : world.requests()) EXPECT_EQ(request["tls"], Value("TLSv1.3"));
 }
