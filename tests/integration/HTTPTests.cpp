@@ -296,9 +296,9 @@ TEST_P(OverHTTP, AnExchangeEndsAtItsLimitWhereverItStops) {
     SCOPED_TRACE(name);
     std::latch allCame(std::max(others, 1));
     const ScriptedServer server(
-        [&](Peer& peer) {
-          if (greets) peer.request();
-          peer.write(sent);
+        [&allCame, isGreeted = greets, part = sent](Peer& peer) {
+          if (isGreeted) peer.request();
+          peer.write(part);
           allCame.count_down();
           keepSilent(peer);
         },
