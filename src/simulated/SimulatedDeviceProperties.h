@@ -13,10 +13,8 @@ class SimulatedDeviceProperties : public DeviceProperties {
  public:
   std::map<std::string, std::string, std::less<>> answers;
   bool internalInstall = false;
-  std::function<void()> whenAsked;  ///< called at each question, to do what other threads might do
 
   std::optional<std::string> answer(std::string_view question) const override {
-    if (whenAsked) whenAsked();
     const auto found = answers.find(question);
     return found == answers.end() ? std::nullopt : std::optional(found->second);
   }

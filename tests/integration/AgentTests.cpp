@@ -1,7 +1,4 @@
 #include "integration/support/AgentWorld.h"
-#include "platform/codec/JSON.h"
-#include "platform/text/SHA256Hash.h"
-#include "unit/OddSerialNumbers.h"
 
 namespace kvr::testing {
 namespace {
@@ -41,34 +38,6 @@ TEST_F(TheAgent, DownloadsOnceAndThenAnswersFromTheCacheUntilTheLanguageChanges)
   }
   const Value preferences = world.preferences();
   for (const auto& [key, value] : preferences.dictionary()) EXPECT_THAT(key, Not(HasSubstr("SN")));
-}
-
-TEST_F(TheAgent, TakesAnyTextForASerialNumber) {
-  const auto odd = oddSerialNumbers();
-  world.pair(odd);
-  world.startAgent();
-  const auto client = world.newClient();
-  std::set<std::string> all(odd.begin(), odd.end()), echoed, asked;
-  all.insert(World::kPhone);
-  for (const auto& info : World::allInfos(client, World::Refresh)) {
-    EXPECT_EQ(label(info), Value("Warranty"));
-    echoed.insert(info["device"]["serialNumber"].string());
-  }
-  EXPECT_EQ(echoed, all);
-  for (const auto& request : world.coverageRequests()) {
-    asked.insert((*readJSON(request["body"].string()))["serialNumber"].string());
-  }
-  EXPECT_EQ(asked, all);
-  for (const auto& serialNumber : odd) {
-    if (serialNumber.find('\0') != std::string::npos) continue;  // no call can contain it
-    const Value info = World::info(client, serialNumber, World::Default);
-    EXPECT_EQ(info["device"]["serialNumber"], Value(serialNumber));
-    EXPECT_EQ(label(info), Value("Warranty")) << "from the cache";
-    EXPECT_EQ(client.value("b", client.call("DismissFollowUpForSerialNumber", "s", {serialNumber})),
-              Value(true));
-    EXPECT_TRUE(world.preferences().contains(sha256Hash(serialNumber) + ".dismissed"));
-  }
-  EXPECT_THAT(world.coverageRequests(), SizeIs(all.size()));
 }
 
 TEST_F(TheAgent, ServesOthersWhileSomeWaitForRenewalsAndAttestations) {
@@ -120,14 +89,6 @@ TEST_F(TheAgent, LeavesCleanlyAfterAChangeOfLanguageAndComesBackWhenItIsCalled) 
   world.waitForName(false);
   world.pair({World::kFirstWatch});  // it starts the agent again without a call
   world.bus.daemon().waitForErrorOutput("Devices followups to be posted, if required", before);
-}
-
-TEST_F(TheAgent, FollowsTheFileOfPairedWatches) {
-  world.pair({});
-  world.startAgent();
-  world.pair({World::kFirstWatch});
-  world.agent().waitForErrorOutput("Devices followups to be posted, if required, after paired device change");
-  EXPECT_THAT(world.coverageRequests(), SizeIs(2));
 }
 
 TEST_F(TheAgent, SaysFirstThatItWasLaunched) {

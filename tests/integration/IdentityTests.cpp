@@ -2,10 +2,7 @@
 #include "integration/support/AgentWorld.h"
 
 #include <signal.h>
-#include <sys/socket.h>
 #include <unistd.h>
-
-#include <cstring>
 
 namespace kvr::testing {
 namespace {
@@ -157,51 +154,16 @@ TEST_F(TheAgentsPeer, IsServedOnlyWhenItIsAGrantedProgramOfTheAgentsUser) {
   expect(false, "set to another user", {{path}}, "it belongs to another user");
 }
 
-/// Forged answers to calls number `first` and following, `count` of them: the bus's answer about a client,
-/// naming `process`.
-std::string forgedAnswers(const std::string& agent, std::uint32_t first, std::uint32_t count, pid_t process) {
-  std::string body;
-  std::string* out = &body;
-  const auto align = [&](std::size_t to) { out->resize((out->size() + to - 1) / to * to); };
-  const auto number = [&](std::size_t value) {
-    align(4);
-    const auto little = static_cast<std::uint32_t>(value);
-    out->append(reinterpret_cast<const char*>(&little), 4);
-  };
-  const auto text = [&](std::string_view value) {
-    number(value.size());
-    out->append(value).push_back('\0');
-  };
-  number(0);  // the array's length, filled in later
-  for (const auto& [key, value] : {std::pair<const char*, std::size_t>{"UnixUserID", ::geteuid()},
-                                   {"ProcessID", static_cast<std::size_t>(process)}}) {
-    align(8);
-    text(key);
-    out->append("\1u", 3);
-    number(value);
-  }
-  const auto length = static_cast<std::uint32_t>(body.size() - 8);
-  std::memcpy(body.data(), &length, 4);
-
-  std::string all;
-  for (std::uint32_t i = 0; i < count; ++i) {
-    std::string message("l\2\1\1", 4);
-    out = &message;
-    number(body.size());
-    number(1000 + i);
-    number(0);  // the length of the fields, filled in later
-    out->append("\5\1u", 4);
-    number(first + i);
-    out->append("\6\1s", 4);
-    text(agent);
-    align(8);
-    out->append(std::string_view("\10\1g\0\5a{sv}\0", 11));
-    const auto fields = static_cast<std::uint32_t>(message.size() - 16);
-    std::memcpy(message.data() + 12, &fields, 4);
-    align(8);
-    all += message + body;
-  }
-  return all;
+/// A forged answer to the agent's call of this number: the bus's answer about a client, naming `process`.
+BusMessageRef forgedAnswer(const RawBusClient& client, const std::string& agent, std::uint64_t number,
+                           pid_t process) {
+  const auto call = client.newCall("DefaultDevice");
+  EXPECT_GE(sd_bus_message_seal(call.get(), number, 0), 0);
+  sd_bus_message* answer = nullptr;
+  EXPECT_GE(sd_bus_message_new_method_return(call.get(), &answer), 0);
+  sd_bus_message_set_destination(answer, agent.c_str());
+  sd_bus_message_append(answer, "a{sv}", 2, "UnixUserID", "u", ::geteuid(), "ProcessID", "u", process);
+  return BusMessageRef(answer);
 }
 
 TEST_F(TheAgentsPeer, IsNotWhoForgedAnswersOfTheBusSayItIs) {
@@ -217,14 +179,14 @@ TEST_F(TheAgentsPeer, IsNotWhoForgedAnswersOfTheBusSayItIs) {
   const BusMessageRef pong(ping);
   std::uint64_t number = 0;
   ASSERT_GE(sd_bus_message_get_cookie(ping, &number), 0);
-  const std::string forged = forgedAnswers(sd_bus_message_get_sender(ping),
-                                           static_cast<std::uint32_t>(number) + 1, 16, granted.pid());
   // They arrive right after the call, before the bus can answer the agent's own question about the caller.
   world.agent().send(SIGSTOP);
   ASSERT_GE(sd_bus_send(client.bus(), client.newCall("DefaultDevice").get(), nullptr), 0);
-  ASSERT_GE(sd_bus_flush(client.bus()), 0);
-  ASSERT_EQ(::send(sd_bus_get_fd(client.bus()), forged.data(), forged.size(), MSG_NOSIGNAL),
-            static_cast<ssize_t>(forged.size()));
+  for (int next = 1; next <= 16; ++next) {
+    const auto forged = forgedAnswer(client, sd_bus_message_get_sender(ping),
+                                     number + static_cast<std::uint64_t>(next), granted.pid());
+    ASSERT_GE(sd_bus_send(client.bus(), forged.get(), nullptr), 0);
+  }
   // Once this call is answered, the bus has forwarded all messages before it.
   ASSERT_GE(sd_bus_call_method(client.bus(), kBusName, kBusPath, kBusName, "GetId", nullptr, nullptr, ""), 0);
   world.agent().send(SIGCONT);

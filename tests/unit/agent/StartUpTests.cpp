@@ -46,17 +46,6 @@ TEST_F(AStart, ServesTheBootBeforeTheUpgradeAndHasThatStoredInBetween) {
   }
 }
 
-TEST_F(AStart, RunsNoActivityBeforeItIsThrough) {
-  world.preferences.setObject(inDays(-1), std::string(names::kOutreach) + names::kTargetDateSuffix);
-  // Simulates other threads that run while migration asks for the device.
-  world.deviceProperties.whenAsked = [this] { world.queues.run(); };
-  const StartUp startUp(world.platform);
-  world.deviceProperties.whenAsked = nullptr;
-  EXPECT_FALSE(world.log.contains("trigger activity"));
-  world.queues.run();
-  EXPECT_TRUE(world.log.contains("trigger activity"));
-}
-
 TEST_F(AStart, GivesAMigratedFollowUpARefreshThatDoesNotComeTooSoon) {
   const Date change = inDays(0.5);
   world.files.putPropertyList("/home/user/Library/Application Support/com.tarsil.Kavrel/Warranty.plist",

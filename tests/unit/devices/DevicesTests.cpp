@@ -29,8 +29,6 @@ struct ADeviceInfo : SimulatedTest {
 };
 
 TEST_F(ADeviceInfo, TellsItsOfferAndDecodesPartByPart) {
-  EXPECT_TRUE(KVRDeviceInfo::supportsSecureCoding() && KVRDevice::supportsSecureCoding() &&
-              KVRWarranty::supportsSecureCoding());
   const auto device = KVRDevice::deviceWithName("P", "S", {}, 0);
   EXPECT_EQ(KVRDeviceInfo(device, warranty(false)).description(), "P (S) ((null)) - Default: No offer");
   EXPECT_EQ(KVRDeviceInfo(device, nullptr).description(), "P (S) ((null)) - Default: No offer");

@@ -154,23 +154,6 @@ TEST_F(AFollowUpActivity, PutsOffOnlyARefreshThatDoesNotLieAhead) {
   }
 }
 
-TEST_F(AFollowUpActivity, ShowsEveryCountOfShortDaysFromItsMomentOn) {
-  constexpr double kShortDay = 10;  // in seconds
-  world.preferences.setObject(kShortDay, preference::kOneDayInterval);
-  const Date end = world.clock.now() + 20.5 * kShortDay;
-  const KVRDeviceInfoList list{info("A", due((end - world.clock.now()) / kDay), old)};
-  runWith<KVRFollowUpPost>(list);
-  const auto refresh = std::make_shared<KVRFollowUpRefresh>(
-      world.platform, [list](std::uint64_t, bool, const DeviceInfosAnswer& answer) { answer(list); });
-  KVRScheduler::newSchedulerWithActivityDelegate(world.platform, refresh)
-      ->scheduleActivityForDate(world.clock.now());
-  for (int left = 20; left > 0; --left) {
-    world.queues.advance(end - left * kShortDay + 1.5 - world.clock.now());
-    EXPECT_EQ(pending().at(0).informativeFooterText,
-              Value(left > 1 ? std::to_string(left) + " days left" : "One day left"));
-  }
-}
-
 TEST_F(AFollowUpActivity, RefreshesForAsLongAsAnythingIsShown) {
   EXPECT_EQ(runWith<KVRFollowUpRefresh>({{info("A", due(2.5))}}), ActivityResult::Finished);
   EXPECT_EQ(world.log.count("No followups present, don't schedule another refresh"), 1U);

@@ -122,23 +122,6 @@ TEST_F(AnActivityTable, RunsAgainAtTheDateADeferredRunWaitsFor) {
   EXPECT_THAT(table.secondsToNext(now), Optional(::testing::DoubleNear(ActivityTable::kShortestCycle, 1e-6)));
 }
 
-TEST_F(AnActivityTable, KeepsARegistrationThatWasMadeDuringTheRun) {
-  for (const auto result : {kFinished, kDeferred}) {
-    add("a", {});
-    EXPECT_THAT(started(), ElementsAre("a"));
-    add("a", {5, 0});
-    pass(20);
-    EXPECT_THAT(started(), IsEmpty()) << "never twice at once";
-    end("a", result);
-    EXPECT_TRUE(table.isRegisteredFor("a", now.date));
-    EXPECT_THAT(started(), ElementsAre("a"));
-    const auto old = numbers["a"];
-    end("a", kFinished);
-    EXPECT_FALSE(table.end("a", old, kFinished, now).changesTree) << "an end is told once";
-    EXPECT_EQ(table.runsUnderWay(), 0U);
-  }
-}
-
 TEST_F(AnActivityTable, SpacesOutWhatReactionsRegisterAgainAndAgainAndNothingElse) {
   const auto react = [&] { return add("a", {}, 0, RegistrationCause::Reaction).heldUntil; };
   const double start = now.uptime;
@@ -187,9 +170,6 @@ TEST_F(AnActivityTable, TakesUpItsTreeAgainAndKeepsWhatNobodyChecksInFor) {
   ActivityTable next;
   next.adopt(table.tree());
   EXPECT_EQ(next.tree(), table.tree());
-  const Dictionary entry{{"delay", 3600},         {"gracePeriod", 360},         {"requiresNetwork", true},
-                         {"priority", "utility"}, {"registeredDate", now.date}, {"dueDate", now.date + 3780}};
-  EXPECT_EQ(next.tree()["activities"]["a"], Value(entry));
   EXPECT_EQ(next.secondsToNext(now), std::nullopt);
   next.checkIn("a", kBlock);
   EXPECT_THAT(next.secondsToNext(now), Optional(3780.0));

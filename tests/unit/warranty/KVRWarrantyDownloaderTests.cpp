@@ -2,7 +2,6 @@
 #include "core/scheduling/SchedulingKeys.h"
 #include "core/warranty/CacheMetadata.h"
 #include "platform/codec/JSON.h"
-#include "platform/names/Names.h"
 #include "unit/CoverageWorld.h"
 
 namespace kvr {
@@ -175,35 +174,6 @@ TEST_F(ADownload, SchedulesAConversionOutreachOnceThoughNothingCanBeStored) {
   for (int round = 0; round < 3; ++round) EXPECT_TRUE(download("WATCH").success);
   EXPECT_EQ(world.log.count("scheduling conversion outreach 2023-11-14 22:13:20 +0000"), 1U);
   EXPECT_TRUE(world.log.contains("is scheduled, which still cannot be stored"));
-}
-
-TEST_F(ADownload, StoresAConversionDateThatCouldNotBeStoredBefore) {
-  // When nothing could be stored, and when only the preferences could not.
-  for (const bool canBeCached : {false, true}) {
-    const Date date{1'900'000'000.0 - canBeCached};
-    converts(std::to_string(1'900'000'000 - canBeCached));
-    const Error full{"files", ENOSPC, "no space"};
-    const std::string preferences = "/home/user/Library/Preferences/com.tarsil.kvragent.plist";
-    const auto device = canBeCached ? "WATCH" : CoverageWorld::kLocal;
-    if (canBeCached) {
-      world.files.setWriteFault(preferences, full);
-    } else {
-      world.files.setWriteFault(full);
-    }
-    EXPECT_TRUE(download(device).success);
-    EXPECT_NE(scheduledDate(), date);
-    EXPECT_FALSE(world.files.get(cachedFile(device))) << "an agent that is killed now hears of it again";
-    world.files.setWriteFault(std::nullopt);
-    world.files.setWriteFault(preferences, std::nullopt);
-    EXPECT_TRUE(download(device).success);
-    // The files of a killed agent contain the date and what resumes the run.
-    const auto registered =
-        world.files.getPropertyList("/home/user/Library/Activities/com.tarsil.kvragent.plist");
-    EXPECT_TRUE(registered["activities"].contains(names::kConversionOutreach));
-    const auto stored = world.files.getPropertyList(preferences);
-    EXPECT_EQ(stored[preference::kConversionOutreachScheduledDate], Value(date));
-    EXPECT_EQ(stored[std::string(names::kConversionOutreach) + names::kTargetDateSuffix], Value(date));
-  }
 }
 
 TEST_F(ADownload, TakesANegativeConversionDateForOneInTheFarFuture) {
