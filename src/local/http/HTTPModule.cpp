@@ -2,6 +2,7 @@
 #include "local/http/HTTPTransfers.h"
 
 #include <curl/curl.h>
+#include <malloc.h>
 #include <pthread.h>
 
 #include <condition_variable>
@@ -21,7 +22,7 @@ constexpr long kConnectionsPerHost = 64;
 /// Connections to a host after a service has refused some.
 constexpr long kFewConnections = 6;
 constexpr long kIdleConnections = kConnectionsPerHost;
-/// Connections are closed when no transfer has run for this long.
+/// When no transfer has run for this long, connections are closed and free memory is given back.
 constexpr std::chrono::seconds kIdleTime{5};
 /// The longest wait while a transfer is under way: if libcurl forgets one, this finds it again.
 constexpr milliseconds kLongestWait{1000};
@@ -144,6 +145,9 @@ std::optional<std::vector<CurlTransfers::ExchangeRef>> CurlTransfers::nextExchan
     // The multi handle owns the connections, so replacing it closes them.
     if (auto fresh = newMultiHandle()) multi_ = std::move(fresh);
     wereMany_ = false;
+    lock.unlock();
+    malloc_trim(0);
+    lock.lock();
     changed_.wait(lock, isCalled);
   }
   if (ending_) return std::nullopt;
