@@ -54,6 +54,37 @@ TEST_F(AService, LetsGoOfTheObjectWithItsConnectionEvenInTheMiddleOfACall) {
   EXPECT_THAT(log.texts(LogLevel::Error), IsEmpty());
 }
 
+TEST_F(AService, DoesNotCarryOutWhatStillWaitsWhenItsClientLeaves) {
+  std::promise<void> begun;
+  std::promise<void> release;
+  std::vector<Value> served;
+  behave([&](const std::string&, const Array& arguments, const ServiceReply& reply) {
+    served.push_back(arguments.at(0));
+    if (arguments.at(0) == Value("first")) {
+      begun.set_value();
+      release.get_future().wait();
+    }
+    reply(arguments.at(0));
+  });
+  auto serving = serve();
+  RawBusClient client = newClient();
+  client.send("EchoText", "s", {"first"});
+  begun.get_future().wait();
+  client.send("EchoText", "s", {"second"});
+  const char* unique = nullptr;
+  ASSERT_GE(sd_bus_get_unique_name(client.bus(), &unique), 0);
+  const std::string name = unique;
+  client.leave();
+  const RawBusClient other = newClient();
+  while (sd_bus_get_name_creds(other.bus(), name.c_str(), 0, nullptr) >= 0) {
+  }
+  // What the bus tells the service comes before what is sent from now on.
+  EXPECT_EQ(other.call("EchoText", "s", {"of another"}).error, "");
+  release.set_value();
+  serving.reset();
+  EXPECT_THAT(served, ElementsAre(Value("first"), Value("of another")));
+}
+
 TEST_F(AService, AnswersWithAnErrorWhatItCannotServe) {
   std::atomic<int> served = 0;
   behave([&](const std::string&, const Array& arguments, const ServiceReply& reply) {
