@@ -91,6 +91,13 @@ TEST_F(TheAgent, LeavesCleanlyAfterAChangeOfLanguageAndComesBackWhenItIsCalled) 
   world.bus.daemon().waitForErrorOutput("Devices followups to be posted, if required", before);
 }
 
+TEST_F(TheAgent, ServesOnWhenNobodyReadsItsLogAnyMore) {
+  world.prologue = "mkfifo \"$HOME/log\"\nexec 3<>\"$HOME/log\" 2>\"$HOME/log\" 3<&-";
+  world.startAgent();
+  EXPECT_THAT(World::allInfos(world.newClient(), World::CacheOnly), SizeIs(3));
+  EXPECT_EQ(world.agent().terminate(), 0);
+}
+
 TEST_F(TheAgent, SaysFirstThatItWasLaunched) {
   for (const auto* file : {"Network.plist", "Locale.plist", "PairedDevices.plist"}) {
     world.directory.write(std::string("device/") + file, "damaged");
