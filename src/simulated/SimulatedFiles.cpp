@@ -32,10 +32,11 @@ std::int64_t nanoseconds(Date date) {
 
 class Lock : public FileLock {
  public:
-  explicit Lock(std::recursive_mutex& mutex) : lock_(mutex) {}
+  explicit Lock(std::shared_ptr<Turns> turns) : turns_(std::move(turns)), turn_(*turns_) {}
 
  private:
-  const std::lock_guard<std::recursive_mutex> lock_;
+  const std::shared_ptr<Turns> turns_;
+  const Turn turn_;
 };
 
 }  // namespace
@@ -64,7 +65,10 @@ const Result<Value>& SimulatedFiles::File::propertyList() const {
   return *tree;
 }
 
-SimulatedFiles::SimulatedFiles(const Clock& clock) : clock_(clock) { addDirectories(kHomeDirectory); }
+SimulatedFiles::SimulatedFiles(const Clock& clock, SimulatedWorkQueues* queues)
+    : clock_(clock), queues_(queues) {
+  addDirectories(kHomeDirectory);
+}
 
 Result<std::optional<FileContents>> SimulatedFiles::read(const std::string& path, std::size_t limit) {
   const std::lock_guard lock(mutex_);
@@ -93,7 +97,12 @@ class SimulatedFiles::Replacement : public ReplaceSteps {
       : files_(files),
         path_(path),
         temporary_(directoryOf(path) + "/." + path.substr(path.rfind('/') + 1) + std::string(kTemporaryTag) +
-                   std::to_string(files.lastInode_ + 1)) {}
+                   std::to_string(++files.lastInode_)) {
+    ++files_.replacements_;
+  }
+  ~Replacement() override { --files_.replacements_; }
+  Replacement(const Replacement&) = delete;
+  Replacement& operator=(const Replacement&) = delete;
 
   std::optional<Error> createTemporary() override {
     if (auto error = files_.begin(Step::CreateTemporary, path_)) return error;
@@ -134,8 +143,11 @@ std::optional<Error> SimulatedFiles::replace(const std::string& path, const std:
   if (directories_.contains(path)) return failure(EISDIR, path);
   if (!directories_.contains(directoryOf(path))) return failure(ENOENT, path);
   removeLeftovers(directoryOf(path));
-  Replacement steps(*this, path);
-  auto error = replaceAtomically(steps, bytes);
+  std::optional<Error> error;
+  {
+    Replacement steps(*this, path);
+    error = replaceAtomically(steps, bytes);
+  }
   tellChange(lock, path, !error);
   return error;
 }
@@ -175,13 +187,14 @@ std::optional<Error> SimulatedFiles::move(const std::string& from, const std::st
   std::unique_lock lock(mutex_);
   if (auto fault = writeFaultOf(from)) return fault;
   if (auto fault = writeFaultOf(to)) return fault;
-  const auto found = files_.find(from);
-  if (found == files_.end()) return failure(directories_.contains(from) ? EISDIR : ENOENT, from);
+  if (!files_.contains(from)) return failure(directories_.contains(from) ? EISDIR : ENOENT, from);
   if (!replaces && (files_.contains(to) || directories_.contains(to))) return failure(EEXIST, to);
   if (directories_.contains(to)) return failure(EISDIR, to);
   if (!directories_.contains(directoryOf(to))) return failure(ENOENT, to);
   if (auto error = begin(Step::Rename, to)) return error;
   if (from == to) return std::nullopt;
+  const auto found = files_.find(from);
+  if (found == files_.end()) return failure(ENOENT, from);
   File file = found->second;
   file.stamp.changedNanoseconds = nanoseconds(clock_.now());
   put(to, std::move(file));
@@ -195,9 +208,11 @@ std::optional<Error> SimulatedFiles::move(const std::string& from, const std::st
 std::unique_ptr<FileLock> SimulatedFiles::lock(const std::string& directory) {
   static_cast<void>(createDirectory(directory));
   std::unique_lock own(mutex_);
-  auto& mutex = locks_[directory];
+  auto& turns = locks_[directory];
+  if (!turns) turns = queues_ != nullptr ? queues_->newTurns(directory) : std::make_shared<ThreadTurns>();
+  const auto taken = turns;
   own.unlock();
-  return std::make_unique<Lock>(mutex);
+  return std::make_unique<Lock>(taken);
 }
 
 void SimulatedFiles::put(const std::string& path, std::string bytes) {
@@ -290,6 +305,11 @@ bool SimulatedFiles::isKilled() const {
   return hasEnded();
 }
 
+std::size_t SimulatedFiles::replacementsUnderWay() const {
+  const std::lock_guard lock(mutex_);
+  return replacements_;
+}
+
 bool SimulatedFiles::hasEnded() const { return lastStep_ && steps_ >= *lastStep_; }
 
 void SimulatedFiles::takeOver(const SimulatedFiles& other) {
@@ -321,9 +341,14 @@ void SimulatedFiles::losePower(std::mt19937_64& random) {
   }
 }
 
-// Steps; with the mutex held.
+// Steps; with the mutex held, which `begin` releases while others run.
 
 std::optional<Error> SimulatedFiles::begin(Step step, const std::string& path) {
+  if (queues_ != nullptr) {
+    mutex_.unlock();
+    queues_->mayPause();
+    mutex_.lock();
+  }
   if (hasEnded()) return failure(EIO, path);
   if (stepFault_) {
     if (auto fault = stepFault_(step, path)) return fault;

@@ -3,6 +3,7 @@
 #include "platform/services/Clock.h"
 #include "platform/services/Files.h"
 #include "platform/value/Value.h"
+#include "simulated/loop/SimulatedWorkQueues.h"
 
 #include <functional>
 #include <map>
@@ -24,7 +25,9 @@ class SimulatedFiles : public Files {
  public:
   static constexpr const char* kHomeDirectory = "/home/user";
 
-  explicit SimulatedFiles(const Clock& clock);
+  /// With queues, items that change files may be suspended before each step, and wait for locks in virtual
+  /// time.
+  explicit SimulatedFiles(const Clock& clock, SimulatedWorkQueues* queues = nullptr);
 
   std::string homeDirectory() const override { return kHomeDirectory; }
   Result<std::optional<FileContents>> read(const std::string& path, std::size_t limit) override;
@@ -71,6 +74,8 @@ class SimulatedFiles : public Files {
   /// Simulates a killed process: after `count` more steps, no step has an effect.
   void killAfterSteps(std::size_t count);
   bool isKilled() const;
+  /// How many files are being replaced now.
+  std::size_t replacementsUnderWay() const;
   /// Replaces these files by those of another instance.
   void takeOver(const SimulatedFiles& other);
   /// Loses what was not synced, as far as `random` decides: the latest changes of names, and the end of
@@ -116,6 +121,7 @@ class SimulatedFiles : public Files {
   std::optional<Error> move(const std::string& from, const std::string& to, bool replaces);
 
   const Clock& clock_;
+  SimulatedWorkQueues* const queues_;
   mutable std::mutex mutex_;  ///< guards what follows
   std::map<std::string, File> files_;
   std::set<std::string> directories_;
@@ -129,7 +135,8 @@ class SimulatedFiles : public Files {
   std::optional<std::size_t> lastStep_;
   std::size_t steps_ = 0;
   std::size_t reads_ = 0;
-  std::map<std::string, std::recursive_mutex> locks_;
+  std::map<std::string, std::shared_ptr<Turns>> locks_;
+  std::size_t replacements_ = 0;
 };
 
 }  // namespace kvr

@@ -63,7 +63,7 @@ struct SimulatedPlatform {
   SimulatedLog log;
   SimulatedClock clock;
   SimulatedWorkQueues queues;
-  SimulatedFiles files{clock};
+  SimulatedFiles files{clock, &queues};
   PropertyListFiles propertyLists{files, clock, log};
   FilePreferences preferences{propertyLists, log, names::kAgent};
   SimulatedUserLocale locale;

@@ -81,10 +81,15 @@ void Invariants::fileChanged(const std::string& path, bool isDone) {
     report("files are whole", path);
   }
   // Leftovers of an earlier process are removed before the first file of a directory is replaced.
+  if (platform_->files.replacementsUnderWay() > 0) return checkContents(path);
   const bool isCleared = isDone && bytes && path.find(".damaged-") == std::string::npos && !filesFailed_;
   for (const auto& neighbour : platform_->files.list(path.substr(0, path.rfind('/')), kTemporaryTag)) {
     if (isCleared || !leftovers_.contains(neighbour)) report("no temporary file stays", neighbour);
   }
+  checkContents(path);
+}
+
+void Invariants::checkContents(const std::string& path) {
   if (path == kPreferencesPath) checkPreferences();
   if (path == kFollowUpsPath) checkFollowUps();
 }
@@ -246,7 +251,9 @@ void Invariants::posted(const FollowUpItem& item, bool wasPending, bool isDone) 
   } else {
     refreshed_.erase(*item.uniqueIdentifier);
   }
-  if (!wasPending) toBeListed_.insert(sha256Hash(item.userInfo.at(names::kFollowUpSerialNumber).string()));
+  if (wasPending) return;
+  toBeListed_.insert_or_assign(sha256Hash(item.userInfo.at(names::kFollowUpSerialNumber).string()),
+                               world_.now);
 }
 
 void Invariants::clearing(const std::vector<std::string>& uniqueIdentifiers,

@@ -26,7 +26,10 @@ void Life::apply(const Event& event) {
   say("#" + std::to_string(event.number) + " " + nameOf(event.kind));
   switch (event.kind) {
     case EventKind::Call:
-      if (process_) say("  " + clients_.ask(dice, process_->simulated));
+      // Several programs may call at once.
+      for (auto calls = dice.oneOf({1, 1, 2, 6}); process_ && calls > 0; --calls) {
+        say("  " + clients_.ask(dice, process_->simulated));
+      }
       break;
     case EventKind::Offer:
       return offer(dice);

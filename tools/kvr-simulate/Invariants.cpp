@@ -39,6 +39,7 @@ void Figures::add(const Figures& other) {
   clockJumps += other.clockJumps;
   fileFaults += other.fileFaults;
   runs += other.runs;
+  pauses += other.pauses;
 }
 
 void Invariants::report(const std::string& invariant, const std::string& detail) {
@@ -77,21 +78,32 @@ void Invariants::beginProcess(SimulatedPlatform& platform) {
 
 void Invariants::endProcess() {
   if (platform_ == nullptr) return;
-  for (const auto& fault : platform_->faults()) report("completions are answered once", fault);
+  figures.pauses += platform_->queues.pauses();
+  reportFaults();
   platform_ = nullptr;
+}
+
+void Invariants::reportFaults() {
+  for (const auto& fault : platform_->faults()) {
+    const bool isDeadlock = fault.find("deadlock") != std::string::npos;
+    report(isDeadlock ? "no two wait for each other" : "completions are answered once", fault);
+  }
 }
 
 void Invariants::step() {
   if (!isWatching()) return;
-  for (const auto& fault : platform_->faults()) report("completions are answered once", fault);
+  reportFaults();
   if (toBeListed_.empty()) return;
+  // Once time has passed, what was posted before is recorded.
   const auto list = preferences()[preference::kFollowUpPostedHashes];
-  for (const auto& hash : toBeListed_) {
+  std::erase_if(toBeListed_, [&](const auto& posted) {
+    const auto& [hash, when] = posted;
+    if (when == world_.now) return false;
     const bool isListed =
         list.isArray() && std::ranges::find(list.array(), Value(hash)) != list.array().end();
     if (!isListed && !filesFail_) report("what is posted is remembered", hash);
-  }
-  toBeListed_.clear();
+    return true;
+  });
 }
 
 /// Start-up offers the service as its last step.

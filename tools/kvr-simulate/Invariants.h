@@ -28,6 +28,7 @@ struct Figures {
   std::size_t clockJumps = 0;
   std::size_t fileFaults = 0;
   std::size_t runs = 0;
+  std::size_t pauses = 0;
 
   void add(const Figures& other);
 };
@@ -61,7 +62,7 @@ class Invariants {
   void endProcess();
   /// Whether the process is alive and not cut off from its files.
   bool isWatching() const { return platform_ != nullptr && !platform_->files.isKilled(); }
-  /// Call after every work item.
+  /// Call after every work item; others may be in the middle.
   void step();
   /// Call when nothing has happened for a while: nothing may be overdue, and what is shown must be up to
   /// date.
@@ -120,6 +121,7 @@ class Invariants {
 
   bool isStartingUp() const;
   void checkConversionDate(const Value& stored);
+  void reportFaults();
   void readCaches();
   void cacheChanged(const std::string& path);
   void downloaded(const std::string& lastUpdatedKey);
@@ -128,6 +130,7 @@ class Invariants {
   bool isSurelyOpen(const std::string& serialNumber) const;
   void checkCleared(const std::string& serialNumber);
   void checkNames(const std::string& path);
+  void checkContents(const std::string& path);
   void checkPreferences();
   void checkChange(const std::string& key, const Value& before, const Value& after, const Value& tree);
   void checkTargetDateRemoval(const std::string& activity, const Value& before);
@@ -149,7 +152,7 @@ class Invariants {
   std::map<std::string, Run> runs_;
   std::map<std::string, std::deque<double>> runTimes_;
   Value preferences_;  ///< as last seen
-  std::set<std::string> toBeListed_;
+  std::map<std::string, double> toBeListed_;  ///< hashes of devices, and when their follow-ups were posted
   std::set<std::string> leftovers_;  ///< files that existed when the process began
   std::map<std::string, std::string> durable_;
   bool filesFail_ = false;

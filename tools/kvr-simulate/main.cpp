@@ -116,9 +116,10 @@ int simulate(const Arguments& arguments, const std::vector<std::uint64_t>& seeds
   for (auto& thread : threads) thread.join();
   std::printf(
       "%zu seeds of %g years: %zu starts, %zu crashes, %zu losses of power, %zu calls, %zu requests, "
-      "%zu posts, %zu clock jumps, %zu file faults, %zu runs of activities\n",
+      "%zu posts, %zu clock jumps, %zu file faults, %zu runs of activities, %zu switches in the middle of "
+      "work\n",
       seeds.size(), arguments.years, figures.starts, figures.crashes, figures.powerLosses, figures.calls,
-      figures.requests, figures.posts, figures.clockJumps, figures.fileFaults, figures.runs);
+      figures.requests, figures.posts, figures.clockJumps, figures.fileFaults, figures.runs, figures.pauses);
   if (broken.empty()) return EXIT_SUCCESS;
   for (const auto& [seed, outcome] : broken) {
     explain(seed, arguments, outcome);

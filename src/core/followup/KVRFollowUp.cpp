@@ -21,9 +21,17 @@ KVRFollowUp::KVRFollowUp(Platform& platform)
     : KVRFollowUp(platform, std::make_shared<KVRDefaultFolllowUpProvider>(platform)) {}
 
 KVRFollowUp::KVRFollowUp(Platform& platform, std::shared_ptr<KVRFollowUpProvider> theFollowUpProvider)
-    : followUpProvider(std::move(theFollowUpProvider)),
-      platform_(platform),
-      turn_(platform.sharedObjects.get<Turn>([] { return new Turn; })) {}
+    : followUpProvider(std::move(theFollowUpProvider)), platform_(platform) {}
+
+Turn KVRFollowUp::takeTurn() const {
+  struct FollowUpTurns {
+    std::shared_ptr<Turns> turns;
+  };
+  return Turn(
+      *platform_.sharedObjects
+           .get<FollowUpTurns>([this] { return new FollowUpTurns{platform_.queues.newTurns("follow-ups")}; })
+           ->turns);
+}
 
 std::vector<FollowUpItem> KVRFollowUp::pendingItems() {
   auto items = followUpProvider()->pendingFollowUpItems();

@@ -7,7 +7,6 @@
 
 #include <cstddef>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <vector>
@@ -24,8 +23,8 @@ namespace kvr {
 ///     KVRFollowUp(platform).refreshFollowupWithDeviceInfos(infos);
 ///
 /// Make one for each call; it has no lasting state. Failures of the centre are logged and otherwise ignored;
-/// the preferences then stay as they are. Any thread, synchronous. A lock per platform serialises the
-/// operations: a dismissal in the middle of a refresh could otherwise be undone by it.
+/// the preferences then stay as they are. Any thread, synchronous. The operations on one platform take turns:
+/// a dismissal in the middle of a refresh could otherwise be undone by it.
 class KVRFollowUp {
  public:
   explicit KVRFollowUp(Platform& platform);
@@ -75,13 +74,9 @@ class KVRFollowUp {
   bool isDue(const KVRDeviceInfo& deviceInfo);
   KVRDeviceInfoList updateItems(std::vector<FollowUpItem>& pending, const KVRDeviceInfoList& deviceInfos);
 
-  struct Turn {
-    std::recursive_mutex mutex;
-  };
-  std::unique_lock<std::recursive_mutex> takeTurn() const { return std::unique_lock(turn_->mutex); }
+  Turn takeTurn() const;
 
   Platform& platform_;
-  const std::shared_ptr<Turn> turn_;
 };
 
 }  // namespace kvr

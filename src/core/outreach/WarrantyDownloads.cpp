@@ -13,7 +13,7 @@ namespace {
 
 /// The last scheduled conversion date, if it could not be stored. It counts as stored: otherwise the
 /// downloads of its own outreach would schedule it again and again for as long as the disk is full. Guarded
-/// by the scheduling lock (`KVRScheduler::takeTurn`).
+/// by the scheduling turn (`KVRScheduler::takeTurn`).
 struct UnstoredDate {
   std::optional<Date> date;
 };
@@ -92,7 +92,7 @@ std::shared_ptr<KVRWarrantyDownloader> newWarrantyDownloader(Platform& platform,
 bool _scheduleConversionOutreachIfRequiredForWarranty(Platform& platform, const KVRWarrantyRef& warranty,
                                                       const KVRWarrantyRef& andCachedWarranty) {
   if (!warranty) return true;
-  // Downloads of several devices get here concurrently. The lock makes sure that the earliest date wins.
+  // Downloads of several devices get here concurrently. The turn makes sure that the earliest date wins.
   const auto turn = KVRScheduler::takeTurn(platform);
   makeUpForUnstoredDate(platform);
   const auto facts = conversionFacts(platform, *warranty, andCachedWarranty);

@@ -77,11 +77,14 @@ void KVRScheduler::clearScheduledActivities(Platform& platform) {
   }
 }
 
-std::unique_lock<std::recursive_mutex> KVRScheduler::takeTurn(Platform& platform) {
-  struct Turn {
-    std::recursive_mutex mutex;
+Turn KVRScheduler::takeTurn(Platform& platform) {
+  struct SchedulingTurns {
+    std::shared_ptr<Turns> turns;
   };
-  return std::unique_lock(platform.sharedObjects.get<Turn>([] { return new Turn; })->mutex);
+  return Turn(
+      *platform.sharedObjects
+           .get<SchedulingTurns>([&] { return new SchedulingTurns{platform.queues.newTurns("scheduling")}; })
+           ->turns);
 }
 
 void KVRScheduler::monitorForScheduledActivity() {

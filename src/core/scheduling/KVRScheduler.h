@@ -5,7 +5,6 @@
 #include "platform/value/AtomicProperty.h"
 
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string>
 
@@ -34,10 +33,10 @@ class KVRScheduler : public std::enable_shared_from_this<KVRScheduler> {
   /// Removes the target date of every activity. What the platform has registered stays registered.
   static void clearScheduledActivities(Platform& platform);
 
-  /// The scheduling lock, one per platform, recursive. It makes storing a date and registering its activity
-  /// one step, so that concurrent schedulings cannot mix. Code that decides by a stored date holds it from
-  /// reading the date until it has scheduled.
-  static std::unique_lock<std::recursive_mutex> takeTurn(Platform& platform);
+  /// Takes a scheduling turn, of which there is one at a time on a platform. It makes storing a date and
+  /// registering its activity one step, so that concurrent schedulings cannot mix. Code that decides by a
+  /// stored date has a turn from reading the date until it has scheduled.
+  static Turn takeTurn(Platform& platform);
 
   /// Checks in for an activity that was scheduled by an earlier start, or that the platform runs by itself.
   void monitorForScheduledActivity();

@@ -123,6 +123,10 @@ std::shared_ptr<Signal> LocalWorkQueues::newSignal() {
   });
 }
 
+std::shared_ptr<Turns> LocalWorkQueues::newTurns(std::string /*label*/) {
+  return std::make_shared<ThreadTurns>();
+}
+
 std::size_t LocalWorkQueues::outstanding() const { return pool_->outstanding() + main_.pending(); }
 
 void LocalWorkQueues::beginEnding() { pool_->beginEnding(); }

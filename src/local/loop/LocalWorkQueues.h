@@ -30,6 +30,7 @@ class LocalWorkQueues : public WorkQueues {
   void after(double delay, WorkQueueRef queue, Work work) override;
   std::shared_ptr<Timer> newRepeatingTimer(double interval, WorkQueueRef queue, Work work) override;
   std::shared_ptr<Signal> newSignal() override;
+  std::shared_ptr<Turns> newTurns(std::string label) override;
 
   /// Items queued or running, except the one running on the main thread (which may be the caller). Delayed
   /// items do not count until they are due.

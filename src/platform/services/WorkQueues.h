@@ -44,7 +44,31 @@ class Signal {
   virtual bool wait(std::optional<double> limit) = 0;
 };
 
-/// The queues, timers and waits of one process.
+/// Gives one operation at a time its turn: whoever locks it waits until the others have unlocked it.
+///
+/// For operations that change files or preferences, post items or hand over work while they have their turn.
+/// It may be locked again within a turn; unlock it on the thread that locked it.
+class Turns {
+ public:
+  virtual ~Turns() = default;
+  virtual void lock() = 0;
+  virtual void unlock() = 0;
+};
+
+/// One turn; it ends when this is destroyed.
+using Turn = std::unique_lock<Turns>;
+
+/// Turns among the threads of a process.
+class ThreadTurns : public Turns {
+ public:
+  void lock() override { mutex_.lock(); }
+  void unlock() override { mutex_.unlock(); }
+
+ private:
+  std::recursive_mutex mutex_;
+};
+
+/// The queues, timers, waits and turns of one process.
 ///
 /// Serial queues (the main queue is one) run one item at a time, in the order added. Concurrent queues run
 /// items in parallel. Blocked items do not stop others: further threads are started in their place. Delays
@@ -61,6 +85,9 @@ class WorkQueues {
   /// Hands `work` to `queue` every `interval` seconds, first after one interval.
   virtual std::shared_ptr<Timer> newRepeatingTimer(double interval, WorkQueueRef queue, Work work) = 0;
   virtual std::shared_ptr<Signal> newSignal() = 0;
+  /// Locks that guard operations come from here too, so that the simulation sees who has a turn and who waits
+  /// for it, and can let others run in the middle of it. `label` says what is done in turn.
+  virtual std::shared_ptr<Turns> newTurns(std::string label) = 0;
 };
 
 /// Counts outstanding work and notifies when the count reaches zero. Reusable. Thread-safe.

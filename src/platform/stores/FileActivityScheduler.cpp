@@ -97,7 +97,8 @@ FileActivityScheduler::FileActivityScheduler(PropertyListFiles& lists, const Clo
       log_(log),
       directory_(lists.files().homeDirectory() + "/" + std::string(names::kActivitiesFolder)),
       path_(directory_ + "/" + mainBundleIdentifier + ".plist"),
-      occasions_(std::move(occasions)) {}
+      occasions_(std::move(occasions)),
+      fileTurns_(queues.newTurns("the activities' file")) {}
 
 std::unique_ptr<Activity> FileActivityScheduler::newActivity(std::string identifier) {
   return std::make_unique<Handle>(*this, std::move(identifier));
@@ -249,40 +250,48 @@ void FileActivityScheduler::end(const std::string& identifier, std::uint64_t num
 
 // The file.
 
-/// Must not be called with `mutex_` held: setting a damaged file aside takes the file lock, and `write` takes
-/// the file lock before `mutex_`.
 void FileActivityScheduler::load() {
-  std::call_once(loaded_, [this] {
-    const auto tree = lists_.read(path_, kDictionary, kSetAside, ActivityTable::complaintAbout);
-    const std::lock_guard lock(mutex_);
-    unreadable_ = !tree;
-    if (tree) table_.adopt(*tree);
-  });
+  if (loaded_) return;
+  const Turn turn(*fileTurns_);
+  if (loaded_) return;
+  const auto tree = lists_.read(path_, kDictionary, kSetAside, ActivityTable::complaintAbout);
+  const std::lock_guard lock(mutex_);
+  unreadable_ = !tree;
+  if (tree) table_.adopt(*tree);
+  loaded_ = true;
 }
 
 void FileActivityScheduler::save() {
   bool adopted = false;
   {
-    const std::lock_guard saving(saving_);
+    const Turn turn(*fileTurns_);
     adopted = write();
   }
   if (adopted) startDue();
 }
 
+/// Tries again to read a file that could not be read. Returns whether that succeeded.
+bool FileActivityScheduler::adoptUnreadable() {
+  {
+    const std::lock_guard lock(mutex_);
+    if (!unreadable_) return false;
+  }
+  const auto found = lists_.read(path_, kDictionary, kSetAside, ActivityTable::complaintAbout);
+  if (!found) return false;  // `read` has logged it
+  const std::lock_guard lock(mutex_);
+  table_.adopt(*found);
+  unreadable_ = false;
+  return true;
+}
+
 /// Writes the file under its lock. Returns whether registrations were adopted that could not be read before.
 bool FileActivityScheduler::write() {
-  bool adopted = false;
   const auto fileLock = lists_.lock(directory_);
+  const bool adopted = adoptUnreadable();
   Value tree;
   {
     const std::lock_guard lock(mutex_);
-    if (unreadable_) {
-      const auto found = lists_.read(path_, kDictionary, kSetAside, ActivityTable::complaintAbout);
-      if (!found) return false;  // `read` has logged it
-      table_.adopt(*found);
-      unreadable_ = false;
-      adopted = true;
-    }
+    if (unreadable_) return false;
     tree = table_.tree();
   }
   if (const auto error = lists_.write(path_, tree, PropertyListEncoding::Binary)) {

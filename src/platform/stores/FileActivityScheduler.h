@@ -8,6 +8,7 @@
 #include "platform/stores/ActivityTable.h"
 #include "platform/stores/PropertyListFiles.h"
 
+#include <atomic>
 #include <cstddef>
 #include <memory>
 #include <mutex>
@@ -83,6 +84,7 @@ class FileActivityScheduler : public ActivityScheduler {
   void load();
   void start(ActivityBlock block, const std::shared_ptr<RunEnd>& end);
   void save();
+  bool adoptUnreadable();
   bool write();
 
   PropertyListFiles& lists_;
@@ -95,9 +97,9 @@ class FileActivityScheduler : public ActivityScheduler {
   const std::string path_;
   const ActivityOccasions occasions_;
 
-  std::once_flag loaded_;     ///< the file is loaded before the table is used
-  std::mutex saving_;         ///< held while the file is written; taken before `mutex_`
-  mutable std::mutex mutex_;  ///< guards the members below
+  const std::shared_ptr<Turns> fileTurns_;  ///< for reading and writing the file
+  std::atomic<bool> loaded_{false};         ///< the file is loaded before the table is used
+  mutable std::mutex mutex_;                ///< guards the members below; never held while a file is accessed
   ActivityTable table_;
   bool unreadable_ = false;  ///< the file could not be read yet, so it must not be overwritten
   bool networkReachable_ = true;

@@ -175,7 +175,7 @@ void PropertyListFiles::forgetWhileLocked(const std::string& path) {
 /// renaming.
 std::optional<Result<Value>> PropertyListFiles::setAside(const std::string& path, const Error& reason,
                                                          const FileStamp& stamp) {
-  const auto lock = files_.lock(directoryOf(path));
+  const auto fileLock = lock(directoryOf(path));
   const auto now = files_.stamp(path);
   if (!now || !*now || !sameContent(**now, stamp)) return std::nullopt;
   const std::string base = path + ".damaged-" + compactTime(clock_.now());

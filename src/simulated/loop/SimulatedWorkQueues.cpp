@@ -34,11 +34,16 @@ T takeAt(std::vector<T>& list, std::size_t index) {
 
 class SimulatedWorkQueues::Queue : public WorkQueue, public std::enable_shared_from_this<Queue> {
  public:
-  Queue(SimulatedWorkQueues& theQueues, bool serial) : queues(theQueues), isSerial(serial) {}
-  void async(Work work) override { queues.enqueue(shared_from_this(), std::move(work)); }
+  Queue(SimulatedWorkQueues& theQueues, bool serial, std::string theLabel)
+      : queues(theQueues), isSerial(serial), label(std::move(theLabel)) {}
+  void async(Work work) override {
+    queues.enqueue(shared_from_this(), std::move(work));
+    queues.mayPause();
+  }
 
   SimulatedWorkQueues& queues;
   const bool isSerial;
+  const std::string label;
   bool isBusy = false;
   std::deque<Work> items;  ///< of a serial queue
 };
@@ -47,8 +52,10 @@ class SimulatedWorkQueues::Queue : public WorkQueue, public std::enable_shared_f
 struct SimulatedWorkQueues::Runner {
   explicit Runner(SimulatedWorkQueues& queues) : fiber([this, &queues] { queues.work(*this); }) {}
 
-  std::shared_ptr<Queue> queue;
+  std::shared_ptr<Queue> queue;  ///< null for a concurrent one
   Work item;
+  std::uint64_t number = 0;  ///< of the item, in the order in which items start
+  const SimulatedTurns* awaited = nullptr;
   bool isDone = false;
   bool isStopping = false;
   Fiber fiber;
@@ -72,6 +79,7 @@ class SimulatedWorkQueues::SimulatedSignal : public Signal {
     for (const auto& waiter : waiters) {
       if (waiter->signal == this) queues_.wake(waiter, Outcome::Signalled);
     }
+    queues_.mayPause();
   }
   bool wait(std::optional<double> limit) override { return signalled_ || queues_.wait(*this, limit); }
   bool isSignalled() const { return signalled_; }
@@ -79,6 +87,30 @@ class SimulatedWorkQueues::SimulatedSignal : public Signal {
  private:
   SimulatedWorkQueues& queues_;
   bool signalled_ = false;
+};
+
+class SimulatedWorkQueues::SimulatedTurns : public Turns {
+ public:
+  SimulatedTurns(SimulatedWorkQueues& queues, std::string theLabel)
+      : label(std::move(theLabel)), queues_(queues) {}
+  void lock() override {
+    queues_.mayPause();
+    queues_.take(*this);
+  }
+  void unlock() override {
+    if (--depth > 0) return;
+    queues_.endTurn(*this);
+    queues_.mayPause();
+  }
+  bool areTakenByAnother(const Runner* runner) const { return depth > 0 && holder != runner; }
+
+  const std::string label;
+  int depth = 0;                   ///< how often the holder has locked it
+  const Runner* holder = nullptr;  ///< null: code outside of all items, if `depth` is not 0
+  std::vector<Runner*> waiting;
+
+ private:
+  SimulatedWorkQueues& queues_;
 };
 
 class SimulatedWorkQueues::SimulatedTimer : public Timer {
@@ -130,8 +162,11 @@ class SimulatedWorkQueues::SimulatedTimer : public Timer {
 SimulatedWorkQueues::SimulatedWorkQueues(SimulatedClock& clock, std::uint64_t seed)
     : clock_(clock),
       random_(seed),
-      mainQueue_(std::make_shared<Queue>(*this, true)),
-      concurrentQueues_{std::make_shared<Queue>(*this, false), std::make_shared<Queue>(*this, false)} {}
+      mainQueue_(std::make_shared<Queue>(*this, true, "main")),
+      concurrentQueues_{std::make_shared<Queue>(*this, false, "default"),
+                        std::make_shared<Queue>(*this, false, "background")} {
+  drawPointsToPause();
+}
 
 SimulatedWorkQueues::~SimulatedWorkQueues() {
   end();
@@ -143,8 +178,8 @@ SimulatedWorkQueues::~SimulatedWorkQueues() {
 
 WorkQueueRef SimulatedWorkQueues::mainQueue() { return mainQueue_; }
 
-WorkQueueRef SimulatedWorkQueues::newSerialQueue(std::string /*label*/) {
-  return std::make_shared<Queue>(*this, true);
+WorkQueueRef SimulatedWorkQueues::newSerialQueue(std::string label) {
+  return std::make_shared<Queue>(*this, true, std::move(label));
 }
 
 WorkQueueRef SimulatedWorkQueues::concurrentQueue(Priority priority) {
@@ -162,6 +197,10 @@ std::shared_ptr<Timer> SimulatedWorkQueues::newRepeatingTimer(double interval, W
 }
 
 std::shared_ptr<Signal> SimulatedWorkQueues::newSignal() { return std::make_shared<SimulatedSignal>(*this); }
+
+std::shared_ptr<Turns> SimulatedWorkQueues::newTurns(std::string label) {
+  return std::make_shared<SimulatedTurns>(*this, std::move(label));
+}
 
 // Time.
 
@@ -228,7 +267,17 @@ void SimulatedWorkQueues::enqueue(const std::shared_ptr<Queue>& queue, Work work
   if (!queue->isBusy && queue->items.size() == 1) readyQueues_.push_back(queue);
 }
 
+/// Runs until an item ends or waits.
 bool SimulatedWorkQueues::runOne() {
+  do {
+    pausedLast_ = false;
+    if (!runPart()) return false;
+  } while (pausedLast_);
+  return true;
+}
+
+/// Runs one item until it ends, waits or pauses.
+bool SimulatedWorkQueues::runPart() {
   const auto count = readyQueues_.size() + readyItems_.size() + readyRunners_.size();
   if (count == 0) return false;
   auto choice = static_cast<std::size_t>(random_() % count);
@@ -258,6 +307,7 @@ void SimulatedWorkQueues::start(std::shared_ptr<Queue> queue, Work work) {
   idleRunners_.pop_back();
   runner.queue = std::move(queue);
   runner.item = std::move(work);
+  runner.number = ++itemsStarted_;
   runner.isDone = false;
   resume(runner);
 }
@@ -296,6 +346,86 @@ void SimulatedWorkQueues::requireOutside() const {
   if (current_ != nullptr) throw std::logic_error("the simulation is driven from inside an item");
 }
 
+void SimulatedWorkQueues::pauseEvery(std::uint64_t points) {
+  pauseEvery_ = points;
+  drawPointsToPause();
+}
+
+/// Never 0, which `mayPause` counts down to.
+void SimulatedWorkQueues::drawPointsToPause() {
+  pointsToPause_ =
+      pauseEvery_ == 0 ? std::numeric_limits<std::uint64_t>::max() : 1 + random_() % (2 * pauseEvery_ - 1);
+}
+
+void SimulatedWorkQueues::pause() {
+  drawPointsToPause();
+  if (ended_ || (readyQueues_.empty() && readyItems_.empty() && readyRunners_.empty())) return;
+  ++pauses_;
+  pausedLast_ = true;
+  readyRunners_.push_back(current_);
+  current_->fiber.pause();
+}
+
+// Turns.
+
+void SimulatedWorkQueues::take(SimulatedTurns& turns) {
+  while (turns.areTakenByAnother(current_)) {
+    current_ == nullptr ? takeOutside(turns) : takeInItem(turns);
+  }
+  turns.holder = current_;
+  ++turns.depth;
+}
+
+void SimulatedWorkQueues::takeInItem(SimulatedTurns& turns) {
+  Runner& runner = *current_;
+  runner.awaited = &turns;
+  const auto* holder = turns.holder;
+  while (holder != nullptr && holder != &runner && holder->awaited != nullptr)
+    holder = holder->awaited->holder;
+  if (holder == &runner) {
+    const auto waits = describeWaits();
+    runner.awaited = nullptr;
+    throw std::logic_error("deadlock: " + waits);
+  }
+  turns.waiting.push_back(&runner);
+  runner.fiber.pause();
+  runner.awaited = nullptr;
+}
+
+/// Runs others until the turn has ended.
+void SimulatedWorkQueues::takeOutside(const SimulatedTurns& turns) {
+  while (turns.depth > 0) {
+    while (step(clock_.elapsed_)) continue;
+    if (!runOne() && !step(kNever)) throw std::logic_error("deadlock: " + describeWaits());
+  }
+}
+
+void SimulatedWorkQueues::endTurn(SimulatedTurns& turns) {
+  turns.holder = nullptr;
+  const auto waiting = std::exchange(turns.waiting, {});
+  readyRunners_.insert(readyRunners_.end(), waiting.begin(), waiting.end());
+}
+
+std::string SimulatedWorkQueues::describeRunner(const Runner* runner) {
+  if (runner == nullptr) return "code outside of all items";
+  return "item " + std::to_string(runner->number) + " of " +
+         (runner->queue ? "the queue '" + runner->queue->label + "'" : "a concurrent queue");
+}
+
+/// Who waits for whom.
+std::string SimulatedWorkQueues::describeWaits() const {
+  std::string text;
+  for (const auto& runner : runners_) {
+    if (runner->awaited == nullptr) continue;
+    text += describeRunner(runner.get()) + " waits for the turn '" + runner->awaited->label + "' of " +
+            describeRunner(runner->awaited->holder) + "; ";
+  }
+  for (const auto& waiter : waiters_) {
+    if (!waiter->hasLimit) text += describeRunner(waiter->runner) + " waits for a signal; ";
+  }
+  return text + "nothing can end this wait";
+}
+
 // Waiting.
 
 bool SimulatedWorkQueues::wait(SimulatedSignal& signal, std::optional<double> limit) {
@@ -311,7 +441,7 @@ bool SimulatedWorkQueues::waitInItem(SimulatedSignal& signal, std::optional<doub
   waiters_.push_back(waiter);
   if (limit) waiter->timer = schedule(*limit, [this, waiter] { wake(waiter, Outcome::Over); });
   current_->fiber.pause();
-  if (waiter->outcome == Outcome::Deadlocked) throw std::logic_error("deadlock: nothing can end this wait");
+  if (waiter->outcome == Outcome::Deadlocked) throw std::logic_error("deadlock: " + deadlock_);
   return waiter->outcome == Outcome::Signalled;
 }
 
@@ -320,7 +450,7 @@ bool SimulatedWorkQueues::waitOutside(const SimulatedSignal& signal, std::option
   while (!signal.isSignalled() && !ending_) {
     while (step(clock_.elapsed_)) continue;
     if (runOne() || step(deadline)) continue;
-    if (!limit) throw std::logic_error("deadlock: nothing can end this wait");
+    if (!limit) throw std::logic_error("deadlock: " + describeWaits());
     clock_.elapsed_ = std::max(clock_.elapsed_, deadline);
     break;
   }
@@ -335,6 +465,7 @@ void SimulatedWorkQueues::wake(const std::shared_ptr<Waiter>& waiter, Outcome ou
 }
 
 void SimulatedWorkQueues::wakeDeadlocked() {
+  deadlock_ = describeWaits();
   const auto waiters = waiters_;
   for (const auto& waiter : waiters) wake(waiter, Outcome::Deadlocked);
 }
@@ -348,6 +479,7 @@ void SimulatedWorkQueues::beginEnding() {
 void SimulatedWorkQueues::end() {
   requireOutside();
   beginEnding();
+  ended_ = true;
   while (!readyRunners_.empty()) resume(*takeAt(readyRunners_, 0));
   closed_ = true;
   const auto queues = std::exchange(readyQueues_, {});

@@ -20,8 +20,9 @@ namespace kvr {
 ///
 /// Nothing runs until the test calls `run`, `advance` or `runUntil`. When several items could run next, the
 /// seed picks one: the same seed gives the same order; each order is one that real threads could produce as
-/// well. An item that waits for a signal is suspended while others run; its serial queue stays busy
-/// meanwhile. Time passes only when nothing can run.
+/// well. An item that waits for a signal or a turn is suspended while others run; its serial queue stays busy
+/// meanwhile. The seed also suspends items where a thread could be pre-empted to effect (`mayPause`): where
+/// they take or end a turn, hand over work, signal, or change a file. Time passes only when nothing can run.
 ///
 ///     queues.mainQueue()->async([&] { ... });
 ///     queues.run();                                // everything that can run without time passing
@@ -29,9 +30,11 @@ namespace kvr {
 ///     EXPECT_TRUE(queues.runUntil([&] { return replied; }));  // however long it takes
 ///
 /// Faults (see `faults`) are an exception that leaves an item, a wait on the main queue, and a wait that
-/// nothing can end any more. Use it on one thread only.
+/// nothing can end any more: its fault says who waits for whom. Use it on one thread only.
 class SimulatedWorkQueues : public WorkQueues {
  public:
+  static constexpr std::uint64_t kPauseEvery = 8;
+
   SimulatedWorkQueues(SimulatedClock& clock, std::uint64_t seed);
   ~SimulatedWorkQueues() override;
   SimulatedWorkQueues(const SimulatedWorkQueues&) = delete;
@@ -43,6 +46,16 @@ class SimulatedWorkQueues : public WorkQueues {
   void after(double delay, WorkQueueRef queue, Work work) override;
   std::shared_ptr<Timer> newRepeatingTimer(double interval, WorkQueueRef queue, Work work) override;
   std::shared_ptr<Signal> newSignal() override;
+  std::shared_ptr<Turns> newTurns(std::string label) override;
+
+  /// Lets others run now, if this is called inside an item, others can run, and the seed says so.
+  void mayPause() {
+    if (current_ != nullptr && --pointsToPause_ == 0) pause();
+  }
+  /// How many calls of `mayPause` lie between two pauses, on average; 0: no pauses.
+  void pauseEvery(std::uint64_t points);
+  /// Number of pauses so far.
+  std::size_t pauses() const { return pauses_; }
 
   // For tests; not from inside an item. All of them throw std::logic_error when work adds more work without
   // end while no time passes.
@@ -63,6 +76,8 @@ class SimulatedWorkQueues : public WorkQueues {
   /// destructor calls it too.
   void end();
 
+  /// Whether an item is suspended in the middle for another reason than a wait for a signal.
+  bool isAnyPaused() const { return !readyRunners_.empty(); }
   /// Items waiting inside `Signal::wait`.
   std::size_t waiting() const { return waiters_.size(); }
   /// Whether anything can run now or later.
@@ -76,6 +91,7 @@ class SimulatedWorkQueues : public WorkQueues {
   class Queue;
   class SimulatedTimer;
   class SimulatedSignal;
+  class SimulatedTurns;
   struct Runner;
   struct Waiter;
   using EventKey = std::pair<double, std::uint64_t>;  ///< virtual time when due, then order of scheduling
@@ -87,6 +103,7 @@ class SimulatedWorkQueues : public WorkQueues {
 
   void enqueue(const std::shared_ptr<Queue>& queue, Work work);
   bool runOne();
+  bool runPart();
   void start(std::shared_ptr<Queue> queue, Work work);
   void resume(Runner& runner);
   void work(Runner& runner);
@@ -98,6 +115,15 @@ class SimulatedWorkQueues : public WorkQueues {
   enum class Outcome { Signalled, Over, Deadlocked };
   void wake(const std::shared_ptr<Waiter>& waiter, Outcome outcome);
   void wakeDeadlocked();
+  void pause();
+  void drawPointsToPause();
+
+  void take(SimulatedTurns& turns);
+  void takeInItem(SimulatedTurns& turns);
+  void takeOutside(const SimulatedTurns& turns);
+  void endTurn(SimulatedTurns& turns);
+  static std::string describeRunner(const Runner* runner);
+  std::string describeWaits() const;
   void requireOutside() const;
 
   SimulatedClock& clock_;
@@ -113,10 +139,18 @@ class SimulatedWorkQueues : public WorkQueues {
   std::vector<std::unique_ptr<Runner>> runners_;
   std::vector<Runner*> idleRunners_;
   Runner* current_ = nullptr;
+  std::uint64_t itemsStarted_ = 0;
   std::vector<std::shared_ptr<Waiter>> waiters_;
 
+  std::uint64_t pauseEvery_ = kPauseEvery;
+  std::uint64_t pointsToPause_ = 0;
+  bool pausedLast_ = false;  ///< the runner that was resumed last has paused
+  std::size_t pauses_ = 0;
+
   std::vector<std::string> faults_;
+  std::string deadlock_;  ///< who waited for whom when nothing could end the waits any more
   bool ending_ = false;
+  bool ended_ = false;  ///< no more pauses
   bool closed_ = false;
   std::shared_ptr<Queue> mainQueue_;
   std::shared_ptr<Queue> concurrentQueues_[2];
