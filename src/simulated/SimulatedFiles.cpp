@@ -91,18 +91,32 @@ Result<std::optional<FileStamp>> SimulatedFiles::stamp(const std::string& path) 
   return std::optional(found->second.stamp);
 }
 
+/// Notes paths as being changed, until `end`. Used with the mutex held.
+class SimulatedFiles::Changing {
+ public:
+  Changing(SimulatedFiles& files, std::vector<std::string> paths) : files_(files), paths_(std::move(paths)) {
+    files_.changing_.insert(paths_.begin(), paths_.end());
+  }
+  ~Changing() { end(); }
+  Changing(const Changing&) = delete;
+  Changing& operator=(const Changing&) = delete;
+
+  void end() {
+    for (const auto& path : std::exchange(paths_, {})) files_.changing_.erase(files_.changing_.find(path));
+  }
+
+ private:
+  SimulatedFiles& files_;
+  std::vector<std::string> paths_;
+};
+
 class SimulatedFiles::Replacement : public ReplaceSteps {
  public:
   Replacement(SimulatedFiles& files, const std::string& path)
       : files_(files),
         path_(path),
         temporary_(directoryOf(path) + "/." + path.substr(path.rfind('/') + 1) + std::string(kTemporaryTag) +
-                   std::to_string(++files.lastInode_)) {
-    ++files_.replacements_;
-  }
-  ~Replacement() override { --files_.replacements_; }
-  Replacement(const Replacement&) = delete;
-  Replacement& operator=(const Replacement&) = delete;
+                   std::to_string(++files.lastInode_)) {}
 
   std::optional<Error> createTemporary() override {
     if (auto error = files_.begin(Step::CreateTemporary, path_)) return error;
@@ -143,11 +157,10 @@ std::optional<Error> SimulatedFiles::replace(const std::string& path, const std:
   if (directories_.contains(path)) return failure(EISDIR, path);
   if (!directories_.contains(directoryOf(path))) return failure(ENOENT, path);
   removeLeftovers(directoryOf(path));
-  std::optional<Error> error;
-  {
-    Replacement steps(*this, path);
-    error = replaceAtomically(steps, bytes);
-  }
+  Changing changing(*this, {path});
+  Replacement steps(*this, path);
+  auto error = replaceAtomically(steps, bytes);
+  changing.end();
   tellChange(lock, path, !error);
   return error;
 }
@@ -168,9 +181,11 @@ std::optional<Error> SimulatedFiles::remove(const std::string& path) {
   if (auto fault = writeFaultOf(path)) return fault;
   if (directories_.contains(path)) return failure(EISDIR, path);
   if (!files_.contains(path)) return failure(ENOENT, path);
+  Changing changing(*this, {path});
   if (auto error = begin(Step::Remove, path)) return error;
   put(path, std::optional<File>());
   auto error = syncDirectoryOf(path);
+  changing.end();
   tellChange(lock, path, !error);
   return error;
 }
@@ -191,6 +206,7 @@ std::optional<Error> SimulatedFiles::move(const std::string& from, const std::st
   if (!replaces && (files_.contains(to) || directories_.contains(to))) return failure(EEXIST, to);
   if (directories_.contains(to)) return failure(EISDIR, to);
   if (!directories_.contains(directoryOf(to))) return failure(ENOENT, to);
+  Changing changing(*this, {from, to});
   if (auto error = begin(Step::Rename, to)) return error;
   if (from == to) return std::nullopt;
   const auto found = files_.find(from);
@@ -200,6 +216,7 @@ std::optional<Error> SimulatedFiles::move(const std::string& from, const std::st
   put(to, std::move(file));
   put(from, std::optional<File>());
   auto error = syncDirectoryOf(to);
+  changing.end();
   tellChange(lock, from, !error);
   tellChange(lock, to, !error);
   return error;
@@ -305,9 +322,9 @@ bool SimulatedFiles::isKilled() const {
   return hasEnded();
 }
 
-std::size_t SimulatedFiles::replacementsUnderWay() const {
+std::set<std::string> SimulatedFiles::changing() const {
   const std::lock_guard lock(mutex_);
-  return replacements_;
+  return {changing_.begin(), changing_.end()};
 }
 
 bool SimulatedFiles::hasEnded() const { return lastStep_ && steps_ >= *lastStep_; }

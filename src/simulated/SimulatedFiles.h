@@ -74,8 +74,8 @@ class SimulatedFiles : public Files {
   /// Simulates a killed process: after `count` more steps, no step has an effect.
   void killAfterSteps(std::size_t count);
   bool isKilled() const;
-  /// How many files are being replaced now.
-  std::size_t replacementsUnderWay() const;
+  /// The paths whose changes have begun and not ended.
+  std::set<std::string> changing() const;
   /// Replaces these files by those of another instance.
   void takeOver(const SimulatedFiles& other);
   /// Loses what was not synced, as far as `random` decides: the latest changes of names, and the end of
@@ -87,6 +87,7 @@ class SimulatedFiles : public Files {
 
  private:
   class Replacement;
+  class Changing;
   struct File {
     std::string bytes;
     FileStamp stamp;
@@ -136,7 +137,7 @@ class SimulatedFiles : public Files {
   std::size_t steps_ = 0;
   std::size_t reads_ = 0;
   std::map<std::string, std::shared_ptr<Turns>> locks_;
-  std::size_t replacements_ = 0;
+  std::multiset<std::string> changing_;
 };
 
 }  // namespace kvr

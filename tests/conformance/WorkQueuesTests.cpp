@@ -302,6 +302,63 @@ TEST_P(WorkQueuesTest, EndingEndsEveryWait) {
   EXPECT_EQ(ended, kMany);
 }
 
+TEST_P(WorkQueuesTest, OneOperationAtATimeHasItsTurnAndAFailureEndsIt) {
+  const auto turns = queues().newTurns("test");
+  const auto othersMayRun = serial();
+  const auto done = newSignal();
+  std::atomic<int> running{0};
+  std::atomic<int> most{0};
+  std::atomic<int> through{0};
+  for (int i = 0; i < kMany; ++i) {
+    concurrent()->async([&, i] {
+      const Turn turn(*turns);
+      const Turn again(*turns);
+      most = std::max<int>(most, ++running);
+      othersMayRun->async([] {});
+      --running;
+      if (++through == kMany) done->signal();
+      if (i % 2 == 0) throw std::runtime_error("boom");
+    });
+  }
+  await(done);
+  EXPECT_EQ(most, 1);
+
+  const auto begun = newSignal();
+  concurrent()->async([&] {
+    const Turn turn(*turns);
+    begun->signal();
+    newSignal()->wait(0.01);
+    record.emplace_back("inside");
+  });
+  await(begun);
+  const Turn turn(*turns);
+  record.emplace_back("outside of all queues");
+  EXPECT_THAT(record, ElementsAre("inside", "outside of all queues"));
+}
+
+// Only for virtual time.
+
+TEST(SimulatedQueues, SayWhoWaitsForWhomWhenTwoTakeTwoTurnsInOppositeOrder) {
+  SimulatedClock clock;
+  SimulatedWorkQueues queues(clock, 1);
+  const auto fork = queues.newTurns("fork");
+  const auto knife = queues.newTurns("knife");
+  const auto bothHaveOne = queues.newSignal();
+  int having = 0;
+  const auto take = [&](Turns& first, Turns& second) {
+    const Turn turn(first);
+    if (++having == 2) bothHaveOne->signal();
+    bothHaveOne->wait(std::nullopt);
+    const Turn other(second);
+  };
+  queues.newSerialQueue("Ada")->async([&] { take(*fork, *knife); });
+  queues.newSerialQueue("Ben")->async([&] { take(*knife, *fork); });
+  queues.run();
+  EXPECT_THAT(queues.faults(),
+              ElementsAre(AllOf(HasSubstr("the queue 'Ada' waits for the turn 'knife' of item"),
+                                HasSubstr("the queue 'Ben' waits for the turn 'fork' of item"))));
+}
+
 // Only for real threads.
 
 TEST(LocalQueues, DrainOnceNothingIsQueuedOrRunningAndTakeNothingMore) {

@@ -33,8 +33,7 @@ std::uint64_t policyIn(const Value& value) { return static_cast<std::uint64_t>(v
 
 }  // namespace
 
-Value::Array Clients::argumentsFor(const std::string& member, Dice& dice) const {
-  auto serialNumber = dice.oneOf(world_.serialNumbers());
+Value::Array Clients::argumentsFor(const std::string& member, Dice& dice, std::string serialNumber) {
   if (dice.happens(0.1)) {
     serialNumber = dice.oneOf<std::string>(
         {"", "SNSTRANGER", "a/b", std::string("SN\0X", 4), std::string(200, 'x'), "\xC3\xA9"});
@@ -61,9 +60,9 @@ std::shared_ptr<SimulatedServiceConnection> Clients::connection(Dice& dice, Simu
   return connections_.back();
 }
 
-std::string Clients::ask(Dice& dice, SimulatedPlatform& platform) {
+std::string Clients::ask(Dice& dice, SimulatedPlatform& platform, const std::string& serialNumber) {
   const auto member = dice.oneOf(kMembers);
-  auto arguments = argumentsFor(member, dice);
+  auto arguments = argumentsFor(member, dice, serialNumber);
   std::string text = member + " " + describe(Value(arguments));
   const auto asked = connection(dice, platform);
   open_.push_back({member, arguments, asked->invoke(member, arguments), world_.now, kLimit});
@@ -100,6 +99,7 @@ void Clients::checkAnswers() {
 
 void Clients::checkAnswer(const OpenCall& call) {
   const auto& reply = *call.call->reply;
+  if (call.member == kDismiss) invariants_.dismissalAnswered(call.arguments[0].string());
   if (call.member == "GetDefaultDeviceInfoUsingPolicy") {
     checkInfo(call, reply, world_.phone, policyIn(call.arguments[0]));
   } else if (call.member == "GetDeviceInfoForSerialNumber") {

@@ -16,8 +16,8 @@ class Clients {
  public:
   Clients(World& world, Invariants& invariants) : world_(world), invariants_(invariants) {}
 
-  /// Makes a random call; returns a description for a trace.
-  std::string ask(Dice& dice, SimulatedPlatform& platform);
+  /// Makes a random call, about this device if it is about one; returns a description for a trace.
+  std::string ask(Dice& dice, SimulatedPlatform& platform, const std::string& serialNumber);
   std::shared_ptr<const SimulatedServiceConnection::Call> invoke(SimulatedPlatform& platform,
                                                                  const std::string& member,
                                                                  Value::Array arguments);
@@ -44,7 +44,7 @@ class Clients {
   void checkInfo(const OpenCall& call, const Value& info, const std::string& serialNumber,
                  std::uint64_t policy);
   std::shared_ptr<SimulatedServiceConnection> connection(Dice& dice, SimulatedPlatform& platform);
-  Value::Array argumentsFor(const std::string& member, Dice& dice) const;
+  static Value::Array argumentsFor(const std::string& member, Dice& dice, std::string serialNumber);
 
   World& world_;
   Invariants& invariants_;

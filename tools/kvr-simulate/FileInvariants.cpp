@@ -81,7 +81,7 @@ void Invariants::fileChanged(const std::string& path, bool isDone) {
     report("files are whole", path);
   }
   // Leftovers of an earlier process are removed before the first file of a directory is replaced.
-  if (platform_->files.replacementsUnderWay() > 0) return checkContents(path);
+  if (!platform_->files.changing().empty()) return checkContents(path);
   const bool isCleared = isDone && bytes && path.find(".damaged-") == std::string::npos && !filesFailed_;
   for (const auto& neighbour : platform_->files.list(path.substr(0, path.rfind('/')), kTemporaryTag)) {
     if (isCleared || !leftovers_.contains(neighbour)) report("no temporary file stays", neighbour);

@@ -26,11 +26,7 @@ void Life::apply(const Event& event) {
   say("#" + std::to_string(event.number) + " " + nameOf(event.kind));
   switch (event.kind) {
     case EventKind::Call:
-      // Several programs may call at once.
-      for (auto calls = dice.oneOf({1, 1, 2, 6}); process_ && calls > 0; --calls) {
-        say("  " + clients_.ask(dice, process_->simulated));
-      }
-      break;
+      return call(dice);
     case EventKind::Offer:
       return offer(dice);
     case EventKind::Watch:
@@ -76,6 +72,15 @@ void Life::apply(const Event& event) {
       return damage(dice);
     case EventKind::Setting:
       return setting(dice);
+  }
+}
+
+/// Several programs may call at once, about the same device.
+void Life::call(Dice& dice) {
+  if (!process_) return;
+  const auto serialNumber = dice.oneOf(world_.serialNumbers());
+  for (auto calls = dice.oneOf({1, 1, 2, 6}); calls > 0; --calls) {
+    say("  " + clients_.ask(dice, process_->simulated, serialNumber));
   }
 }
 
@@ -211,7 +216,7 @@ void Life::serviceFault(Dice& dice) {
     world_.service.coverageFault = world_.service.versionFault = Fault::None;
     disturb();
   });
-  if (process_ && dice.happens(0.5)) say("  " + clients_.ask(dice, process_->simulated));
+  if (dice.happens(0.5)) call(dice);
 }
 
 void Life::fileFault(Dice& dice) {

@@ -55,6 +55,7 @@ void Invariants::beginProcess(SimulatedPlatform& platform) {
   excuseRuns();
   begun_.clear();
   dismissed_.clear();
+  answered_.clear();
   endDismisses_.reset();
   expired_.clear();
   lastRequest_ = -1e9;
@@ -79,6 +80,7 @@ void Invariants::beginProcess(SimulatedPlatform& platform) {
 void Invariants::endProcess() {
   if (platform_ == nullptr) return;
   figures.pauses += platform_->queues.pauses();
+  for (const auto& path : platform_->files.changing()) durable_.erase(path);
   reportFaults();
   platform_ = nullptr;
 }
@@ -93,15 +95,38 @@ void Invariants::reportFaults() {
 void Invariants::step() {
   if (!isWatching()) return;
   reportFaults();
+  checkListed();
+  checkDismissed();
+}
+
+/// Once time has passed, what was posted before is recorded.
+void Invariants::checkListed() {
   if (toBeListed_.empty()) return;
-  // Once time has passed, what was posted before is recorded.
   const auto list = preferences()[preference::kFollowUpPostedHashes];
   std::erase_if(toBeListed_, [&](const auto& posted) {
-    const auto& [hash, when] = posted;
-    if (when == world_.now) return false;
+    if (posted.second == world_.now) return false;
     const bool isListed =
-        list.isArray() && std::ranges::find(list.array(), Value(hash)) != list.array().end();
-    if (!isListed && !filesFail_) report("what is posted is remembered", hash);
+        list.isArray() && std::ranges::find(list.array(), Value(posted.first)) != list.array().end();
+    if (!isListed && !filesFail_) report("what is posted is remembered", posted.first);
+    return true;
+  });
+}
+
+/// Once time has passed, a follow-up whose dismissal was answered is gone, unless its offer has begun again.
+/// Whoever saw the follow-up before the dismissal must not have brought it back.
+void Invariants::checkDismissed() {
+  std::erase_if(answered_, [this](const auto& answered) {
+    if (answered.second == world_.now) return false;
+    const auto stored = preferences();
+    for (const auto& item : pendingItems()) {
+      const auto* const offer = world_.service.find(item.title);
+      const auto found = item.userInfo.find(names::kFollowUpSerialNumber);
+      if (offer == nullptr || found == item.userInfo.end() || found->second != Value(answered.first))
+        continue;
+      if (isDismissed(*offer, stored) && !filesFailed_) {
+        report("what is dismissed stays dismissed", "it is still shown: " + describe(item.title));
+      }
+    }
     return true;
   });
 }

@@ -91,6 +91,10 @@ class Invariants {
   /// From now on look-ups may fail for a while, or may have found something else before.
   void trouble() { troubled_ = world_.now; }
   void dismissalAsked(const std::string& serialNumber) { dismissed_.insert(serialNumber); }
+  /// A client was told that this device's follow-up is dismissed.
+  void dismissalAnswered(const std::string& serialNumber) {
+    answered_.insert_or_assign(serialNumber, world_.now);
+  }
   void suspended(double seconds);
   /// After this, items may be shown with an earlier text.
   void powerLost() { refreshed_.clear(); }
@@ -122,6 +126,8 @@ class Invariants {
   bool isStartingUp() const;
   void checkConversionDate(const Value& stored);
   void reportFaults();
+  void checkListed();
+  void checkDismissed();
   void readCaches();
   void cacheChanged(const std::string& path);
   void downloaded(const std::string& lastUpdatedKey);
@@ -151,9 +157,9 @@ class Invariants {
   SimulatedPlatform* platform_ = nullptr;
   std::map<std::string, Run> runs_;
   std::map<std::string, std::deque<double>> runTimes_;
-  Value preferences_;  ///< as last seen
+  Value preferences_;                         ///< as last seen
   std::map<std::string, double> toBeListed_;  ///< hashes of devices, and when their follow-ups were posted
-  std::set<std::string> leftovers_;  ///< files that existed when the process began
+  std::set<std::string> leftovers_;           ///< files that existed when the process began
   std::map<std::string, std::string> durable_;
   bool filesFail_ = false;
   bool filesFailed_ = false;  ///< in this process; the agent may know more than its files contain
@@ -167,7 +173,8 @@ class Invariants {
   Value conversionAtStart_;         ///< the target date of the conversion outreach when the process began
   std::set<Date> conversionDates_;  ///< all that the service ever sent
   std::map<std::string, Cache> caches_;
-  std::set<std::string> dismissed_;  ///< serial numbers whose dismissal was requested in this process
+  std::set<std::string> dismissed_;         ///< serial numbers whose dismissal was requested in this process
+  std::map<std::string, double> answered_;  ///< serial numbers whose dismissal was just answered, and when
   double troubled_ = -1e9;
   std::set<std::string> expired_;  ///< items that expired before the clock was set, in this process
   std::optional<std::set<std::string>> endDismisses_;  ///< set once the process is told to end

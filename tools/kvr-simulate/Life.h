@@ -62,6 +62,7 @@ class Life {
   }
   SimulatedPlatform* platform() { return process_ ? &process_->simulated : nullptr; }
 
+  void call(Dice& dice);
   void offer(Dice& dice);
   void watch(Dice& dice);
   void account(Dice& dice);

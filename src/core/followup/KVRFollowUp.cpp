@@ -27,10 +27,9 @@ Turn KVRFollowUp::takeTurn() const {
   struct FollowUpTurns {
     std::shared_ptr<Turns> turns;
   };
-  return Turn(
-      *platform_.sharedObjects
-           .get<FollowUpTurns>([this] { return new FollowUpTurns{platform_.queues.newTurns("follow-ups")}; })
-           ->turns);
+  const auto shared = platform_.sharedObjects.get<FollowUpTurns>(
+      [this] { return new FollowUpTurns{platform_.queues.newTurns("follow-ups")}; });
+  return Turn(*shared->turns);
 }
 
 std::vector<FollowUpItem> KVRFollowUp::pendingItems() {

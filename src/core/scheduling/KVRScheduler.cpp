@@ -81,10 +81,9 @@ Turn KVRScheduler::takeTurn(Platform& platform) {
   struct SchedulingTurns {
     std::shared_ptr<Turns> turns;
   };
-  return Turn(
-      *platform.sharedObjects
-           .get<SchedulingTurns>([&] { return new SchedulingTurns{platform.queues.newTurns("scheduling")}; })
-           ->turns);
+  const auto shared = platform.sharedObjects.get<SchedulingTurns>(
+      [&] { return new SchedulingTurns{platform.queues.newTurns("scheduling")}; });
+  return Turn(*shared->turns);
 }
 
 void KVRScheduler::monitorForScheduledActivity() {
