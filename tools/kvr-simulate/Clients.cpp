@@ -86,6 +86,29 @@ std::shared_ptr<const SimulatedServiceConnection::Call> Clients::invoke(Simulate
   return call;
 }
 
+void Clients::lieInWait(Dice& dice) {
+  if (dice.happens(0.2)) {
+    dismissesSeen_ = dice.number();
+  } else {
+    schedulesAfter_ = dice.oneOf({60.0, 86400.0, 1e6});
+  }
+}
+
+void Clients::followUpsSeen(SimulatedPlatform& platform, const std::vector<FollowUpItem>& pending) {
+  if (!dismissesSeen_ || pending.empty() || !invariants_.isWatching()) return;
+  const auto& item = pending[*std::exchange(dismissesSeen_, std::nullopt) % pending.size()];
+  const auto serialNumber = item.userInfo.find(names::kFollowUpSerialNumber);
+  if (serialNumber == item.userInfo.end()) return;
+  invariants_.dismissalAsked(serialNumber->second.string());
+  invoke(platform, kDismiss, {serialNumber->second});
+}
+
+void Clients::registering(SimulatedPlatform& platform, const std::string& activity) {
+  if (!schedulesAfter_ || activity != names::kOutreach || !invariants_.isWatching()) return;
+  invariants_.excuseRuns();
+  invoke(platform, "ScheduleOutreachAfter", {*std::exchange(schedulesAfter_, std::nullopt)});
+}
+
 void Clients::checkAnswers() {
   std::erase_if(open_, [this](const OpenCall& call) {
     const bool isAnswered = call.call->reply.has_value();

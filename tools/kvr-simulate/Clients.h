@@ -4,6 +4,7 @@
 #include "simulated/SimulatedServiceListeners.h"
 
 #include <memory>
+#include <optional>
 #include <set>
 #include <string>
 #include <vector>
@@ -21,6 +22,12 @@ class Clients {
   std::shared_ptr<const SimulatedServiceConnection::Call> invoke(SimulatedPlatform& platform,
                                                                  const std::string& member,
                                                                  Value::Array arguments);
+  /// From now on a client waits for a moment at which the agent is in the middle of its work.
+  void lieInWait(Dice& dice);
+  /// The agent has just looked at the pending follow-ups: a client dismisses one, if one lies in wait.
+  void followUpsSeen(SimulatedPlatform& platform, const std::vector<FollowUpItem>& pending);
+  /// The agent is about to register this activity: a client schedules an outreach, if one lies in wait.
+  void registering(SimulatedPlatform& platform, const std::string& activity);
   void checkAnswers();
   /// The devices with an unanswered request to dismiss their follow-ups.
   std::set<std::string> serialNumbersToDismiss() const;
@@ -50,6 +57,8 @@ class Clients {
   Invariants& invariants_;
   std::vector<std::shared_ptr<SimulatedServiceConnection>> connections_;
   std::vector<OpenCall> open_;
+  std::optional<std::uint64_t> dismissesSeen_;  ///< decides which follow-up
+  std::optional<double> schedulesAfter_;        ///< seconds
 };
 
 }  // namespace kvr::simulate

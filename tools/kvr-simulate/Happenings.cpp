@@ -78,6 +78,7 @@ void Life::apply(const Event& event) {
 /// Several programs may call at once, about the same device.
 void Life::call(Dice& dice) {
   if (!process_) return;
+  if (dice.happens(0.5)) clients_.lieInWait(dice);
   const auto serialNumber = dice.oneOf(world_.serialNumbers());
   for (auto calls = dice.oneOf({1, 1, 2, 6}); calls > 0; --calls) {
     say("  " + clients_.ask(dice, process_->simulated, serialNumber));

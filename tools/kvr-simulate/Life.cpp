@@ -33,7 +33,7 @@ void Life::birth() {
 }
 
 void Life::start() {
-  process_ = std::make_unique<Process>(world_, invariants_, world_.seed * 1'000'003 + ++starts_,
+  process_ = std::make_unique<Process>(world_, invariants_, clients_, world_.seed * 1'000'003 + ++starts_,
                                        options_.leastLogged, files_.get());
   auto& simulated = process_->simulated;
   simulated.clock.set(SimulatedClock::kDefaultStart + world_.now + clockOffset_);

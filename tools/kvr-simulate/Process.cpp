@@ -15,8 +15,13 @@ HTTPResponse endingResponse() { return {0, std::nullopt, Error{"http", 42, "the 
 class RecordingActivity : public Activity {
  public:
   RecordingActivity(std::unique_ptr<Activity> activity, Log& log, Invariants& invariants,
-                    const std::function<void()>& checkedIn)
-      : activity_(std::move(activity)), log_(log), invariants_(invariants), checkedIn_(checkedIn) {}
+                    const std::function<void()>& checkedIn,
+                    const std::function<void(const std::string&)>& registering)
+      : activity_(std::move(activity)),
+        log_(log),
+        invariants_(invariants),
+        checkedIn_(checkedIn),
+        registering_(registering) {}
 
   const std::string& identifier() const override { return activity_->identifier(); }
   void setEarliestDate(Date date) override { activity_->setEarliestDate(date); }
@@ -26,6 +31,7 @@ class RecordingActivity : public Activity {
     checkedIn_();
   }
   void registerAnew(const ActivityRegistration& registration, ActivityBlock block) override {
+    registering_(identifier());
     activity_->registerAnew(registration, recorded(std::move(block)));
   }
 
@@ -45,12 +51,14 @@ class RecordingActivity : public Activity {
   Log& log_;
   Invariants& invariants_;
   const std::function<void()>& checkedIn_;
+  const std::function<void(const std::string&)>& registering_;
 };
 
 class RecordingClient : public FollowUpCenterClient {
  public:
-  RecordingClient(std::unique_ptr<FollowUpCenterClient> client, Invariants& invariants)
-      : client_(std::move(client)), invariants_(invariants) {}
+  RecordingClient(std::unique_ptr<FollowUpCenterClient> client, Invariants& invariants,
+                  const RecordingCenter::Seen& seen)
+      : client_(std::move(client)), invariants_(invariants), seen_(seen) {}
 
   std::optional<Error> postItem(const FollowUpItem& item) override {
     const auto pending = client_->pendingItems();
@@ -64,34 +72,47 @@ class RecordingClient : public FollowUpCenterClient {
     if (pending) invariants_.clearing(uniqueIdentifiers, *pending);
     return client_->clearPendingItems(uniqueIdentifiers);
   }
-  Result<std::vector<FollowUpItem>> pendingItems() override { return client_->pendingItems(); }
+  Result<std::vector<FollowUpItem>> pendingItems() override {
+    auto pending = client_->pendingItems();
+    if (pending) seen_(*pending);
+    return pending;
+  }
 
  private:
   const std::unique_ptr<FollowUpCenterClient> client_;
   Invariants& invariants_;
+  const RecordingCenter::Seen& seen_;
 };
 
 }  // namespace
 
 std::unique_ptr<Activity> RecordingActivities::newActivity(std::string identifier) {
   return std::make_unique<RecordingActivity>(scheduler_.newActivity(std::move(identifier)), log_, invariants_,
-                                             checkedIn_);
+                                             checkedIn_, registering_);
 }
 
 std::unique_ptr<FollowUpCenterClient> RecordingCenter::newClient(std::string clientIdentifier) {
-  return std::make_unique<RecordingClient>(center_.newClient(std::move(clientIdentifier)), invariants_);
+  return std::make_unique<RecordingClient>(center_.newClient(std::move(clientIdentifier)), invariants_,
+                                           seen_);
 }
 
-Process::Process(World& world, Invariants& invariants, std::uint64_t seed, LogLevel leastLogged,
-                 const SimulatedFiles* files)
+Process::Process(World& world, Invariants& invariants, Clients& clients, std::uint64_t seed,
+                 LogLevel leastLogged, const SimulatedFiles* files)
     : simulated(seed, leastLogged),
       world_(world),
       invariants_(invariants),
       began_(world.now),
       pause_(seed % kSlowStarts == 0 ? Dice(seed).between(0, kLongestPause) : 0),
-      activities_(simulated.activities, simulated.log, invariants, [this] { letOthersRun(); }),
+      activities_(
+          simulated.activities, simulated.log, invariants, [this] { letOthersRun(); },
+          [this, &clients](const std::string& activity) {
+            if (startUp_) clients.registering(simulated, activity);
+          }),
       services_(simulated.services, [this] { letOthersRun(); }),
-      followUps_(simulated.followUps, invariants),
+      followUps_(simulated.followUps, invariants,
+                 [this, &clients](const std::vector<FollowUpItem>& pending) {
+                   if (startUp_) clients.followUpsSeen(simulated, pending);
+                 }),
       platform_{simulated.log,
                 simulated.clock,
                 simulated.queues,

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "core/agent/StartUp.h"
+#include "kvr-simulate/Clients.h"
 #include "kvr-simulate/Invariants.h"
 
 #include <functional>
@@ -13,12 +14,17 @@
 namespace kvr::simulate {
 
 /// Forwards to the simulated scheduler and reports runs to the invariants; calls `checkedIn` after each
-/// check-in of an activity.
+/// check-in of an activity, and `registering` before each registration.
 class RecordingActivities : public ActivityScheduler {
  public:
   RecordingActivities(ActivityScheduler& scheduler, Log& log, Invariants& invariants,
-                      std::function<void()> checkedIn)
-      : scheduler_(scheduler), log_(log), invariants_(invariants), checkedIn_(std::move(checkedIn)) {}
+                      std::function<void()> checkedIn,
+                      std::function<void(const std::string& activity)> registering)
+      : scheduler_(scheduler),
+        log_(log),
+        invariants_(invariants),
+        checkedIn_(std::move(checkedIn)),
+        registering_(std::move(registering)) {}
 
   std::unique_ptr<Activity> newActivity(std::string identifier) override;
   void suspend() override { scheduler_.suspend(); }
@@ -29,6 +35,7 @@ class RecordingActivities : public ActivityScheduler {
   Log& log_;
   Invariants& invariants_;
   const std::function<void()> checkedIn_;
+  const std::function<void(const std::string& activity)> registering_;
 };
 
 /// Forwards to the simulated listeners and calls `beforeNew` before each new listener.
@@ -47,24 +54,28 @@ class RecordingListeners : public ServiceListeners {
   const std::function<void()> beforeNew_;
 };
 
-/// Forwards to the simulated follow-up centre and reports posting and clearing to the invariants.
+/// Forwards to the simulated follow-up centre and reports posting and clearing to the invariants; calls
+/// `seen` after each look at the pending items.
 class RecordingCenter : public FollowUpCenter {
  public:
-  RecordingCenter(FollowUpCenter& center, Invariants& invariants)
-      : center_(center), invariants_(invariants) {}
+  using Seen = std::function<void(const std::vector<FollowUpItem>& pending)>;
+
+  RecordingCenter(FollowUpCenter& center, Invariants& invariants, Seen seen)
+      : center_(center), invariants_(invariants), seen_(std::move(seen)) {}
 
   std::unique_ptr<FollowUpCenterClient> newClient(std::string clientIdentifier) override;
 
  private:
   FollowUpCenter& center_;
   Invariants& invariants_;
+  const Seen seen_;
 };
 
 /// One process of the agent: a simulated platform that is observed, and the agent on it.
 class Process {
  public:
   /// `files`: the files that the previous process left, or null.
-  Process(World& world, Invariants& invariants, std::uint64_t seed, LogLevel leastLogged,
+  Process(World& world, Invariants& invariants, Clients& clients, std::uint64_t seed, LogLevel leastLogged,
           const SimulatedFiles* files);
   ~Process();
   Process(const Process&) = delete;
