@@ -80,8 +80,11 @@ std::string Clients::ask(Dice& dice, SimulatedPlatform& platform, const std::str
 std::shared_ptr<const SimulatedServiceConnection::Call> Clients::invoke(SimulatedPlatform& platform,
                                                                         const std::string& member,
                                                                         Value::Array arguments) {
-  connections_.push_back(platform.services.connect(names::kAgent, {{{names::kEntitlement, true}}}));
-  auto call = connections_.back()->invoke(member, arguments);
+  const auto asked = platform.services.connect(names::kAgent, {{{names::kEntitlement, true}}});
+  auto call = asked->invoke(member, arguments);
+  // In the middle of the agent's work, others may have run since, and the process may have ended.
+  if (!invariants_.isWatching()) return call;
+  connections_.push_back(asked);
   open_.push_back({member, std::move(arguments), call, world_.now, kLimit});
   return call;
 }
@@ -90,8 +93,13 @@ void Clients::lieInWait(Dice& dice) {
   if (dice.happens(0.2)) {
     dismissesSeen_ = dice.number();
   } else {
-    schedulesAfter_ = dice.oneOf({60.0, 86400.0, 1e6});
+    schedulesAfter_ = dice.oneOf({60.0, 60.0, 86400.0});
   }
+}
+
+void Clients::lieInWaitNoLonger() {
+  dismissesSeen_.reset();
+  schedulesAfter_.reset();
 }
 
 void Clients::followUpsSeen(SimulatedPlatform& platform, const std::vector<FollowUpItem>& pending) {

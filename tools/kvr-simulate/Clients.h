@@ -24,6 +24,7 @@ class Clients {
                                                                  Value::Array arguments);
   /// From now on a client waits for a moment at which the agent is in the middle of its work.
   void lieInWait(Dice& dice);
+  void lieInWaitNoLonger();
   /// The agent has just looked at the pending follow-ups: a client dismisses one, if one lies in wait.
   void followUpsSeen(SimulatedPlatform& platform, const std::vector<FollowUpItem>& pending);
   /// The agent is about to register this activity: a client schedules an outreach, if one lies in wait.

@@ -148,6 +148,7 @@ void Life::look() {
 /// After the faults have stopped: requests an outreach, waits for its effects, and looks up every device.
 void Life::rest() {
   endFaults();
+  clients_.lieInWaitNoLonger();
   agenda_.clear();
   if (!process_) startsAt_ = std::min(startsAt_, world_.now);
   advanceTo(world_.now + 2 * kDay);

@@ -56,6 +56,7 @@ struct SimulatedWorkQueues::Runner {
   Work item;
   std::uint64_t number = 0;  ///< of the item, in the order in which items start
   const SimulatedTurns* awaited = nullptr;
+  bool isHeldBack = false;  ///< paused until nothing else can run
   bool isDone = false;
   bool isStopping = false;
   Fiber fiber;
@@ -278,14 +279,20 @@ bool SimulatedWorkQueues::runOne() {
 
 /// Runs one item until it ends, waits or pauses.
 bool SimulatedWorkQueues::runPart() {
-  const auto count = readyQueues_.size() + readyItems_.size() + readyRunners_.size();
+  const auto heldBack = std::stable_partition(readyRunners_.begin(), readyRunners_.end(),
+                                              [](const Runner* runner) { return !runner->isHeldBack; });
+  auto runners = static_cast<std::size_t>(heldBack - readyRunners_.begin());
+  if (readyQueues_.empty() && readyItems_.empty() && runners == 0) runners = readyRunners_.size();
+  const auto count = readyQueues_.size() + readyItems_.size() + runners;
   if (count == 0) return false;
   auto choice = static_cast<std::size_t>(random_() % count);
-  if (choice < readyRunners_.size()) {
-    resume(*takeAt(readyRunners_, choice));
+  if (choice < runners) {
+    auto* const runner = takeAt(readyRunners_, choice);
+    runner->isHeldBack = false;
+    resume(*runner);
     return true;
   }
-  choice -= readyRunners_.size();
+  choice -= runners;
   if (choice < readyItems_.size()) {
     start(nullptr, takeAt(readyItems_, choice));
     return true;
@@ -362,6 +369,7 @@ void SimulatedWorkQueues::pause() {
   if (ended_ || (readyQueues_.empty() && readyItems_.empty() && readyRunners_.empty())) return;
   ++pauses_;
   pausedLast_ = true;
+  current_->isHeldBack = random_() % 2 == 0;
   readyRunners_.push_back(current_);
   current_->fiber.pause();
 }
