@@ -22,6 +22,14 @@ struct TheAgentOnItsHost : ::testing::Test {
     world.prologue += "mount --bind '" + (world.directory / file).string() + "' " + hosts + "\n";
   }
 
+  /// Has the agent write to a journal that the test reads.
+  void replaceJournal() {
+    world.prologue =
+        "mount -t tmpfs run /run; mkdir -p /run/systemd/journal; : >/run/systemd/journal/socket\n"
+        "export JOURNAL_STREAM=$(stat -L -c %d:%i /dev/stderr)\n";
+    replace("/run/systemd/journal/socket", "journal");
+  }
+
   AgentWorld world;
 };
 
@@ -46,10 +54,7 @@ std::map<std::string, std::string> fieldsOf(std::string_view entry) {
 
 TEST_F(TheAgentOnItsHost, WritesToTheJournalWhereItsErrorOutputLeadsThere) {
   const DatagramSocket journal(world.directory / "journal");
-  world.prologue =
-      "mount -t tmpfs run /run; mkdir -p /run/systemd/journal; : >/run/systemd/journal/socket\n"
-      "export JOURNAL_STREAM=$(stat -L -c %d:%i /dev/stderr)\n";
-  replace("/run/systemd/journal/socket", "journal");
+  replaceJournal();
   world.moreEnvironment = {{"KVR_LOG_LEVEL", "debug"}};
   world.directory.write("device/Network.plist", "damaged");
   const std::string call = "getting warranty using policy two\nlines: 1";
@@ -71,6 +76,19 @@ TEST_F(TheAgentOnItsHost, WritesToTheJournalWhereItsErrorOutputLeadsThere) {
   client.send("GetDeviceInfoForSerialNumber", "st", {"two\nlines", World::CacheOnly});
   reading.get();
   EXPECT_EQ(world.agent().errorOutput(), "");
+}
+
+TEST_F(TheAgentOnItsHost, AnswersWhileTheJournalHasStoppedReadingAndWritesAgainAfterwards) {
+  const DatagramSocket journal(world.directory / "journal");
+  replaceJournal();
+  world.startAgent();
+  const auto client = world.newClient();
+  // Each call makes more entries than the socket holds.
+  for (int call = 0; call < 3; ++call) World::info(client, World::kFirstWatch, World::CacheOnly);
+  while (journal.hasMessage()) journal.receive();
+  const std::string large(500'000, 'x');
+  World::info(client, large, World::CacheOnly);
+  EXPECT_THAT(journal.receive(), AllOf(::testing::StartsWith("MESSAGE="), HasSubstr(large)));
 }
 
 TEST_F(TheAgentOnItsHost, FollowsTheTimeZone) {

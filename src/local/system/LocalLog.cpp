@@ -2,12 +2,9 @@
 
 #include "local/system/Descriptor.h"
 
-#define SD_JOURNAL_SUPPRESS_LOCATION
 #include <poll.h>
 #include <sys/stat.h>
 #include <sys/sysmacros.h>
-#include <sys/uio.h>
-#include <systemd/sd-journal.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -52,11 +49,11 @@ const char* nameOf(LogLevel level) {
 const char* priorityOf(LogLevel level) {
   switch (level) {
     case LogLevel::Debug:
-      return "PRIORITY=7";
+      return "7";
     case LogLevel::Error:
-      return "PRIORITY=3";
+      return "3";
     default:
-      return "PRIORITY=5";
+      return "5";
   }
 }
 
@@ -136,16 +133,15 @@ void appendEscaped(std::string& line, std::string_view message) {
   }
 }
 
-bool sendToJournal(LogLevel level, const std::string& message) {
-  const std::string text = "MESSAGE=" + message;
-  const std::string subsystem = "SUBSYSTEM=" + std::string(Log::kSubsystem);
-  const std::string category = "CATEGORY=" + std::string(Log::kCategory);
-  const auto field = [](std::string_view line) {
-    return iovec{const_cast<char*>(line.data()), line.size()};  // NOLINT: the journal only reads it
-  };
-  const std::array fields{field(text), field(priorityOf(level)), field("SYSLOG_IDENTIFIER=kvragent"),
-                          field(subsystem), field(category)};
-  return ::sd_journal_sendv(fields.data(), static_cast<int>(fields.size())) == 0;
+std::string journalEntry(LogLevel level, const std::string& message) {
+  std::string entry;
+  entry.reserve(message.size() + 128);
+  JournalSocket::appendField(entry, "MESSAGE", message);
+  JournalSocket::appendField(entry, "PRIORITY", priorityOf(level));
+  JournalSocket::appendField(entry, "SYSLOG_IDENTIFIER", "kvragent");
+  JournalSocket::appendField(entry, "SUBSYSTEM", Log::kSubsystem);
+  JournalSocket::appendField(entry, "CATEGORY", Log::kCategory);
+  return entry;
 }
 
 }  // namespace
@@ -160,8 +156,18 @@ LocalLog::LocalLog(LogLevel least, bool revealPrivate, Sink sink, int descriptor
     : Log(least, revealPrivate), sink_(sink), descriptor_(descriptor), mayBlock_(mayBlock(descriptor)) {}
 
 void LocalLog::write(LogLevel level, const std::string& message) {
-  if (sink_ == Sink::Journal && sendToJournal(level, message)) return;
+  if (sink_ == Sink::Journal && writeEntry(level, message)) return;
   writeLine(level, message);
+}
+
+/// False if there is no journal. If it accepts nothing for a while, entries are dropped without waiting until
+/// it has taken one again.
+bool LocalLog::writeEntry(LogLevel level, const std::string& message) {
+  const auto entry = journalEntry(level, message);
+  const std::lock_guard lock(mutex_);
+  const auto outcome = journal_.send(entry, std::chrono::steady_clock::now() + (stuck_ ? 0s : kPatience));
+  stuck_ = outcome == JournalSocket::Outcome::Full;
+  return outcome != JournalSocket::Outcome::Failed;
 }
 
 void LocalLog::writeLine(LogLevel level, const std::string& message) {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "local/system/JournalSocket.h"
 #include "platform/log/Log.h"
 
 #include <chrono>
@@ -8,7 +9,8 @@
 
 namespace kvr {
 
-/// The log of this machine: the journal, or lines on a file descriptor.
+/// The log of this machine: the journal, or lines on a file descriptor. A reader that has stopped reading
+/// delays the agent by a second, once; what it does not take is lost.
 ///
 /// A line is `TIMESTAMP LEVEL com.tarsil.Kavrel:core MESSAGE`, written with one call. Characters of a message
 /// that could end the line, or control a terminal, are escaped.
@@ -27,14 +29,16 @@ class LocalLog : public Log {
   void write(LogLevel level, const std::string& message) override;
 
  private:
+  bool writeEntry(LogLevel level, const std::string& message);
   void writeLine(LogLevel level, const std::string& message);
   bool isReady(std::chrono::steady_clock::time_point deadline);
 
   const Sink sink_;
   const int descriptor_;
   const bool mayBlock_;
-  std::mutex mutex_;    ///< guards what follows, and the order of lines whose writing may block
-  bool stuck_ = false;  ///< the last line was not accepted, or not all of it
+  std::mutex mutex_;  ///< guards what follows, and the order of what may block
+  JournalSocket journal_;
+  bool stuck_ = false;  ///< the last line or entry was not accepted, or not all of it
   bool torn_ = false;   ///< a part of it was written
 };
 

@@ -6,6 +6,7 @@
 #include <sys/time.h>
 #include <sys/un.h>
 
+#include <cstring>
 #include <filesystem>
 #include <stdexcept>
 #include <string>
@@ -26,10 +27,23 @@ class DatagramSocket {
       throw std::runtime_error("no socket at " + path.string());
     }
   }
-  /// Waits for the next message.
+  bool hasMessage() const { return ::recv(socket_.get(), nullptr, 0, MSG_PEEK | MSG_DONTWAIT) >= 0; }
+  /// Waits for the next message; of one that is a file, for its content.
   std::string receive() const {
-    std::string message(std::size_t{1} << 16U, '\0');
-    const auto size = ::recv(socket_.get(), message.data(), message.size(), 0);
+    std::string message(std::size_t{1} << 20U, '\0');
+    alignas(cmsghdr) char control[CMSG_SPACE(sizeof(int))];
+    iovec part{message.data(), message.size()};
+    msghdr header{};
+    header.msg_iov = &part;
+    header.msg_iovlen = 1;
+    header.msg_control = control;
+    header.msg_controllen = sizeof control;
+    auto size = ::recvmsg(socket_.get(), &header, MSG_CMSG_CLOEXEC);
+    if (const auto* const sent = CMSG_FIRSTHDR(&header); size == 0 && sent != nullptr) {
+      int file = -1;
+      std::memcpy(&file, CMSG_DATA(sent), sizeof file);
+      size = ::pread(Descriptor(file).get(), message.data(), message.size(), 0);
+    }
     if (size < 0) throw std::runtime_error("no message came");
     message.resize(static_cast<std::size_t>(size));
     return message;
