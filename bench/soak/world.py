@@ -61,7 +61,7 @@ class World:
         self.kind, self.directory, self.programs, self.clock, self.report = kind, directory, programs, clock, report
         self.home, self.device = f"{directory}/home", f"{directory}/device"
         self.isEnding = False
-        self.children, self.agent = [], None
+        self.children, self.keeper, self.agent = [], None, None
         self.log, self.logEnd = os.pipe()
         threading.Thread(target=self.read_log, daemon=True).start()
         self.lines, self.heldBack = [], None
@@ -193,10 +193,11 @@ class World:
                 request = json.load(file)
             os.unlink(path)
             self.report.count("requests to the service")
+            reason = request.get("reason")
             # A request that was under way when the clock was set has the former time.
-            isOfFormerTime = "requestTimestamp" in request.get("reason", "") and time.monotonic() - self.clock.lastSet < LIMIT
-            if "reason" in request and not isOfFormerTime:
-                self.report.fail(f"{self.kind}: a wrong request, {request['reason']}")
+            isOfFormerTime = "requestTimestamp" in (reason or "") and time.monotonic() - self.clock.lastSet < LIMIT
+            if reason and not isOfFormerTime:
+                self.report.fail(f"{self.kind}: a wrong request, {reason}")
 
     def start_agent(self):
         agent = f"{self.programs}/kvragent"
@@ -209,7 +210,8 @@ class World:
             with Peer(self.address) as peer:
                 peer.call(*BUS, "ReloadConfig")
         else:
-            threading.Thread(target=self.run_agent, args=(agent,)).start()
+            self.keeper = threading.Thread(target=self.run_agent, args=(agent,))
+            self.keeper.start()
         self.wait_for_agent()
 
     def run_agent(self, program):
@@ -223,7 +225,8 @@ class World:
 
     def note_end(self, status):
         """An agent ends with status 0, or because it was killed."""
-        if status not in (0, -signal.SIGKILL):
+        isEarly = self.isEnding and status == -signal.SIGTERM  # it had not begun yet
+        if status not in (0, -signal.SIGKILL) and not isEarly:
             self.report.fail(f"{self.kind}: it ended with status {status}")
         if self.kind == "lasting" and not self.isEnding:
             self.report.fail(f"{self.kind}: it ended, though nobody had asked it to")
@@ -266,9 +269,12 @@ class World:
         self.isEnding = True
         process = self.kill_agent(signal.SIGTERM)
         end = time.monotonic() + 20
-        while process and os.path.exists(f"/proc/{process}/task") and time.monotonic() < end:
-            if self.agent and self.agent.poll() is not None:
-                break
+        if self.keeper:
+            self.keeper.join(20)
+            while self.keeper.is_alive():  # it was just starting another one
+                self.agent.terminate()
+                self.keeper.join(1)
+        while self.kind == "activated" and process and os.path.exists(f"/proc/{process}") and time.monotonic() < end:
             time.sleep(0.05)
         for child in reversed(self.children):
             child.send_signal(signal.SIGTERM)
