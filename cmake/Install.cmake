@@ -1,5 +1,5 @@
-# What is installed, and the two Debian packages: the agent with its command line, and the client library for building
-# other programs.
+# What is installed, and the Debian packages: the agent with its command line, a stand-in for the coverage service, the
+# client library for running other programs, and what it takes to build them.
 set(KVR_LIBEXEC ${CMAKE_INSTALL_LIBEXECDIR}/kvragent)
 set(KVR_AGENT ${CMAKE_INSTALL_FULL_LIBEXECDIR}/kvragent/kvragent)
 configure_file(dbus/com.tarsil.kvragent.service.in com.tarsil.kvragent.service @ONLY)
@@ -21,10 +21,17 @@ install(FILES docs/man/kvragent-device.5 DESTINATION ${CMAKE_INSTALL_MANDIR}/man
 install(FILES docs/man/kvragent.8 DESTINATION ${CMAKE_INSTALL_MANDIR}/man8)
 install(FILES completion/kvrctl.bash DESTINATION ${CMAKE_INSTALL_DATADIR}/bash-completion/completions RENAME kvrctl)
 install(FILES completion/_kvrctl DESTINATION ${CMAKE_INSTALL_DATADIR}/zsh/vendor-completions)
-install(DIRECTORY examples DESTINATION ${CMAKE_INSTALL_DOCDIR} USE_SOURCE_PERMISSIONS)
+# With permissions of their own, since the agent ignores a device that others may write.
+install(DIRECTORY examples/client examples/device DESTINATION ${CMAKE_INSTALL_DOCDIR}/examples)
+install(PROGRAMS examples/coverage.py DESTINATION ${CMAKE_INSTALL_DOCDIR}/examples)
+install(PROGRAMS examples/service/start DESTINATION ${CMAKE_INSTALL_DOCDIR}/examples/service)
 
-set(CMAKE_INSTALL_DEFAULT_COMPONENT_NAME client)
-install(TARGETS kvragent-client EXPORT kvragent-client LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR})
+set(CMAKE_INSTALL_DEFAULT_COMPONENT_NAME service)
+install(TARGETS kvr-coverage-service RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
+
+set(CMAKE_INSTALL_DEFAULT_COMPONENT_NAME development)
+install(TARGETS kvragent-client EXPORT kvragent-client LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR}
+        COMPONENT client NAMELINK_COMPONENT development)
 foreach(header client/AgentClient client/LocalState client/Records platform/value/Date
         platform/value/Error platform/value/Value)
   get_filename_component(folder ${header} DIRECTORY)
@@ -42,17 +49,34 @@ set(CPACK_PACKAGE_NAME kvragent)
 set(CPACK_PACKAGE_CONTACT "The kvragent developers <kvragent@example.org>")
 set(CPACK_PACKAGING_INSTALL_PREFIX /usr)
 set(CPACK_STRIP_FILES ON)
-set(CPACK_COMPONENTS_ALL agent client)
+set(CPACK_COMPONENTS_ALL agent service client development)
 set(CPACK_DEB_COMPONENT_INSTALL ON)
 set(CPACK_DEBIAN_FILE_NAME DEB-DEFAULT)
 set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS ON)
+# What else is linked with the client library depends on its package; the agent's modules are nobody's libraries.
+set(CPACK_DEBIAN_PACKAGE_GENERATE_SHLIBS ON)
+set(CPACK_DEBIAN_PACKAGE_GENERATE_SHLIBS_POLICY ">=")
+set(summary "warranty and coverage agent of a device")
+
 set(CPACK_DEBIAN_AGENT_PACKAGE_NAME kvragent)
-set(CPACK_COMPONENT_AGENT_DESCRIPTION "warranty and coverage agent of a device")
+set(CPACK_COMPONENT_AGENT_DESCRIPTION "${summary}")
 set(CPACK_DEBIAN_AGENT_PACKAGE_SECTION utils)
 set(CPACK_DEBIAN_AGENT_PACKAGE_DEPENDS "default-dbus-session-bus | dbus-session-bus | dbus")
 set(CPACK_DEBIAN_AGENT_PACKAGE_RECOMMENDS "ca-certificates")
-set(CPACK_DEBIAN_CLIENT_PACKAGE_NAME libkvragent-client-dev)
-set(CPACK_COMPONENT_CLIENT_DESCRIPTION "warranty and coverage agent of a device (client library)")
-set(CPACK_DEBIAN_CLIENT_PACKAGE_SECTION libdevel)
+set(CPACK_DEBIAN_AGENT_PACKAGE_SUGGESTS "kvr-coverage-service")
+
+set(CPACK_DEBIAN_SERVICE_PACKAGE_NAME kvr-coverage-service)
+set(CPACK_COMPONENT_SERVICE_DESCRIPTION "${summary} (stand-in for its service)")
+set(CPACK_DEBIAN_SERVICE_PACKAGE_SECTION utils)
+set(CPACK_DEBIAN_SERVICE_PACKAGE_RECOMMENDS "kvragent")
+
+set(CPACK_DEBIAN_CLIENT_PACKAGE_NAME libkvragent-client0)
+set(CPACK_COMPONENT_CLIENT_DESCRIPTION "${summary} (client library)")
+set(CPACK_DEBIAN_CLIENT_PACKAGE_SECTION libs)
 set(CPACK_DEBIAN_CLIENT_PACKAGE_RECOMMENDS "kvragent")
+
+set(CPACK_DEBIAN_DEVELOPMENT_PACKAGE_NAME libkvragent-client-dev)
+set(CPACK_COMPONENT_DEVELOPMENT_DESCRIPTION "${summary} (for building clients)")
+set(CPACK_DEBIAN_DEVELOPMENT_PACKAGE_SECTION libdevel)
+set(CPACK_DEBIAN_DEVELOPMENT_PACKAGE_DEPENDS "libkvragent-client0 (= ${PROJECT_VERSION})")
 include(CPack)

@@ -1,5 +1,9 @@
 #pragma once
 
+#if __cplusplus < 202002L
+#error "The kvragent client library needs C++20: compile with -std=c++20 or later."
+#endif
+
 #include "platform/value/Date.h"
 #include "platform/value/Value.h"
 

@@ -1,3 +1,4 @@
+#include "AgentPreferences.h"
 #include "Behaviours.h"
 #include "Service.h"
 #include "WireServer.h"
@@ -19,7 +20,7 @@ namespace {
 using namespace kvr::coverage_service;
 
 /// Serves until a termination signal arrives; false when serving ended without one.
-bool serve(WireServer& server, int port, const sigset_t& signals) {
+bool serve(WireServer& server, const std::string& url, const sigset_t& signals) {
   auto served = std::async(std::launch::async, [&server] {
     const bool wasStopped = server.listen_after_bind();
     if (!wasStopped) ::kill(::getpid(), SIGTERM);
@@ -29,7 +30,7 @@ bool serve(WireServer& server, int port, const sigset_t& signals) {
   using namespace std::chrono_literals;
   while (!server.is_running() && served.wait_for(1ms) == std::future_status::timeout) {
   }
-  std::printf("listening on http://127.0.0.1:%d\n", port);
+  std::printf("listening on %s\n", url.c_str());
   std::fflush(stdout);
   int signal = 0;
   sigwait(&signals, &signal);
@@ -44,6 +45,7 @@ int main(int argc, char** argv) {
   app.footer(Behaviours::kHelp);
   Service::Options options;
   int port = 0;
+  bool directsAgent = false;
   app.add_option(
          "--root", options.root,
          "Directory of the answers (kvrV2.plist, coverage/SERIAL[.LOCALE].json, coverage/default.json); "
@@ -58,6 +60,8 @@ int main(int argc, char** argv) {
                  "Certificate file (PEM or DER): requests about the local device must be attested by it");
   app.add_option("--accounts", options.accounts, "The agent's Accounts.plist, to check headers by value");
   app.add_option("--storefront", options.storefront, "The storefront expected in place of the account's own");
+  app.add_flag("--direct-agent", directsAgent,
+               "Make this user's agent ask this service, by setting the URLs in its preferences");
   CLI11_PARSE(app, argc, argv);
 
   // Before any thread starts, so that only this thread receives the signals.
@@ -78,7 +82,12 @@ int main(int argc, char** argv) {
       std::fputs("kvr-coverage-service: the port cannot be had\n", stderr);
       return EXIT_FAILURE;
     }
-    return serve(server, port, signals) ? EXIT_SUCCESS : EXIT_FAILURE;
+    const std::string url = "http://127.0.0.1:" + std::to_string(port);
+    if (directsAgent && !directAgentTo(url)) {
+      std::fputs("kvr-coverage-service: the agent's preferences cannot be written\n", stderr);
+      return EXIT_FAILURE;
+    }
+    return serve(server, url, signals) ? EXIT_SUCCESS : EXIT_FAILURE;
   } catch (const std::exception& error) {
     std::fprintf(stderr, "kvr-coverage-service: %s\n", error.what());
     return EXIT_FAILURE;
