@@ -26,7 +26,6 @@ const std::vector<std::string> kMembers{"ScheduleOutreach",
                                         "GetDeviceInfoForSerialNumber",
                                         "GetAllDeviceInfosUsingPolicy",
                                         "GetAllDeviceInfosUsingPolicy",
-                                        kDismiss,
                                         kDismiss};
 
 std::uint64_t policyIn(const Value& value) { return static_cast<std::uint64_t>(value.asInteger()); }

@@ -1,5 +1,7 @@
 #include "simulated/loop/SimulatedWorkQueues.h"
 
+#include "simulated/loop/SimulatedWorkParts.h"
+
 #include <algorithm>
 #include <exception>
 #include <limits>
@@ -10,17 +12,9 @@ namespace kvr {
 
 namespace {
 
-constexpr double kNever = std::numeric_limits<double>::infinity();
-constexpr double kLongestDelay = 1e13;  // seconds; anything above never comes
 constexpr double kShortestInterval = 0.001;
 constexpr int kMostItemsAtOnce = 300'000;
 constexpr int kMostEvents = 20'000'000;
-
-double cleanDelay(double delay) {
-  if (!(delay > 0)) return 0;
-  if (delay > kLongestDelay) return kNever;
-  return delay;
-}
 
 template <class T>
 T takeAt(std::vector<T>& list, std::size_t index) {
@@ -31,88 +25,6 @@ T takeAt(std::vector<T>& list, std::size_t index) {
 }
 
 }  // namespace
-
-class SimulatedWorkQueues::Queue : public WorkQueue, public std::enable_shared_from_this<Queue> {
- public:
-  Queue(SimulatedWorkQueues& theQueues, bool serial, std::string theLabel)
-      : queues(theQueues), isSerial(serial), label(std::move(theLabel)) {}
-  void async(Work work) override {
-    queues.enqueue(shared_from_this(), std::move(work));
-    queues.mayPause();
-  }
-
-  SimulatedWorkQueues& queues;
-  const bool isSerial;
-  const std::string label;
-  bool isBusy = false;
-  std::deque<Work> items;  ///< of a serial queue
-};
-
-/// Runs items one after the other on its own stack.
-struct SimulatedWorkQueues::Runner {
-  explicit Runner(SimulatedWorkQueues& queues) : fiber([this, &queues] { queues.work(*this); }) {}
-
-  std::shared_ptr<Queue> queue;  ///< null for a concurrent one
-  Work item;
-  std::uint64_t number = 0;  ///< of the item, in the order in which items start
-  const SimulatedTurns* awaited = nullptr;
-  bool isHeldBack = false;  ///< paused until nothing else can run
-  bool isDone = false;
-  bool isStopping = false;
-  Fiber fiber;
-};
-
-struct SimulatedWorkQueues::Waiter {
-  Runner* runner;
-  const SimulatedSignal* signal;
-  bool hasLimit;
-  EventKey timer;
-  Outcome outcome;
-};
-
-class SimulatedWorkQueues::SimulatedSignal : public Signal {
- public:
-  explicit SimulatedSignal(SimulatedWorkQueues& queues) : queues_(queues) {}
-
-  void signal() override {
-    if (std::exchange(signalled_, true)) return;
-    const auto waiters = queues_.waiters_;
-    for (const auto& waiter : waiters) {
-      if (waiter->signal == this) queues_.wake(waiter, Outcome::Signalled);
-    }
-    queues_.mayPause();
-  }
-  bool wait(std::optional<double> limit) override { return signalled_ || queues_.wait(*this, limit); }
-  bool isSignalled() const { return signalled_; }
-
- private:
-  SimulatedWorkQueues& queues_;
-  bool signalled_ = false;
-};
-
-class SimulatedWorkQueues::SimulatedTurns : public Turns {
- public:
-  SimulatedTurns(SimulatedWorkQueues& queues, std::string theLabel)
-      : label(std::move(theLabel)), queues_(queues) {}
-  void lock() override {
-    queues_.mayPause();
-    queues_.take(*this);
-  }
-  void unlock() override {
-    if (--depth > 0) return;
-    queues_.endTurn(*this);
-    queues_.mayPause();
-  }
-  bool areTakenByAnother(const Runner* runner) const { return depth > 0 && holder != runner; }
-
-  const std::string label;
-  int depth = 0;                   ///< how often the holder has locked it
-  const Runner* holder = nullptr;  ///< null: code outside of all items, if `depth` is not 0
-  std::vector<Runner*> waiting;
-
- private:
-  SimulatedWorkQueues& queues_;
-};
 
 class SimulatedWorkQueues::SimulatedTimer : public Timer {
  public:
@@ -353,16 +265,8 @@ void SimulatedWorkQueues::requireOutside() const {
   if (current_ != nullptr) throw std::logic_error("the simulation is driven from inside an item");
 }
 
-void SimulatedWorkQueues::pauseEvery(std::uint64_t points) {
-  pauseEvery_ = points;
-  drawPointsToPause();
-}
-
 /// Never 0, which `mayPause` counts down to.
-void SimulatedWorkQueues::drawPointsToPause() {
-  pointsToPause_ =
-      pauseEvery_ == 0 ? std::numeric_limits<std::uint64_t>::max() : 1 + random_() % (2 * pauseEvery_ - 1);
-}
+void SimulatedWorkQueues::drawPointsToPause() { pointsToPause_ = 1 + random_() % (2 * kPauseEvery - 1); }
 
 void SimulatedWorkQueues::pause() {
   drawPointsToPause();
@@ -374,109 +278,7 @@ void SimulatedWorkQueues::pause() {
   current_->fiber.pause();
 }
 
-// Turns.
-
-void SimulatedWorkQueues::take(SimulatedTurns& turns) {
-  while (turns.areTakenByAnother(current_)) {
-    current_ == nullptr ? takeOutside(turns) : takeInItem(turns);
-  }
-  turns.holder = current_;
-  ++turns.depth;
-}
-
-void SimulatedWorkQueues::takeInItem(SimulatedTurns& turns) {
-  Runner& runner = *current_;
-  runner.awaited = &turns;
-  const auto* holder = turns.holder;
-  while (holder != nullptr && holder != &runner && holder->awaited != nullptr)
-    holder = holder->awaited->holder;
-  if (holder == &runner) {
-    const auto waits = describeWaits();
-    runner.awaited = nullptr;
-    throw std::logic_error("deadlock: " + waits);
-  }
-  turns.waiting.push_back(&runner);
-  runner.fiber.pause();
-  runner.awaited = nullptr;
-}
-
-/// Runs others until the turn has ended.
-void SimulatedWorkQueues::takeOutside(const SimulatedTurns& turns) {
-  while (turns.depth > 0) {
-    while (step(clock_.elapsed_)) continue;
-    if (!runOne() && !step(kNever)) throw std::logic_error("deadlock: " + describeWaits());
-  }
-}
-
-void SimulatedWorkQueues::endTurn(SimulatedTurns& turns) {
-  turns.holder = nullptr;
-  const auto waiting = std::exchange(turns.waiting, {});
-  readyRunners_.insert(readyRunners_.end(), waiting.begin(), waiting.end());
-}
-
-std::string SimulatedWorkQueues::describeRunner(const Runner* runner) {
-  if (runner == nullptr) return "code outside of all items";
-  return "item " + std::to_string(runner->number) + " of " +
-         (runner->queue ? "the queue '" + runner->queue->label + "'" : "a concurrent queue");
-}
-
-/// Who waits for whom.
-std::string SimulatedWorkQueues::describeWaits() const {
-  std::string text;
-  for (const auto& runner : runners_) {
-    if (runner->awaited == nullptr) continue;
-    text += describeRunner(runner.get()) + " waits for the turn '" + runner->awaited->label + "' of " +
-            describeRunner(runner->awaited->holder) + "; ";
-  }
-  for (const auto& waiter : waiters_) {
-    if (!waiter->hasLimit) text += describeRunner(waiter->runner) + " waits for a signal; ";
-  }
-  return text + "nothing can end this wait";
-}
-
-// Waiting.
-
-bool SimulatedWorkQueues::wait(SimulatedSignal& signal, std::optional<double> limit) {
-  if (limit && cleanDelay(*limit) == kNever) limit.reset();
-  return current_ == nullptr ? waitOutside(signal, limit) : waitInItem(signal, limit);
-}
-
-bool SimulatedWorkQueues::waitInItem(SimulatedSignal& signal, std::optional<double> limit) {
-  if (current_->queue == mainQueue_) throw std::logic_error("an item waits on the main queue");
-  if (ending_) return false;
-  const auto waiter =
-      std::make_shared<Waiter>(Waiter{current_, &signal, limit.has_value(), {}, Outcome::Over});
-  waiters_.push_back(waiter);
-  if (limit) waiter->timer = schedule(*limit, [this, waiter] { wake(waiter, Outcome::Over); });
-  current_->fiber.pause();
-  if (waiter->outcome == Outcome::Deadlocked) throw std::logic_error("deadlock: " + deadlock_);
-  return waiter->outcome == Outcome::Signalled;
-}
-
-bool SimulatedWorkQueues::waitOutside(const SimulatedSignal& signal, std::optional<double> limit) {
-  const double deadline = limit ? clock_.elapsed_ + cleanDelay(*limit) : kNever;
-  while (!signal.isSignalled() && !ending_) {
-    while (step(clock_.elapsed_)) continue;
-    if (runOne() || step(deadline)) continue;
-    if (!limit) throw std::logic_error("deadlock: " + describeWaits());
-    clock_.elapsed_ = std::max(clock_.elapsed_, deadline);
-    break;
-  }
-  return signal.isSignalled();
-}
-
-void SimulatedWorkQueues::wake(const std::shared_ptr<Waiter>& waiter, Outcome outcome) {
-  waiter->outcome = outcome;
-  if (waiter->hasLimit) cancel(waiter->timer);
-  std::erase(waiters_, waiter);
-  readyRunners_.push_back(waiter->runner);
-}
-
-void SimulatedWorkQueues::wakeDeadlocked() {
-  deadlock_ = describeWaits();
-  const auto waiters = waiters_;
-  for (const auto& waiter : waiters) wake(waiter, Outcome::Deadlocked);
-}
+// Ending.
 
 void SimulatedWorkQueues::beginEnding() {
   ending_ = true;

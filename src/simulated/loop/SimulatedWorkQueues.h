@@ -33,6 +33,7 @@ namespace kvr {
 /// nothing can end any more: its fault says who waits for whom. Use it on one thread only.
 class SimulatedWorkQueues : public WorkQueues {
  public:
+  /// How many calls of `mayPause` lie between two pauses, on average.
   static constexpr std::uint64_t kPauseEvery = 8;
 
   SimulatedWorkQueues(SimulatedClock& clock, std::uint64_t seed);
@@ -52,8 +53,6 @@ class SimulatedWorkQueues : public WorkQueues {
   void mayPause() {
     if (current_ != nullptr && --pointsToPause_ == 0) pause();
   }
-  /// How many calls of `mayPause` lie between two pauses, on average; 0: no pauses.
-  void pauseEvery(std::uint64_t points);
   /// Number of pauses so far.
   std::size_t pauses() const { return pauses_; }
 
@@ -76,8 +75,6 @@ class SimulatedWorkQueues : public WorkQueues {
   /// destructor calls it too.
   void end();
 
-  /// Whether an item is suspended in the middle for another reason than a wait for a signal.
-  bool isAnyPaused() const { return !readyRunners_.empty(); }
   /// Items waiting inside `Signal::wait`.
   std::size_t waiting() const { return waiters_.size(); }
   /// Whether anything can run now or later.
@@ -142,7 +139,6 @@ class SimulatedWorkQueues : public WorkQueues {
   std::uint64_t itemsStarted_ = 0;
   std::vector<std::shared_ptr<Waiter>> waiters_;
 
-  std::uint64_t pauseEvery_ = kPauseEvery;
   std::uint64_t pointsToPause_ = 0;
   bool pausedLast_ = false;  ///< the runner that was resumed last has paused
   std::size_t pauses_ = 0;
