@@ -14,7 +14,7 @@ LocalPlatform::LocalPlatform(EventLoop& mainLoop, std::unique_ptr<LocalLog> theL
       services(queues, *log, entitlements, std::move(busLost)),
       activities(mainLoop, root, clock, queues, random, deviceProperties, *log, names::kAgent,
                  {names::kPostUpgrade, names::kPostBoot}, {}),
-      changes(mainLoop, *log, root, locale, pairedDevices, notifications),
+      changes(mainLoop, *log, root, locale, pairedDevices, notifications, &services.observers()),
       cleanExit(mainLoop, queues, activities, http, services, *log, names::kAgent) {}
 
 void LocalPlatform::beginEnding() {

@@ -71,7 +71,7 @@ struct LocalPlatform {
   LocalHTTP http{queues, *log};
   LocalServiceListeners services;
   LocalActivityScheduler activities;
-  FileFollowUpCenter followUps{propertyLists, clock};
+  FileFollowUpCenter followUps{propertyLists, clock, services.observers()};
   LocalCarrierInfo carriers{root};
   LocalNotifications notifications{services.connection(), queues, *log};
   LocalChanges changes;
@@ -101,6 +101,7 @@ struct LocalPlatform {
       .followUps = followUps,
       .carriers = carriers,
       .notifications = notifications,
+      .observers = services.observers(),
       .cleanExit = cleanExit,
       .applications = applications,
       .store = store,

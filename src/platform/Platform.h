@@ -13,6 +13,7 @@
 #include "platform/services/FollowUpCenter.h"
 #include "platform/services/HTTP.h"
 #include "platform/services/Notifications.h"
+#include "platform/services/Observers.h"
 #include "platform/services/PairedDeviceRegistry.h"
 #include "platform/services/Preferences.h"
 #include "platform/services/Processes.h"
@@ -55,6 +56,7 @@ struct Platform {
   FollowUpCenter& followUps;
   CarrierInfo& carriers;
   Notifications& notifications;
+  Observers& observers;
   CleanExit& cleanExit;
   ApplicationRegistry& applications;
   StoreLookup& store;

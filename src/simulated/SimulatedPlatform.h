@@ -15,6 +15,7 @@
 #include "simulated/SimulatedHTTP.h"
 #include "simulated/SimulatedLog.h"
 #include "simulated/SimulatedNotifications.h"
+#include "simulated/SimulatedObservers.h"
 #include "simulated/SimulatedPairedDeviceRegistry.h"
 #include "simulated/SimulatedProcesses.h"
 #include "simulated/SimulatedServiceListeners.h"
@@ -80,7 +81,8 @@ struct SimulatedPlatform {
   SimulatedActivityScheduler activities{
       propertyLists,    clock, queues,        random,
       deviceProperties, log,   names::kAgent, {names::kPostUpgrade, names::kPostBoot}};
-  FileFollowUpCenter followUps{propertyLists, clock};
+  SimulatedObservers observers;
+  FileFollowUpCenter followUps{propertyLists, clock, observers};
   SimulatedCarrierInfo carriers;
   SimulatedNotifications notifications{queues};
   SimulatedCleanExit cleanExit{clock};
@@ -109,6 +111,7 @@ struct SimulatedPlatform {
       .followUps = followUps,
       .carriers = carriers,
       .notifications = notifications,
+      .observers = observers,
       .cleanExit = cleanExit,
       .applications = applications,
       .store = store,

@@ -1,5 +1,6 @@
 #include "conformance/FileWorld.h"
 #include "platform/stores/FileFollowUpCenter.h"
+#include "simulated/SimulatedObservers.h"
 
 namespace kvr {
 namespace {
@@ -22,7 +23,8 @@ struct AFollowUpCenter : InBothWorlds {
 
   const std::string folder = world.path("Library/FollowUps");
   const std::string path = folder + "/" + kClient + ".plist";
-  FileFollowUpCenter center{world.lists, world.clock};
+  SimulatedObservers observers;
+  FileFollowUpCenter center{world.lists, world.clock, observers};
   const std::unique_ptr<FollowUpCenterClient> client = center.newClient(kClient);
 };
 INSTANTIATE_TEST_SUITE_P(, AFollowUpCenter, ::testing::Bool(), AFollowUpCenter::nameOf);

@@ -134,6 +134,7 @@ Process::Process(World& world, Invariants& invariants, Clients& clients, std::ui
                 followUps_,
                 simulated.carriers,
                 simulated.notifications,
+                simulated.observers,
                 simulated.cleanExit,
                 simulated.applications,
                 simulated.store,

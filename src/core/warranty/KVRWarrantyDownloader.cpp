@@ -166,23 +166,32 @@ void KVRWarrantyDownloader::finish(const Value& answer, const std::optional<std:
   const KVRWarrantyRef warranty = KVRWarranty::warrantyWithDictionary(platform_, answer);
   const KVRWarrantyRef cached = KVRWarranty::cachedWarrantyForSerialNumber(platform_, serialNumber);
   if (caller_.warrantyDownloaded(warranty, cached)) {
-    store(*warranty, serialNumber);
+    store(*warranty, cached, serialNumber);
   } else {
     platform_.log.error("the warranty is not cached, its conversion date cannot be stored");
   }
   completion(true, warranty);
 }
 
-void KVRWarrantyDownloader::store(const KVRWarranty& warranty,
+void KVRWarrantyDownloader::store(const KVRWarranty& warranty, const KVRWarrantyRef& cached,
                                   const std::optional<std::string>& serialNumber) {
   const auto locale = platform_.locale.preferredIdentifier();
   platform_.log.standard("caching warranty for locale: '%@', version: %@", locale, kCacheFormatVersion);
   warranty.cacheWarranty(serialNumber);
   if (!serialNumber) return;  // without one there is no hash to keep the metadata under
   const CacheMetadata metadata(*serialNumber);
+  // The same answer is news where the cached one did not count any more.
+  const auto wasStored = [this](const std::string& key, const Value& value) {
+    return platform_.preferences.objectForKey(key) == value;
+  };
+  const bool isNews =
+      platform_.observers.areThere() &&
+      !(cached && cached->dictionaryRepresentation() == warranty.dictionaryRepresentation() &&
+        wasStored(metadata.localeKey, locale) && wasStored(metadata.versionKey, kCacheFormatVersion));
   platform_.preferences.setObjects({{metadata.lastUpdatedDateKey, platform_.clock.now()},
                                     {metadata.localeKey, locale},
                                     {metadata.versionKey, kCacheFormatVersion}});
+  if (isNews) platform_.observers.tell({{*serialNumber}, {}, false});
 }
 
 Value KVRWarrantyDownloader::dictionaryFromURL(const URL& url,

@@ -60,7 +60,8 @@ class KVRWarrantyDownloader : public std::enable_shared_from_this<KVRWarrantyDow
                       const AttemptCompletion& completion);
   void finish(const Value& answer, const std::optional<std::string>& serialNumber,
               const DownloadCompletion& completion);
-  void store(const KVRWarranty& warranty, const std::optional<std::string>& serialNumber);
+  void store(const KVRWarranty& warranty, const KVRWarrantyRef& cached,
+             const std::optional<std::string>& serialNumber);
 
   Platform& platform_;
   const DownloadCaller caller_;

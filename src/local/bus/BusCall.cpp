@@ -59,6 +59,7 @@ Result<BusCall> readBusCall(sd_bus_message* message, const ServiceInterface& int
     arguments.push_back(*std::move(value));
   }
   call.arguments = std::make_shared<const Value::Array>(std::move(arguments));
+  call.interface = &interface;
   call.index = static_cast<std::size_t>(method - interface.methods.begin());
   call.message.reset(sd_bus_message_ref(message));
   return call;

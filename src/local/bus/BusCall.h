@@ -15,13 +15,14 @@ inline constexpr const char* kBusErrorTooMany = SD_BUS_ERROR_LIMITS_EXCEEDED;
 /// One call of an interface; its signature and arguments have been checked.
 struct BusCall {
   BusMessageRef message;
-  std::size_t index = 0;  ///< of the method in its interface
+  const ServiceInterface* interface = nullptr;
+  std::size_t index = 0;  ///< of the method in that interface
   std::shared_ptr<const Value::Array> arguments;
   std::size_t bytes = 0;  ///< total length of the text arguments
 };
 
-/// Parses and checks a call. The error's domain is the D-Bus error name to answer with. Texts are limited to
-/// 1 MiB, since no method of this interface needs a longer one.
+/// Parses and checks a call of an interface, which must outlive it. The error's domain is the D-Bus error
+/// name to answer with. Texts are limited to 1 MiB, since no method of this interface needs a longer one.
 Result<BusCall> readBusCall(sd_bus_message* message, const ServiceInterface& interface);
 
 /// Answers with a value of one of the types of BusCodec.h. If that cannot be sent, the caller gets an error,

@@ -192,7 +192,9 @@ void BusClient::receive(sd_bus_message* message) {
   if (waiting_.size() + open_.size() >= kCalls.when(*context_->openCalls)) {
     return failBusCall(message, kBusErrorTooMany, "too many calls of this connection are unanswered");
   }
-  Result<BusCall> call = readBusCall(message, context_->interface);
+  const char* const interface = sd_bus_message_get_interface(message);
+  const bool isAboutChanges = interface && std::string_view(interface) == changesInterface().name;
+  Result<BusCall> call = readBusCall(message, isAboutChanges ? changesInterface() : context_->interface);
   if (!call) return failBusCall(message, call.error().domain.c_str(), call.error().message);
   if (call->bytes > 0 && bytes_ + call->bytes > kBytes.when(*context_->openBytes)) {
     return failBusCall(message, kBusErrorTooMany, "the unanswered calls of this connection are too large");
@@ -228,6 +230,11 @@ void BusClient::settle(const BusCall& call) {
 void BusClient::serve(BusCall call) {
   const std::uint64_t number = ++lastCall_;
   const std::size_t index = call.index;
+  if (call.interface == &changesInterface()) {
+    const bool isNews = observe(call);
+    open_.emplace(number, std::move(call));
+    return answer(number, isNews);
+  }
   const auto reply = std::make_shared<CallReply>(context_->thread, weak_from_this(), number);
   const ServiceReply completion(context_->log, context_->interface.methods[index].member,
                                 [reply](Value value) { reply->give(std::move(value)); });
@@ -240,13 +247,20 @@ void BusClient::serve(BusCall call) {
   open_.emplace(number, std::move(call));
 }
 
+/// Carries out a call of `changesInterface`.
+bool BusClient::observe(const BusCall& call) {
+  const bool isSubscription = std::string_view(call.interface->methods[call.index].member) == "Subscribe";
+  return isSubscription ? context_->observers->add(sd_bus_message_get_bus(call.message.get()), name_)
+                        : context_->observers->remove(name_);
+}
+
 void BusClient::answer(std::uint64_t number, const std::optional<Value>& value) {
   const auto found = open_.find(number);
   if (found == open_.end()) return;
   const BusCall call = std::move(found->second);
   open_.erase(found);
   settle(call);
-  const ServiceMethod& method = context_->interface.methods[call.index];
+  const ServiceMethod& method = call.interface->methods[call.index];
   if (!value) return failBusCall(call.message.get(), kBusErrorFailed, "the call went without an answer");
   if (sd_bus_message_get_expect_reply(call.message.get()) > 0 &&
       !context_->unread->maySend(sd_bus_message_get_bus(call.message.get()), name_, *value)) {
@@ -264,6 +278,7 @@ void BusClient::close() {
   *context_->openCalls -= waiting_.size() + open_.size();
   *context_->openBytes -= std::exchange(bytes_, 0);
   context_->unread->forget(name_);
+  context_->observers->remove(name_);
   waiting_.clear();
   open_.clear();
   watch_.reset();

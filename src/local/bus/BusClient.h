@@ -2,6 +2,7 @@
 
 #include "local/bus/BusCall.h"
 #include "local/bus/BusConnection.h"
+#include "local/bus/BusObservers.h"
 #include "local/bus/UnreadReplies.h"
 #include "local/buscodec/BusHandles.h"
 #include "local/device/LocalEntitlements.h"
@@ -48,7 +49,8 @@ class DelegateGate {
 ///      is asked. A peer of another user, or one whose identity cannot be established, has no entitlements;
 ///   3. if the process is still alive and the bus, asked again, still knows the connection, it is admitted.
 ///
-/// The calls of an admitted client go in order to its own serial queue. The calls of a refused client are
+/// The calls of an admitted client go in order to its own serial queue; those that ask to be told of changes
+/// are answered at once. The calls of a refused client are
 /// answered with an error until it leaves. Everything runs on the bus thread unless noted otherwise.
 class BusClient : public ServiceConnection, public std::enable_shared_from_this<BusClient> {
  public:
@@ -63,6 +65,7 @@ class BusClient : public ServiceConnection, public std::enable_shared_from_this<
     ServiceInterface interface;
     /// Calls that wait or are being served, of all clients. Any thread.
     std::shared_ptr<std::atomic<std::size_t>> openCalls;
+    std::shared_ptr<BusObservers> observers;
     /// Drops a client that has left the bus. On the bus thread.
     std::function<void(const std::string& uniqueName)> forget;
     /// The bytes of the open calls' arguments, of all clients. This and what follows: on the bus thread.
@@ -74,7 +77,7 @@ class BusClient : public ServiceConnection, public std::enable_shared_from_this<
 
   /// Starts the admission. An error when the bus cannot be asked.
   std::optional<Error> begin(sd_bus* bus);
-  /// Takes one call of the service's interface.
+  /// Takes one call of the service's interface, or of `changesInterface`.
   void receive(sd_bus_message* call);
   /// The client has left: drops its calls and ignores answers from now on.
   void close();
@@ -105,6 +108,7 @@ class BusClient : public ServiceConnection, public std::enable_shared_from_this<
   bool isBusAnswer(sd_bus_message* reply, const char* member, sd_bus_message_handler_t handler);
   void serveWaiting();
   void serve(BusCall call);
+  bool observe(const BusCall& call);
   void settle(const BusCall& call);
   void release();
 

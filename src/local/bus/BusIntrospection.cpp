@@ -1,5 +1,7 @@
 #include "local/bus/BusIntrospection.h"
 
+#include "local/bus/BusObservers.h"
+
 namespace kvr {
 namespace {
 
@@ -20,15 +22,20 @@ constexpr std::string_view kHead =
  </interface>
 )";
 
+constexpr std::string_view kSignal =
+    R"(  <signal name="Changed">
+   <arg type="as" name="records"/>
+   <arg type="as" name="followUps"/>
+   <arg type="b" name="devices"/>
+  </signal>
+)";
+
 void appendArgument(std::string& document, const ServiceArgument& argument, const char* direction) {
   document.append("   <arg type=\"").append(argument.type).append("\" name=\"").append(argument.name);
   document.append("\" direction=\"").append(direction).append("\"/>\n");
 }
 
-}  // namespace
-
-std::string introspectionDocument(const ServiceInterface& interface) {
-  std::string document(kHead);
+void appendInterface(std::string& document, const ServiceInterface& interface, std::string_view signals) {
   document.append(" <interface name=\"").append(interface.name).append("\">\n");
   for (const ServiceMethod& method : interface.methods) {
     document.append("  <method name=\"").append(method.member).append("\">\n");
@@ -36,7 +43,16 @@ std::string introspectionDocument(const ServiceInterface& interface) {
     appendArgument(document, method.out, "out");
     document.append("  </method>\n");
   }
-  return document.append(" </interface>\n</node>\n");
+  document.append(signals).append(" </interface>\n");
+}
+
+}  // namespace
+
+std::string introspectionDocument(const ServiceInterface& interface) {
+  std::string document(kHead);
+  appendInterface(document, interface, "");
+  appendInterface(document, changesInterface(), kSignal);
+  return document.append("</node>\n");
 }
 
 std::string signatureOf(const ServiceMethod& method) {

@@ -106,7 +106,9 @@ bool BusService::take(sd_bus_message* message) {
     return true;
   }
   const char* const interface = sd_bus_message_get_interface(message);
-  if (interface && std::string_view(interface) != context_->interface.name) return false;
+  const bool isOurs = !interface || std::string_view(interface) == context_->interface.name ||
+                      std::string_view(interface) == changesInterface().name;
+  if (!isOurs) return false;
   receive(message);
   return true;
 }
@@ -173,6 +175,7 @@ void BusService::close() {
   object_.reset();
   for (const auto& [name, client] : std::exchange(clients_, {})) client->close();
   context_->unread->close();
+  context_->observers->close();
   done_ = nullptr;
 }
 

@@ -34,7 +34,7 @@ class LocalServiceListeners::Listener : public ServiceListener {
                              [&owner](const Error& error) { owner.lose(error); }},
         BusClient::Context{owner.queues_, owner.log_, owner.entitlements_, owner.connection_.thread(),
                            owner.queues_.newSerialQueue(name_ + ".listener"), delegate_, interface,
-                           owner.openCalls_, nullptr});
+                           owner.openCalls_, owner.observers_, nullptr});
     owner.open(service_);
   }
 
@@ -52,7 +52,8 @@ LocalServiceListeners::LocalServiceListeners(WorkQueues& queues, Log& log,
       log_(log),
       entitlements_(entitlements),
       busLost_(std::move(busLost)),
-      connection_(log, [this](const Error& error) { lose(error); }) {}
+      connection_(log, [this](const Error& error) { lose(error); }),
+      observers_(std::make_shared<BusObservers>(connection_.thread(), log)) {}
 
 LocalServiceListeners::~LocalServiceListeners() {
   connection_.thread()->post([this] {

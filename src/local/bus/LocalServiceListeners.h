@@ -1,6 +1,7 @@
 #pragma once
 
 #include "local/bus/BusConnection.h"
+#include "local/bus/BusObservers.h"
 #include "local/device/LocalEntitlements.h"
 #include "platform/log/Log.h"
 #include "platform/services/ServiceListener.h"
@@ -39,6 +40,8 @@ class LocalServiceListeners : public ServiceListeners {
   void beginEnding();
   /// The shared connection, for other users of the bus; they must be destroyed before this object.
   BusConnection& connection() { return connection_; }
+  /// The clients that asked to be told of changes.
+  Observers& observers() { return *observers_; }
   /// Whether the bus, or the service manager behind it, starts an agent when somebody calls this name. Waits
   /// for the bus a few seconds at most. Not on the bus thread.
   bool isActivatable(const std::string& name);
@@ -58,7 +61,8 @@ class LocalServiceListeners : public ServiceListeners {
   std::function<void()> busLost_;
   const std::shared_ptr<std::atomic<std::size_t>> openCalls_ = std::make_shared<std::atomic<std::size_t>>(0);
   std::vector<std::shared_ptr<BusService>> services_;  ///< used on the bus thread
-  BusConnection connection_;                           ///< destroyed first
+  BusConnection connection_;                           ///< destroyed first, but for what only posts to it
+  const std::shared_ptr<BusObservers> observers_;
 };
 
 }  // namespace kvr

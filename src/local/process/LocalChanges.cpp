@@ -17,6 +17,7 @@ constexpr double kSettling = 0.1;  // seconds
 constexpr auto kBurst = 1s;        // the longest time between edits that belong together
 constexpr const char* kLocale = "Locale.plist";
 constexpr const char* kPairedDevices = "PairedDevices.plist";
+constexpr const char* kDeviceProperties = "DeviceProperties.plist";
 
 bool containsAll(const std::set<std::string>& whole, const std::set<std::string>& part) {
   return std::ranges::includes(whole, part);
@@ -26,15 +27,17 @@ bool containsAll(const std::set<std::string>& whole, const std::set<std::string>
 
 LocalChanges::LocalChanges(EventLoop& loop, Log& log, const DeviceRoot& root, const LocalUserLocale& locale,
                            const LocalPairedDeviceRegistry& pairedDevices, LocalNotifications& notifications,
-                           const std::vector<std::string>& hostLocale)
+                           Observers* observers, const std::vector<std::string>& hostLocale)
     : root_(root),
       locale_(locale),
       pairedDevices_(pairedDevices),
       notifications_(notifications),
+      observers_(observers),
       hostLocale_(hostLocale),
       loop_(loop),
       language_(languageNow()),
       watches_(watchesNow()),
+      devices_(devicesNow()),
       localeFile_{kLocale, &LocalChanges::tellLocale, 0, stampOf(kLocale)},
       watchesFile_{kPairedDevices, &LocalChanges::tellWatches, 0, stampOf(kPairedDevices)} {
   const auto watch = [&](const std::string& path, FileWatch::Changed changed) {
@@ -47,8 +50,22 @@ LocalChanges::LocalChanges(EventLoop& loop, Log& log, const DeviceRoot& root, co
     handleEdit(localeFile_, writes, writes > 0 && root_.dictionary(kLocale).isDictionary());
   });
   watch(root.pathOf(kPairedDevices), [this](std::size_t writes) {
+    tellDevices();
     handleEdit(watchesFile_, writes, writes > 0 && root_.array(kPairedDevices).isArray());
   });
+  if (observers_) watch(root.pathOf(kDeviceProperties), [this](std::size_t) { tellDevices(); });
+}
+
+Value LocalChanges::devicesNow() const {
+  if (!observers_) return {};
+  return Value::Array{root_.dictionary(kDeviceProperties), root_.array(kPairedDevices)};
+}
+
+void LocalChanges::tellDevices() {
+  Value now = devicesNow();
+  if (now == devices_) return;
+  devices_ = std::move(now);
+  observers_->tell({{}, {}, true});
 }
 
 std::string LocalChanges::languageNow() const {

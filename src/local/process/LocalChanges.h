@@ -4,6 +4,7 @@
 #include "local/device/LocalPairedDeviceRegistry.h"
 #include "local/locale/LocalUserLocale.h"
 #include "local/loop/FileWatch.h"
+#include "platform/services/Observers.h"
 
 #include <chrono>
 #include <cstddef>
@@ -21,6 +22,8 @@ namespace kvr {
 /// Posts one notification for each edit, even if several edits are noticed at once. A file that is missing or
 /// unreadable may be about to be replaced, so it is checked again a moment later. Built and destroyed on the
 /// loop's thread.
+///
+/// Observers, if given, are told when what the two files about devices say of them is another.
 class LocalChanges {
  public:
   /// Where hosts keep their locale.
@@ -28,6 +31,7 @@ class LocalChanges {
 
   LocalChanges(EventLoop& loop, Log& log, const DeviceRoot& root, const LocalUserLocale& locale,
                const LocalPairedDeviceRegistry& pairedDevices, LocalNotifications& notifications,
+               Observers* observers = nullptr,
                const std::vector<std::string>& hostLocale = hostLocaleFiles());
 
  private:
@@ -47,6 +51,9 @@ class LocalChanges {
     bool isLookToCome = false;  ///< a check is scheduled
   };
   std::optional<FileStamp> stampOf(const char* file) const;
+  /// What clients are told of devices: this one and its watches.
+  Value devicesNow() const;
+  void tellDevices();
   void handleEdit(Subject& subject, std::size_t writes, bool isWhole);
   void lookLater(Subject& subject);
   bool tellLocale(std::size_t edits, bool isCertain);
@@ -57,10 +64,12 @@ class LocalChanges {
   const LocalUserLocale& locale_;
   const LocalPairedDeviceRegistry& pairedDevices_;
   LocalNotifications& notifications_;
+  Observers* const observers_;
   const std::vector<std::string> hostLocale_;
   EventLoop& loop_;
   std::string language_;
   std::set<std::string> watches_;
+  Value devices_;
   Subject localeFile_;
   Subject watchesFile_;
   std::vector<std::unique_ptr<FileWatch>> fileWatches_;

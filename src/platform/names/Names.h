@@ -15,6 +15,9 @@ inline constexpr const char* kAgent = "com.tarsil.kvragent";
 
 inline constexpr const char* kObjectPath = "/com/tarsil/kvragent";
 inline constexpr const char* kInterface = "com.tarsil.kvragent.KVRAgentProtocol";
+/// How a client asks to be told of changes, and how it is told.
+inline constexpr const char* kChangesInterface = "com.tarsil.kvragent.Changes";
+inline constexpr const char* kChangedMember = "Changed";
 /// Clients whose program lacks this entitlement (a true boolean) are not served.
 inline constexpr const char* kEntitlement = "com.tarsil.private.kvragent";
 

@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <functional>
+#include <set>
 #include <utility>
 
 namespace kvr {
@@ -85,13 +86,32 @@ std::optional<Error> complaintAbout(const Value& tree) {
   return std::nullopt;
 }
 
+/// The serial numbers of the devices that have an item in only one of the two lists.
+std::set<std::string> differences(const Value& before, const Value& after) {
+  const auto only = [](const Value& here, const Value& there, std::set<std::string>& found) {
+    if (!here.isArray()) return;
+    const Value::Array others = there.isArray() ? there.array() : Value::Array();
+    for (const Value& entry : here.array()) {
+      if (std::ranges::find(others, entry) != others.end()) continue;
+      if (const auto serialNumber = entry[kUserInfo][names::kFollowUpSerialNumber].stringIfAny()) {
+        found.insert(*serialNumber);
+      }
+    }
+  };
+  std::set<std::string> found;
+  only(before, after, found);
+  only(after, before, found);
+  return found;
+}
+
 }  // namespace
 
 class FileFollowUpCenter::Client : public FollowUpCenterClient {
  public:
-  Client(PropertyListFiles& lists, const Clock& clock, const std::string& identifier)
+  Client(PropertyListFiles& lists, const Clock& clock, Observers& observers, const std::string& identifier)
       : lists_(lists),
         clock_(clock),
+        observers_(observers),
         isUsable_(canNameFile(identifier)),
         directory_(lists.files().homeDirectory() + "/" + std::string(names::kFollowUpsFolder)),
         path_(directory_ + "/" + identifier + ".plist") {}
@@ -146,41 +166,46 @@ class FileFollowUpCenter::Client : public FollowUpCenterClient {
     return entries;
   }
 
-  using Change = std::function<void(Value::Array&)>;
+  using Modify = std::function<void(Value::Array&)>;
 
-  /// The tree after the change; null if nothing changes.
-  Result<Value> changedBy(const Change& apply) const {
+  /// The tree after the change; null if nothing changes. `before` becomes the items that it replaces.
+  Result<Value> changedBy(const Modify& apply, Value& before) const {
     const auto stored = read();
     if (!stored) return stored.error();
     Value::Array entries = pendingEntries(*stored);
     apply(entries);
     Value::Dictionary tree = stored->isDictionary() ? stored->dictionary() : Value::Dictionary();
-    const Value before = tree[kItems];
+    before = tree[kItems];
     if (before == Value(entries) || (before.isNull() && entries.empty())) return Value();
     tree.insert_or_assign(kItems, std::move(entries));
     return Value(std::move(tree));
   }
 
-  std::optional<Error> change(const Change& apply) {
+  std::optional<Error> change(const Modify& apply) {
+    Value before;
     // A change without effect, such as clearing an item that is not pending, needs no lock.
-    auto changed = changedBy(apply);
+    auto changed = changedBy(apply, before);
     if (changed && changed->isNull()) return std::nullopt;
     const auto lock = lists_.lock(directory_);
-    changed = changedBy(apply);
+    changed = changedBy(apply, before);
     if (!changed) return changed.error();
     if (changed->isNull()) return std::nullopt;
-    return lists_.write(path_, *changed, PropertyListEncoding::Binary);
+    auto error = lists_.write(path_, *changed, PropertyListEncoding::Binary);
+    if (!error && observers_.areThere())
+      observers_.tell({{}, differences(before, (*changed)[kItems]), false});
+    return error;
   }
 
   PropertyListFiles& lists_;
   const Clock& clock_;
+  Observers& observers_;
   const bool isUsable_;
   const std::string directory_;
   const std::string path_;
 };
 
 std::unique_ptr<FollowUpCenterClient> FileFollowUpCenter::newClient(std::string clientIdentifier) {
-  return std::make_unique<Client>(lists_, clock_, clientIdentifier);
+  return std::make_unique<Client>(lists_, clock_, observers_, clientIdentifier);
 }
 
 }  // namespace kvr
