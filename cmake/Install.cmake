@@ -32,7 +32,7 @@ install(TARGETS kvr-coverage-service RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR}
 set(CMAKE_INSTALL_DEFAULT_COMPONENT_NAME development)
 install(TARGETS kvragent-client EXPORT kvragent-client LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR}
         COMPONENT client NAMELINK_COMPONENT development)
-foreach(header client/AgentClient client/LocalState client/Records platform/value/Date
+foreach(header client/AgentClient client/AgentConnection client/LocalState client/Records platform/value/Date
         platform/value/Error platform/value/Value)
   get_filename_component(folder ${header} DIRECTORY)
   install(FILES src/${header}.h DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/kvragent/${folder})

@@ -1,6 +1,6 @@
 #include "client/AgentClient.h"
 
-#include "local/buscodec/BusCodec.h"
+#include "client/AgentFailures.h"
 #include "local/buscodec/BusHandles.h"
 #include "platform/names/Names.h"
 
@@ -8,48 +8,12 @@
 #include <utility>
 
 namespace kvr::client {
+
+using namespace bus;  // NOLINT(google-build-using-namespace)
+
 namespace {
 
 constexpr std::uint64_t kSecond = 1'000'000;  // microseconds
-
-constexpr const char* kUnreachable[] = {
-    SD_BUS_ERROR_SERVICE_UNKNOWN, SD_BUS_ERROR_NAME_HAS_NO_OWNER, SD_BUS_ERROR_NO_REPLY,
-    SD_BUS_ERROR_DISCONNECTED,    SD_BUS_ERROR_TIMEOUT,           SD_BUS_ERROR_NO_SERVER,
-    SD_BUS_ERROR_UNKNOWN_OBJECT,
-};
-
-Error failure(Failure code, std::string message) {
-  return {std::string(kErrorDomain), code, std::move(message)};
-}
-
-Error failureOf(int result, const BusError& error) {
-  const std::string_view name = error.name();
-  const std::string message = *error.message() ? error.message() : std::generic_category().message(-result);
-  if (name == SD_BUS_ERROR_ACCESS_DENIED) return failure(Refused, message);
-  for (const char* one : kUnreachable) {
-    if (name == one) return failure(AgentUnreachable, message);
-  }
-  const bool couldNotStart = name.starts_with("org.freedesktop.DBus.Error.Spawn.");
-  if (couldNotStart || result == -ECONNRESET || result == -ENOTCONN)
-    return failure(AgentUnreachable, message);
-  return failure(OtherFailure, message);
-}
-
-Value argumentOf(Policy policy) { return static_cast<std::uint64_t>(policy); }
-
-template <class Record>
-Result<Record> recordIn(const Result<Value>& reply) {
-  if (!reply) return reply.error();
-  return Record::from(*reply);
-}
-
-template <class Record>
-Result<std::vector<Record>> recordsIn(const Result<Value>& reply) {
-  if (!reply) return reply.error();
-  std::vector<Record> records;
-  for (const Value& record : reply->array()) records.push_back(Record::from(record));
-  return records;
-}
 
 }  // namespace
 
@@ -75,23 +39,16 @@ bool AgentClient::isAgentRunning() const {
 
 Result<Value> AgentClient::call(const char* member, const std::vector<Argument>& arguments,
                                 const char* replyType) const {
-  sd_bus_message* made = nullptr;
-  int r = sd_bus_message_new_method_call(bus_.get(), &made, names::kAgent, names::kObjectPath,
-                                         names::kInterface, member);
-  const BusMessageRef message(made);
-  if (r < 0) return failure(OtherFailure, busError(r, "the call cannot be made").message);
-  for (const Argument& argument : arguments) {
-    const auto error = appendBusValue(made, argument.type, argument.value);
-    if (error) return failure(OtherFailure, error->message);
-  }
+  const Result<BusMessageRef> message = newCall(bus_.get(), member, arguments);
+  if (!message) return message.error();
   sd_bus_message* answer = nullptr;
   sd_bus_slot* pending = nullptr;
   const auto keep = [](sd_bus_message* given, void* kept, sd_bus_error*) {
     *static_cast<sd_bus_message**>(kept) = sd_bus_message_ref(given);
     return 0;
   };
-  r = sd_bus_call_async(bus_.get(), &pending, made, keep, static_cast<void*>(&answer),
-                        static_cast<std::uint64_t>(patience_) * kSecond);
+  int r = sd_bus_call_async(bus_.get(), &pending, message->get(), keep, static_cast<void*>(&answer),
+                            static_cast<std::uint64_t>(patience_) * kSecond);
   const BusSlotRef slot(pending);
   for (int seconds = 0; r >= 0 && answer == nullptr;) {
     r = sd_bus_process(bus_.get(), nullptr);
@@ -101,14 +58,7 @@ Result<Value> AgentClient::call(const char* member, const std::vector<Argument>&
   }
   const BusMessageRef reply(answer);
   if (answer == nullptr) return failureOf(r, BusError());
-  if (const sd_bus_error* error = sd_bus_message_get_error(answer)) {
-    BusError copy;
-    sd_bus_error_copy(copy.get(), error);
-    return failureOf(-sd_bus_message_get_errno(answer), copy);
-  }
-  Result<Value> value = readBusValue(answer, replyType);
-  if (!value) return failure(OtherFailure, "the agent's answer cannot be read: " + value.error().message);
-  return value;
+  return valueIn(answer, replyType);
 }
 
 Result<Device> AgentClient::defaultDevice() const {

@@ -1,5 +1,9 @@
 #pragma once
 
+#if __cplusplus < 202002L
+#error "The kvragent client library needs C++20: compile with -std=c++20 or later."
+#endif
+
 #include "client/Records.h"
 #include "platform/value/Error.h"
 
@@ -28,9 +32,12 @@ enum Failure : std::int64_t {
   AgentUnreachable = 2,  ///< no agent is running, or it ended before it answered
   Refused = 3,           ///< the agent refuses this program; the message names the missing entitlement
   OtherFailure = 4,      ///< anything else; see the message
+  NoAnswer = 5,          ///< the agent did not answer within the time that the call gives it
+  Cancelled = 6,         ///< the call was cancelled, or its connection destroyed (`AgentConnection`)
 };
 
-/// A connection to the agent. Use it on one thread, one call at a time:
+/// A connection to the agent whose calls wait; `AgentConnection` is one for programs with a loop. Use it on
+/// one thread, one call at a time:
 ///
 ///     Result<AgentClient> agent = AgentClient::connect();
 ///     if (agent) { auto info = agent->defaultDeviceInfo(Policy::Default); … }

@@ -49,4 +49,14 @@ struct DeviceInfo {
   static DeviceInfo from(const Value& record);
 };
 
+/// What has changed since the last one of these, by the serial numbers of the devices.
+struct Change {
+  /// The agent tells this client from here on, for the first time or again. Before, anything may have
+  /// changed.
+  bool isBeginning = false;
+  std::vector<std::string> records;    ///< their coverage is another
+  std::vector<std::string> followUps;  ///< their offer was posted, changed or removed
+  bool devices = false;                ///< the list of devices; ask for all of them anew
+};
+
 }  // namespace kvr::client

@@ -20,6 +20,7 @@ struct Options {
   bool all = false;
   bool json = false;
   bool showSerial = false;
+  bool isWatched = false;
 
   Report report() const { return Report(showSerial ? Report::Serials::Whole : Report::Serials::Shortened); }
 };

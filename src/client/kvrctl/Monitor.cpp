@@ -2,6 +2,7 @@
 
 #include "client/AgentClient.h"
 #include "client/LocalState.h"
+#include "client/kvrctl/Changes.h"
 #include "client/kvrctl/Output.h"
 #include "client/kvrctl/Terminal.h"
 #include "local/buscodec/BusHandles.h"
@@ -157,9 +158,12 @@ Status monitor(const Report& report, bool inJSON) {
   sigemptyset(&signals);
   sigaddset(&signals, SIGINT);
   sigaddset(&signals, SIGTERM);
+  sigaddset(&signals, SIGPIPE);
   ::pthread_sigmask(SIG_BLOCK, &signals, nullptr);
   EventLoop loop;
   endWith(loop, {SIGINT, SIGTERM});
+  constexpr int kOutputGone = 77;
+  endWithOutput(loop, kOutputGone);
   sd_bus* opened = nullptr;
   if (const int r = sd_bus_open_user(&opened); r < 0) {
     return fail({std::string(kErrorDomain), NoBus,
@@ -190,10 +194,19 @@ Status monitor(const Report& report, bool inJSON) {
     activities.update();
     downloads.update();
   });
+  Result<AgentConnection> agent = AgentConnection::connect();
+  if (!agent) return fail(agent.error());
+  // Of follow-ups, their file tells more.
+  const ChangesInLoop changes(loop, *std::move(agent), [&](const Change& change) {
+    if (change.isBeginning) return;
+    for (const auto& device : change.records) teller.tell("coverage", report.serial(device), "changed");
+    if (change.devices) teller.tell("devices", "", "changed");
+  });
   teller.tell("monitor", "", "watching");
   const int status = loop.run();
   sd_bus_detach_event(opened);
   if (status == EXIT_SUCCESS) return kFine;
+  if (status == kOutputGone) return kFailed;
   return fail({std::string(kErrorDomain), NoBus, "the session bus has gone"});
 }
 

@@ -6,8 +6,8 @@
 namespace kvr::client {
 
 /// Prints each change as it happens, one line each (a JSON document if `inJSON`): notifications on the bus,
-/// agents starting and ending, follow-ups, activities, downloads. Ends on SIGINT or SIGTERM, or when the bus
-/// goes away.
+/// agents starting and ending, follow-ups, activities, downloads, and what the agent tells of devices. Ends
+/// on SIGINT or SIGTERM; as a failure when the bus goes away, or nobody reads the output any more.
 Status monitor(const Report& report, bool inJSON);
 
 }  // namespace kvr::client

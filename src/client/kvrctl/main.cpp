@@ -1,5 +1,6 @@
 // kvrctl: asks the agent about this device, its paired devices and their warranties.
 
+#include "client/kvrctl/Changes.h"
 #include "client/kvrctl/Commands.h"
 #include "client/kvrctl/Monitor.h"
 #include "client/kvrctl/Terminal.h"
@@ -85,7 +86,9 @@ class CommandLine {
   }
 
   void addQuestions() {
-    add("status", "Every device at a glance, from what is known already (the default)", showStatus);
+    add("status", "Every device at a glance, from what is known already (the default)", [this] {
+      return options_.isWatched ? watchStatus(options_) : withAgent(showStatus, options_);
+    })->add_flag("--watch", options_.isWatched, "Again whenever it changes");
     add("device", "This device", showDevice);
     add("paired", "The paired devices", showPaired);
     CLI::App* const info = add("info", "A device and its warranty", showInfo);
