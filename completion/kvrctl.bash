@@ -20,6 +20,7 @@ _kvrctl() {
     schedule-outreach) options+=" --after" ;;
     account-added) options+=" --no-wait" ;;
     timeline) options+=" --svg" ;;
+    status) options+=" --watch" ;;
   esac
   COMPREPLY=($(compgen -W "$options" -- "$current"))
 }
