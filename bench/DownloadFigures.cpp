@@ -140,6 +140,7 @@ void store() {
       .followUps = platform.followUps,
       .carriers = platform.carriers,
       .notifications = platform.notifications,
+      .observers = platform.observers,
       .cleanExit = platform.cleanExit,
       .applications = platform.applications,
       .store = platform.store,
