@@ -114,6 +114,7 @@ class Copy:
     def __init__(self, folder, jobs):
         self.folder, self.tree, self.build = folder, folder / "tree", folder / "build"
         self.jobs = jobs
+        self.running = None  # the process group of the command that runs
         self.environment = dict(os.environ, CCACHE_BASEDIR=str(folder), CCACHE_NOHASHDIR="1",
                                 CCACHE_SLOPPINESS="pch_defines,time_macros,include_file_mtime,include_file_ctime")
 
@@ -166,18 +167,24 @@ class Copy:
         with open(output, "wb") as file:
             process = subprocess.Popen(command, stdout=file, stderr=subprocess.STDOUT, stdin=subprocess.DEVNULL,
                                        cwd=self.folder, env=self.environment, start_new_session=True)
+            self.running = process.pid
             hangs = False
             try:
                 process.wait(limit)
             except subprocess.TimeoutExpired:
                 hangs = True
-            finally:
-                try:
-                    os.killpg(process.pid, signal.SIGKILL)  # with what it has started
-                except ProcessLookupError:
-                    pass
-                process.wait()
+            self.kill()
+            process.wait()
         return Ending(process.returncode, output.read_text(errors="replace"), hangs, time.monotonic() - began)
+
+    def kill(self):
+        """Ends the command that runs, with what it has started."""
+        group, self.running = self.running, None
+        try:
+            if group:
+                os.killpg(group, signal.SIGKILL)
+        except ProcessLookupError:
+            pass
 
     def plant(self, fault):
         texts = fault.planted(self.tree)
