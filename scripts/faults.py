@@ -15,7 +15,7 @@ from rooms import ROOT, git_files
 
 FAULTS = ROOT / "faults"
 OUTSIDE = ("tests/", "faults/", "docs/")  # what a fault may not change
-UNUSED = ("faults/", "docs/", "scripts/", "bench/", "completion/", "examples/")  # what the copies do without
+UNUSED = ("faults/", "docs/", "scripts/")  # what the copies do without
 LEAST_LIMIT = 60  # seconds for a stage
 LIMIT_FACTOR = 10  # ... or so many times what it takes on the tree without a fault
 
