@@ -53,7 +53,8 @@ std::vector<std::uint64_t> seedsIn(const std::string& path) {
   for (std::string line; std::getline(file, line);) {
     std::istringstream words(line.substr(0, line.find('#')));
     for (std::uint64_t seed = 0; words >> seed;) seeds.push_back(seed);
-    if (!words.eof()) throw CLI::ValidationError("--seeds-of", path + ": no seed: " + line);
+    if (!words.eof())
+      throw CLI::ValidationError("--seeds-of", std::string(path).append(": no seed: ").append(line));
   }
   if (seeds.empty()) throw CLI::ValidationError("--seeds-of", path + ": no seeds");
   return seeds;
