@@ -49,23 +49,21 @@ int ChangesInLoop::dispatch() {
   return sd_event_source_set_enabled(descriptor_, SD_EVENT_OFF);
 }
 
-void endWithOutput(EventLoop& loop, int status) {
+void endWithOutput(EventLoop& loop) {
   // An error of the output is reported without being asked for. A file has none, and is not watched.
   sd_event_add_io(
       loop.event(), nullptr, STDOUT_FILENO, 0,
-      [](sd_event_source* source, int, std::uint32_t, void* it) {
-        return sd_event_exit(sd_event_source_get_event(source),
-                             static_cast<int>(reinterpret_cast<std::intptr_t>(it)));
+      [](sd_event_source* source, int, std::uint32_t, void*) {
+        return sd_event_exit(sd_event_source_get_event(source), kOutputGone);
       },
-      reinterpret_cast<void*>(static_cast<std::intptr_t>(status)));
+      nullptr);
   sd_event_add_post(
       loop.event(), nullptr,
-      [](sd_event_source* source, void* it) {
+      [](sd_event_source* source, void*) {
         if (std::ferror(stdout) == 0) return 0;
-        return sd_event_exit(sd_event_source_get_event(source),
-                             static_cast<int>(reinterpret_cast<std::intptr_t>(it)));
+        return sd_event_exit(sd_event_source_get_event(source), kOutputGone);
       },
-      reinterpret_cast<void*>(static_cast<std::intptr_t>(status)));
+      nullptr);
 }
 
 Status watchStatus(const Options& options) {
@@ -77,14 +75,15 @@ Status watchStatus(const Options& options) {
   if (!connection) return fail(connection.error());
   std::signal(SIGPIPE, SIG_IGN);
   EventLoop loop;
-  endWithOutput(loop, kFailed);
+  endWithOutput(loop);
   bool isFirst = true;
   const ChangesInLoop changes(loop, *std::move(connection), [&](const Change&) {
     if (!std::exchange(isFirst, false) && !options.json) print("\n", kFine);
     const Status shown = showStatus(*agent, options);
     if (shown == kUnreachable || shown == kRefused) loop.exit(shown);
   });
-  return static_cast<Status>(loop.run());
+  const int status = loop.run();
+  return status == kOutputGone ? kFailed : static_cast<Status>(status);
 }
 
 }  // namespace kvr::client

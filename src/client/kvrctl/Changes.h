@@ -26,8 +26,10 @@ class ChangesInLoop {
   sd_event_source* timer_ = nullptr;
 };
 
-/// Ends the loop with this status when nobody can read the standard output any more.
-void endWithOutput(EventLoop& loop, int status);
+/// The loop's status when nobody can read the standard output any more; no other end of a loop has it.
+constexpr int kOutputGone = 77;
+/// Ends the loop with that status then.
+void endWithOutput(EventLoop& loop);
 
 /// The status of all devices, again whenever it changes. Ends when the agent refuses this program, when the
 /// bus goes, and when nobody reads the output any more.

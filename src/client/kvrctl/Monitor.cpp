@@ -162,8 +162,7 @@ Status monitor(const Report& report, bool inJSON) {
   ::pthread_sigmask(SIG_BLOCK, &signals, nullptr);
   EventLoop loop;
   endWith(loop, {SIGINT, SIGTERM});
-  constexpr int kOutputGone = 77;
-  endWithOutput(loop, kOutputGone);
+  endWithOutput(loop);
   sd_bus* opened = nullptr;
   if (const int r = sd_bus_open_user(&opened); r < 0) {
     return fail({std::string(kErrorDomain), NoBus,

@@ -127,6 +127,8 @@ int BusObservers::handleRead(sd_bus_message* message, void* userdata, sd_bus_err
   });
 }
 
+// A copy: the caller's name may belong to the observer that is removed.
+// NOLINTNEXTLINE(performance-unnecessary-value-param)
 void BusObservers::lose(std::string name, const std::string& why) {
   const bool hasLeft = why == SD_BUS_ERROR_NO_REPLY || why == SD_BUS_ERROR_SERVICE_UNKNOWN;
   if (!hasLeft) log_.error("Connection %@ is told of no more changes: %@", name, why);
