@@ -73,6 +73,14 @@ TEST_F(TheAgentsLife, SchedulesThePostAtTheEarliestDateOfAnOutreach) {
                        "(null)/(null)"));
 }
 
+TEST_F(TheAgentsLife, DefersAnOutreachThatTheEndOfTheProcessCutsShort) {
+  world.coverage = [this](const HTTPRequest&) {
+    world.cleanExit.beginEnding();
+    return HTTPResponse{500, {}, {}};
+  };
+  EXPECT_EQ(run<KVROutreachActivity>(), ActivityResult::Deferred);
+}
+
 TEST_F(TheAgentsLife, BeginsWithTheFirstPostUpgradeRun) {
   for (const bool hasAccount : {true, false}) {
     if (!hasAccount) world.accounts.primary.reset();
